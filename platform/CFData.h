@@ -1,0 +1,39 @@
+// Byte buffers, immutable or mutable. A mutable data object grows without limit when its
+// capacity is 0.
+//
+// NOTE: CFDataGetBytePtr and CFDataGetMutableBytePtr are valid until the data object next
+// changes its length (append, set length, increase, replace, delete) or is destroyed.
+#pragma once
+
+#include "platform/CFBase.h"
+
+CFTypeID CFDataGetTypeID();
+
+/// A new data object with a copy of `length` bytes (null `bytes` allowed when `length` is 0).
+CFDataRef CFDataCreate(CFAllocatorRef allocator, const UInt8* bytes, CFIndex length);
+/// A new data object over `bytes` without copying them. When the data object is destroyed the
+/// bytes are given to `bytesDeallocator`: kCFAllocatorMalloc (and the default allocator) frees
+/// them with free(), kCFAllocatorNull leaves them alone.
+CFDataRef CFDataCreateWithBytesNoCopy(CFAllocatorRef allocator, const UInt8* bytes, CFIndex length,
+                                      CFAllocatorRef bytesDeallocator);
+CFDataRef CFDataCreateCopy(CFAllocatorRef allocator, CFDataRef data);
+/// A new empty mutable data object; `capacity` 0 means unlimited (a limit is not enforced).
+CFMutableDataRef CFDataCreateMutable(CFAllocatorRef allocator, CFIndex capacity);
+CFMutableDataRef CFDataCreateMutableCopy(CFAllocatorRef allocator, CFIndex capacity, CFDataRef data);
+
+CFIndex CFDataGetLength(CFDataRef data);
+/// Null for an empty data object is allowed; never dereference past the length.
+const UInt8* CFDataGetBytePtr(CFDataRef data);
+UInt8* CFDataGetMutableBytePtr(CFMutableDataRef data);
+/// Copies the bytes of `range` (kept inside the data by the caller) to `buffer`.
+void CFDataGetBytes(CFDataRef data, CFRange range, UInt8* buffer);
+
+/// Cuts or grows the length; new bytes are zero.
+void CFDataSetLength(CFMutableDataRef data, CFIndex length);
+/// Grows the length by `extraLength` zero bytes.
+void CFDataIncreaseLength(CFMutableDataRef data, CFIndex extraLength);
+void CFDataAppendBytes(CFMutableDataRef data, const UInt8* bytes, CFIndex length);
+/// Replaces the bytes of `range` with `newLength` bytes from `newBytes`.
+void CFDataReplaceBytes(CFMutableDataRef data, CFRange range, const UInt8* newBytes,
+                        CFIndex newLength);
+void CFDataDeleteBytes(CFMutableDataRef data, CFRange range);
