@@ -32,7 +32,9 @@ CFIndex CFArrayBSearchValues(CFArrayRef array, CFRange range, const void* value,
                              CFComparatorFunction comparator, void* context);
 
 void CFArrayAppendValue(CFMutableArrayRef array, const void* value);
+/// `index` may equal the count (the value is appended).
 void CFArrayInsertValueAtIndex(CFMutableArrayRef array, CFIndex index, const void* value);
+/// `index` may equal the count (the value is appended).
 void CFArraySetValueAtIndex(CFMutableArrayRef array, CFIndex index, const void* value);
 void CFArrayRemoveValueAtIndex(CFMutableArrayRef array, CFIndex index);
 void CFArrayRemoveAllValues(CFMutableArrayRef array);

@@ -1,0 +1,180 @@
+#include "platform/CFCollectionStorage.h"
+
+#include <algorithm>
+#include <cstdlib>
+
+#include "platform/Log.h"
+
+namespace glyphwell::runtime {
+
+void ReportInvalidArgument(const char* condition, const std::source_location& where) {
+    AssertionFailure(condition, where.function_name(), where.file_name(), int(where.line()));
+}
+
+bool CheckRange(CFRange range, CFIndex count, const std::source_location& where) {
+    bool inside = range.location >= 0 && range.length >= 0 && range.location <= count &&
+                  range.length <= count - range.location;
+    if (!inside)
+        ReportInvalidArgument("range lies inside the collection", where);
+    return inside;
+}
+
+// ---------------------------------------------------------------------------------------------
+// ElementReleaser
+
+namespace {
+
+struct PendingRelease {
+    CFReleaseCallBack release;
+    const void* value;
+};
+
+// Trivially destructible on purpose: containers may be destroyed while the thread's (or the
+// process's) destructors run, after a std::vector here would be gone. The outermost releaser
+// frees the storage when it has drained the queue.
+struct ReleaseQueue {
+    PendingRelease* items;
+    size_t count;
+    size_t capacity;
+    bool active;
+};
+thread_local ReleaseQueue releaseQueue{};
+
+} // namespace
+
+ElementReleaser::ElementReleaser() noexcept : outermost_(!releaseQueue.active) {
+    releaseQueue.active = true;
+}
+
+ElementReleaser::~ElementReleaser() {
+    if (!outermost_)
+        return;
+    // Releasing an item may destroy a container, whose releaser appends to the queue.
+    while (releaseQueue.count > 0) {
+        PendingRelease item = releaseQueue.items[--releaseQueue.count];
+        item.release(kCFAllocatorDefault, item.value);
+    }
+    std::free(releaseQueue.items);
+    releaseQueue = ReleaseQueue{};
+}
+
+void ElementReleaser::Release(CFReleaseCallBack release, const void* value) {
+    if (!release)
+        return;
+    if (!outermost_) {
+        ReleaseQueue& queue = releaseQueue;
+        if (queue.count == queue.capacity) {
+            size_t capacity = queue.capacity ? queue.capacity * 2 : 64;
+            void* grown = std::realloc(queue.items, capacity * sizeof(PendingRelease));
+            if (grown) {
+                queue.items = static_cast<PendingRelease*>(grown);
+                queue.capacity = capacity;
+            }
+        }
+        if (queue.count < queue.capacity) {
+            queue.items[queue.count++] = PendingRelease{release, value};
+            return;
+        }
+        // Out of memory for the queue: release at once, spending stack instead.
+    }
+    release(kCFAllocatorDefault, value);
+}
+
+// ---------------------------------------------------------------------------------------------
+// HashedTable
+
+const void* HashedTable::RemovedKey() noexcept {
+    static const char marker = 0;
+    return &marker;
+}
+
+// Fibonacci hashing: the top bits of the product spread keys whose hashes differ only in their
+// high or low bits (pointers, small integers).
+size_t HashedTable::HomeSlot(CFHashCode hash) const noexcept {
+    return size_t((uint64_t(hash) * 0x9e3779b97f4a7c15ULL) >> slotShift_);
+}
+
+CFIndex HashedTable::Find(const void* key, CFHashCode hash) const {
+    if (slots_.empty())
+        return -1;
+    // The index is at most half full, so the probe always reaches an empty slot.
+    const size_t mask = slots_.size() - 1;
+    for (size_t slot = HomeSlot(hash);; slot = (slot + 1) & mask) {
+        size_t position = slots_[slot];
+        if (position == 0)
+            return -1;
+        const HashedEntry& entry = entries_[position - 1];
+        if (entry.hash == hash && entry.key != RemovedKey() &&
+            CallEqual(equalCallBack_, entry.key, key))
+            return CFIndex(position - 1);
+    }
+}
+
+void HashedTable::PlaceInIndex(CFHashCode hash, size_t position) {
+    const size_t mask = slots_.size() - 1;
+    size_t slot = HomeSlot(hash);
+    while (slots_[slot] != 0)
+        slot = (slot + 1) & mask;
+    slots_[slot] = position + 1;
+}
+
+void HashedTable::Append(const void* key, const void* value, CFHashCode hash) {
+    // Every entry, removed or not, holds one slot; keep at most half of the slots in use. The
+    // new index leaves room for half as many entries again, so regrowth stays amortised O(1)
+    // even when removals and additions alternate.
+    if (2 * (entries_.size() + 1) > slots_.size())
+        Rebuild(size_t(liveCount_) + size_t(liveCount_) / 2 + 1);
+    entries_.push_back(HashedEntry{key, value, hash});
+    ++liveCount_;
+    PlaceInIndex(hash, entries_.size() - 1);
+}
+
+HashedEntry HashedTable::Remove(CFIndex position) {
+    HashedEntry& slotEntry = entries_[size_t(position)];
+    HashedEntry removed = slotEntry;
+    slotEntry.key = RemovedKey();
+    slotEntry.value = nullptr;
+    --liveCount_;
+    ++removedCount_;
+    // Compact once removed entries outnumber live ones: amortised O(1) per removal.
+    if (removedCount_ > size_t(liveCount_))
+        Rebuild(size_t(liveCount_));
+    return removed;
+}
+
+std::vector<HashedEntry> HashedTable::TakeAll() noexcept {
+    std::vector<HashedEntry> taken;
+    taken.swap(entries_);
+    std::erase_if(taken, [](const HashedEntry& entry) { return entry.key == RemovedKey(); });
+    slots_.clear();
+    slotShift_ = 64;
+    liveCount_ = 0;
+    removedCount_ = 0;
+    return taken;
+}
+
+void HashedTable::Reserve(CFIndex count) {
+    if (count > 0 && 2 * size_t(count) > slots_.size())
+        Rebuild(size_t(count));
+}
+
+void HashedTable::Rebuild(size_t count) {
+    if (removedCount_ > 0) {
+        std::erase_if(entries_, [](const HashedEntry& entry) { return entry.key == RemovedKey(); });
+        removedCount_ = 0;
+    }
+    count = std::max(count, entries_.size());
+    size_t size = 8;
+    unsigned shift = 61;
+    while (size < 2 * count) {
+        size *= 2;
+        --shift;
+    }
+    slots_.assign(size, 0);
+    slotShift_ = shift;
+    entries_.reserve(count);
+    for (size_t position = 0; position < entries_.size(); ++position)
+        PlaceInIndex(entries_[position].hash, position);
+}
+
+} // namespace glyphwell::runtime

@@ -1,0 +1,135 @@
+// Storage shared by the container kinds (internal to platform/): argument checks that report
+// through the assertion handler, the element releaser that keeps the destruction of nested
+// containers flat, and the hashed table behind sets and dictionaries.
+//
+// The hashed table differs from std::unordered_map in two ways the containers need: entries are
+// kept in insertion order (a dense vector, enumerated front to back), and keys are hashed and
+// compared through the container's callbacks. An open-addressing index maps hashes to entry
+// positions; removal marks the entry and compacts once marked entries outnumber live ones.
+#pragma once
+
+#include <cstddef>
+#include <source_location>
+#include <vector>
+
+#include "platform/CFRuntime.h"
+
+namespace glyphwell::runtime {
+
+/// Reports a failed argument check through the assertion handler, naming the public function
+/// in which it happened.
+void ReportInvalidArgument(const char* condition, const std::source_location& where);
+
+/// The object behind `value` as kind T, or null (reported as `condition`) when `value` is null
+/// or of another kind.
+template <class T>
+T* CheckedObject(const void* value, CFTypeID kind, const char* condition,
+                 const std::source_location& where) {
+    T* object = AsMutable<T>(value, kind);
+    if (!object)
+        ReportInvalidArgument(condition, where);
+    return object;
+}
+
+/// Whether `range` lies inside a sequence of `count` elements; reported when it does not.
+bool CheckRange(CFRange range, CFIndex count, const std::source_location& where);
+
+/// Gives back a destroyed container's counts on its elements. The first releaser on a thread
+/// calls the release callbacks at once; releasers created while it lives (by the destructors of
+/// the elements it releases) queue their elements instead, and the first one drains the queue
+/// before it goes. Destroying a value nested N levels deep therefore takes constant stack.
+class ElementReleaser {
+public:
+    ElementReleaser() noexcept;
+    ~ElementReleaser();
+    ElementReleaser(const ElementReleaser&) = delete;
+    ElementReleaser& operator=(const ElementReleaser&) = delete;
+
+    /// Calls `release` for `value` now or later; a null callback does nothing.
+    void Release(CFReleaseCallBack release, const void* value);
+
+private:
+    bool outermost_;
+};
+
+/// What storing a key does when the table holds an equal key already, or does not.
+enum class PutMode {
+    AddOnly,      ///< add an absent key; leave a present one alone
+    AddOrReplace, ///< add an absent key; replace a present one's value (a set's member)
+    ReplaceOnly   ///< replace a present one; ignore an absent key
+};
+
+/// One entry of a hashed table. Sets leave `value` null.
+struct HashedEntry {
+    const void* key;
+    const void* value;
+    CFHashCode hash; ///< the key's hash, kept so that growing never calls the callback again
+};
+
+class HashedTable {
+public:
+    /// Keys are hashed with `hash` and compared with `equal`; null means pointer identity.
+    HashedTable(CFHashCallBack hash, CFEqualCallBack equal) noexcept
+        : hashCallBack_(hash), equalCallBack_(equal) {}
+
+    /// The number of live entries.
+    CFIndex Count() const noexcept { return liveCount_; }
+    CFHashCode HashOf(const void* key) const { return CallHash(hashCallBack_, key); }
+
+    /// The position of the live entry whose key equals `key` (whose hash is `hash`), or -1.
+    CFIndex Find(const void* key, CFHashCode hash) const;
+    /// The entry at a position returned by Find. NOTE: invalidated by Append and Remove.
+    HashedEntry& EntryAt(CFIndex position) noexcept { return entries_[size_t(position)]; }
+    const HashedEntry& EntryAt(CFIndex position) const noexcept {
+        return entries_[size_t(position)];
+    }
+
+    /// Adds an entry whose key is not present (checked by the caller). Takes no counts.
+    void Append(const void* key, const void* value, CFHashCode hash);
+    /// Takes out the entry at a position returned by Find and returns it for the caller to
+    /// release. Later positions may move.
+    HashedEntry Remove(CFIndex position);
+    /// Takes out every entry, in insertion order, for the caller to release.
+    std::vector<HashedEntry> TakeAll() noexcept;
+    /// Makes room for `count` live entries without regrowing the index.
+    void Reserve(CFIndex count);
+
+    /// Calls `visit(const HashedEntry&)` for each live entry in insertion order. The entry is a
+    /// copy, and the bounds are checked on every step, so a visitor that changes the table
+    /// (a caller error) cannot make the walk leave the storage.
+    template <class Visit> void ForEach(Visit&& visit) const {
+        for (size_t i = 0; i < entries_.size(); ++i) {
+            HashedEntry entry = entries_[i];
+            if (entry.key != RemovedKey())
+                visit(entry);
+        }
+    }
+    /// Like ForEach, stopping at the first entry for which `test` returns true; returns whether
+    /// one did.
+    template <class Test> bool Any(Test&& test) const {
+        for (size_t i = 0; i < entries_.size(); ++i) {
+            HashedEntry entry = entries_[i];
+            if (entry.key != RemovedKey() && test(entry))
+                return true;
+        }
+        return false;
+    }
+
+private:
+    /// Marks a removed entry; its address cannot be a caller's key.
+    static const void* RemovedKey() noexcept;
+    /// Drops removed entries and rebuilds the index with room for `count` live entries.
+    void Rebuild(size_t count);
+    size_t HomeSlot(CFHashCode hash) const noexcept;
+    void PlaceInIndex(CFHashCode hash, size_t position);
+
+    CFHashCallBack hashCallBack_;
+    CFEqualCallBack equalCallBack_;
+    std::vector<HashedEntry> entries_; ///< insertion order, removed entries included
+    std::vector<size_t> slots_;        ///< entry position + 1, 0 for an empty slot; power of two
+    unsigned slotShift_ = 64;          ///< 64 - log2(slots_.size())
+    CFIndex liveCount_ = 0;
+    size_t removedCount_ = 0;
+};
+
+} // namespace glyphwell::runtime
