@@ -2,13 +2,20 @@
 
 #include <algorithm>
 #include <cstdlib>
+#include <string>
+#include <string_view>
 
 #include "platform/Log.h"
 
 namespace glyphwell::runtime {
 
+// The compiler names the function with its whole signature; the log shows only its name.
 void ReportInvalidArgument(const char* condition, const std::source_location& where) {
-    AssertionFailure(condition, where.function_name(), where.file_name(), int(where.line()));
+    std::string_view name = where.function_name();
+    name = name.substr(0, name.find('('));
+    if (size_t space = name.rfind(' '); space != std::string_view::npos)
+        name.remove_prefix(space + 1);
+    AssertionFailure(condition, std::string(name).c_str(), where.file_name(), int(where.line()));
 }
 
 bool CheckRange(CFRange range, CFIndex count, const std::source_location& where) {
