@@ -1,0 +1,136 @@
+// Wrappers over array values. TCFDeque<T> is a view that never owns its reference; TCFArray<T>
+// owns one count; TCFMutableArray, TCFLazyMutableArray and TCFSortedArray own a mutable array of
+// untyped references. T is the element's reference type (TCFArray<CFStringRef>); elements are
+// handed out as T without any check of their kind. Reading a null array yields no elements.
+#pragma once
+
+#include <concepts>
+
+#include "cfutil/TCFRetained.h"
+#include "platform/CFArray.h"
+
+/// A view of an array value: does not retain, does not release.
+template <class T> class TCFDeque {
+public:
+    /// Stores `array` (may be null); does not retain.
+    explicit TCFDeque(CFArrayRef array) : array_(array) {}
+
+    /// The held array; does not retain.
+    operator CFArrayRef() const { return array_; }
+    /// The element count; 0 for null.
+    CFIndex GetCount() const { return array_ ? CFArrayGetCount(array_) : 0; }
+    /// The element at `index` (kept below GetCount() by the caller) as T; null for a null array.
+    /// Does not retain.
+    T At(CFIndex index) const {
+        if (!array_)
+            return nullptr;
+        return static_cast<T>(const_cast<void*>(CFArrayGetValueAtIndex(array_, index)));
+    }
+
+protected:
+    CFArrayRef array_;
+};
+
+/// Owns one count of an array value and releases it when destroyed. Cannot be copied.
+template <class T> class TCFArray : public TCFDeque<T> {
+public:
+    /// Retains `array` (null-safe).
+    explicit TCFArray(CFArrayRef array) : TCFDeque<T>(TCFSafeRetain(array)) {}
+    /// Adopts `array` (no retain; may be null).
+    TCFArray(CFArrayRef array, adopted_t) : TCFDeque<T>(array) {}
+    /// Creates an immutable array of the `count` `values`, handled by `callBacks`.
+    TCFArray(const void** values, CFIndex count, const CFArrayCallBacks* callBacks)
+        : TCFDeque<T>(CFArrayCreate(kCFAllocatorDefault, values, count, callBacks)) {}
+    TCFArray(const TCFArray&) = delete;
+    TCFArray& operator=(const TCFArray&) = delete;
+    /// Releases the held array (null-safe).
+    ~TCFArray() { TCFSafeRelease(this->array_); }
+
+    /// Returns the held array with its count and leaves this wrapper null; the caller releases
+    /// the result.
+    CFArrayRef Orphan() {
+        CFArrayRef array = this->array_;
+        this->array_ = nullptr;
+        return array;
+    }
+};
+
+/// Owns a mutable array of untyped references. Every constructor leaves it holding an array.
+class TCFMutableArray : TNoncopyable, public TCFArray<const void*> {
+public:
+    /// Creates an empty array of property values (retained, compared with CFEqual); `capacity`
+    /// 0 means unlimited. Any integer type is taken, so that TCFMutableArray(0) is not mistaken
+    /// for the null-pointer overload below.
+    template <std::integral I>
+    explicit TCFMutableArray(I capacity)
+        : TCFMutableArray(CreateEmptyArray(CFIndex(capacity)), kAdopted) {}
+    /// Creates an empty array handled by `callBacks`, then inserts the `count` `values` at its
+    /// start, in order.
+    TCFMutableArray(CFIndex count, const void** values, const CFArrayCallBacks* callBacks);
+    /// Creates a mutable copy of `array` (a new empty array of property values when `array` is
+    /// null); `capacity` 0 means unlimited.
+    TCFMutableArray(CFArrayRef array, CFIndex capacity);
+    /// Retains and shares `array`; creates a new empty array of property values when it is null.
+    explicit TCFMutableArray(CFMutableArrayRef array);
+
+    /// The held array typed as mutable; does not retain.
+    CFMutableArrayRef GetMutable() const { return const_cast<CFMutableArrayRef>(array_); }
+    /// Appends `value`, which the array's callbacks retain.
+    void Append(const void* value) const { CFArrayAppendValue(GetMutable(), value); }
+    /// Appends the elements of `range` of `other`.
+    void Append(CFArrayRef other, CFRange range) const {
+        CFArrayAppendArray(GetMutable(), other, range);
+    }
+    /// Inserts `value` before the element at `index` (at most GetCount()).
+    void InsertValueAtIndex(CFIndex index, const void* value) const {
+        CFArrayInsertValueAtIndex(GetMutable(), index, value);
+    }
+    /// Removes the element at `index` (below GetCount()).
+    void RemoveValueAtIndex(CFIndex index) const { CFArrayRemoveValueAtIndex(GetMutable(), index); }
+
+protected:
+    /// Adopts `array` (no retain), which the caller guarantees to be non-null.
+    TCFMutableArray(CFMutableArrayRef array, adopted_t) : TCFArray(array, kAdopted) {}
+    /// A new empty array of property values. Returns a new reference; the caller releases it.
+    static CFMutableArrayRef CreateEmptyArray(CFIndex capacity);
+};
+
+/// A mutable array of property values that is created by the first Append: until then it holds
+/// null, GetCount() is 0 and Orphan() yields null, so an empty result costs no allocation.
+class TCFLazyMutableArray : TNoncopyable, public TCFArray<const void*> {
+public:
+    /// Holds no array.
+    TCFLazyMutableArray() : TCFArray(nullptr, kAdopted) {}
+
+    /// Creates an empty array of property values with unlimited capacity when none is held.
+    void LazyCreate() {
+        if (!array_)
+            array_ = CFArrayCreateMutable(kCFAllocatorDefault, 0, &kCFTypeArrayCallBacks);
+    }
+    /// LazyCreate(), then appends `value`, which the array retains.
+    void Append(const void* value) {
+        LazyCreate();
+        CFArrayAppendValue(GetMutable(), value);
+    }
+    /// The held array typed as mutable, or null while nothing was appended; does not retain.
+    CFMutableArrayRef GetMutable() const { return const_cast<CFMutableArrayRef>(array_); }
+};
+
+/// A mutable array of untyped references kept in ascending order by a three-way comparison
+/// (kCFCompareLessThan, kCFCompareEqualTo, kCFCompareGreaterThan) and its context.
+class TCFSortedArray : public TCFMutableArray {
+public:
+    /// Creates an empty array of property values ordered by `comparator`, which is called with
+    /// `context` (not retained; it must outlive the array); `capacity` 0 means unlimited.
+    TCFSortedArray(CFComparatorFunction comparator, void* context, CFIndex capacity = 0)
+        : TCFMutableArray(capacity), comparator_(comparator), context_(context) {}
+
+    /// The comparison that orders the array.
+    CFComparatorFunction GetComparator() const { return comparator_; }
+    /// The context handed to every call of the comparison.
+    void* GetContext() const { return context_; }
+
+private:
+    CFComparatorFunction comparator_;
+    void* context_;
+};

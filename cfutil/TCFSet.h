@@ -1,0 +1,63 @@
+// Wrappers over set values: TCFSet<T> owns one count of a set whose members are references of
+// type T; TCFMutableSet owns a mutable set of untyped references. Reading a null set yields no
+// members.
+#pragma once
+
+#include "cfutil/TCFRetained.h"
+#include "platform/CFSet.h"
+
+/// Owns one count of a set value and releases it when destroyed. Cannot be copied.
+template <class T> class TCFSet {
+public:
+    /// Retains `set` (null-safe).
+    explicit TCFSet(CFSetRef set) : set_(TCFSafeRetain(set)) {}
+    /// Adopts `set` (no retain; may be null).
+    TCFSet(CFSetRef set, adopted_t) : set_(set) {}
+    TCFSet(const TCFSet&) = delete;
+    TCFSet& operator=(const TCFSet&) = delete;
+    /// Releases the held set (null-safe).
+    ~TCFSet() { TCFSafeRelease(set_); }
+
+    /// The held set; does not retain.
+    operator CFSetRef() const { return set_; }
+    /// The member count; 0 for null.
+    CFIndex GetCount() const { return set_ ? CFSetGetCount(set_) : 0; }
+    /// Fills `values` (a caller array of GetCount() entries) with the members; leaves it
+    /// untouched for null. Does not retain.
+    void GetValues(const void** values) const {
+        if (set_)
+            CFSetGetValues(set_, values);
+    }
+    /// True when the set holds a member equal to `value`; false for null.
+    bool ContainsValue(T value) const { return set_ && CFSetContainsValue(set_, value); }
+    /// Returns the held set with its count and leaves this wrapper null; the caller releases
+    /// the result.
+    CFSetRef Orphan() {
+        CFSetRef set = set_;
+        set_ = nullptr;
+        return set;
+    }
+
+protected:
+    CFSetRef set_;
+};
+
+/// Owns a mutable set of untyped references.
+class TCFMutableSet : public TCFSet<const void*> {
+public:
+    /// Creates an empty set of property values (retained, compared with CFEqual and CFHash);
+    /// `capacity` 0 means unlimited.
+    explicit TCFMutableSet(CFIndex capacity = 0)
+        : TCFSet(CFSetCreateMutable(kCFAllocatorDefault, capacity, &kCFTypeSetCallBacks),
+                 kAdopted) {}
+    /// Adopts `set` (no retain), for example the result of CFSetCreateMutableCopy; the caller
+    /// guarantees it is non-null.
+    TCFMutableSet(CFMutableSetRef set, adopted_t) : TCFSet(set, kAdopted) {}
+
+    /// The held set typed as mutable; does not retain.
+    CFMutableSetRef GetMutable() const { return const_cast<CFMutableSetRef>(set_); }
+    /// Adds `value` when no equal member is present; the set retains it.
+    void AddValue(const void* value) const { CFSetAddValue(GetMutable(), value); }
+    /// Removes the member equal to `value`, if any.
+    void RemoveValue(const void* value) const { CFSetRemoveValue(GetMutable(), value); }
+};

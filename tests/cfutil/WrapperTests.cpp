@@ -1,0 +1,395 @@
+// The property-value wrappers: who owns which count, how null references read, and what the
+// constructors create.
+#include <cstring>
+#include <string>
+
+#include <gtest/gtest.h>
+
+#include "cfutil/TCFArray.h"
+#include "cfutil/TCFData.h"
+#include "cfutil/TCFDictionary.h"
+#include "cfutil/TCFError.h"
+#include "cfutil/TCFNumber.h"
+#include "cfutil/TCFRetained.h"
+#include "cfutil/TCFSet.h"
+#include "cfutil/TCFString.h"
+#include "cfutil/TCFURL.h"
+#include "cfutil/TUTF8Buffer.h"
+#include "platform/PropertyValues.h"
+
+namespace {
+
+/// A new string with one count (not a shared constant, so its count can be watched).
+CFStringRef NewString(const char* text) {
+    return CFStringCreateWithCString(kCFAllocatorDefault, text, kCFStringEncodingUTF8);
+}
+
+std::string Text(CFStringRef string) {
+    char buffer[1024];
+    return CFStringGetCString(string, buffer, sizeof buffer, kCFStringEncodingUTF8) ? buffer
+                                                                                    : "<?>";
+}
+
+} // namespace
+
+TEST(Retained, RetainingConstructorAddsACountAndAdoptingDoesNot) {
+    CFStringRef string = NewString("held");
+    {
+        TCFRetained<CFStringRef> retained(string);
+        EXPECT_EQ(CFGetRetainCount(string), 2);
+        TCFRetained<CFStringRef> copy(retained);
+        EXPECT_EQ(CFGetRetainCount(string), 3);
+    }
+    EXPECT_EQ(CFGetRetainCount(string), 1);
+    {
+        TCFRetained<CFStringRef> adopted(TCFRetain(string), kAdopted);
+        TCFAdopted<CFStringRef> alsoAdopted(TCFRetain(string));
+        EXPECT_EQ(CFGetRetainCount(string), 3);
+        EXPECT_EQ(static_cast<CFStringRef>(alsoAdopted), string);
+    }
+    EXPECT_EQ(CFGetRetainCount(string), 1);
+    CFRelease(string);
+}
+
+TEST(Retained, AdoptReleasesThePreviousReference) {
+    CFStringRef first = NewString("first");
+    CFStringRef second = NewString("second");
+    TCFRetained<CFStringRef> retained(first);
+    retained.Adopt(TCFRetain(second));
+    EXPECT_EQ(CFGetRetainCount(first), 1);
+    EXPECT_EQ(CFGetRetainCount(second), 2);
+    CFRelease(first);
+    CFRelease(second);
+}
+
+TEST(Retained, SafeHelpersAcceptNull) {
+    EXPECT_EQ(TCFSafeRetain<CFStringRef>(nullptr), nullptr);
+    TCFSafeRelease(nullptr);
+    TCFRetained<CFStringRef> empty(nullptr);
+    EXPECT_EQ(empty.Orphan(), nullptr);
+}
+
+TEST(SafeEqual, ComparesNullsByIdentityAndValuesByContent) {
+    TCFString a(NewString("same"));
+    TCFString b(NewString("same"));
+    TCFString c(NewString("other"));
+    ASSERT_NE(static_cast<CFStringRef>(a), static_cast<CFStringRef>(b));
+
+    EXPECT_TRUE(TCFSafeEqual(nullptr, nullptr));
+    EXPECT_FALSE(TCFSafeEqual(a, nullptr));
+    EXPECT_FALSE(TCFSafeEqual(nullptr, a));
+    EXPECT_TRUE(TCFSafeEqual(a, a));
+    EXPECT_TRUE(TCFSafeEqual(a, b));
+    EXPECT_FALSE(TCFSafeEqual(a, c));
+}
+
+TEST(OwningWrappers, StringAdoptsWhileDataArraySetAndUrlRetain) {
+    CFStringRef string = NewString("adopted");
+    CFRetain(string); // our own count, to watch the wrapper's
+    { TCFString adopted(string); }
+    EXPECT_EQ(CFGetRetainCount(string), 1);
+    CFRelease(string);
+
+    const UInt8 bytes[] = {1, 2, 3};
+    CFDataRef data = CFDataCreate(kCFAllocatorDefault, bytes, 3);
+    CFArrayRef array = CFArrayCreate(kCFAllocatorDefault, nullptr, 0, &kCFTypeArrayCallBacks);
+    CFSetRef set = CFSetCreate(kCFAllocatorDefault, nullptr, 0, &kCFTypeSetCallBacks);
+    CFURLRef url = CFURLCreateWithString(kCFAllocatorDefault, CFSTR("file:///tmp/x"), nullptr);
+    {
+        TCFData dataWrapper(data);
+        TCFArray<CFStringRef> arrayWrapper(array);
+        TCFSet<CFStringRef> setWrapper(set);
+        TCFURL urlWrapper(url);
+        for (CFTypeRef value : {CFTypeRef(data), CFTypeRef(array), CFTypeRef(set), CFTypeRef(url)})
+            EXPECT_EQ(CFGetRetainCount(value), 2);
+    }
+    for (CFTypeRef value : {CFTypeRef(data), CFTypeRef(array), CFTypeRef(set), CFTypeRef(url)}) {
+        EXPECT_EQ(CFGetRetainCount(value), 1);
+        CFRelease(value);
+    }
+}
+
+TEST(OwningWrappers, OrphanHandsOutTheCountAndLeavesNothingToRelease) {
+    TCFString string(NewString("s"));
+    TCFMutableDictionary dictionary;
+    TCFArray<CFStringRef> array(CFArrayCreate(kCFAllocatorDefault, nullptr, 0, nullptr), kAdopted);
+    TCFURL url(CFSTR("/tmp/x"), kIsFile, nullptr);
+    TCFError error(CFSTR("Domain"), 7, nullptr);
+    TCFNumber number(SInt64(5));
+    TCFData data(nullptr);
+    TCFMutableSet set;
+
+    CFTypeRef orphans[] = {string.Orphan(), dictionary.Orphan(), array.Orphan(), url.Orphan(),
+                           error.Orphan(),  number.Orphan(),     set.Orphan()};
+    for (CFTypeRef orphan : orphans) {
+        ASSERT_NE(orphan, nullptr);
+        EXPECT_EQ(CFGetRetainCount(orphan), 1);
+    }
+    EXPECT_EQ(static_cast<CFStringRef>(string), nullptr);
+    EXPECT_EQ(static_cast<CFURLRef>(url), nullptr);
+    EXPECT_EQ(data.Orphan(), nullptr);
+    // The wrappers are destroyed after the orphans' counts are given back here; a release by a
+    // wrapper would be a use after free.
+    for (CFTypeRef orphan : orphans)
+        CFRelease(orphan);
+}
+
+TEST(ViewWrappers, NullReadsAsEmpty) {
+    TCFStr string(nullptr);
+    char buffer[4] = "abc";
+    EXPECT_EQ(string.GetLength(), 0);
+    EXPECT_EQ(string.GetCharacterAtIndex(0), 0);
+    EXPECT_EQ(string.GetMaxSize(kCFStringEncodingUTF8), 0);
+    EXPECT_FALSE(string.GetCString(buffer, sizeof buffer, kCFStringEncodingUTF8));
+    EXPECT_EQ(string.GetMaxSizeOfFileSystemRepresentation(), 0);
+    EXPECT_FALSE(string.GetFileSystemRepresentation(buffer, sizeof buffer));
+    CFRange found = string.Find(CFSTR("a"), 0);
+    EXPECT_EQ(found.location, kCFNotFound);
+    EXPECT_EQ(found.length, 0);
+    EXPECT_FALSE(string.HasPrefix(CFSTR("")));
+    EXPECT_EQ(string.CreateSubstring(CFRangeMake(0, 0)), nullptr);
+    EXPECT_STREQ(buffer, "abc");
+
+    TCFBlob blob(nullptr);
+    EXPECT_EQ(blob.GetPtr(), nullptr);
+    EXPECT_EQ(blob.GetLength(), 0);
+    EXPECT_EQ(TCFBlob::GetDataPtr(nullptr), nullptr);
+
+    TCFDict dictionary(nullptr);
+    const void* keys[1] = {&buffer};
+    const void* values[1] = {&buffer};
+    EXPECT_EQ(dictionary.GetCount(), 0);
+    EXPECT_EQ(dictionary.GetValue(CFSTR("key")), nullptr);
+    dictionary.GetKeysAndValues(keys, values);
+    EXPECT_EQ(keys[0], &buffer);
+    EXPECT_EQ(values[0], &buffer);
+
+    TCFDeque<CFStringRef> array(nullptr);
+    EXPECT_EQ(array.GetCount(), 0);
+    EXPECT_EQ(array.At(0), nullptr);
+
+    TCFSet<CFStringRef> set(nullptr);
+    EXPECT_EQ(set.GetCount(), 0);
+    EXPECT_FALSE(set.ContainsValue(CFSTR("a")));
+    set.GetValues(values);
+    EXPECT_EQ(values[0], &buffer);
+
+    TCFURL url(nullptr);
+    EXPECT_EQ(url.CopyAbsoluteURL(), nullptr);
+    EXPECT_TRUE(url == nullptr);
+}
+
+TEST(StringWrappers, ReadTheHeldText) {
+    TCFStr string(CFSTR("Hello, world"));
+    char buffer[16];
+    EXPECT_EQ(string.GetLength(), 12);
+    EXPECT_EQ(string.GetCharacterAtIndex(4), u'o');
+    EXPECT_EQ(string.GetMaxSize(kCFStringEncodingUTF8), 36);
+    ASSERT_TRUE(string.GetCString(buffer, sizeof buffer, kCFStringEncodingUTF8));
+    EXPECT_STREQ(buffer, "Hello, world");
+    EXPECT_FALSE(string.GetCString(buffer, 12, kCFStringEncodingUTF8));
+    EXPECT_EQ(string.Find(CFSTR("O"), kCFCompareCaseInsensitive).location, 4);
+    EXPECT_TRUE(string.HasPrefix(CFSTR("Hell")));
+    EXPECT_FALSE(string.HasPrefix(CFSTR("world")));
+    TCFString substring(string.CreateSubstring(CFRangeMake(7, 5)));
+    EXPECT_EQ(Text(substring), "world");
+}
+
+TEST(StringWrappers, CodeIsReadAsMacRomanCStringMostSignificantByteFirst) {
+    EXPECT_EQ(Text(TCFString(UInt32(0x74657874))), "text"); // 't' 'e' 'x' 't'
+    EXPECT_EQ(Text(TCFString(UInt32(0x41004243))), "A");
+    EXPECT_EQ(Text(TCFString(UInt32(0))), "");
+    EXPECT_EQ(Text(TCFString(UInt32(0x8E000000))), "\xC3\xA9"); // Mac Roman 0x8E is U+00E9
+}
+
+TEST(StringWrappers, BytesAreDecodedAsPlainText) {
+    const UInt8 utf8WithMark[] = {0xEF, 0xBB, 0xBF, 'a', 'b'};
+    TCFString string(utf8WithMark, sizeof utf8WithMark, kCFStringEncodingUTF8);
+    EXPECT_EQ(string.GetLength(), 3); // the byte-order mark stays text
+    const UInt8 invalid[] = {0xFF};
+    EXPECT_EQ(static_cast<CFStringRef>(TCFString(invalid, 1, kCFStringEncodingUTF8)), nullptr);
+}
+
+TEST(StringWrappers, MutableStringAppendsAndReplaces) {
+    TCFMutableString string;
+    string.Append(CFSTR("Hello, world"));
+    string.Replace(CFRangeMake(0, 5), CFSTR("Goodbye"));
+    EXPECT_EQ(Text(string), "Goodbye, world");
+}
+
+TEST(DictionaryWrappers, CreatedDictionaryRetainsKeysAndValues) {
+    CFStringRef key = NewString("key");
+    CFStringRef value = NewString("value");
+    const void* keys[] = {key};
+    const void* values[] = {value};
+    {
+        TCFDictionary dictionary(keys, values, 1);
+        EXPECT_EQ(dictionary.GetCount(), 1);
+        EXPECT_EQ(dictionary.GetValue(CFSTR("key")), value);
+        EXPECT_EQ(CFGetRetainCount(value), 2);
+        const void* outKeys[1] = {};
+        const void* outValues[1] = {};
+        dictionary.GetKeysAndValues(outKeys, outValues);
+        EXPECT_EQ(outKeys[0], key);
+        EXPECT_EQ(outValues[0], value);
+    }
+    EXPECT_EQ(CFGetRetainCount(key), 1);
+    EXPECT_EQ(CFGetRetainCount(value), 1);
+    CFRelease(key);
+    CFRelease(value);
+}
+
+TEST(DictionaryWrappers, SetPairReplacesAndAddPairKeepsExistingValue) {
+    TCFMutableDictionary dictionary(0);
+    dictionary.SetPair(CFSTR("k"), CFSTR("one"));
+    dictionary.SetPair(CFSTR("k"), CFSTR("two"));
+    dictionary.AddPair(CFSTR("k"), CFSTR("three"));
+    dictionary.AddPair(CFSTR("other"), CFSTR("four"));
+    EXPECT_EQ(dictionary.GetCount(), 2);
+    EXPECT_TRUE(TCFSafeEqual(dictionary.GetValue(CFSTR("k")), CFSTR("two")));
+    EXPECT_TRUE(TCFSafeEqual(dictionary.GetValue(CFSTR("other")), CFSTR("four")));
+}
+
+TEST(ArrayWrappers, MutableArrayConstructors) {
+    const void* values[] = {CFSTR("a"), CFSTR("b"), CFSTR("c")};
+    TCFMutableArray empty(0);
+    EXPECT_EQ(empty.GetCount(), 0);
+
+    TCFMutableArray filled(3, values, &kCFTypeArrayCallBacks);
+    ASSERT_EQ(filled.GetCount(), 3);
+    EXPECT_EQ(filled.At(0), values[0]);
+    EXPECT_EQ(filled.At(2), values[2]);
+
+    TCFMutableArray copy(static_cast<CFArrayRef>(filled), 0);
+    EXPECT_NE(copy.GetMutable(), filled.GetMutable());
+    EXPECT_EQ(copy.GetCount(), 3);
+    TCFMutableArray fromNull(static_cast<CFArrayRef>(nullptr), 0);
+    EXPECT_NE(fromNull.GetMutable(), nullptr);
+
+    CFIndex countBefore = CFGetRetainCount(filled);
+    {
+        TCFMutableArray shared(filled.GetMutable());
+        EXPECT_EQ(shared.GetMutable(), filled.GetMutable());
+        EXPECT_EQ(CFGetRetainCount(filled), countBefore + 1);
+    }
+    EXPECT_EQ(CFGetRetainCount(filled), countBefore);
+    TCFMutableArray sharedNull(static_cast<CFMutableArrayRef>(nullptr));
+    EXPECT_NE(sharedNull.GetMutable(), nullptr);
+}
+
+TEST(ArrayWrappers, MutableArrayAppendsInsertsAndRemoves) {
+    const void* values[] = {CFSTR("a"), CFSTR("b"), CFSTR("c")};
+    TCFArray<CFStringRef> source(values, 3, &kCFTypeArrayCallBacks);
+    TCFMutableArray array(0);
+    array.Append(CFSTR("x"));
+    array.Append(source, CFRangeMake(1, 2));
+    array.InsertValueAtIndex(0, CFSTR("y"));
+    array.RemoveValueAtIndex(1);
+    ASSERT_EQ(array.GetCount(), 3);
+    TCFDeque<CFStringRef> view(array);
+    EXPECT_EQ(Text(view.At(0)) + Text(view.At(1)) + Text(view.At(2)), "ybc");
+}
+
+TEST(ArrayWrappers, LazyArrayExistsOnlyAfterFirstAppend) {
+    TCFLazyMutableArray untouched;
+    EXPECT_EQ(untouched.GetCount(), 0);
+    EXPECT_EQ(untouched.GetMutable(), nullptr);
+    EXPECT_EQ(untouched.Orphan(), nullptr);
+
+    TCFLazyMutableArray array;
+    array.Append(CFSTR("a"));
+    array.Append(CFSTR("b"));
+    EXPECT_EQ(array.GetCount(), 2);
+    TCFArray<CFStringRef> orphan(array.Orphan(), kAdopted);
+    EXPECT_EQ(orphan.GetCount(), 2);
+    EXPECT_EQ(array.GetCount(), 0);
+}
+
+TEST(ArrayWrappers, SortedArrayStartsEmptyWithItsComparison) {
+    auto compare = [](const void*, const void*, void*) { return kCFCompareEqualTo; };
+    int context = 0;
+    TCFSortedArray array(compare, &context);
+    EXPECT_EQ(array.GetCount(), 0);
+    EXPECT_NE(array.GetMutable(), nullptr);
+    EXPECT_EQ(array.GetComparator(), static_cast<CFComparatorFunction>(compare));
+    EXPECT_EQ(array.GetContext(), &context);
+}
+
+TEST(SetWrappers, MutableSetAddsDistinctValuesAndRemoves) {
+    TCFMutableSet set;
+    CFStringRef value = NewString("a");
+    set.AddValue(value);
+    set.AddValue(CFSTR("a"));
+    set.AddValue(CFSTR("b"));
+    EXPECT_EQ(set.GetCount(), 2);
+    EXPECT_EQ(CFGetRetainCount(value), 2);
+    set.RemoveValue(CFSTR("a"));
+    EXPECT_EQ(CFGetRetainCount(value), 1);
+    EXPECT_FALSE(set.ContainsValue(CFSTR("a")));
+    EXPECT_TRUE(set.ContainsValue(CFSTR("b")));
+    CFRelease(value);
+
+    TCFMutableSet adopted(CFSetCreateMutableCopy(kCFAllocatorDefault, 0, set), kAdopted);
+    EXPECT_EQ(adopted.GetCount(), 1);
+    EXPECT_NE(adopted.GetMutable(), set.GetMutable());
+}
+
+TEST(NumberWrapper, MapsSignedCharAndLongToTheirTypeCodes) {
+    TCFNumber small(SInt8(-5));
+    TCFNumber large(SInt64(1) << 40);
+    EXPECT_EQ(CFNumberGetType(small), kCFNumberCharType);
+    EXPECT_EQ(CFNumberGetType(large), kCFNumberLongType);
+    SInt64 value = 0;
+    ASSERT_TRUE(CFNumberGetValue(small, kCFNumberSInt64Type, &value));
+    EXPECT_EQ(value, -5);
+    ASSERT_TRUE(CFNumberGetValue(large, kCFNumberSInt64Type, &value));
+    EXPECT_EQ(value, SInt64(1) << 40);
+}
+
+TEST(URLWrapper, FilePathIsNeverADirectory) {
+    TCFURL file(CFSTR("/tmp/folder/"), kIsFile, nullptr);
+    ASSERT_NE(static_cast<CFURLRef>(file), nullptr);
+    EXPECT_FALSE(CFURLHasDirectoryPath(file));
+    TCFAdopted<CFStringRef> path(CFURLCopyFileSystemPath(file, kCFURLPOSIXPathStyle));
+    EXPECT_EQ(Text(path), "/tmp/folder");
+}
+
+TEST(URLWrapper, RelativePathResolvesAgainstBase) {
+    TCFURL base(CFURLCreateWithString(kCFAllocatorDefault, CFSTR("file:///fonts/"), nullptr),
+                kAdopted);
+    TCFURL file(CFSTR("sub/Font.otf"), kIsFile, base);
+    TCFURL absolute(file.CopyAbsoluteURL(), kAdopted);
+    TCFURL expected(CFSTR("/fonts/sub/Font.otf"), kIsFile, nullptr);
+    EXPECT_TRUE(absolute == expected);
+    EXPECT_FALSE(absolute != expected);
+    EXPECT_TRUE(file != expected); // still relative to its base
+}
+
+TEST(ErrorWrapper, CreatesErrorWithDomainAndCode) {
+    TCFError error(CFSTR("Domain"), 42, nullptr);
+    ASSERT_NE(static_cast<CFErrorRef>(error), nullptr);
+    EXPECT_EQ(Text(CFErrorGetDomain(error)), "Domain");
+    EXPECT_EQ(CFErrorGetCode(error), 42);
+}
+
+TEST(UTF8Buffer, NullStringGivesNoText) {
+    TUTF8Buffer buffer(nullptr);
+    EXPECT_EQ(buffer.GetCount(), 0u);
+}
+
+TEST(UTF8Buffer, EmptyStringGivesEmptyCString) {
+    TUTF8Buffer buffer(CFSTR(""));
+    EXPECT_GE(buffer.GetCount(), 1u);
+    EXPECT_STREQ(buffer.GetBuffer(), "");
+}
+
+TEST(UTF8Buffer, HoldsUTF8PathOfAnyLength) {
+    TUTF8Buffer accented(CFSTR("/tmp/caf\u00e9"));
+    EXPECT_STREQ(accented.GetBuffer(), "/tmp/caf\xC3\xA9");
+
+    std::string longPath = "/" + std::string(600, 'x');
+    TCFString string(NewString(longPath.c_str()));
+    TUTF8Buffer buffer(string);
+    EXPECT_GT(buffer.GetCount(), 601u);
+    EXPECT_EQ(std::string(buffer.GetBuffer()), longPath);
+}
