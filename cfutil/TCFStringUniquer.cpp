@@ -1,0 +1,240 @@
+// The process-wide string uniquer: an open-addressing hash table of never-removed entries.
+//
+// Readers probe the table without a lock; writers insert and grow it under one mutex. This is
+// sound because nothing is ever removed or changed once published: an entry is fully written
+// before its pointer is stored (release) into a slot, and a reader loads slots with acquire. When
+// the table grows, the old slot array stays allocated (chained from the new one), so a reader
+// still probing it reads valid memory; it may miss a recent entry, and a miss always falls back
+// to the locked path, which decides. So two threads asking for the same new text get one string.
+//
+// Every allocation stays reachable from the instance (held by a static pointer) for the life of
+// the process, so leak checkers do not report the table at exit.
+#include "cfutil/TCFStringUniquer.h"
+
+#include <atomic>
+#include <cstdint>
+#include <cstdlib>
+#include <cstring>
+#include <memory>
+#include <mutex>
+#include <string>
+
+#include "cfutil/TStackBuffer.h"
+#include "platform/Log.h"
+
+namespace {
+
+/// The hash of utf8Hash over `length` bytes that hold no zero byte.
+uint32_t HashText(const unsigned char* text, size_t length) {
+    uint32_t hash = 0x9E3779B9u;
+    for (; length >= 2; text += 2, length -= 2) {
+        hash += text[0];
+        const uint32_t mixed = (uint32_t(text[1]) << 11) ^ hash;
+        hash = (hash << 16) ^ mixed;
+        hash += hash >> 11;
+    }
+    if (length == 1) {
+        hash += text[0];
+        hash ^= hash << 11;
+        hash += hash >> 17;
+    }
+    hash ^= hash << 3;
+    hash += hash >> 5;
+    hash ^= hash << 2;
+    hash += hash >> 15;
+    hash ^= hash << 10;
+    return hash != 0 ? hash : 0x80000000u;
+}
+
+/// One table entry, allocated in one block with its private, zero-terminated key copy right
+/// after it. Written once before it is published, never changed or freed afterwards.
+struct Entry {
+    CFStringRef string; ///< holds the creation's count and the table's own
+    uint32_t hash;
+    size_t length; ///< key bytes, without the terminating zero
+
+    const char* Key() const { return reinterpret_cast<const char*>(this + 1); }
+    char* Key() { return reinterpret_cast<char*>(this + 1); }
+};
+
+/// A slot array of a power-of-two size, at most half full so that every probe ends at an empty
+/// slot. Replaced (never freed) when it would become fuller.
+struct Table {
+    explicit Table(unsigned sizeLog2, const Table* older)
+        : shift(64 - sizeLog2), mask((size_t(1) << sizeLog2) - 1),
+          slots(new std::atomic<Entry*>[mask + 1]()), previous(older) {}
+
+    /// The first slot to probe for `hash`: the top bits of a multiplicative mix, so that every
+    /// bit of the hash counts.
+    size_t Home(uint32_t hash) const { return size_t((hash * 0x9E3779B97F4A7C15ull) >> shift); }
+
+    const unsigned shift;
+    const size_t mask;
+    const std::unique_ptr<std::atomic<Entry*>[]> slots;
+    const Table* const previous; ///< the array this one replaced; kept for lock-free readers
+};
+
+constexpr unsigned kInitialSizeLog2 = 10;
+
+} // namespace
+
+/// The process-wide table. Created once by TCFStringUniquer::CreateStringUniquer, never destroyed.
+class TCFStringUniquerImp {
+public:
+    TCFStringUniquerImp() : table_(new Table(kInitialSizeLog2, nullptr)) {}
+    TCFStringUniquerImp(const TCFStringUniquerImp&) = delete;
+    TCFStringUniquerImp& operator=(const TCFStringUniquerImp&) = delete;
+
+    CFStringRef GetUniqueString(CFStringRef string);
+    CFStringRef GetUniqueString(const char* bytes, CFIndex length);
+
+private:
+    static CFStringRef Find(const Table& table, const char* key, size_t length, uint32_t hash);
+    CFStringRef Insert(Entry* entry);
+
+    std::atomic<const Table*> table_; ///< the current slot array; replaced under mutex_
+    std::mutex mutex_;                ///< serialises insertion and growth
+    size_t count_ = 0;                ///< entries in the table; guarded by mutex_
+};
+
+/// The string of the entry whose key is the `length` bytes at `key`, or null when `table` has
+/// none. Safe without the lock.
+CFStringRef TCFStringUniquerImp::Find(const Table& table, const char* key, size_t length,
+                                      uint32_t hash) {
+    for (size_t index = table.Home(hash);; index = (index + 1) & table.mask) {
+        const Entry* entry = table.slots[index].load(std::memory_order_acquire);
+        if (!entry)
+            return nullptr;
+        if (entry->hash == hash && entry->length == length &&
+            std::memcmp(entry->Key(), key, length) == 0)
+            return entry->string;
+    }
+}
+
+/// Enters `entry` unless its key is already present. Returns the string now in the table for
+/// that key; when it is not `entry`'s, `entry` was not entered and stays the caller's.
+CFStringRef TCFStringUniquerImp::Insert(Entry* entry) {
+    std::lock_guard<std::mutex> lock(mutex_);
+    const Table* table = table_.load(std::memory_order_relaxed);
+    if (CFStringRef existing = Find(*table, entry->Key(), entry->length, entry->hash))
+        return existing;
+
+    if (2 * (count_ + 1) > table->mask + 1) {
+        // Grow to twice the size; readers keep probing the old array until they see the new one.
+        auto* grown = new Table(64 - table->shift + 1, table);
+        for (size_t index = 0; index <= table->mask; ++index) {
+            Entry* moved = table->slots[index].load(std::memory_order_relaxed);
+            if (!moved)
+                continue;
+            size_t slot = grown->Home(moved->hash);
+            while (grown->slots[slot].load(std::memory_order_relaxed))
+                slot = (slot + 1) & grown->mask;
+            grown->slots[slot].store(moved, std::memory_order_relaxed);
+        }
+        table_.store(grown, std::memory_order_release);
+        table = grown;
+    }
+
+    size_t slot = table->Home(entry->hash);
+    while (table->slots[slot].load(std::memory_order_relaxed))
+        slot = (slot + 1) & table->mask;
+    table->slots[slot].store(entry, std::memory_order_release);
+    ++count_;
+    return entry->string;
+}
+
+/// Null bytes or a length of 0 or less yield null. Otherwise the key is the text up to its first
+/// zero byte, or all `length` bytes when they hold none (callers normally put a zero byte at
+/// index `length`, but nothing beyond `length` is read).
+CFStringRef TCFStringUniquerImp::GetUniqueString(const char* bytes, CFIndex length) {
+    if (!bytes || length <= 0)
+        return nullptr;
+    const size_t keyLength = strnlen(bytes, size_t(length));
+    const uint32_t hash = HashText(reinterpret_cast<const unsigned char*>(bytes), keyLength);
+    if (CFStringRef found = Find(*table_.load(std::memory_order_acquire), bytes, keyLength, hash))
+        return found;
+
+    // A miss: make the entry outside the lock, so that the lock is held only to insert.
+    auto* entry = static_cast<Entry*>(std::malloc(sizeof(Entry) + keyLength + 1));
+    if (!entry)
+        return nullptr;
+    std::memcpy(entry->Key(), bytes, keyLength);
+    entry->Key()[keyLength] = '\0';
+    entry->hash = hash;
+    entry->length = keyLength;
+    entry->string = CFStringCreateWithBytes(nullptr, reinterpret_cast<const UInt8*>(bytes), length,
+                                            kCFStringEncodingUTF8, false);
+    if (!entry->string) {
+        CFLog(kCFLogLevelError, "string %s (length %d : %lu) could not be converted to CFString!",
+              entry->Key(), int(length), static_cast<unsigned long>(keyLength));
+        std::free(entry);
+        return nullptr;
+    }
+
+    CFStringRef unique = Insert(entry);
+    if (unique == entry->string) {
+        // The table keeps the creation's count and takes one of its own: never given back.
+        CFRetain(unique);
+    } else {
+        // Another thread entered the same key first; its string is the one handed out.
+        CFRelease(entry->string);
+        std::free(entry);
+    }
+    return unique;
+}
+
+/// Converts `string` to UTF-8 in a buffer that is inline up to 128 bytes, then uniques the text
+/// up to the first zero byte. The input itself comes back when it has no UTF-8 form (a lone
+/// surrogate) or its text is empty, so a non-null input never yields null.
+CFStringRef TCFStringUniquerImp::GetUniqueString(CFStringRef string) {
+    if (!string)
+        return nullptr;
+    const CFIndex size =
+        CFStringGetMaximumSizeForEncoding(CFStringGetLength(string), kCFStringEncodingUTF8) + 1;
+    TStackBuffer<char, 128> buffer{uint64_t(size)};
+    char* text = buffer.GetBuffer();
+    if (!CFStringGetCString(string, text, size, kCFStringEncodingUTF8))
+        return string;
+    const CFIndex length = CFIndex(std::strlen(text));
+    return length > 0 ? GetUniqueString(text, length) : string;
+}
+
+CFStringRef TCFStringUniquer::GetUniqueString(CFStringRef string) const {
+    return imp_->GetUniqueString(string);
+}
+
+CFStringRef TCFStringUniquer::GetUniqueString(const char* bytes, CFIndex length) const {
+    return imp_->GetUniqueString(bytes, length);
+}
+
+TCFStringUniquerImp* TCFStringUniquer::GetStringUniquer() {
+    // A function-local static is initialised once, and concurrent first callers wait for it.
+    // The pointer itself is never destroyed, so the instance outlives every other static.
+    static TCFStringUniquerImp* const instance = CreateStringUniquer();
+    return instance;
+}
+
+TCFStringUniquerImp* TCFStringUniquer::CreateStringUniquer() {
+    return new TCFStringUniquerImp;
+}
+
+CFHashCode utf8Hash(const void* key) {
+    const char* text = static_cast<const char*>(key);
+    return HashText(reinterpret_cast<const unsigned char*>(text), std::strlen(text));
+}
+
+Boolean utf8Equal(const void* a, const void* b) {
+    return a == b || std::strcmp(static_cast<const char*>(a), static_cast<const char*>(b)) == 0;
+}
+
+/// Keys are UTF-8; one that is not (which the table never holds) is shown as Latin-1 rather
+/// than not at all.
+CFStringRef utf8CopyDescription(const void* key) {
+    const std::string text = std::string("[") + static_cast<const char*>(key) + "]";
+    const auto* bytes = reinterpret_cast<const UInt8*>(text.data());
+    const auto length = CFIndex(text.size());
+    if (CFStringRef description =
+            CFStringCreateWithBytes(nullptr, bytes, length, kCFStringEncodingUTF8, false))
+        return description;
+    return CFStringCreateWithBytes(nullptr, bytes, length, kCFStringEncodingISOLatin1, false);
+}
