@@ -1,0 +1,237 @@
+#include <string>
+#include <vector>
+
+#include <gtest/gtest.h>
+
+#include "platform/PropertyValues.h"
+#include "support/LogCapture.h"
+#include "tests/platform/ContainerTestSupport.h"
+
+using namespace glyphwell::testing;
+
+namespace {
+
+CFComparisonResult compareTokens(const void* a, const void* b, void*) {
+    intptr_t left = TokenValue(a), right = TokenValue(b);
+    return left < right   ? kCFCompareLessThan
+           : left > right ? kCFCompareGreaterThan
+                          : kCFCompareEqualTo;
+}
+
+// Orders tokens by their hundreds only, so that tokens with the same hundreds tie.
+CFComparisonResult compareHundreds(const void* a, const void* b, void* context) {
+    ++*static_cast<int*>(context);
+    return compareTokens(Token(TokenValue(a) / 100), Token(TokenValue(b) / 100), nullptr);
+}
+
+Owned<CFArrayRef> tokenArray(std::vector<intptr_t> numbers) {
+    std::vector<const void*> values;
+    for (intptr_t number : numbers)
+        values.push_back(Token(number));
+    return Own(CFArrayCreate(nullptr, values.data(), CFIndex(values.size()), nullptr));
+}
+
+std::vector<intptr_t> tokensOf(CFArrayRef array) {
+    std::vector<intptr_t> numbers;
+    for (CFIndex i = 0; i < CFArrayGetCount(array); ++i)
+        numbers.push_back(TokenValue(CFArrayGetValueAtIndex(array, i)));
+    return numbers;
+}
+
+} // namespace
+
+TEST(CFArray, RetainsInsertedValuesAndGivesThemBack) {
+    auto one = MakeInt(1), two = MakeInt(2);
+    auto array = Own(CFArrayCreateMutable(nullptr, 0, &kCFTypeArrayCallBacks));
+    CFArrayAppendValue(array.get(), one.get());
+    CFArrayInsertValueAtIndex(array.get(), 0, one.get());
+    CFArrayAppendValue(array.get(), two.get());
+    EXPECT_EQ(CFGetRetainCount(one.get()), 3);
+    EXPECT_EQ(CFGetRetainCount(two.get()), 2);
+
+    CFArraySetValueAtIndex(array.get(), 0, two.get()); // one -> two
+    EXPECT_EQ(CFGetRetainCount(one.get()), 2);
+    EXPECT_EQ(CFGetRetainCount(two.get()), 3);
+    CFArrayRemoveValueAtIndex(array.get(), 2);
+    EXPECT_EQ(CFGetRetainCount(two.get()), 2);
+
+    // Replacing a value by itself must not free it in between.
+    const void* same[] = {one.get()};
+    CFArrayReplaceValues(array.get(), CFRangeMake(1, 1), same, 1);
+    EXPECT_EQ(CFGetRetainCount(one.get()), 2);
+
+    array.reset();
+    EXPECT_EQ(CFGetRetainCount(one.get()), 1);
+    EXPECT_EQ(CFGetRetainCount(two.get()), 1);
+}
+
+TEST(CFArray, NullCallbacksKeepCountsAndCompareByPointer) {
+    auto five = MakeInt(5), otherFive = MakeInt(5);
+    const void* values[] = {five.get(), nullptr};
+    auto array = Own(CFArrayCreate(nullptr, values, 2, nullptr));
+    EXPECT_EQ(CFGetRetainCount(five.get()), 1);
+    EXPECT_EQ(CFArrayGetFirstIndexOfValue(array.get(), CFRangeMake(0, 2), otherFive.get()),
+              kCFNotFound);
+    EXPECT_EQ(CFArrayGetFirstIndexOfValue(array.get(), CFRangeMake(0, 2), nullptr), 1);
+
+    auto copy = Own(CFArrayCreateMutableCopy(nullptr, 0, array.get()));
+    CFArrayAppendValue(copy.get(), five.get());
+    EXPECT_EQ(CFGetRetainCount(five.get()), 1);
+    EXPECT_EQ(CFArrayGetCountOfValue(copy.get(), CFRangeMake(0, 3), five.get()), 2);
+}
+
+TEST(CFArray, EqualityComparesElementsInOrder) {
+    auto a1 = MakeInt(1);
+    auto a2 = MakeText("two");
+    auto b1 = MakeNumber(kCFNumberFloat64Type, 1.0);
+    auto b2 = MakeText("two");
+    const void* left[] = {a1.get(), a2.get()};
+    const void* right[] = {b1.get(), b2.get()};
+    const void* reversed[] = {b2.get(), b1.get()};
+    auto array = Own(CFArrayCreate(nullptr, left, 2, &kCFTypeArrayCallBacks));
+    auto same = Own(CFArrayCreate(nullptr, right, 2, &kCFTypeArrayCallBacks));
+    auto otherOrder = Own(CFArrayCreate(nullptr, reversed, 2, &kCFTypeArrayCallBacks));
+    auto shorter = Own(CFArrayCreate(nullptr, left, 1, &kCFTypeArrayCallBacks));
+
+    EXPECT_TRUE(CFEqual(array.get(), same.get()));
+    EXPECT_EQ(CFHash(array.get()), CFHash(same.get()));
+    EXPECT_FALSE(CFEqual(array.get(), otherOrder.get()));
+    EXPECT_FALSE(CFEqual(array.get(), shorter.get()));
+}
+
+TEST(CFArray, FindsValuesWithinRangeByEquality) {
+    auto x = MakeText("x"), y = MakeText("y"), alsoX = MakeText("x");
+    const void* values[] = {x.get(), y.get(), x.get(), y.get(), x.get()};
+    auto array = Own(CFArrayCreate(nullptr, values, 5, &kCFTypeArrayCallBacks));
+    EXPECT_EQ(CFArrayGetCountOfValue(array.get(), CFRangeMake(0, 5), alsoX.get()), 3);
+    EXPECT_EQ(CFArrayGetCountOfValue(array.get(), CFRangeMake(1, 3), alsoX.get()), 1);
+    EXPECT_EQ(CFArrayGetFirstIndexOfValue(array.get(), CFRangeMake(1, 4), alsoX.get()), 2);
+    EXPECT_EQ(CFArrayGetLastIndexOfValue(array.get(), CFRangeMake(0, 4), alsoX.get()), 2);
+    EXPECT_EQ(CFArrayGetLastIndexOfValue(array.get(), CFRangeMake(1, 1), alsoX.get()), kCFNotFound);
+    EXPECT_TRUE(CFArrayContainsValue(array.get(), CFRangeMake(3, 1), y.get()));
+    EXPECT_FALSE(CFArrayContainsValue(array.get(), CFRangeMake(0, 0), x.get()));
+}
+
+TEST(CFArray, BinarySearchGivesEqualOrInsertionIndex) {
+    auto array = tokenArray({10, 20, 20, 30, 40});
+    auto search = [&](CFRange range, intptr_t value) {
+        return CFArrayBSearchValues(array.get(), range, Token(value), compareTokens, nullptr);
+    };
+    CFRange all = CFRangeMake(0, 5);
+    EXPECT_EQ(search(all, 10), 0);
+    EXPECT_EQ(search(all, 20), 1);
+    EXPECT_EQ(search(all, 40), 4);
+    EXPECT_EQ(search(all, 5), 0);
+    EXPECT_EQ(search(all, 25), 3);
+    EXPECT_EQ(search(all, 50), 5);
+    // Within a range, not-found positions stay inside [location, location + length].
+    EXPECT_EQ(search(CFRangeMake(1, 3), 5), 1);
+    EXPECT_EQ(search(CFRangeMake(1, 3), 35), 4);
+    EXPECT_EQ(search(CFRangeMake(2, 0), 99), 2);
+}
+
+TEST(CFArray, SortIsStableAndStaysInItsRange) {
+    auto sorted = tokenArray({999, 301, 102, 303, 104, 205, 306, 107, 0});
+    auto array = Own(CFArrayCreateMutableCopy(nullptr, 0, sorted.get()));
+    int calls = 0;
+    CFArraySortValues(array.get(), CFRangeMake(1, 7), compareHundreds, &calls);
+    EXPECT_GT(calls, 0);
+    EXPECT_EQ(tokensOf(array.get()),
+              (std::vector<intptr_t>{999, 102, 104, 107, 205, 301, 303, 306, 0}));
+}
+
+TEST(CFArray, EditsSpliceInPlace) {
+    auto source = tokenArray({1, 2, 3, 4});
+    auto array = Own(CFArrayCreateMutableCopy(nullptr, 0, source.get()));
+    const void* inserted[] = {Token(7), Token(8), Token(9)};
+    CFArrayReplaceValues(array.get(), CFRangeMake(1, 2), inserted, 3);
+    EXPECT_EQ(tokensOf(array.get()), (std::vector<intptr_t>{1, 7, 8, 9, 4}));
+    CFArrayReplaceValues(array.get(), CFRangeMake(0, 4), nullptr, 0);
+    EXPECT_EQ(tokensOf(array.get()), (std::vector<intptr_t>{4}));
+    CFArrayInsertValueAtIndex(array.get(), 1, Token(5));
+    CFArrayInsertValueAtIndex(array.get(), 0, Token(3));
+    CFArrayExchangeValuesAtIndices(array.get(), 0, 2);
+    EXPECT_EQ(tokensOf(array.get()), (std::vector<intptr_t>{5, 4, 3}));
+    // Appending a range of the array to itself reads the values before the storage moves.
+    CFArrayAppendArray(array.get(), array.get(), CFRangeMake(0, 3));
+    EXPECT_EQ(tokensOf(array.get()), (std::vector<intptr_t>{5, 4, 3, 5, 4, 3}));
+    CFArrayRemoveAllValues(array.get());
+    EXPECT_EQ(CFArrayGetCount(array.get()), 0);
+}
+
+TEST(CFArray, ApplyFunctionVisitsRangeInIndexOrder) {
+    auto array = tokenArray({1, 2, 3, 4, 5});
+    std::vector<intptr_t> seen;
+    CFArrayApplyFunction(
+        array.get(), CFRangeMake(1, 3),
+        [](const void* value, void* context) {
+            static_cast<std::vector<intptr_t>*>(context)->push_back(TokenValue(value));
+        },
+        &seen);
+    EXPECT_EQ(seen, (std::vector<intptr_t>{2, 3, 4}));
+}
+
+TEST(CFArray, CopiesKeepCallbacksAndAreIndependent) {
+    auto one = MakeInt(1);
+    const void* values[] = {one.get()};
+    auto array = Own(CFArrayCreate(nullptr, values, 1, &kCFTypeArrayCallBacks));
+    auto mutableCopy = Own(CFArrayCreateMutableCopy(nullptr, 0, array.get()));
+    EXPECT_EQ(CFGetRetainCount(one.get()), 3);
+    CFArrayAppendValue(mutableCopy.get(), one.get());
+    EXPECT_EQ(CFGetRetainCount(one.get()), 4);
+    EXPECT_EQ(CFArrayGetCount(array.get()), 1);
+
+    auto frozen = Own(CFArrayCreateCopy(nullptr, mutableCopy.get()));
+    CFArrayRemoveAllValues(mutableCopy.get());
+    EXPECT_EQ(CFArrayGetCount(frozen.get()), 2);
+    EXPECT_EQ(CFGetRetainCount(one.get()), 4);
+    EXPECT_EQ(CFGetTypeID(frozen.get()), CFArrayGetTypeID());
+}
+
+TEST(CFArray, MisuseIsReportedAndIgnored) {
+    auto array = tokenArray({1, 2});
+    LogCapture log;
+    CFArrayAppendValue(const_cast<CFMutableArrayRef>(array.get()), Token(3));
+    EXPECT_EQ(CFArrayGetValueAtIndex(array.get(), 2), nullptr);
+    EXPECT_EQ(CFArrayGetValueAtIndex(array.get(), -1), nullptr);
+    EXPECT_EQ(CFArrayGetCountOfValue(array.get(), CFRangeMake(1, 2), Token(2)), 0);
+    EXPECT_EQ(tokensOf(array.get()), (std::vector<intptr_t>{1, 2}));
+
+    std::vector<std::string> lines = log.Texts();
+    ASSERT_EQ(lines.size(), 8u);
+    EXPECT_EQ(lines[0].rfind("*** Assertion failure in CFArrayAppendValue, ", 0), 0u) << lines[0];
+    EXPECT_EQ(lines[1], "Invalid parameter not satisfying: array is mutable");
+    EXPECT_EQ(lines[2].rfind("*** Assertion failure in CFArrayGetValueAtIndex, ", 0), 0u);
+    EXPECT_EQ(lines[3], "Invalid parameter not satisfying: index lies inside the array");
+    EXPECT_EQ(lines[7], "Invalid parameter not satisfying: range lies inside the collection");
+}
+
+TEST(CFArray, IndexEqualToCountAppends) {
+    auto array = Own(CFArrayCreateMutable(nullptr, 0, nullptr));
+    CFArrayInsertValueAtIndex(array.get(), 0, Token(1));
+    CFArraySetValueAtIndex(array.get(), 1, Token(2));
+    EXPECT_EQ(tokensOf(array.get()), (std::vector<intptr_t>{1, 2}));
+}
+
+TEST(CFArray, DescriptionListsElements) {
+    auto a = MakeText("alpha"), b = MakeText("beta");
+    const void* values[] = {a.get(), b.get()};
+    auto array = Own(CFArrayCreate(nullptr, values, 2, &kCFTypeArrayCallBacks));
+    std::string text = glyphwell::Describe(array.get());
+    EXPECT_EQ(text.rfind("<CFArray 0x", 0), 0u) << text;
+    const std::string tail = ">{count = 2, values = (\n\t0 : alpha\n\t1 : beta\n)}";
+    ASSERT_GE(text.size(), tail.size());
+    EXPECT_EQ(text.substr(text.size() - tail.size()), tail);
+}
+
+// Nested a hundred thousand levels deep, a recursive teardown would overrun the stack.
+TEST(CFArray, DestroysDeepNestingWithoutDeepRecursion) {
+    CFArrayRef inner = CFArrayCreate(nullptr, nullptr, 0, &kCFTypeArrayCallBacks);
+    for (int level = 0; level < 100000; ++level) {
+        const void* values[] = {inner};
+        CFArrayRef outer = CFArrayCreate(nullptr, values, 1, &kCFTypeArrayCallBacks);
+        CFRelease(inner);
+        inner = outer;
+    }
+    CFRelease(inner);
+}

@@ -1,0 +1,43 @@
+// Test helpers for the container suites: owning references and short ways to make elements.
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <type_traits>
+
+#include "platform/PropertyValues.h"
+
+namespace glyphwell::testing {
+
+struct ReleaseDeleter {
+    void operator()(const void* value) const { CFRelease(value); }
+};
+
+/// One reference, released when the holder goes.
+template <class Ref> using Owned = std::unique_ptr<std::remove_pointer_t<Ref>, ReleaseDeleter>;
+
+template <class Ref> Owned<Ref> Own(Ref value) {
+    return Owned<Ref>(value);
+}
+
+/// A new number of type `type` holding `value` converted to that type.
+template <class T> Owned<CFNumberRef> MakeNumber(CFNumberType type, T value) {
+    return Own(CFNumberCreate(nullptr, type, &value));
+}
+inline Owned<CFNumberRef> MakeInt(int value) {
+    return MakeNumber(kCFNumberIntType, value);
+}
+
+inline Owned<CFStringRef> MakeText(const char* text) {
+    return Own(CFStringCreateWithCString(nullptr, text, kCFStringEncodingUTF8));
+}
+
+/// A small integer stored as a pointer, for containers with null callbacks.
+inline const void* Token(intptr_t number) {
+    return reinterpret_cast<const void*>(number);
+}
+inline intptr_t TokenValue(const void* token) {
+    return reinterpret_cast<intptr_t>(token);
+}
+
+} // namespace glyphwell::testing

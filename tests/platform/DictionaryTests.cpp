@@ -1,0 +1,261 @@
+#include <string>
+#include <utility>
+#include <vector>
+
+#include <gtest/gtest.h>
+
+#include "platform/PropertyValues.h"
+#include "support/LogCapture.h"
+#include "tests/platform/ContainerTestSupport.h"
+
+using namespace glyphwell::testing;
+
+namespace {
+
+using Pairs = std::vector<std::pair<const void*, const void*>>;
+
+Owned<CFDictionaryRef> makeDictionary(const Pairs& pairs, bool standardCallBacks = true) {
+    std::vector<const void*> keys, values;
+    for (const auto& [key, value] : pairs) {
+        keys.push_back(key);
+        values.push_back(value);
+    }
+    return Own(CFDictionaryCreate(nullptr, keys.data(), values.data(), CFIndex(keys.size()),
+                                  standardCallBacks ? &kCFTypeDictionaryKeyCallBacks : nullptr,
+                                  standardCallBacks ? &kCFTypeDictionaryValueCallBacks : nullptr));
+}
+
+Owned<CFMutableDictionaryRef> makeMutable() {
+    return Own(CFDictionaryCreateMutable(nullptr, 0, &kCFTypeDictionaryKeyCallBacks,
+                                         &kCFTypeDictionaryValueCallBacks));
+}
+
+Pairs pairsOf(CFDictionaryRef dictionary) {
+    size_t count = size_t(CFDictionaryGetCount(dictionary));
+    std::vector<const void*> keys(count), values(count);
+    CFDictionaryGetKeysAndValues(dictionary, keys.data(), values.data());
+    Pairs pairs;
+    for (size_t i = 0; i < count; ++i)
+        pairs.emplace_back(keys[i], values[i]);
+    return pairs;
+}
+
+} // namespace
+
+TEST(CFDictionary, RetainsKeysAndValuesAndGivesThemBack) {
+    auto key = MakeText("key");
+    auto first = MakeInt(1), second = MakeInt(2);
+    auto dictionary = makeMutable();
+    CFDictionarySetValue(dictionary.get(), key.get(), first.get());
+    EXPECT_EQ(CFGetRetainCount(key.get()), 2);
+    EXPECT_EQ(CFGetRetainCount(first.get()), 2);
+
+    CFDictionarySetValue(dictionary.get(), key.get(), second.get());
+    EXPECT_EQ(CFGetRetainCount(key.get()), 2);
+    EXPECT_EQ(CFGetRetainCount(first.get()), 1);
+    EXPECT_EQ(CFGetRetainCount(second.get()), 2);
+    CFDictionarySetValue(dictionary.get(), key.get(), second.get()); // same value again
+    EXPECT_EQ(CFGetRetainCount(second.get()), 2);
+
+    auto copy = Own(CFDictionaryCreateCopy(nullptr, dictionary.get()));
+    EXPECT_EQ(CFGetRetainCount(second.get()), 3);
+    CFDictionaryRemoveValue(dictionary.get(), key.get());
+    EXPECT_EQ(CFGetRetainCount(key.get()), 2);
+    EXPECT_EQ(CFGetRetainCount(second.get()), 2);
+    copy.reset();
+    EXPECT_EQ(CFGetRetainCount(key.get()), 1);
+    EXPECT_EQ(CFGetRetainCount(second.get()), 1);
+}
+
+TEST(CFDictionary, CreateWithRepeatedKeyKeepsLastValueInFirstPlace) {
+    auto a = MakeText("a"), b = MakeText("b"), alsoA = MakeText("a");
+    auto v1 = MakeInt(1), v2 = MakeInt(2), v3 = MakeInt(3);
+    auto dictionary =
+        makeDictionary({{a.get(), v1.get()}, {b.get(), v2.get()}, {alsoA.get(), v3.get()}});
+    EXPECT_EQ(pairsOf(dictionary.get()), (Pairs{{a.get(), v3.get()}, {b.get(), v2.get()}}));
+    EXPECT_EQ(CFGetRetainCount(v1.get()), 1);
+    EXPECT_EQ(CFGetRetainCount(alsoA.get()), 1);
+}
+
+TEST(CFDictionary, EnumeratesInInsertionOrder) {
+    std::vector<Owned<CFStringRef>> keys;
+    for (const char* name : {"zeta", "alpha", "mid", "beta", "omega"})
+        keys.push_back(MakeText(name));
+    auto dictionary = makeMutable();
+    for (size_t i = 0; i < keys.size(); ++i)
+        CFDictionaryAddValue(dictionary.get(), keys[i].get(), kCFBooleanTrue);
+    std::vector<std::string> visited;
+    CFDictionaryApplyFunction(
+        dictionary.get(),
+        [](const void* key, const void*, void* context) {
+            static_cast<std::vector<std::string>*>(context)->push_back(glyphwell::Describe(key));
+        },
+        &visited);
+    EXPECT_EQ(visited, (std::vector<std::string>{"zeta", "alpha", "mid", "beta", "omega"}));
+}
+
+TEST(CFDictionary, ReplacingAndRemovingKeepOrder) {
+    auto a = MakeText("a"), b = MakeText("b"), c = MakeText("c"), d = MakeText("d");
+    auto one = MakeInt(1), two = MakeInt(2);
+    auto dictionary = makeMutable();
+    for (CFStringRef key : {a.get(), b.get(), c.get()})
+        CFDictionaryAddValue(dictionary.get(), key, one.get());
+    CFDictionarySetValue(dictionary.get(), a.get(), two.get());
+    CFDictionaryReplaceValue(dictionary.get(), b.get(), two.get());
+    CFDictionaryReplaceValue(dictionary.get(), d.get(), two.get()); // absent: nothing
+    CFDictionaryAddValue(dictionary.get(), c.get(), two.get());     // present: nothing
+    EXPECT_EQ(pairsOf(dictionary.get()),
+              (Pairs{{a.get(), two.get()}, {b.get(), two.get()}, {c.get(), one.get()}}));
+
+    CFDictionaryRemoveValue(dictionary.get(), b.get());
+    CFDictionarySetValue(dictionary.get(), d.get(), one.get());
+    CFDictionarySetValue(dictionary.get(), b.get(), one.get());
+    EXPECT_EQ(pairsOf(dictionary.get()), (Pairs{{a.get(), two.get()},
+                                                {c.get(), one.get()},
+                                                {d.get(), one.get()},
+                                                {b.get(), one.get()}}));
+    EXPECT_EQ(CFDictionaryGetCountOfValue(dictionary.get(), one.get()), 3);
+    EXPECT_TRUE(CFDictionaryContainsValue(dictionary.get(), two.get()));
+    CFDictionaryRemoveAllValues(dictionary.get());
+    EXPECT_EQ(CFDictionaryGetCount(dictionary.get()), 0);
+    EXPECT_EQ(CFGetRetainCount(a.get()), 1);
+    EXPECT_EQ(CFGetRetainCount(one.get()), 1);
+}
+
+TEST(CFDictionary, EqualityIgnoresOrderAndComparesValues) {
+    auto a = MakeText("a"), b = MakeText("b");
+    auto one = MakeInt(1), two = MakeInt(2);
+    auto ab = makeDictionary({{a.get(), one.get()}, {b.get(), two.get()}});
+    auto ba = makeDictionary({{b.get(), two.get()}, {a.get(), one.get()}});
+    auto swapped = makeDictionary({{a.get(), two.get()}, {b.get(), one.get()}});
+    auto onlyA = makeDictionary({{a.get(), one.get()}});
+    EXPECT_TRUE(CFEqual(ab.get(), ba.get()));
+    EXPECT_EQ(CFHash(ab.get()), CFHash(ba.get()));
+    EXPECT_FALSE(CFEqual(ab.get(), swapped.get()));
+    EXPECT_FALSE(CFEqual(ab.get(), onlyA.get()));
+    EXPECT_FALSE(CFEqual(onlyA.get(), ab.get()));
+}
+
+TEST(CFDictionary, NumericallyEqualNumbersAreOneKey) {
+    auto byteOne = MakeNumber(kCFNumberSInt8Type, int8_t(1));
+    auto doubleOne = MakeNumber(kCFNumberFloat64Type, 1.0);
+    auto longOne = MakeNumber(kCFNumberLongType, 1L);
+    auto half = MakeNumber(kCFNumberFloat32Type, 0.5f);
+    auto dictionary = makeMutable();
+    CFDictionarySetValue(dictionary.get(), byteOne.get(), CFSTR("first"));
+    CFDictionarySetValue(dictionary.get(), half.get(), CFSTR("half"));
+    CFDictionarySetValue(dictionary.get(), doubleOne.get(), CFSTR("second"));
+    EXPECT_EQ(CFDictionaryGetCount(dictionary.get()), 2);
+    EXPECT_EQ(CFDictionaryGetValue(dictionary.get(), longOne.get()), CFSTR("second"));
+    EXPECT_EQ(pairsOf(dictionary.get())[0].first, byteOne.get());
+}
+
+TEST(CFDictionary, ArraysAreKeysByValue) {
+    auto one = MakeInt(1), two = MakeInt(2);
+    const void* items[] = {one.get(), two.get()};
+    auto key = Own(CFArrayCreate(nullptr, items, 2, &kCFTypeArrayCallBacks));
+    auto mutableKey = Own(CFArrayCreateMutableCopy(nullptr, 0, key.get()));
+    auto dictionary = makeDictionary({{key.get(), CFSTR("pair")}});
+    EXPECT_EQ(CFDictionaryGetValue(dictionary.get(), mutableKey.get()), CFSTR("pair"));
+    CFArrayRemoveValueAtIndex(mutableKey.get(), 1);
+    EXPECT_FALSE(CFDictionaryContainsKey(dictionary.get(), mutableKey.get()));
+}
+
+TEST(CFDictionary, NullCallbacksTakeNullAndLeaveCounts) {
+    auto five = MakeInt(5), otherFive = MakeInt(5);
+    auto dictionary = makeDictionary({{five.get(), nullptr}, {nullptr, Token(7)}}, false);
+    EXPECT_EQ(CFGetRetainCount(five.get()), 1);
+    const void* value = Token(1);
+    EXPECT_TRUE(CFDictionaryGetValueIfPresent(dictionary.get(), five.get(), &value));
+    EXPECT_EQ(value, nullptr);
+    EXPECT_EQ(CFDictionaryGetValue(dictionary.get(), nullptr), Token(7));
+    EXPECT_FALSE(CFDictionaryContainsKey(dictionary.get(), otherFive.get()));
+
+    auto copy = Own(CFDictionaryCreateMutableCopy(nullptr, 0, dictionary.get()));
+    CFDictionarySetValue(copy.get(), otherFive.get(), otherFive.get());
+    EXPECT_EQ(CFDictionaryGetCount(copy.get()), 3);
+    EXPECT_EQ(CFGetRetainCount(otherFive.get()), 1);
+    std::vector<const void*> keys(3);
+    CFDictionaryGetKeysAndValues(copy.get(), keys.data(), nullptr);
+    EXPECT_EQ(keys, (std::vector<const void*>{five.get(), nullptr, otherFive.get()}));
+}
+
+TEST(CFDictionary, LargeDictionaryFindsEveryKey) {
+    const int count = 100000;
+    std::vector<Owned<CFStringRef>> keys;
+    std::vector<Owned<CFNumberRef>> values;
+    std::vector<const void*> keyRefs, valueRefs;
+    for (int i = 0; i < count; ++i) {
+        keys.push_back(MakeText(("key" + std::to_string(i)).c_str()));
+        values.push_back(MakeInt(i));
+        keyRefs.push_back(keys.back().get());
+        valueRefs.push_back(values.back().get());
+    }
+    auto dictionary =
+        Own(CFDictionaryCreate(nullptr, keyRefs.data(), valueRefs.data(), count,
+                               &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks));
+    auto lookup = MakeText("key4242");
+    EXPECT_EQ(CFDictionaryGetValue(dictionary.get(), lookup.get()), values[4242].get());
+
+    auto edited = Own(CFDictionaryCreateMutableCopy(nullptr, 0, dictionary.get()));
+    for (int i = 0; i < count; i += 3)
+        CFDictionaryRemoveValue(edited.get(), keyRefs[size_t(i)]);
+    Pairs remaining = pairsOf(edited.get());
+    ASSERT_EQ(remaining.size(), size_t(count - (count + 2) / 3));
+    for (size_t i = 0, k = 1; i < remaining.size(); ++i, k += (k % 3 == 2) ? 2 : 1)
+        ASSERT_EQ(remaining[i].first, keyRefs[k]) << i;
+    for (int i = 0; i < count; ++i)
+        ASSERT_EQ(CFDictionaryGetValue(edited.get(), keyRefs[size_t(i)]),
+                  i % 3 ? valueRefs[size_t(i)] : nullptr);
+
+    for (int i = count; i-- > 0;)
+        if (i % 3 == 0)
+            CFDictionaryAddValue(edited.get(), keyRefs[size_t(i)], valueRefs[size_t(i)]);
+    EXPECT_TRUE(CFEqual(dictionary.get(), edited.get()));
+    edited.reset();
+    dictionary.reset();
+    EXPECT_EQ(CFGetRetainCount(keyRefs[0]), 1);
+    EXPECT_EQ(CFGetRetainCount(valueRefs[1]), 1);
+}
+
+TEST(CFDictionary, ChangingImmutableDictionaryIsReportedAndIgnored) {
+    auto dictionary = makeDictionary({});
+    LogCapture log;
+    CFDictionarySetValue(const_cast<CFMutableDictionaryRef>(dictionary.get()), CFSTR("k"),
+                         CFSTR("v"));
+    EXPECT_EQ(CFDictionaryGetCount(dictionary.get()), 0);
+    std::vector<std::string> lines = log.Texts();
+    ASSERT_EQ(lines.size(), 2u);
+    EXPECT_EQ(lines[0].rfind("*** Assertion failure in CFDictionarySetValue, ", 0), 0u) << lines[0];
+    EXPECT_EQ(lines[1], "Invalid parameter not satisfying: dictionary is mutable");
+}
+
+TEST(CFDictionary, DescriptionListsPairs) {
+    auto dictionary = makeDictionary({{CFSTR("name"), CFSTR("value")}});
+    std::string text = glyphwell::Describe(dictionary.get());
+    EXPECT_EQ(text.rfind("<CFDictionary 0x", 0), 0u) << text;
+    EXPECT_NE(text.find(">{count = 1, entries = (\n\tname = value\n)}"), std::string::npos) << text;
+}
+
+// Dictionaries, sets and arrays nested into one another a hundred thousand levels deep: a
+// recursive teardown would overrun the stack.
+TEST(CFDictionary, DestroysDeepMixedNestingWithoutDeepRecursion) {
+    CFTypeRef inner =
+        CFDictionaryCreate(nullptr, nullptr, nullptr, 0, &kCFTypeDictionaryKeyCallBacks,
+                           &kCFTypeDictionaryValueCallBacks);
+    for (int level = 0; level < 100000; ++level) {
+        const void* items[] = {inner};
+        const void* keys[] = {CFSTR("k")};
+        CFTypeRef outer;
+        if (level % 3 == 0)
+            outer = CFDictionaryCreate(nullptr, keys, items, 1, &kCFTypeDictionaryKeyCallBacks,
+                                       &kCFTypeDictionaryValueCallBacks);
+        else if (level % 3 == 1)
+            outer = CFSetCreate(nullptr, items, 1, &kCFTypeSetCallBacks);
+        else
+            outer = CFArrayCreate(nullptr, items, 1, &kCFTypeArrayCallBacks);
+        CFRelease(inner);
+        inner = outer;
+    }
+    CFRelease(inner);
+}

@@ -1,0 +1,170 @@
+#include <string>
+#include <vector>
+
+#include <gtest/gtest.h>
+
+#include "platform/PropertyValues.h"
+#include "support/LogCapture.h"
+#include "tests/platform/ContainerTestSupport.h"
+
+using namespace glyphwell::testing;
+
+namespace {
+
+Owned<CFSetRef> makeSet(std::vector<const void*> values,
+                        const CFSetCallBacks* callBacks = &kCFTypeSetCallBacks) {
+    return Own(CFSetCreate(nullptr, values.data(), CFIndex(values.size()), callBacks));
+}
+
+std::vector<const void*> membersOf(CFSetRef set) {
+    std::vector<const void*> members(size_t(CFSetGetCount(set)));
+    CFSetGetValues(set, members.data());
+    return members;
+}
+
+} // namespace
+
+TEST(CFSet, CreateKeepsFirstOfEqualValues) {
+    auto five = MakeInt(5), wideFive = MakeNumber(kCFNumberSInt64Type, int64_t(5));
+    auto realFive = MakeNumber(kCFNumberFloat32Type, 5.0f), six = MakeInt(6);
+    auto set = makeSet({five.get(), wideFive.get(), six.get(), realFive.get()});
+    EXPECT_EQ(CFSetGetCount(set.get()), 2);
+    EXPECT_EQ(CFSetGetValue(set.get(), realFive.get()), five.get());
+    EXPECT_EQ(CFSetGetCountOfValue(set.get(), wideFive.get()), 1);
+    EXPECT_EQ(CFGetRetainCount(five.get()), 2);
+    EXPECT_EQ(CFGetRetainCount(wideFive.get()), 1);
+    EXPECT_EQ(CFGetRetainCount(realFive.get()), 1);
+    set.reset();
+    EXPECT_EQ(CFGetRetainCount(five.get()), 1);
+    EXPECT_EQ(CFGetRetainCount(six.get()), 1);
+}
+
+TEST(CFSet, EnumeratesInInsertionOrder) {
+    auto c = MakeText("c"), a = MakeText("a"), b = MakeText("b");
+    auto set = makeSet({c.get(), a.get(), b.get()});
+    EXPECT_EQ(membersOf(set.get()), (std::vector<const void*>{c.get(), a.get(), b.get()}));
+    std::vector<const void*> visited;
+    CFSetApplyFunction(
+        set.get(),
+        [](const void* value, void* context) {
+            static_cast<std::vector<const void*>*>(context)->push_back(value);
+        },
+        &visited);
+    EXPECT_EQ(visited, membersOf(set.get()));
+}
+
+TEST(CFSet, EqualityIgnoresOrder) {
+    auto x = MakeText("x"), y = MakeText("y"), z = MakeText("z");
+    auto xy = makeSet({x.get(), y.get()});
+    auto yx = makeSet({y.get(), x.get()});
+    auto xz = makeSet({x.get(), z.get()});
+    auto xyz = makeSet({x.get(), y.get(), z.get()});
+    EXPECT_TRUE(CFEqual(xy.get(), yx.get()));
+    EXPECT_EQ(CFHash(xy.get()), CFHash(yx.get()));
+    EXPECT_FALSE(CFEqual(xy.get(), xz.get()));
+    EXPECT_FALSE(CFEqual(xy.get(), xyz.get()));
+    EXPECT_FALSE(CFEqual(xyz.get(), xy.get()));
+}
+
+TEST(CFSet, AddSetAndReplaceTreatEqualMembersDifferently) {
+    auto one = MakeInt(1), otherOne = MakeNumber(kCFNumberSInt8Type, int8_t(1));
+    auto two = MakeInt(2), three = MakeInt(3);
+    auto set = Own(CFSetCreateMutable(nullptr, 0, &kCFTypeSetCallBacks));
+    CFSetAddValue(set.get(), one.get());
+    CFSetAddValue(set.get(), two.get());
+    CFSetAddValue(set.get(), otherOne.get()); // present: left alone
+    EXPECT_EQ(CFSetGetValue(set.get(), otherOne.get()), one.get());
+    EXPECT_EQ(CFGetRetainCount(otherOne.get()), 1);
+
+    CFSetSetValue(set.get(), otherOne.get()); // replaces in place
+    EXPECT_EQ(membersOf(set.get()), (std::vector<const void*>{otherOne.get(), two.get()}));
+    EXPECT_EQ(CFGetRetainCount(one.get()), 1);
+    EXPECT_EQ(CFGetRetainCount(otherOne.get()), 2);
+
+    CFSetReplaceValue(set.get(), three.get()); // absent: nothing
+    CFSetReplaceValue(set.get(), one.get());
+    CFSetSetValue(set.get(), three.get()); // absent: added
+    EXPECT_EQ(membersOf(set.get()), (std::vector<const void*>{one.get(), two.get(), three.get()}));
+    EXPECT_EQ(CFGetRetainCount(otherOne.get()), 1);
+}
+
+TEST(CFSet, RemovalKeepsOrderAndReleases) {
+    auto a = MakeText("a"), b = MakeText("b"), c = MakeText("c"), d = MakeText("d");
+    auto set = Own(CFSetCreateMutable(nullptr, 0, &kCFTypeSetCallBacks));
+    for (CFStringRef member : {a.get(), b.get(), c.get(), d.get()})
+        CFSetAddValue(set.get(), member);
+    auto alsoB = MakeText("b");
+    CFSetRemoveValue(set.get(), alsoB.get());
+    CFSetRemoveValue(set.get(), alsoB.get());
+    EXPECT_EQ(CFGetRetainCount(b.get()), 1);
+    EXPECT_FALSE(CFSetContainsValue(set.get(), b.get()));
+    CFSetAddValue(set.get(), b.get());
+    EXPECT_EQ(membersOf(set.get()), (std::vector<const void*>{a.get(), c.get(), d.get(), b.get()}));
+    CFSetRemoveAllValues(set.get());
+    EXPECT_EQ(CFSetGetCount(set.get()), 0);
+    EXPECT_EQ(CFGetRetainCount(a.get()), 1);
+    EXPECT_EQ(CFGetRetainCount(b.get()), 1);
+}
+
+TEST(CFSet, NullCallbacksUsePointerIdentity) {
+    auto five = MakeInt(5), otherFive = MakeInt(5);
+    auto set = makeSet({five.get(), otherFive.get(), nullptr, five.get()}, nullptr);
+    EXPECT_EQ(CFSetGetCount(set.get()), 3);
+    EXPECT_TRUE(CFSetContainsValue(set.get(), nullptr));
+    EXPECT_EQ(CFGetRetainCount(five.get()), 1);
+    auto copy = Own(CFSetCreateMutableCopy(nullptr, 0, set.get()));
+    CFSetRemoveValue(copy.get(), five.get());
+    EXPECT_EQ(membersOf(copy.get()), (std::vector<const void*>{otherFive.get(), nullptr}));
+    EXPECT_EQ(CFGetRetainCount(five.get()), 1);
+}
+
+TEST(CFSet, ArraysAreMembersByValue) {
+    auto one = MakeInt(1), two = MakeInt(2);
+    const void* pair[] = {one.get(), two.get()};
+    auto array = Own(CFArrayCreate(nullptr, pair, 2, &kCFTypeArrayCallBacks));
+    auto equalArray = Own(CFArrayCreate(nullptr, pair, 2, &kCFTypeArrayCallBacks));
+    auto set = makeSet({array.get(), equalArray.get()});
+    EXPECT_EQ(CFSetGetCount(set.get()), 1);
+    EXPECT_TRUE(CFSetContainsValue(set.get(), equalArray.get()));
+}
+
+TEST(CFSet, LargeSetKeepsEveryMemberFindable) {
+    const intptr_t count = 100000;
+    std::vector<const void*> tokens;
+    for (intptr_t i = 0; i < count; ++i)
+        tokens.push_back(Token(i * 16)); // pointer-like: low bits are zero
+    auto set = Own(CFSetCreateMutable(nullptr, 0, nullptr));
+    for (const void* token : tokens)
+        CFSetAddValue(set.get(), token);
+    for (intptr_t i = 0; i < count; i += 2)
+        CFSetRemoveValue(set.get(), tokens[size_t(i)]);
+    ASSERT_EQ(CFSetGetCount(set.get()), count / 2);
+    for (intptr_t i = 0; i < count; ++i)
+        ASSERT_EQ(CFSetContainsValue(set.get(), tokens[size_t(i)]), i % 2 == 1) << i;
+    std::vector<const void*> members = membersOf(set.get());
+    for (size_t i = 0; i < members.size(); ++i)
+        ASSERT_EQ(members[i], tokens[2 * i + 1]);
+
+    auto whole = Own(CFSetCreate(nullptr, tokens.data(), count, nullptr));
+    auto reversed = std::vector<const void*>(tokens.rbegin(), tokens.rend());
+    auto wholeReversed = Own(CFSetCreate(nullptr, reversed.data(), count, nullptr));
+    EXPECT_TRUE(CFEqual(whole.get(), wholeReversed.get()));
+    EXPECT_FALSE(CFEqual(whole.get(), set.get()));
+}
+
+TEST(CFSet, ChangingImmutableSetIsReportedAndIgnored) {
+    auto one = MakeInt(1);
+    auto set = makeSet({one.get()});
+    LogCapture log;
+    CFSetRemoveValue(const_cast<CFMutableSetRef>(set.get()), one.get());
+    EXPECT_EQ(CFSetGetCount(set.get()), 1);
+    EXPECT_EQ(log.Texts().back(), "Invalid parameter not satisfying: set is mutable");
+}
+
+TEST(CFSet, DescriptionListsMembers) {
+    auto a = MakeText("a");
+    auto set = makeSet({a.get()});
+    std::string text = glyphwell::Describe(set.get());
+    EXPECT_EQ(text.rfind("<CFSet 0x", 0), 0u) << text;
+    EXPECT_NE(text.find(">{count = 1, values = (\n\ta\n)}"), std::string::npos) << text;
+}
