@@ -1,0 +1,120 @@
+// libFuzzer target for the segmented data stream's readers over untrusted buffers.
+//
+// Input: a little-endian 16-bit buffer length N, then N bytes of buffer (fewer when the input
+// ends first), then a program: one byte per reader operation, some followed by an argument byte.
+// The buffer goes through QZDataStreamWithData, which pads it to a root header; every pointer the
+// readers hand out must then lie inside the buffer. Run with -close_fd_mask=2: the dump and the
+// unterminated-string warning write to stderr.
+#include <cstddef>
+#include <cstdint>
+#include <cstring>
+
+#include "datastream/QZDataStream.h"
+#include "platform/CFBase.h"
+#include "platform/CFData.h"
+
+namespace {
+
+void check(bool condition) {
+    if (!condition)
+        __builtin_trap();
+}
+
+bool inside(QZDataStreamRef stream, const void* pointer, int64_t size) {
+    const UInt8* base = CFDataGetBytePtr(stream->data);
+    const UInt8* at = static_cast<const UInt8*>(pointer);
+    return at >= base && at + size <= base + CFDataGetLength(stream->data);
+}
+
+void run(QZDataStreamRef stream, const uint8_t* program, size_t size) {
+    unsigned char scratch[256];
+    for (size_t i = 0; i < size; ++i) {
+        uint8_t op = program[i] % 14;
+        uint8_t argument = i + 1 < size ? program[i + 1] : 0;
+        int32_t length = -1;
+        const char* text = nullptr;
+        QZDataStreamSegment* header = nullptr;
+        switch (op) {
+        case 0: {
+            int64_t opened = QZDataStreamOpenReadSegment(stream);
+            check(opened == -1 || opened == stream->readTop);
+            break;
+        }
+        case 1:
+            QZDataStreamCloseReadSegment(stream);
+            break;
+        case 2:
+            header = QZDataStreamSkipReadSegment(stream);
+            check(!header || inside(stream, header, sizeof *header));
+            break;
+        case 3:
+            QZDataStreamResetReadSegment(stream);
+            break;
+        case 4:
+            QZDataStreamResetStream(stream);
+            check(stream->readTop == 0);
+            break;
+        case 5:
+            check(QZDataStreamReadBytes(stream, scratch, argument) <= argument);
+            ++i;
+            break;
+        case 6:
+            QZDataStreamReadUInt32(stream);
+            break;
+        case 7:
+            QZDataStreamReadDouble(stream);
+            break;
+        case 8:
+            text = QZDataStreamReadString(stream, &length);
+            check(length >= 0 && (!text || inside(stream, text, length)));
+            check(text || length == 0);
+            break;
+        case 9:
+            text = QZDataStreamReadString(stream, nullptr);
+            check(!text || inside(stream, text, int64_t(strlen(text)) + 1));
+            break;
+        case 10:
+            text = QZDataStreamReadCString(stream);
+            check(!text || inside(stream, text, int64_t(strlen(text)) + 1));
+            break;
+        case 11:
+            QZDataStreamBytesLeftToRead(stream);
+            QZDataStreamBytesLeftToReadInCurrentSegment(stream);
+            break;
+        case 12:
+            header = QZDataStreamCurrentReadSegment(stream);
+            check(!header || inside(stream, header, sizeof *header));
+            break;
+        default:
+            if (argument % 16 == 0)
+                QZDataStreamShow(stream); // rare: it describes the whole buffer
+            ++i;
+            break;
+        }
+    }
+}
+
+} // namespace
+
+extern "C" int LLVMFuzzerTestOneInput(const uint8_t* input, size_t size) {
+    if (size < 2)
+        return 0;
+    size_t bufferSize = input[0] | size_t(input[1]) << 8;
+    input += 2;
+    size -= 2;
+    if (bufferSize > size)
+        bufferSize = size;
+
+    CFMutableDataRef data = CFDataCreateMutable(kCFAllocatorDefault, 0);
+    CFDataAppendBytes(data, input, CFIndex(bufferSize));
+    QZDataStreamRef stream = QZDataStreamWithData(data);
+    CFRelease(data);
+    check(stream && CFDataGetLength(stream->data) >= 24);
+
+    run(stream, input + bufferSize, size - bufferSize);
+
+    QZDataStreamClearStream(stream);
+    check(CFDataGetLength(stream->data) == 24);
+    QZDataStreamFree(stream);
+    return 0;
+}
