@@ -1,0 +1,385 @@
+#include "serialization/TCFResurrectContext.h"
+
+#include <syslog.h>
+
+#include <algorithm>
+#include <cstring>
+
+#include "bitmap/QZBitmapRepresentation.h"
+#include "cfutil/TCFError.h"
+#include "cfutil/TCFRetained.h"
+#include "cfutil/TCFStringUniquer.h"
+#include "cfutil/TStackBuffer.h"
+#include "serialization/TCFFlattenContext.h"
+
+namespace {
+
+using ElementTable = TStackBuffer<void const*, 30>;
+
+/// Makes room for element `index` of a container of `count` elements, doubling the table so
+/// that its size follows the elements actually read rather than the count the stream claims.
+void ReserveElement(ElementTable& table, unsigned long index, long count) {
+    if (index < table.GetCount())
+        return;
+    const unsigned long doubled = std::max<unsigned long>(2 * table.GetCount(), 30);
+    table.SetCount(std::min<unsigned long>(doubled, static_cast<unsigned long>(count)));
+}
+
+void ReleaseElements(ElementTable& table, long count) {
+    for (long i = count - 1; i >= 0; --i)
+        TCFSafeRelease(table[i]);
+}
+
+/// True when `length` is that of a bitmap representation: the BMP and up to 16 more planes.
+bool IsPlausibleBitmapLength(uint32_t length) {
+    return length >= 8192 && (length - 8192) % 8193 == 0 && (length - 8192) / 8193 <= 16;
+}
+
+/// Counts the containers open around the reader while it lives.
+class NestingLevel {
+public:
+    explicit NestingLevel(unsigned& depth) : depth_(depth) { ++depth_; }
+    ~NestingLevel() { --depth_; }
+    NestingLevel(const NestingLevel&) = delete;
+    NestingLevel& operator=(const NestingLevel&) = delete;
+
+private:
+    unsigned& depth_;
+};
+
+} // namespace
+
+void* ConvertToNative(void* value, long size) { return ConvertToBigEndian(value, size); }
+
+TCFResurrectContext::TCFResurrectContext(unsigned char const* bytes, unsigned long length)
+    : cursor(bytes), end(bytes ? bytes + length : nullptr), corrupted(false) {}
+
+TCFResurrectContext::TCFResurrectContext(unsigned long address, unsigned long length)
+    : TCFResurrectContext(reinterpret_cast<unsigned char const*>(address), length) {}
+
+TCFResurrectContext::~TCFResurrectContext() = default;
+
+void TCFResurrectContext::ResurrectionError(char const* label) {
+    if (corrupted)
+        return;
+    cursor = nullptr;
+    end = nullptr;
+    corrupted = true;
+    glyphwell::SystemLog(LOG_ERR, "ERROR: Quzel got corrupted data. (%s)", label);
+}
+
+bool TCFResurrectContext::BytesAvailable(unsigned long count) const {
+    return !corrupted && cursor && static_cast<unsigned long>(end - cursor) >= count;
+}
+
+unsigned int TCFResurrectContext::StreamIn32bitEntity() {
+    uint32_t value;
+    std::memcpy(&value, cursor, 4);
+    cursor += 4;
+    return __builtin_bswap32(value);
+}
+
+TCFType TCFResurrectContext::StreamInTCFTypeID() {
+    if (!BytesAvailable(4)) {
+        ResurrectionError("cftype");
+        return kTCFTypeAny;
+    }
+    return static_cast<TCFType>(StreamIn32bitEntity());
+}
+
+long TCFResurrectContext::StreamInCFIndex() {
+    if (!BytesAvailable(4)) {
+        ResurrectionError("cfindex");
+        return 0;
+    }
+    return static_cast<int32_t>(StreamIn32bitEntity());
+}
+
+void TCFResurrectContext::StreamInData(void* destination, unsigned long size, long count) {
+    unsigned long total = 0;
+    const bool sized = count >= 0 && !__builtin_mul_overflow(size, static_cast<unsigned long>(count),
+                                                             &total);
+    if (!sized || !BytesAvailable(total)) {
+        if (sized)
+            std::memset(destination, 0, total);
+        ResurrectionError("data");
+        return;
+    }
+    std::memcpy(destination, cursor, total);
+    cursor += total;
+    if (size > 1) {
+        auto* element = static_cast<unsigned char*>(destination);
+        for (long i = 0; i < count; ++i, element += size)
+            ConvertToNative(element, static_cast<long>(size));
+    }
+}
+
+__CFString const* TCFResurrectContext::RetrieveCFString() {
+    return static_cast<CFStringRef>(Resurrect(kTCFTypeString));
+}
+__CFNumber const* TCFResurrectContext::RetrieveCFNumber() {
+    return static_cast<CFNumberRef>(Resurrect(kTCFTypeNumber));
+}
+__CFBoolean const* TCFResurrectContext::RetrieveCFBoolean() {
+    return static_cast<CFBooleanRef>(Resurrect(kTCFTypeBoolean));
+}
+__CFData const* TCFResurrectContext::RetrieveCFData() {
+    return static_cast<CFDataRef>(Resurrect(kTCFTypeData));
+}
+__CFCharacterSet const* TCFResurrectContext::RetrieveCFCharacterSet() {
+    return static_cast<CFCharacterSetRef>(Resurrect(kTCFTypeCharacterSet));
+}
+__CFArray const* TCFResurrectContext::RetrieveCFArray() {
+    return static_cast<CFArrayRef>(Resurrect(kTCFTypeArray));
+}
+__CFDictionary const* TCFResurrectContext::RetrieveCFDictionary() {
+    return static_cast<CFDictionaryRef>(Resurrect(kTCFTypeDictionary));
+}
+__CFSet const* TCFResurrectContext::RetrieveCFSet() {
+    return static_cast<CFSetRef>(Resurrect(kTCFTypeSet));
+}
+__CFURL const* TCFResurrectContext::RetrieveCFURL() {
+    return static_cast<CFURLRef>(Resurrect(kTCFTypeURL));
+}
+__CFUUID const* TCFResurrectContext::RetrieveCFUUID() {
+    return static_cast<CFUUIDRef>(Resurrect(kTCFTypeUUID));
+}
+__CFError* TCFResurrectContext::RetrieveCFError() {
+    return static_cast<CFErrorRef>(const_cast<void*>(Resurrect(kTCFTypeError)));
+}
+
+void const* TCFResurrectContext::Resurrect(TCFType expected) {
+    if (!cursor)
+        return nullptr;
+    const TCFType type = StreamInTCFTypeID();
+    if (expected != kTCFTypeAny && type != expected) {
+        CFLog(kCFLogLevelError, "Quzel encounters an unexpected type. (%d, %d)",
+              static_cast<int>(type), static_cast<int>(expected));
+        return nullptr;
+    }
+    switch (type) {
+    case kTCFTypeString:
+        return ResurrectCFString();
+    case kTCFTypeNumber:
+        return ResurrectCFNumber();
+    case kTCFTypeBoolean:
+        return ResurrectCFBoolean();
+    case kTCFTypeData:
+        return ResurrectCFData();
+    case kTCFTypeCharacterSet:
+        return ResurrectCFCharacterSet();
+    case kTCFTypeURL:
+        return ResurrectCFURL();
+    case kTCFTypeUUID:
+        return ResurrectCFUUID();
+    case kTCFTypeError:
+        return ResurrectCFError();
+    case kTCFTypeArray:
+    case kTCFTypeDictionary:
+    case kTCFTypeSet: {
+        // Each container costs a few frames of stack to read and to release: bound the nesting.
+        if (depth >= kMaxNestingDepth) {
+            ResurrectionError("depth");
+            return nullptr;
+        }
+        NestingLevel level(depth);
+        if (type == kTCFTypeArray)
+            return ResurrectCFArray();
+        if (type == kTCFTypeDictionary)
+            return ResurrectCFDictionary();
+        return ResurrectCFSet();
+    }
+    default:
+        CFLog(kCFLogLevelError, "*** don't how to resurrect type %d", static_cast<int>(type));
+        return nullptr;
+    }
+}
+
+__CFString const* TCFResurrectContext::ResurrectCFString() {
+    const long length = StreamInCFIndex();
+    if (length == 0)
+        return CFSTR("");
+    if (length < 0 || length > kTCFMaxStringLength) {
+        ResurrectionError("cfstr");
+        return CFSTR("");
+    }
+    TStackBuffer<unsigned char, 30> text(static_cast<unsigned long>(length) + 1);
+    StreamInData(text.GetBuffer(), 1, length);
+    text[static_cast<unsigned long>(length)] = 0;
+    // A byte-order mark is not part of the text.
+    const char* bytes = reinterpret_cast<const char*>(text.GetBuffer());
+    long count = length;
+    if (count >= 3 && std::memcmp(bytes, "\xEF\xBB\xBF", 3) == 0) {
+        bytes += 3;
+        count -= 3;
+        if (count == 0)
+            return CFSTR("");
+    }
+    CFStringRef unique = TCFStringUniquer().GetUniqueString(bytes, count);
+    return TCFSafeRetain(unique);
+}
+
+__CFNumber const* TCFResurrectContext::ResurrectCFNumber() {
+    const long type = StreamInCFIndex();
+    const long width = StreamInCFIndex();
+    unsigned char value[8] = {};
+    if (width < 1 || width > 8)
+        ResurrectionError("cfnum");
+    else
+        StreamInData(value, static_cast<unsigned long>(width), 1);
+    if (type >= kCFNumberSInt8Type && type <= kCFNumberMaxType)
+        return CFNumberCreate(kCFAllocatorDefault, type, value);
+    // An unknown type code: keep the value as a signed integer of the width read.
+    int64_t integer = 0;
+    if (width >= 1 && width <= 8) {
+        uint64_t bits = 0;
+        std::memcpy(&bits, value, 8);
+        const unsigned shift = 64 - 8 * static_cast<unsigned>(width);
+        integer = static_cast<int64_t>(bits << shift) >> shift;
+    }
+    return CFNumberCreate(kCFAllocatorDefault, kCFNumberLongType, &integer);
+}
+
+__CFBoolean const* TCFResurrectContext::ResurrectCFBoolean() {
+    if (StreamInCFIndex() != 1) {
+        ResurrectionError("cfbool");
+        return kCFBooleanFalse;
+    }
+    unsigned char byte = 0;
+    StreamInData(&byte, 1, 1);
+    return byte ? kCFBooleanTrue : kCFBooleanFalse;
+}
+
+__CFData const* TCFResurrectContext::ResurrectCFData() {
+    const long length = StreamInCFIndex();
+    if (length < 0 || !BytesAvailable(static_cast<unsigned long>(length))) {
+        ResurrectionError("cfdata");
+        return nullptr;
+    }
+    CFDataRef data = CFDataCreate(kCFAllocatorDefault, cursor, length);
+    cursor += length;
+    return data;
+}
+
+__CFCharacterSet const* TCFResurrectContext::ResurrectCFCharacterSet() {
+    const long length = StreamInCFIndex();
+    if (length < 0 || !BytesAvailable(static_cast<unsigned long>(length))) {
+        ResurrectionError("cfcharset");
+        return nullptr;
+    }
+    unsigned char const* compressed = cursor;
+    cursor += length;
+    if (length < 8)
+        return nullptr;
+    uint32_t claimed;
+    std::memcpy(&claimed, compressed + 4, 4); // little-endian inside the codec's header
+    if (!IsPlausibleBitmapLength(claimed))
+        return nullptr;
+    TCFAdopted<CFDataRef> bitmap(QZCopyUncompressedBitmapRepresentation(compressed, length));
+    if (!bitmap)
+        return nullptr;
+    return CFCharacterSetCreateWithBitmapRepresentation(kCFAllocatorDefault, bitmap);
+}
+
+long TCFResurrectContext::ContainerCount(const char* label) {
+    const long count = StreamInCFIndex();
+    if (count < 0 || count > kTCFMaxContainerCount) {
+        ResurrectionError(label);
+        return 0;
+    }
+    return count;
+}
+
+__CFArray const* TCFResurrectContext::ResurrectCFArray() {
+    const long count = ContainerCount("cfarray");
+    ElementTable table(0);
+    for (long i = 0; i < count; ++i) {
+        ReserveElement(table, static_cast<unsigned long>(i), count);
+        table[i] = Resurrect(kTCFTypeAny);
+        if (!table[i]) {
+            ReleaseElements(table, i);
+            return nullptr;
+        }
+    }
+    CFArrayRef array =
+        CFArrayCreate(kCFAllocatorDefault, table.GetBuffer(), count, &kCFTypeArrayCallBacks);
+    ReleaseElements(table, count);
+    return array;
+}
+
+__CFSet const* TCFResurrectContext::ResurrectCFSet() {
+    const long count = ContainerCount("cfarray");
+    ElementTable table(0);
+    for (long i = 0; i < count; ++i) {
+        ReserveElement(table, static_cast<unsigned long>(i), count);
+        table[i] = Resurrect(kTCFTypeAny);
+        if (!table[i]) {
+            ReleaseElements(table, i);
+            return nullptr;
+        }
+    }
+    CFSetRef set = CFSetCreate(kCFAllocatorDefault, table.GetBuffer(), count, &kCFTypeSetCallBacks);
+    ReleaseElements(table, count);
+    return set;
+}
+
+__CFDictionary const* TCFResurrectContext::ResurrectCFDictionary() {
+    long count = ContainerCount("cfdict");
+    ElementTable keys(0), values(0);
+    for (long i = 0; i < count; ++i) {
+        ReserveElement(keys, static_cast<unsigned long>(i), count);
+        ReserveElement(values, static_cast<unsigned long>(i), count);
+        keys[i] = Resurrect(kTCFTypeAny);
+        values[i] = Resurrect(kTCFTypeAny);
+        if (!keys[i] || !values[i]) {
+            CFLog(kCFLogLevelError,
+                  "*** ResurrectCFDictionary missing either a key or a value, truncating dictionary");
+            TCFSafeRelease(keys[i]);
+            TCFSafeRelease(values[i]);
+            count = i;
+            break;
+        }
+    }
+    CFDictionaryRef dictionary =
+        CFDictionaryCreate(kCFAllocatorDefault, keys.GetBuffer(), values.GetBuffer(), count,
+                           &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks);
+    ReleaseElements(keys, count);
+    ReleaseElements(values, count);
+    return dictionary;
+}
+
+__CFURL const* TCFResurrectContext::ResurrectCFURL() {
+    const long length = StreamInCFIndex();
+    if (length == 0)
+        return CFURLCreateWithBytes(kCFAllocatorDefault, nullptr, 0, kCFStringEncodingUTF8, nullptr);
+    if (length < 0 || length > kTCFMaxStringLength) {
+        ResurrectionError("cfurl");
+        return CFURLCreateWithBytes(kCFAllocatorDefault, nullptr, 0, kCFStringEncodingUTF8, nullptr);
+    }
+    TStackBuffer<unsigned char, 30> bytes(static_cast<unsigned long>(length));
+    StreamInData(bytes.GetBuffer(), 1, length);
+    return CFURLCreateWithBytes(kCFAllocatorDefault, bytes.GetBuffer(), length,
+                                kCFStringEncodingUTF8, nullptr);
+}
+
+__CFUUID const* TCFResurrectContext::ResurrectCFUUID() {
+    const long count = StreamInCFIndex();
+    if (count == 0)
+        return nullptr;
+    if (count != 16) {
+        ResurrectionError("cfuuid");
+        return nullptr;
+    }
+    CFUUIDBytes bytes;
+    StreamInData(&bytes, 1, 16);
+    return CFUUIDCreateFromUUIDBytes(kCFAllocatorDefault, bytes);
+}
+
+__CFError* TCFResurrectContext::ResurrectCFError() {
+    const long code = StreamInCFIndex();
+    StreamInTCFTypeID(); // the domain's type id, not checked
+    TCFAdopted<CFStringRef> domain(ResurrectCFString());
+    if (CFStringGetLength(domain) < 1)
+        return nullptr;
+    return TCFError(domain, code, nullptr).Orphan();
+}

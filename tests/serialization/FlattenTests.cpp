@@ -1,0 +1,275 @@
+#include <gtest/gtest.h>
+
+#include <string>
+
+#include "serialization/TCFFlattenContext.h"
+#include "support/LogCapture.h"
+#include "support/Values.h"
+
+using namespace glyphwell::testing;
+
+namespace {
+
+/// The flattened bytes of `value` in a new buffer, as upper-case hex.
+std::string Flattened(CFTypeRef value) {
+    Ref buffer(CFDataCreateMutable(nullptr, 0));
+    {
+        TCFFlattenContext context(const_cast<__CFData*>(buffer.as<CFDataRef>()), false);
+        context.Flatten(value);
+    }
+    return ToHex(buffer.as<CFDataRef>());
+}
+
+std::string Repeat(const std::string& unit, size_t times) {
+    std::string text;
+    for (size_t i = 0; i < times; ++i)
+        text += unit;
+    return text;
+}
+
+} // namespace
+
+TEST(FlattenExamples, ReproducesTheDocumentedBytes) {
+    EXPECT_EQ(Flattened(Str("abc").get()), "00 00 00 07 00 00 00 03 61 62 63");
+    EXPECT_EQ(Flattened(Dict({}).get()), "00 00 00 10 00 00 00 00");
+    EXPECT_EQ(Flattened(kCFBooleanTrue), "00 00 01 03 00 00 00 01 01");
+    EXPECT_EQ(Flattened(Num<int32_t>(kCFNumberSInt32Type, 1).get()),
+              "00 00 00 16 00 00 00 03 00 00 00 04 00 00 00 01");
+    EXPECT_EQ(Flattened(Num<double>(kCFNumberFloat64Type, 1.0).get()),
+              "00 00 00 16 00 00 00 06 00 00 00 08 3F F0 00 00 00 00 00 00");
+    Ref key = Str("a");
+    EXPECT_EQ(Flattened(Dict({{key.get(), kCFBooleanTrue}}).get()),
+              "00 00 00 10 00 00 00 01 00 00 00 07 00 00 00 01 61 00 00 01 03 00 00 00 01 01");
+}
+
+TEST(FlattenKinds, WritesEveryScalarKind) {
+    EXPECT_EQ(Flattened(kCFBooleanFalse), "00 00 01 03 00 00 00 01 00");
+    Ref empty(CFDataCreate(nullptr, nullptr, 0));
+    EXPECT_EQ(Flattened(empty.get()), "00 00 00 12 00 00 00 00");
+    const UInt8 bytes[] = {0xDE, 0xAD, 0x00};
+    Ref data(CFDataCreate(nullptr, bytes, 3));
+    EXPECT_EQ(Flattened(data.get()), "00 00 00 12 00 00 00 03 DE AD 00");
+    EXPECT_EQ(Flattened(Num<int8_t>(kCFNumberCharType, -2).get()),
+              "00 00 00 16 00 00 00 07 00 00 00 01 FE");
+    EXPECT_EQ(Flattened(Num<int16_t>(kCFNumberShortType, 0x1234).get()),
+              "00 00 00 16 00 00 00 08 00 00 00 02 12 34");
+    EXPECT_EQ(Flattened(Num<int64_t>(kCFNumberLongType, -1).get()),
+              "00 00 00 16 00 00 00 0A 00 00 00 08 FF FF FF FF FF FF FF FF");
+    EXPECT_EQ(Flattened(Num<float>(kCFNumberFloat32Type, 1.5f).get()),
+              "00 00 00 16 00 00 00 05 00 00 00 04 3F C0 00 00");
+    const CFUUIDBytes uuidBytes = {0, 1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11, 12, 13, 14, 15};
+    Ref uuid(CFUUIDCreateFromUUIDBytes(nullptr, uuidBytes));
+    EXPECT_EQ(Flattened(uuid.get()),
+              "00 00 01 02 00 00 00 10 00 01 02 03 04 05 06 07 08 09 0A 0B 0C 0D 0E 0F");
+}
+
+TEST(FlattenKinds, WritesErrorsWithTheCodeCutTo32BitsAndWithoutUserInfo) {
+    Ref domain = Str("D");
+    Ref info = Dict({{domain.get(), kCFBooleanTrue}});
+    Ref error(CFErrorCreate(nullptr, domain.as<CFStringRef>(), 0x100000002L,
+                            info.as<CFDictionaryRef>()));
+    EXPECT_EQ(Flattened(error.get()), "00 00 01 04 00 00 00 02 00 00 00 07 00 00 00 01 44");
+}
+
+TEST(FlattenKinds, WritesRelativeURLsAsTheirAbsoluteForm) {
+    Ref base(CFURLCreateWithString(nullptr, CFSTR("http://h/a/b"), nullptr));
+    Ref url(CFURLCreateWithString(nullptr, CFSTR("c?q"), base.as<CFURLRef>()));
+    EXPECT_EQ(Flattened(url.get()),
+              "00 00 01 01 00 00 00 0E 68 74 74 70 3A 2F 2F 68 2F 61 2F 63 3F 71");
+    Ref empty(CFURLCreateWithBytes(nullptr, nullptr, 0, kCFStringEncodingUTF8, nullptr));
+    ASSERT_TRUE(empty);
+    EXPECT_EQ(Flattened(empty.get()), "00 00 01 01 00 00 00 00");
+}
+
+TEST(FlattenKinds, WritesCharacterSetsThroughTheCodec) {
+    Ref none(CFCharacterSetCreateMutable(nullptr));
+    // The empty BMP bitmap compresses to 12 bytes: format 0, length 8192, literal 0, fill 4096.
+    EXPECT_EQ(Flattened(none.get()),
+              "00 00 00 1B 00 00 00 0C 00 00 00 00 00 20 00 00 00 00 00 10");
+}
+
+TEST(FlattenContainers, WritesEmptyContainersAsTypeAndZeroCount) {
+    EXPECT_EQ(Flattened(Array({}).get()), "00 00 00 11 00 00 00 00");
+    EXPECT_EQ(Flattened(Set({}).get()), "00 00 01 00 00 00 00 00");
+}
+
+TEST(FlattenContainers, WritesElementsDepthFirstInOrder) {
+    Ref a = Str("a");
+    Ref inner = Array({kCFBooleanFalse});
+    EXPECT_EQ(Flattened(Array({a.get(), inner.get(), kCFBooleanTrue}).get()),
+              "00 00 00 11 00 00 00 03 00 00 00 07 00 00 00 01 61 00 00 00 11 00 00 00 01 00 00 "
+              "01 03 00 00 00 01 00 00 00 01 03 00 00 00 01 01");
+}
+
+TEST(FlattenStrings, AcceptsExactlyTheLengthLimit) {
+    LogCapture log;
+    const std::string atLimit = Repeat("x", 0x100000);
+    Ref buffer(CFDataCreateMutable(nullptr, 0));
+    {
+        TCFFlattenContext context(const_cast<__CFData*>(buffer.as<CFDataRef>()), false);
+        context.Flatten(Str(atLimit).get());
+    }
+    EXPECT_EQ(CFDataGetLength(buffer.as<CFDataRef>()), 8 + 0x100000);
+    EXPECT_EQ(ToHex(CFDataGetBytePtr(buffer.as<CFDataRef>()), 8), "00 00 00 07 00 10 00 00");
+    EXPECT_TRUE(log.Texts().empty());
+}
+
+TEST(FlattenStrings, WritesOverlongTextAsEmptyAndLogsOnce) {
+    LogCapture log;
+    EXPECT_EQ(Flattened(Str(Repeat("x", 0x100001)).get()), "00 00 00 07 00 00 00 00");
+    ASSERT_EQ(log.Lines().size(), 1u);
+    EXPECT_EQ(log.Lines()[0].text, "ERROR: Quzel::TCFFlattenContext::FlattenCFString failed.");
+    EXPECT_EQ(log.Lines()[0].channel, glyphwell::LogChannel::System);
+    EXPECT_EQ(log.Lines()[0].level, 3);
+}
+
+TEST(FlattenStrings, CountsAstralCharactersAsTwoUnitsButFourBytes) {
+    EXPECT_EQ(Flattened(Str("\xF0\x9F\x98\x80").get()), "00 00 00 07 00 00 00 04 F0 9F 98 80");
+    // 0x40000 astral characters: 0x80000 units and exactly 0x100000 bytes, the most a reader
+    // takes.
+    const std::string astral = Repeat("\xF0\x9F\x98\x80", 0x40000);
+    Ref buffer(CFDataCreateMutable(nullptr, 0));
+    {
+        TCFFlattenContext context(const_cast<__CFData*>(buffer.as<CFDataRef>()), false);
+        context.Flatten(Str(astral).get());
+    }
+    EXPECT_EQ(CFDataGetLength(buffer.as<CFDataRef>()), 8 + 0x100000);
+}
+
+TEST(FlattenStrings, WritesTextTheReaderWouldRefuseAsEmpty) {
+    // Within the unit limit, but one byte more than a reader accepts: writing it would make the
+    // rest of the stream unreadable.
+    LogCapture log;
+    EXPECT_EQ(Flattened(Str(Repeat("\xF0\x9F\x98\x80", 0x40000) + "x").get()),
+              "00 00 00 07 00 00 00 00");
+    EXPECT_EQ(Flattened(Str(Repeat("\xC3\xA9", 0x100000)).get()), "00 00 00 07 00 00 00 00");
+    EXPECT_EQ(log.Texts(),
+              (std::vector<std::string>{"ERROR: Quzel::TCFFlattenContext::FlattenCFString failed.",
+                                        "ERROR: Quzel::TCFFlattenContext::FlattenCFString failed."}));
+}
+
+TEST(FlattenURLs, WritesURLsTheReaderWouldRefuseAsEmpty) {
+    LogCapture log;
+    const std::string text = "http://h/" + Repeat("a", 0x100000);
+    Ref url(CFURLCreateWithBytes(nullptr, reinterpret_cast<const UInt8*>(text.data()),
+                                 CFIndex(text.size()), kCFStringEncodingUTF8, nullptr));
+    ASSERT_TRUE(url);
+    EXPECT_EQ(Flattened(url.get()), "00 00 01 01 00 00 00 00");
+    EXPECT_EQ(log.Texts(),
+              std::vector<std::string>{"ERROR: Quzel::TCFFlattenContext::FlattenCFURL failed."});
+}
+
+TEST(FlattenStrings, WritesUnconvertibleTextAsEmptyAndGoesOn) {
+    LogCapture log;
+    const UniChar lone[] = {0xD800};
+    Ref broken(CFStringCreateWithCharacters(nullptr, lone, 1));
+    EXPECT_EQ(Flattened(Array({broken.get(), kCFBooleanTrue}).get()),
+              "00 00 00 11 00 00 00 02 00 00 00 07 00 00 00 00 00 00 01 03 00 00 00 01 01");
+    EXPECT_EQ(log.Texts(),
+              std::vector<std::string>{"ERROR: Quzel::TCFFlattenContext::FlattenCFString failed."});
+}
+
+TEST(FlattenFailure, UnsupportedValueEmptiesOnlyWhatTheContextWrote) {
+    LogCapture log;
+    Ref date(CFDateCreate(nullptr, 0));
+    Ref buffer(CFDataCreateMutable(nullptr, 0));
+    const UInt8 prefix[] = {0xAA, 0xBB};
+    CFDataAppendBytes(const_cast<__CFData*>(buffer.as<CFDataRef>()), prefix, 2);
+    {
+        TCFFlattenContext context(const_cast<__CFData*>(buffer.as<CFDataRef>()), false);
+        context.Flatten(Array({kCFBooleanTrue, date.get(), kCFBooleanFalse}).get());
+        EXPECT_EQ(context.GetLength(), 2);
+        context.Flatten(kCFBooleanTrue); // ignored once the job failed
+    }
+    EXPECT_EQ(ToHex(buffer.as<CFDataRef>()), "AA BB");
+    ASSERT_EQ(log.Texts().size(), 1u);
+    const std::string line = log.Texts()[0];
+    const std::string expectedStart =
+        "*** don't know how to flatten type " + std::to_string(CFDateGetTypeID()) + " (object ";
+    EXPECT_EQ(line.substr(0, expectedStart.size()), expectedStart);
+    EXPECT_EQ(line.back(), ')');
+}
+
+TEST(FlattenFailure, NullValueWritesNothing) {
+    EXPECT_EQ(Flattened(nullptr), "");
+}
+
+TEST(FlattenContext, AdoptsOrRetainsTheBuffer) {
+    CFMutableDataRef buffer = CFDataCreateMutable(nullptr, 0);
+    {
+        TCFFlattenContext context(buffer, false);
+        EXPECT_EQ(CFGetRetainCount(buffer), 2);
+        EXPECT_EQ(context.GetStream(), buffer);
+    }
+    EXPECT_EQ(CFGetRetainCount(buffer), 1);
+    CFRetain(buffer);
+    { TCFFlattenContext context(buffer, true); }
+    EXPECT_EQ(CFGetRetainCount(buffer), 1);
+    CFRelease(buffer);
+}
+
+namespace {
+/// Sees every nested string: the per-kind writers must reach it through the virtual table.
+class StringCountingContext : public TCFFlattenContext {
+public:
+    using TCFFlattenContext::TCFFlattenContext;
+    int strings = 0;
+    void FlattenCFString(__CFString const* string) override {
+        ++strings;
+        TCFFlattenContext::FlattenCFString(string);
+    }
+};
+} // namespace
+
+TEST(FlattenContext, NestedValuesGoThroughTheVirtualWriters) {
+    Ref a = Str("a"), b = Str("b"), domain = Str("d");
+    Ref error(CFErrorCreate(nullptr, domain.as<CFStringRef>(), 1, nullptr));
+    Ref value = Dict({{a.get(), Array({b.get(), error.get()}).get()}});
+    Ref buffer(CFDataCreateMutable(nullptr, 0));
+    StringCountingContext context(const_cast<__CFData*>(buffer.as<CFDataRef>()), false);
+    context.Flatten(value.get());
+    EXPECT_EQ(context.strings, 3);
+}
+
+TEST(FlattenEstimates, MatchTheBytesWrittenExceptForStringsAndCharacterSets) {
+    Ref a = Str("a");
+    const UInt8 bytes[] = {1, 2, 3};
+    Ref data(CFDataCreate(nullptr, bytes, 3));
+    Ref url(CFURLCreateWithString(nullptr, CFSTR("file:///x"), nullptr));
+    const CFUUIDBytes uuidBytes = {};
+    Ref uuid(CFUUIDCreateFromUUIDBytes(nullptr, uuidBytes));
+    Ref value = Dict({{a.get(), Array({data.get(), url.get(), uuid.get(), kCFBooleanTrue,
+                                       Num<int32_t>(kCFNumberSInt32Type, 5).get()})
+                                    .get()}});
+    // The key's estimate is 3 bytes per unit + 8 = 11, 2 more than it takes.
+    const std::string written = Flattened(value.get());
+    const CFIndex writtenLength = CFIndex((written.size() + 1) / 3);
+    EXPECT_EQ(TCFFlattenContext::EstimateSize(value.get()), writtenLength + 2);
+    EXPECT_EQ(TCFFlattenContext::EstimateSize(nullptr), 0);
+    Ref date(CFDateCreate(nullptr, 0));
+    EXPECT_EQ(TCFFlattenContext::EstimateSize(date.get()), 0);
+
+    Ref set(CFCharacterSetCreateWithCharactersInRange(nullptr, CFRangeMake(0x1F600, 2)));
+    EXPECT_EQ(TCFFlattenContext::EstimateSize(set.get()), 8200 + 8193);
+}
+
+TEST(FlattenPrimitives, ConvertToBigEndianSwapsOnlyTwoFourAndEightBytes) {
+    uint8_t two[] = {1, 2}, three[] = {1, 2, 3}, eight[] = {1, 2, 3, 4, 5, 6, 7, 8};
+    EXPECT_EQ(ConvertToBigEndian(two, 2), two);
+    EXPECT_EQ(ToHex(two, 2), "02 01");
+    ConvertToBigEndian(three, 3);
+    EXPECT_EQ(ToHex(three, 3), "01 02 03");
+    ConvertToBigEndian(eight, 8);
+    EXPECT_EQ(ToHex(eight, 8), "08 07 06 05 04 03 02 01");
+}
+
+TEST(FlattenPrimitives, StreamOutSwapsEachElementAndLeavesTheSourceAlone) {
+    Ref buffer(CFDataCreateMutable(nullptr, 0));
+    TCFFlattenContext context(const_cast<__CFData*>(buffer.as<CFDataRef>()), false);
+    const uint16_t values[] = {0x0102, 0x0304};
+    context.StreamOut(values, 2, 2);
+    context.StreamOutCFIndex(-2L);
+    context.StreamOutCFIndex(0x1FFFFFFFFL);
+    EXPECT_EQ(ToHex(buffer.as<CFDataRef>()), "01 02 03 04 FF FF FF FE FF FF FF FF");
+    EXPECT_EQ(values[0], 0x0102);
+}

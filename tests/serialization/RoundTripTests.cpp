@@ -1,0 +1,244 @@
+// Every value the writer writes reads back equal: generated trees of every kind.
+#include <gtest/gtest.h>
+
+#include <random>
+#include <string>
+#include <vector>
+
+#include "serialization/TCFFlattenContext.h"
+#include "serialization/TCFResurrectContext.h"
+#include "support/LogCapture.h"
+#include "support/Values.h"
+
+using namespace glyphwell::testing;
+
+namespace {
+
+class ValueGenerator {
+public:
+    explicit ValueGenerator(unsigned seed) : random_(seed) {}
+
+    Ref Any(int depth) {
+        const int kinds = depth > 0 ? 14 : 11;
+        switch (Below(kinds)) {
+        case 0: return Text();
+        case 1: return Number();
+        case 2: return Ref(CFRetain(Below(2) ? kCFBooleanTrue : kCFBooleanFalse));
+        case 3: return Data();
+        case 4: return CharacterSet();
+        case 5: return URL();
+        case 6: return UUID();
+        case 7: return Error();
+        case 8: return Text();
+        case 9: return Number();
+        case 10: return Data();
+        case 11: return Array(depth - 1);
+        case 12: return SetOf(depth - 1);
+        default: return Dictionary(depth - 1);
+        }
+    }
+
+    Ref Text() {
+        static const char* const pieces[] = {"a", "Zz", " ", "\xC3\xA9", "\xE6\x97\xA5",
+                                             "\xF0\x9F\x98\x80", "\xF4\x8F\xBF\xBF", "\xEF\xBF\xBD",
+                                             "~", "\x7F"};
+        std::string text;
+        for (int i = Below(12); i > 0; --i)
+            text += pieces[Below(10)];
+        return Str(text);
+    }
+
+    Ref Number() {
+        const CFNumberType type = 1 + Below(16);
+        const int64_t integer = int64_t(random_()) << 32 ^ int64_t(random_());
+        const double real = std::ldexp(double(int64_t(random_())) - 2147483648.0, Below(80) - 40);
+        switch (CFNumberTypeByteSize(type) * 10 + (IsFloat(type) ? 1 : 0)) {
+        case 10: return Num<int8_t>(type, int8_t(integer));
+        case 20: return Num<int16_t>(type, int16_t(integer));
+        case 40: return Num<int32_t>(type, int32_t(integer));
+        case 41: return Num<float>(type, float(real));
+        case 81: return Num<double>(type, real);
+        default: return Num<int64_t>(type, integer);
+        }
+    }
+
+    Ref Data() {
+        std::vector<UInt8> bytes(size_t(Below(40)));
+        for (UInt8& b : bytes)
+            b = UInt8(random_());
+        return Ref(CFDataCreate(nullptr, bytes.data(), CFIndex(bytes.size())));
+    }
+
+    Ref CharacterSet() {
+        Ref set(CFCharacterSetCreateMutable(nullptr));
+        for (int i = Below(6); i > 0; --i) {
+            const CFIndex plane = Below(3) ? 0 : Below(17);
+            CFCharacterSetAddCharactersInRange(
+                const_cast<__CFCharacterSet*>(set.as<CFCharacterSetRef>()),
+                CFRangeMake(plane * 0x10000 + Below(0x10000), 1 + Below(300)));
+        }
+        return set;
+    }
+
+    Ref URL() {
+        static const char* const urls[] = {"file:///tmp/a%20b.ttf", "https://example.org/f?q=1#x",
+                                           "mailto:a@b", "", "urn:x:y"};
+        const std::string text = urls[Below(5)];
+        return Ref(CFURLCreateWithBytes(nullptr, reinterpret_cast<const UInt8*>(text.data()),
+                                        CFIndex(text.size()), kCFStringEncodingUTF8, nullptr));
+    }
+
+    Ref UUID() {
+        CFUUIDBytes bytes;
+        for (UInt8* b = &bytes.byte0; b <= &bytes.byte15; ++b)
+            *b = UInt8(random_());
+        return Ref(CFUUIDCreateFromUUIDBytes(nullptr, bytes));
+    }
+
+    Ref Error() {
+        Ref domain = Str(Below(2) ? "NSPOSIXErrorDomain" : "example.domain");
+        return Ref(CFErrorCreate(nullptr, domain.as<CFStringRef>(), int32_t(random_()), nullptr));
+    }
+
+    Ref Array(int depth) {
+        std::vector<Ref> items = Items(depth);
+        std::vector<const void*> values;
+        for (const Ref& item : items)
+            values.push_back(item.get());
+        return Ref(CFArrayCreate(nullptr, values.data(), CFIndex(values.size()),
+                                 &kCFTypeArrayCallBacks));
+    }
+
+    Ref SetOf(int depth) {
+        std::vector<Ref> items = Items(depth);
+        std::vector<const void*> values;
+        for (const Ref& item : items)
+            values.push_back(item.get());
+        return Ref(CFSetCreate(nullptr, values.data(), CFIndex(values.size()), &kCFTypeSetCallBacks));
+    }
+
+    Ref Dictionary(int depth) {
+        std::vector<Ref> keys = Items(0), values;
+        std::vector<const void*> k, v;
+        for (const Ref& key : keys) {
+            values.push_back(Any(depth));
+            k.push_back(key.get());
+            v.push_back(values.back().get());
+        }
+        return Ref(CFDictionaryCreate(nullptr, k.data(), v.data(), CFIndex(k.size()),
+                                      &kCFTypeDictionaryKeyCallBacks,
+                                      &kCFTypeDictionaryValueCallBacks));
+    }
+
+private:
+    std::vector<Ref> Items(int depth) {
+        std::vector<Ref> items;
+        for (int i = Below(6); i > 0; --i)
+            items.push_back(Any(depth));
+        return items;
+    }
+    static bool IsFloat(CFNumberType type) {
+        return type == 5 || type == 6 || type == 12 || type == 13 || type == 16;
+    }
+    int Below(int n) { return int(random_() % unsigned(n)); }
+
+    std::mt19937 random_;
+};
+
+std::vector<uint8_t> Flatten(CFTypeRef value) {
+    Ref buffer(CFDataCreateMutable(nullptr, 0));
+    {
+        TCFFlattenContext context(const_cast<__CFData*>(buffer.as<CFDataRef>()), false);
+        context.Flatten(value);
+    }
+    const UInt8* bytes = CFDataGetBytePtr(buffer.as<CFDataRef>());
+    return std::vector<uint8_t>(bytes, bytes + CFDataGetLength(buffer.as<CFDataRef>()));
+}
+
+Ref ReadBack(const std::vector<uint8_t>& bytes) {
+    TCFResurrectContext context(bytes.data(), bytes.size());
+    Ref value(context.Resurrect(kTCFTypeAny));
+    EXPECT_FALSE(context.IsCorrupted());
+    return value;
+}
+
+/// Same kinds, same number type codes, and CFEqual throughout (CFEqual alone lets numbers of
+/// different codes match).
+bool SameNumberCodes(CFTypeRef a, CFTypeRef b) {
+    if (CFGetTypeID(a) == CFNumberGetTypeID())
+        return CFNumberGetType(static_cast<CFNumberRef>(a)) ==
+               CFNumberGetType(static_cast<CFNumberRef>(b));
+    if (CFGetTypeID(a) == CFArrayGetTypeID()) {
+        for (CFIndex i = 0; i < CFArrayGetCount(static_cast<CFArrayRef>(a)); ++i)
+            if (!SameNumberCodes(CFArrayGetValueAtIndex(static_cast<CFArrayRef>(a), i),
+                                 CFArrayGetValueAtIndex(static_cast<CFArrayRef>(b), i)))
+                return false;
+    }
+    return true;
+}
+
+} // namespace
+
+TEST(RoundTrip, GeneratedTreesOfEveryKindReadBackEqual) {
+    LogCapture log;
+    ValueGenerator generator(20261206);
+    for (int i = 0; i < 400; ++i) {
+        Ref value = generator.Any(4);
+        Ref back = ReadBack(Flatten(value.get()));
+        ASSERT_TRUE(back) << "tree " << i << ": " << glyphwell::Describe(value.get());
+        EXPECT_TRUE(CFEqual(back.get(), value.get()))
+            << "tree " << i << ": " << glyphwell::Describe(value.get()) << "\nread back as "
+            << glyphwell::Describe(back.get());
+        EXPECT_TRUE(SameNumberCodes(value.get(), back.get()));
+    }
+    EXPECT_TRUE(log.Texts().empty());
+}
+
+TEST(RoundTrip, WideContainersAndTextsAtTheLimits) {
+    ValueGenerator generator(7);
+    std::vector<Ref> items;
+    std::vector<const void*> values;
+    for (int i = 0; i < 100000; ++i) {
+        items.push_back(i % 2 ? generator.Number() : generator.Text());
+        values.push_back(items.back().get());
+    }
+    Ref wide(CFArrayCreate(nullptr, values.data(), CFIndex(values.size()), &kCFTypeArrayCallBacks));
+    EXPECT_TRUE(CFEqual(ReadBack(Flatten(wide.get())).get(), wide.get()));
+
+    for (const std::string& text : {std::string(0x100000, 'x'),
+                                    [] {
+                                        std::string s;
+                                        for (int i = 0; i < 0x80000; ++i)
+                                            s += "\xC3\xA9";
+                                        return s;
+                                    }(),
+                                    [] {
+                                        std::string s;
+                                        for (int i = 0; i < 0x40000; ++i)
+                                            s += "\xF0\x9F\x98\x80";
+                                        return s;
+                                    }()}) {
+        Ref string = Str(text);
+        EXPECT_TRUE(CFEqual(ReadBack(Flatten(string.get())).get(), string.get()));
+    }
+}
+
+TEST(RoundTrip, CharacterSetsWithEveryPlane) {
+    Ref set(CFCharacterSetCreateMutable(nullptr));
+    for (CFIndex plane = 0; plane <= 16; ++plane)
+        CFCharacterSetAddCharactersInRange(const_cast<__CFCharacterSet*>(set.as<CFCharacterSetRef>()),
+                                           CFRangeMake(plane * 0x10000 + plane * 97, 1 + plane));
+    Ref back = ReadBack(Flatten(set.get()));
+    EXPECT_TRUE(CFEqual(back.get(), set.get()));
+    EXPECT_TRUE(CFCharacterSetIsLongCharacterMember(back.as<CFCharacterSetRef>(), 0x10000 * 16 + 16 * 97));
+}
+
+TEST(RoundTrip, DeepestAcceptedNestingReadsAndReleases) {
+    Ref value(CFArrayCreate(nullptr, nullptr, 0, &kCFTypeArrayCallBacks));
+    for (unsigned i = 1; i < TCFResurrectContext::kMaxNestingDepth; ++i) {
+        const void* inner = value.get();
+        value = Ref(CFArrayCreate(nullptr, &inner, 1, &kCFTypeArrayCallBacks));
+    }
+    Ref back = ReadBack(Flatten(value.get()));
+    EXPECT_TRUE(CFEqual(back.get(), value.get()));
+}

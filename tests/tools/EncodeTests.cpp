@@ -1,0 +1,136 @@
+#include <gtest/gtest.h>
+
+#include <cstdio>
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+
+#include "tools/Base64.h"
+#include "tools/Commands.h"
+
+namespace {
+
+struct Result {
+    int status;
+    std::string out;
+    std::string err;
+};
+
+Result Encode(const std::string& input, std::vector<std::string> arguments = {"--hex"}) {
+    arguments.insert(arguments.begin(), "encode");
+    std::istringstream in(input);
+    std::ostringstream out, err;
+    const int status = glyphwell::tools::RunTool(arguments, in, out, err);
+    return {status, out.str(), err.str()};
+}
+
+} // namespace
+
+TEST(EncodeCommand, PrintsTheDocumentedBytesAsHex) {
+    EXPECT_EQ(Encode("\"abc\"").out, "00 00 00 07 00 00 00 03 61 62 63\n");
+    EXPECT_EQ(Encode("{}").out, "00 00 00 10 00 00 00 00\n");
+    EXPECT_EQ(Encode("true").out, "00 00 01 03 00 00 00 01 01\n");
+    EXPECT_EQ(Encode(R"({"$number": 1, "$type": 3})").out,
+              "00 00 00 16 00 00 00 03 00 00 00 04 00 00 00 01\n");
+    EXPECT_EQ(Encode(R"({"$number": 1.0, "$type": 6})").out,
+              "00 00 00 16 00 00 00 06 00 00 00 08 3F F0 00 00 00 00 00 00\n");
+    EXPECT_EQ(Encode(R"({"a": true})").out,
+              "00 00 00 10 00 00 00 01 00 00 00 07 00 00 00 01 61 00 00 01 03 00 00 00 01 01\n");
+}
+
+TEST(EncodeCommand, MapsPlainAndTaggedJSONToTheirKinds) {
+    EXPECT_EQ(Encode("7").out, "00 00 00 16 00 00 00 0A 00 00 00 08 00 00 00 00 00 00 00 07\n");
+    EXPECT_EQ(Encode("0.5").out, "00 00 00 16 00 00 00 0D 00 00 00 08 3F E0 00 00 00 00 00 00\n");
+    EXPECT_EQ(Encode("[false]").out, "00 00 00 11 00 00 00 01 00 00 01 03 00 00 00 01 00\n");
+    EXPECT_EQ(Encode(R"({"$array": []})").out, "00 00 00 11 00 00 00 00\n");
+    EXPECT_EQ(Encode(R"({"$set": [true]})").out, "00 00 01 00 00 00 00 01 00 00 01 03 00 00 00 01 01\n");
+    EXPECT_EQ(Encode(R"({"$data": "3q0="})").out, "00 00 00 12 00 00 00 02 DE AD\n");
+    EXPECT_EQ(Encode(R"({"$url": "file:///a"})").out,
+              "00 00 01 01 00 00 00 09 66 69 6C 65 3A 2F 2F 2F 61\n");
+    EXPECT_EQ(Encode(R"({"$uuid": "00010203-0405-0607-0809-0a0b0c0d0e0f"})").out,
+              "00 00 01 02 00 00 00 10 00 01 02 03 04 05 06 07 08 09 0A 0B 0C 0D 0E 0F\n");
+    EXPECT_EQ(Encode(R"({"$error": {"domain": "D", "code": 5}})").out,
+              "00 00 01 04 00 00 00 05 00 00 00 07 00 00 00 01 44\n");
+    EXPECT_EQ(Encode(R"({"$dict": [[1, "x"]]})").out,
+              "00 00 00 10 00 00 00 01 00 00 00 16 00 00 00 0A 00 00 00 08 00 00 00 00 00 00 00 "
+              "01 00 00 00 07 00 00 00 01 78\n");
+    EXPECT_EQ(Encode(R"({"$number": -1, "$type": 7})").out, "00 00 00 16 00 00 00 07 00 00 00 01 FF\n");
+    // A set of just U+0000 is a BMP bitmap whose first word is 0x0001: literal 1, fill 4095.
+    EXPECT_EQ(Encode(R"({"$charset": [[0, 0]]})").out,
+              "00 00 00 1B 00 00 00 0E 00 00 00 00 00 20 00 00 01 00 01 00 FF 0F\n");
+}
+
+TEST(EncodeCommand, WritesRawBytesToAFile) {
+    const std::filesystem::path path =
+        std::filesystem::temp_directory_path() / ("glyphwell-encode-" + std::to_string(getpid()));
+    const Result result = Encode("\"abc\"", {"-o", path.string()});
+    EXPECT_EQ(result.status, 0);
+    EXPECT_EQ(result.out, "");
+    std::ifstream file(path, std::ios::binary);
+    const std::string bytes((std::istreambuf_iterator<char>(file)), std::istreambuf_iterator<char>());
+    EXPECT_EQ(bytes, std::string("\0\0\0\x07\0\0\0\x03" "abc", 11));
+    std::filesystem::remove(path);
+}
+
+TEST(EncodeCommand, RejectsBadInputWithThePlaceAndNoOutput) {
+    struct Case {
+        const char* input;
+        const char* message;
+    } cases[] = {
+        {"{\"a\": [1,\n  2,,]}", "<stdin>:2:5: malformed JSON"},
+        {"", "<stdin>:1:1: malformed JSON"},
+        {R"({"a": [1, {"$bogus": 1}]})", "at /a/1: unknown tag \"$bogus\""},
+        {R"({"$number": 1, "$type": 17})", "at /$type: number type code must be an integer from 1 to 16"},
+        {R"({"$number": 1, "$type": 0})", "at /$type: number type code"},
+        {R"({"$number": 300, "$type": 1})", "at /$number: value out of range for type 1"},
+        {R"({"$number": 1.5, "$type": 3})", "at /$number: type 3 needs an integer value"},
+        {R"({"$data": "not base64!"})", "at /$data: \"$data\" must be a base64 string"},
+        {R"({"$uuid": "1234"})", "at /$uuid: \"$uuid\" must be a string"},
+        {R"({"$charset": [[5, 1]]})", "at /$charset/0: a range is [first, last]"},
+        {R"({"k": null})", "at /k: null has no property value"},
+        {R"({"$url": "http://exa mple/"})", "at /$url: not a URL"},
+        {R"({"$dict": [[1]]})", "at /$dict/0: a \"$dict\" entry is a [key, value] pair"},
+        {R"({"$error": {"domain": "D"}})", "at /$error: \"$error\" must be"},
+        {R"({"a/b": {"~": null}})", "at /a~1b/~0: null"},
+        {"18446744073709551615", "at /: integer out of range"},
+    };
+    for (const Case& c : cases) {
+        const Result result = Encode(c.input);
+        EXPECT_EQ(result.status, 1) << c.input;
+        EXPECT_EQ(result.out, "") << c.input;
+        EXPECT_NE(result.err.find(c.message), std::string::npos)
+            << c.input << " gave: " << result.err;
+    }
+}
+
+TEST(EncodeCommand, RefusesTextTheStreamCannotCarry) {
+    const Result result = Encode("[\"" + std::string(0x100001, 'x') + "\"]");
+    EXPECT_EQ(result.status, 1);
+    EXPECT_EQ(result.out, "");
+    EXPECT_NE(result.err.find("at /0: string longer than 1048576 UTF-8 bytes"), std::string::npos);
+}
+
+TEST(EncodeCommand, ReportsUnknownOptionsAndMissingFiles) {
+    EXPECT_EQ(Encode("{}", {"--bogus"}).status, 2);
+    const Result missing = Encode("", {"/nonexistent/input.json"});
+    EXPECT_EQ(missing.status, 1);
+    EXPECT_NE(missing.err.find("cannot open /nonexistent/input.json"), std::string::npos);
+}
+
+TEST(Base64, RoundTripsAndRejectsNonCanonicalText) {
+    using glyphwell::tools::DecodeBase64;
+    using glyphwell::tools::EncodeBase64;
+    for (size_t length = 0; length < 8; ++length) {
+        std::vector<uint8_t> bytes;
+        for (size_t i = 0; i < length; ++i)
+            bytes.push_back(uint8_t(0xF0 + i * 37));
+        const std::string text = EncodeBase64(bytes.data(), bytes.size());
+        EXPECT_EQ(text.size() % 4, 0u);
+        EXPECT_EQ(DecodeBase64(text), bytes);
+    }
+    EXPECT_EQ(EncodeBase64(reinterpret_cast<const uint8_t*>("foobar"), 6), "Zm9vYmFy");
+    EXPECT_FALSE(DecodeBase64("Zg="));
+    EXPECT_FALSE(DecodeBase64("Zh=="));  // stray bits under the padding
+    EXPECT_FALSE(DecodeBase64("Z=g="));
+    EXPECT_FALSE(DecodeBase64("Zm9v YmFy"));
+}
