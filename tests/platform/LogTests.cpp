@@ -1,0 +1,199 @@
+#include <gtest/gtest.h>
+
+#include <syslog.h>
+
+#include <atomic>
+#include <climits>
+#include <cstddef>
+#include <cstdint>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "platform/CFNumber.h"
+#include "platform/Log.h"
+#include "tests/support/LogCapture.h"
+
+namespace {
+
+using glyphwell::Format;
+using glyphwell::LogChannel;
+using glyphwell::LogRecord;
+using glyphwell::testing::LogCapture;
+
+TEST(Format, MixesConversionsLikePrintf) {
+    EXPECT_EQ(
+        Format("%d|%5.2f|%-4s|%x|%llu|%c|%%", 42, 3.14159, "ab", 255, 18446744073709551615ULL, 'Z'),
+        "42| 3.14|ab  |ff|18446744073709551615|Z|%");
+    EXPECT_EQ(Format("%i %u %o %X", -3, 4000000000U, 8U, 0xabcU), "-3 4000000000 10 ABC");
+}
+
+TEST(Format, LengthModifiersTakeTheMatchingArgumentType) {
+    EXPECT_EQ(Format("%hhd %hhu %hd %hu", 300, 257, 70000, 65537), "44 1 4464 1");
+    EXPECT_EQ(Format("%ld %lu %lld", -7L, 7UL, LLONG_MIN), "-7 7 -9223372036854775808");
+    EXPECT_EQ(Format("%zu %zd %jd %ju %td %tx", SIZE_MAX, ptrdiff_t(-3), INTMAX_MIN, UINTMAX_MAX,
+                     ptrdiff_t(-5), ptrdiff_t(255)),
+              "18446744073709551615 -3 -9223372036854775808 18446744073709551615 -5 ff");
+    EXPECT_EQ(Format("%Lf %Lg %lf", 1.5L, 0.25L, 2.0), "1.500000 0.25 2.000000");
+    EXPECT_EQ(Format("%ls %lc", L"wide", wint_t(L'w')), "wide w");
+}
+
+TEST(Format, FloatingPointConversions) {
+    EXPECT_EQ(
+        Format("%a %A %E %G %e %g %F %f", 1.0, 2.0, 1.5, 0.0001, 12345.678, 1e-5, 2.5, -0.125),
+        "0x1p+0 0X1P+1 1.500000E+00 0.0001 1.234568e+04 1e-05 2.500000 -0.125000");
+}
+
+TEST(Format, FlagsWidthAndPrecisionIncludingStars) {
+    EXPECT_EQ(Format("[%+d][% d][%05d][%#x][%#o][%-6d][%*d][%-*d][%.*s][%.3d][%.*f]", 5, 5, 42, 255,
+                     8U, 7, -4, 3, 4, 3, 2, "xyz", 7, -1, 0.5),
+              "[+5][ 5][00042][0xff][010][7     ][3   ][3   ][xy][007][0.500000]");
+}
+
+TEST(Format, PointersStringsAndLongOutput) {
+    EXPECT_EQ(Format("%p %p", nullptr, reinterpret_cast<void*>(0x1234)), "(nil) 0x1234");
+    EXPECT_EQ(Format("<%s>", static_cast<const char*>(nullptr)), "<(null)>");
+    std::string padded = Format("%300d", 1);
+    EXPECT_EQ(padded, std::string(299, ' ') + "1");
+    std::string long_(1000, 'k');
+    EXPECT_EQ(Format("[%s]", long_.c_str()), "[" + long_ + "]");
+}
+
+TEST(Format, ObjectDirectiveInsertsTheDescription) {
+    double value = 1.5;
+    CFNumberRef number = CFNumberCreate(nullptr, kCFNumberFloat64Type, &value);
+    EXPECT_EQ(Format("n=%@ b=%@ z=%@ d=%d", number, kCFBooleanTrue, nullptr, 9),
+              "n=1.5 b=true z=(null) d=9");
+    EXPECT_EQ(Format("[%6@][%-6@][%.2@]", kCFBooleanTrue, kCFBooleanTrue, kCFBooleanFalse),
+              "[  true][true  ][fa]");
+    CFRelease(number);
+}
+
+TEST(Format, BrokenDirectivesAreCopiedAsTheyStand) {
+    EXPECT_EQ(Format("%y and %1$d and 100%", 5), "%y and %1$d and 100%");
+    EXPECT_EQ(Format("%Ld|%hf|%d", 1, 2), "%Ld|%hf|1");
+    EXPECT_EQ(Format("%99999999999d|%d", 3), "%99999999999d|3");
+    EXPECT_EQ(glyphwell::Format(nullptr), "");
+}
+
+TEST(Format, CountDirectiveWritesNothing) {
+    int count = -1;
+    EXPECT_EQ(Format("a%nb%d", &count, 5), "ab5");
+    EXPECT_EQ(count, -1);
+}
+
+TEST(Describe, NullAndValues) {
+    EXPECT_EQ(glyphwell::Describe(nullptr), "(null)");
+    EXPECT_EQ(glyphwell::Describe(kCFBooleanFalse), "false");
+}
+
+TEST(LogSink, EachChannelReachesTheSinkWithItsLevel) {
+    LogCapture log;
+    double value = 1.5;
+    CFNumberRef number = CFNumberCreate(nullptr, kCFNumberFloat64Type, &value);
+    CFLog(kCFLogLevelError, "value %@", number);
+    glyphwell::SystemLog(LOG_ERR, "sys %d", 1);
+    glyphwell::AppLog("app %s", "x");
+    glyphwell::LogLine(LogChannel::Platform, kCFLogLevelDebug, "plain");
+    CFRelease(number);
+
+    std::vector<LogCapture::Line> lines = log.Lines();
+    ASSERT_EQ(lines.size(), 4u);
+    EXPECT_EQ(lines[0].channel, LogChannel::Platform);
+    EXPECT_EQ(lines[0].level, 3);
+    EXPECT_EQ(lines[0].text, "value 1.5");
+    EXPECT_EQ(lines[1].channel, LogChannel::System);
+    EXPECT_EQ(lines[1].level, 3);
+    EXPECT_EQ(lines[1].text, "sys 1");
+    EXPECT_EQ(lines[2].channel, LogChannel::Application);
+    EXPECT_EQ(lines[2].level, 0);
+    EXPECT_EQ(lines[2].text, "app x");
+    EXPECT_EQ(lines[3].level, 7);
+    EXPECT_EQ(lines[3].text, "plain");
+}
+
+TEST(LogSink, SetReturnsThePreviousSinkAndEmptyRestoresTheDefault) {
+    int first = 0, second = 0;
+    glyphwell::LogSink original = glyphwell::SetLogSink([&first](const LogRecord&) { ++first; });
+    glyphwell::LogSink previous = glyphwell::SetLogSink([&second](const LogRecord&) { ++second; });
+    glyphwell::AppLog("to second");
+    previous(LogRecord{LogChannel::Application, 0, "direct"}); // the first sink came back
+    EXPECT_EQ(first, 1);
+    EXPECT_EQ(second, 1);
+
+    glyphwell::SetLogSink({});
+    ::testing::internal::CaptureStderr();
+    glyphwell::AppLog("to stderr %d", 2);
+    EXPECT_EQ(::testing::internal::GetCapturedStderr(), "to stderr 2\n");
+    EXPECT_EQ(second, 1);
+    glyphwell::SetLogSink(original);
+}
+
+TEST(LogSink, LinesLoggedInsideTheSinkGoToTheDefaultSink) {
+    int calls = 0;
+    glyphwell::LogSink previous = glyphwell::SetLogSink([&calls](const LogRecord& record) {
+        ++calls;
+        glyphwell::AppLog("inner after %s", std::string(record.text).c_str());
+    });
+    ::testing::internal::CaptureStderr();
+    glyphwell::AppLog("outer");
+    EXPECT_EQ(::testing::internal::GetCapturedStderr(), "inner after outer\n");
+    EXPECT_EQ(calls, 1);
+    glyphwell::SetLogSink(previous);
+}
+
+TEST(LogSink, ASinkMayReplaceItselfWhileRunning) {
+    LogCapture log;
+    std::string kept(100, 'k'); // captured by value: freed early if the running sink were freed
+    std::string seen;
+    glyphwell::LogSink outer = glyphwell::SetLogSink([kept, &seen](const LogRecord& record) {
+        glyphwell::SetLogSink({});
+        seen = kept + std::string(record.text);
+    });
+    glyphwell::AppLog("x");
+    EXPECT_EQ(seen, kept + "x");
+    glyphwell::SetLogSink(outer);
+}
+
+TEST(LogSink, LinesFromManyThreadsArriveWhole) {
+    LogCapture log;
+    std::vector<std::thread> threads;
+    for (int t = 0; t < 4; ++t)
+        threads.emplace_back([t] {
+            for (int i = 0; i < 200; ++i)
+                glyphwell::AppLog("thread %d line %d", t, i);
+        });
+    for (std::thread& thread : threads)
+        thread.join();
+    std::vector<std::string> texts = log.Texts();
+    ASSERT_EQ(texts.size(), 800u);
+    for (const std::string& text : texts)
+        EXPECT_EQ(text.rfind("thread ", 0), 0u) << text;
+}
+
+TEST(Assertion, FailureLogsTwoApplicationLines) {
+    LogCapture log;
+    glyphwell::AssertionFailure("x > 0", "Compute", "Sample.cpp", 12);
+    std::vector<LogCapture::Line> lines = log.Lines();
+    ASSERT_EQ(lines.size(), 2u);
+    EXPECT_EQ(lines[0].channel, LogChannel::Application);
+    EXPECT_EQ(lines[0].text, "*** Assertion failure in Compute, Sample.cpp:12");
+    EXPECT_EQ(lines[1].channel, LogChannel::Application);
+    EXPECT_EQ(lines[1].text, "Invalid parameter not satisfying: x > 0");
+}
+
+TEST(Assertion, MacroNamesFunctionFileAndLineAndGoesOn) {
+    LogCapture log;
+    int count = 2;
+    GW_ASSERT(count == 2);
+    EXPECT_TRUE(log.Texts().empty());
+    const int line = __LINE__ + 1;
+    GW_ASSERT(count == 3);
+    std::vector<std::string> texts = log.Texts();
+    ASSERT_EQ(texts.size(), 2u);
+    EXPECT_EQ(texts[0], std::string("*** Assertion failure in TestBody, ") + __FILE__ + ":" +
+                            std::to_string(line));
+    EXPECT_EQ(texts[1], "Invalid parameter not satisfying: count == 3");
+}
+
+} // namespace
