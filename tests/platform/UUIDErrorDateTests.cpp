@@ -1,0 +1,166 @@
+#include <gtest/gtest.h>
+
+#include <cmath>
+#include <cstring>
+#include <string>
+
+#include "platform/CFDate.h"
+#include "platform/CFDictionary.h"
+#include "platform/CFError.h"
+#include "platform/CFNumber.h"
+#include "platform/CFString.h"
+#include "platform/CFUUID.h"
+#include "platform/Log.h"
+
+namespace {
+
+std::string Text(CFStringRef string) {
+    return glyphwell::Describe(string);
+}
+
+// A new UUID parsed from `text` (null when malformed).
+CFUUIDRef Parse(const char* text) {
+    CFStringRef string = CFStringCreateWithCString(nullptr, text, kCFStringEncodingUTF8);
+    CFUUIDRef uuid = CFUUIDCreateFromString(nullptr, string);
+    CFRelease(string);
+    return uuid;
+}
+
+TEST(UUID, BytesGiveTheUpperCaseString) {
+    CFUUIDBytes bytes = {0x01, 0x23, 0x45, 0x67, 0x89, 0xab, 0xcd, 0xef,
+                         0x00, 0x11, 0x22, 0x33, 0x44, 0x55, 0x66, 0xff};
+    CFUUIDRef uuid = CFUUIDCreateFromUUIDBytes(nullptr, bytes);
+    EXPECT_EQ(CFGetTypeID(uuid), CFUUIDGetTypeID());
+    CFStringRef string = CFUUIDCreateString(nullptr, uuid);
+    EXPECT_EQ(Text(string), "01234567-89AB-CDEF-0011-2233445566FF");
+    CFUUIDBytes back = CFUUIDGetUUIDBytes(uuid);
+    EXPECT_EQ(std::memcmp(&back, &bytes, 16), 0);
+    CFRelease(string);
+    CFRelease(uuid);
+}
+
+TEST(UUID, ParsesEitherCaseIntoEqualValues) {
+    CFUUIDRef lower = Parse("0a1b2c3d-4e5f-6071-8293-a4b5c6d7e8f9");
+    CFUUIDRef upper = Parse("0A1B2C3D-4E5F-6071-8293-A4B5C6D7E8F9");
+    ASSERT_NE(lower, nullptr);
+    ASSERT_NE(upper, nullptr);
+    EXPECT_TRUE(CFEqual(lower, upper));
+    EXPECT_EQ(CFHash(lower), CFHash(upper));
+    CFUUIDBytes bytes = CFUUIDGetUUIDBytes(lower);
+    EXPECT_EQ(bytes.byte0, 0x0a);
+    EXPECT_EQ(bytes.byte15, 0xf9);
+    CFRelease(lower);
+    CFRelease(upper);
+}
+
+TEST(UUID, MalformedTextGivesNull) {
+    for (const char* text :
+         {"", "0a1b2c3d-4e5f-6071-8293-a4b5c6d7e8f", "0a1b2c3d-4e5f-6071-8293-a4b5c6d7e8f90",
+          "0a1b2c3d4e5f-6071-8293-a4b5c6d7e8f9-", "0a1b2c3d-4e5f-6071-8293_a4b5c6d7e8f9",
+          "0a1b2c3d-4e5f-6071-8293-a4b5c6d7e8g9", "0a1b2c3d-4e5f-6071-8293-a4b5c6d7e8\xc3\xa9"})
+        EXPECT_EQ(Parse(text), nullptr) << text;
+}
+
+TEST(UUID, CreateMakesDistinctVersion4Values) {
+    CFUUIDRef a = CFUUIDCreate(nullptr);
+    CFUUIDRef b = CFUUIDCreate(nullptr);
+    EXPECT_FALSE(CFEqual(a, b));
+    CFUUIDBytes bytes = CFUUIDGetUUIDBytes(a);
+    EXPECT_EQ(bytes.byte6 >> 4, 4);
+    EXPECT_EQ(bytes.byte8 >> 6, 2);
+    CFRelease(a);
+    CFRelease(b);
+}
+
+// A one-entry dictionary with property-value callbacks.
+CFMutableDictionaryRef Info(CFStringRef key, CFTypeRef value) {
+    CFMutableDictionaryRef info = CFDictionaryCreateMutable(
+        nullptr, 0, &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks);
+    CFDictionarySetValue(info, key, value);
+    return info;
+}
+
+TEST(Error, KeepsDomainCodeAndACopyOfTheUserInfo) {
+    CFMutableDictionaryRef info = Info(kCFErrorLocalizedFailureReasonKey, CFSTR("disk full"));
+    CFErrorRef error = CFErrorCreate(nullptr, kCFErrorDomainPOSIX, 28, info);
+    CFDictionarySetValue(info, kCFErrorLocalizedDescriptionKey, CFSTR("later"));
+
+    EXPECT_EQ(CFGetTypeID(error), CFErrorGetTypeID());
+    EXPECT_TRUE(CFEqual(CFErrorGetDomain(error), kCFErrorDomainPOSIX));
+    EXPECT_EQ(CFErrorGetCode(error), 28);
+    CFDictionaryRef copied = CFErrorCopyUserInfo(error);
+    EXPECT_EQ(CFDictionaryGetCount(copied), 1);
+    EXPECT_TRUE(CFEqual(CFDictionaryGetValue(copied, kCFErrorLocalizedFailureReasonKey),
+                        CFSTR("disk full")));
+    CFRelease(copied);
+    CFRelease(error);
+    CFRelease(info);
+}
+
+TEST(Error, WithoutUserInfoCopiesAnEmptyDictionary) {
+    CFErrorRef error = CFErrorCreate(nullptr, CFSTR("Domain"), -1, nullptr);
+    CFDictionaryRef info = CFErrorCopyUserInfo(error);
+    ASSERT_NE(info, nullptr);
+    EXPECT_EQ(CFDictionaryGetCount(info), 0);
+    CFRelease(info);
+    CFRelease(error);
+    EXPECT_EQ(CFErrorCreate(nullptr, nullptr, 1, nullptr), nullptr);
+}
+
+TEST(Error, EqualityComparesDomainCodeAndUserInfo) {
+    CFMutableDictionaryRef reason = Info(kCFErrorLocalizedFailureReasonKey, CFSTR("why"));
+    CFMutableDictionaryRef empty = CFDictionaryCreateMutable(
+        nullptr, 0, &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks);
+    CFStringRef domain = CFStringCreateWithCString(nullptr, "Domain", kCFStringEncodingUTF8);
+    CFErrorRef plain = CFErrorCreate(nullptr, CFSTR("Domain"), 1, nullptr);
+    CFErrorRef sameDomainCopy = CFErrorCreate(nullptr, domain, 1, empty);
+    CFErrorRef otherCode = CFErrorCreate(nullptr, domain, 2, nullptr);
+    CFErrorRef withReason = CFErrorCreate(nullptr, domain, 1, reason);
+    CFErrorRef withReasonAgain = CFErrorCreate(nullptr, CFSTR("Domain"), 1, reason);
+
+    EXPECT_TRUE(CFEqual(plain, sameDomainCopy)); // no user info and an empty one are the same
+    EXPECT_EQ(CFHash(plain), CFHash(sameDomainCopy));
+    EXPECT_FALSE(CFEqual(plain, otherCode));
+    EXPECT_FALSE(CFEqual(plain, withReason));
+    EXPECT_TRUE(CFEqual(withReason, withReasonAgain));
+    EXPECT_EQ(CFHash(withReason), CFHash(withReasonAgain));
+
+    for (CFTypeRef value :
+         {(CFTypeRef)plain, (CFTypeRef)sameDomainCopy, (CFTypeRef)otherCode, (CFTypeRef)withReason,
+          (CFTypeRef)withReasonAgain, (CFTypeRef)domain, (CFTypeRef)reason, (CFTypeRef)empty})
+        CFRelease(value);
+}
+
+TEST(Date, ComparesByAbsoluteTime) {
+    CFDateRef a = CFDateCreate(nullptr, 12.5);
+    CFDateRef b = CFDateCreate(nullptr, 12.5);
+    CFDateRef c = CFDateCreate(nullptr, 13.0);
+    EXPECT_EQ(CFGetTypeID(a), CFDateGetTypeID());
+    EXPECT_EQ(CFDateGetAbsoluteTime(a), 12.5);
+    EXPECT_TRUE(CFEqual(a, b));
+    EXPECT_EQ(CFHash(a), CFHash(b));
+    EXPECT_FALSE(CFEqual(a, c));
+    CFRelease(a);
+    CFRelease(b);
+    CFRelease(c);
+}
+
+TEST(Date, DescriptionAndCurrentTime) {
+    CFDateRef epoch = CFDateCreate(nullptr, 86400 + 3661);
+    std::string text = glyphwell::Describe(epoch);
+    EXPECT_EQ(text.substr(text.find('>') + 1), " 2001-01-02 01:01:01 +0000");
+    CFRelease(epoch);
+    // 2020-01-01 is 599,616,000 s after the reference date.
+    EXPECT_GT(CFAbsoluteTimeGetCurrent(), 599616000.0);
+}
+
+TEST(Null, IsOneSharedImmortalValue) {
+    EXPECT_EQ(CFGetTypeID(kCFNull), CFNullGetTypeID());
+    EXPECT_NE(CFNullGetTypeID(), CFDateGetTypeID());
+    CFRelease(kCFNull);
+    EXPECT_EQ(CFGetRetainCount(kCFNull), 0x7fffffffffffffffL);
+    EXPECT_TRUE(CFEqual(kCFNull, kCFNull));
+    EXPECT_EQ(glyphwell::Describe(kCFNull), "<null>");
+}
+
+} // namespace
