@@ -1,0 +1,29 @@
+// Fuzz target for the bitmap representation decoder: any input must decode without reading or
+// writing out of bounds, and whatever decodes must survive compression and decoding unchanged.
+#include <cstdint>
+#include <cstdlib>
+#include <cstring>
+
+#include "bitmap/QZBitmapRepresentation.h"
+
+extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
+    CFDataRef decoded = QZCopyUncompressedBitmapRepresentation(data, CFIndex(size));
+    if (!decoded)
+        return 0;
+    const UInt8* bytes = CFDataGetBytePtr(decoded);
+    const CFIndex length = CFDataGetLength(decoded);
+
+    CFDataRef compressed = QZCreateCompressedBitmapRepresentation(bytes, length);
+    if (!compressed)
+        abort();
+    CFDataRef again = QZCopyUncompressedBitmapRepresentation(CFDataGetBytePtr(compressed),
+                                                             CFDataGetLength(compressed));
+    if (!again || CFDataGetLength(again) != length ||
+        std::memcmp(CFDataGetBytePtr(again), bytes, size_t(length)) != 0)
+        abort();
+
+    CFRelease(again);
+    CFRelease(compressed);
+    CFRelease(decoded);
+    return 0;
+}
