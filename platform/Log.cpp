@@ -292,7 +292,9 @@ bool FormatDirective(std::string& out, const char*& p, Arguments& arguments) {
     }
 }
 
-std::string VFormat(const char* format, va_list list) {
+} // namespace
+
+std::string FormatV(const char* format, va_list list) {
     std::string out;
     if (!format)
         return out;
@@ -313,8 +315,6 @@ std::string VFormat(const char* format, va_list list) {
     va_end(arguments.list);
     return out;
 }
-
-} // namespace
 
 LogSink SetLogSink(LogSink sink) {
     SinkState& state = State();
@@ -348,14 +348,10 @@ void LogLine(LogChannel channel, int level, std::string_view text) {
     insideSink = false;
 }
 
-std::string FormatV(const char* format, va_list arguments) {
-    return VFormat(format, arguments);
-}
-
 std::string Format(const char* format, ...) {
     va_list arguments;
     va_start(arguments, format);
-    std::string text = VFormat(format, arguments);
+    std::string text = FormatV(format, arguments);
     va_end(arguments);
     return text;
 }
@@ -363,7 +359,7 @@ std::string Format(const char* format, ...) {
 void SystemLog(int priority, const char* format, ...) {
     va_list arguments;
     va_start(arguments, format);
-    std::string text = VFormat(format, arguments);
+    std::string text = FormatV(format, arguments);
     va_end(arguments);
     LogLine(LogChannel::System, priority, text);
 }
@@ -371,7 +367,7 @@ void SystemLog(int priority, const char* format, ...) {
 void AppLog(const char* format, ...) {
     va_list arguments;
     va_start(arguments, format);
-    std::string text = VFormat(format, arguments);
+    std::string text = FormatV(format, arguments);
     va_end(arguments);
     LogLine(LogChannel::Application, 0, text);
 }

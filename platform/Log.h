@@ -42,6 +42,10 @@ using LogSink = std::function<void(const LogRecord&)>;
 /// Installs `sink` for every later line and returns the previous one. An empty function
 /// restores the default sink. Thread-safe; the sink may be called from any thread, one line at a
 /// time.
+///
+/// NOTE: the sink runs under the logging lock, so once SetLogSink returns no thread is still in
+/// the sink it replaced. A line logged from inside the sink, on its own thread, goes to the
+/// default sink; the sink may call SetLogSink; it must not wait for another thread that logs.
 LogSink SetLogSink(LogSink sink);
 
 /// One line on the system log at `priority` (LOG_ERR, ...); printf-style with "%@".
