@@ -30,6 +30,14 @@ std::string Text(CFStringRef string) {
                                                                                     : "<?>";
 }
 
+// The wrappers cost one reference each (the sorted array adds its comparison and context).
+static_assert(sizeof(TCFAdopted<CFStringRef>) == sizeof(void*));
+static_assert(sizeof(TCFMutableDictionary) == sizeof(void*));
+static_assert(sizeof(TCFMutableArray) == sizeof(void*));
+static_assert(sizeof(TCFLazyMutableArray) == sizeof(void*));
+static_assert(sizeof(TCFSortedArray) == 3 * sizeof(void*));
+static_assert(sizeof(TCFMutableString) == sizeof(void*));
+
 } // namespace
 
 TEST(Retained, RetainingConstructorAddsACountAndAdoptingDoesNot) {
