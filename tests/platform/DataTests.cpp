@@ -128,13 +128,6 @@ TEST_F(MutableDataTest, SetLengthCutsOrGrowsWithZeros) {
     EXPECT_EQ(Bytes(data), std::string("ab\0\0\0\0z", 7));
 }
 
-TEST_F(MutableDataTest, ShrinkingThenGrowingClearsTheOldBytes) {
-    Fill("abcdef");
-    CFDataSetLength(data, 1);
-    CFDataIncreaseLength(data, 3);
-    EXPECT_EQ(Bytes(data), std::string("a\0\0\0", 4));
-}
-
 TEST_F(MutableDataTest, ReplaceBytesGrowsOrShrinksTheRange) {
     Fill("abcdef");
     CFDataReplaceBytes(data, CFRangeMake(1, 2), U("XYZW"), 4);

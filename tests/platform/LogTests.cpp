@@ -82,11 +82,6 @@ TEST(Format, CountDirectiveWritesNothing) {
     EXPECT_EQ(count, -1);
 }
 
-TEST(Describe, NullAndValues) {
-    EXPECT_EQ(glyphwell::Describe(nullptr), "(null)");
-    EXPECT_EQ(glyphwell::Describe(kCFBooleanFalse), "false");
-}
-
 TEST(LogSink, EachChannelReachesTheSinkWithItsLevel) {
     LogCapture log;
     double value = 1.5;
