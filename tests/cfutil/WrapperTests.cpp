@@ -373,13 +373,6 @@ TEST(URLWrapper, RelativePathResolvesAgainstBase) {
     EXPECT_TRUE(file != expected); // still relative to its base
 }
 
-TEST(ErrorWrapper, CreatesErrorWithDomainAndCode) {
-    TCFError error(CFSTR("Domain"), 42, nullptr);
-    ASSERT_NE(static_cast<CFErrorRef>(error), nullptr);
-    EXPECT_EQ(Text(CFErrorGetDomain(error)), "Domain");
-    EXPECT_EQ(CFErrorGetCode(error), 42);
-}
-
 TEST(UTF8Buffer, NullStringGivesNoText) {
     TUTF8Buffer buffer(nullptr);
     EXPECT_EQ(buffer.GetCount(), 0u);
