@@ -1,6 +1,7 @@
 // Segmented data stream: headers are addressed by position and copied in and out of the buffer
 // with memcpy (positions are arbitrary, so headers are unaligned), and every position taken from
-// a header is checked against the buffer before it is used. See QZDataStream.h.
+// a header is checked against the buffer before it is used. The public functions' contracts are
+// in QZDataStream.h.
 #include "datastream/QZDataStream.h"
 
 #include <algorithm>
@@ -100,9 +101,9 @@ QZDataStreamSegment* writeSegmentAtPosition(QZDataStreamRef stream, int64_t posi
     return slot;
 }
 
-/// The current read segment's header when another header fits between its cursor and the end of
-/// its content (and of the buffer): the one QZDataStreamOpenReadSegment and
-/// QZDataStreamSkipReadSegment act on. Null otherwise.
+/// The header at the cursor of `current`, the one QZDataStreamOpenReadSegment and
+/// QZDataStreamSkipReadSegment act on; null unless a whole header fits between the cursor and the
+/// end of `current`'s content (and of the buffer).
 QZDataStreamSegment* nestedReadSegment(QZDataStreamRef stream, QZDataStreamSegment* current) {
     if (!current)
         return nullptr;
@@ -145,13 +146,14 @@ const char* readString(QZDataStreamRef stream, int32_t* length, bool* terminated
 }
 
 /// Appends `n` bytes and then `zeros` zero bytes as one item of the current write segment.
-/// Refused (nothing changed) for bad arguments or when the buffer would exceed INT32_MAX bytes.
-void appendItem(QZDataStreamRef stream, const void* bytes, CFIndex n, CFIndex zeros) {
+/// Refused (false, nothing changed) for bad arguments or when the buffer would exceed INT32_MAX
+/// bytes.
+bool appendItem(QZDataStreamRef stream, const void* bytes, CFIndex n, CFIndex zeros) {
     if (!stream || n < 0 || (n > 0 && !bytes) || n > INT32_MAX)
-        return;
+        return false;
     QZDataStreamSegment* current = writeStack(stream);
     if (!current || bufferLength(stream) + n + zeros > INT32_MAX)
-        return;
+        return false;
     QZDataStreamSegment s = load(current);
     int64_t writeTop = stream->writeTop;
     if (n > 0)
@@ -162,6 +164,7 @@ void appendItem(QZDataStreamRef stream, const void* bytes, CFIndex n, CFIndex ze
     s.length = wrap32(static_cast<int64_t>(s.length) + n + zeros);
     s.count += 1;
     store(segmentAtPosition(stream, writeTop), s); // the buffer may have moved
+    return true;
 }
 
 /// Opens a write segment; false when it was refused.
@@ -184,6 +187,11 @@ bool closeWriteSegment(QZDataStreamRef stream) {
     store(parent, p);
     stream->writeTop = indexOfSegment(stream, parent);
     return true;
+}
+
+/// Appends an empty segment; false when it was refused.
+bool appendEmptySegment(QZDataStreamRef stream) {
+    return stream && openWriteSegment(stream) && closeWriteSegment(stream);
 }
 
 /// Closes the current read segment; false when it was refused (root, or no usable parent).
@@ -404,13 +412,14 @@ void QZDataStreamCloseWriteSegment(QZDataStreamRef stream) {
 }
 
 void QZDataStreamAppendEmptySegment(QZDataStreamRef stream) {
-    if (stream && openWriteSegment(stream))
-        closeWriteSegment(stream);
+    appendEmptySegment(stream);
 }
 
 void QZDataStreamAppendEmptySegments(QZDataStreamRef stream, CFIndex n) {
-    for (CFIndex i = 0; i < n; ++i)
-        QZDataStreamAppendEmptySegment(stream);
+    for (CFIndex i = 0; i < n; ++i) {
+        if (!appendEmptySegment(stream))
+            return; // every later one would be refused too
+    }
 }
 
 QZDataStreamSegment* QZDataStreamCurrentWriteSegment(QZDataStreamRef stream) {
@@ -439,8 +448,10 @@ void QZDataStreamAppendCString(QZDataStreamRef stream, const char* text) {
 }
 
 void QZDataStreamAppendEmptyStrings(QZDataStreamRef stream, CFIndex n) {
-    for (CFIndex i = 0; i < n; ++i)
-        appendItem(stream, nullptr, 0, 1);
+    for (CFIndex i = 0; i < n; ++i) {
+        if (!appendItem(stream, nullptr, 0, 1))
+            return; // every later one would be refused too
+    }
 }
 
 void QZDataStreamClearToStartOfSegment(QZDataStreamRef stream) {

@@ -181,8 +181,8 @@ void QZDataStreamAppendEmptySegments(QZDataStreamRef stream, CFIndex n);
 QZDataStreamSegment* QZDataStreamCurrentWriteSegment(QZDataStreamRef stream);
 
 /// Appends `n` bytes as one item (n = 0 still counts one item). Refused for n < 0, null bytes
-/// with n > 0, or a buffer that would exceed INT32_MAX bytes. `bytes` must not point into this
-/// stream's own buffer.
+/// with n > 0, or a buffer that would exceed INT32_MAX bytes. `bytes` may point into this
+/// stream's own buffer (a string just read, say): the data object copies them before it grows.
 void QZDataStreamAppendBytes(QZDataStreamRef stream, const void* bytes, CFIndex n);
 
 /// Appends the 4 bytes of `value` in host byte order, one item.

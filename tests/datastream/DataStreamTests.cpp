@@ -126,6 +126,16 @@ TEST_F(DataStream, StringReadsBackWithItsLengthAndCounts) {
     EXPECT_EQ(length, 0);
 }
 
+TEST_F(DataStream, StringReadFromTheBufferCanBeAppendedToIt) {
+    QZDataStreamAppendCString(stream, "echo");
+    QZDataStreamResetStream(stream);
+    QZDataStreamAppendCString(stream, QZDataStreamReadCString(stream));
+    ExpectHeader(HeaderAt(stream, 0), 0, 24, 10, 34, -1, 3);
+    const Bytes buffer = BufferOf(stream);
+    EXPECT_EQ(Bytes(buffer.begin() + 24, buffer.end()),
+              (Bytes{'e', 'c', 'h', 'o', 0, 'e', 'c', 'h', 'o', 0}));
+}
+
 TEST_F(DataStream, EmptyStringsAreOneZeroByteAndOneItemEach) {
     QZDataStreamAppendEmptyStrings(stream, 0);
     QZDataStreamAppendEmptyStrings(stream, -2);
