@@ -63,9 +63,12 @@ std::vector<uint8_t> Flatten(CFTypeRef value) {
 } // namespace
 
 TEST(ResurrectEmptyInput, EmptyRangeReportsTypeAndTheUnexpectedTypeLine) {
-    const Read read = Dictionary({});
-    EXPECT_FALSE(read.value);
-    EXPECT_EQ(read.log, (Lines{Corrupt("cftype"), "Quzel encounters an unexpected type. (99999, 16)"}));
+    LogCapture capture;
+    const unsigned char byte = 0;
+    TCFResurrectContext context(&byte, 0);
+    EXPECT_EQ(context.RetrieveCFDictionary(), nullptr);
+    EXPECT_EQ(capture.Texts(),
+              (Lines{Corrupt("cftype"), "Quzel encounters an unexpected type. (99999, 16)"}));
 }
 
 TEST(ResurrectEmptyInput, NullBytesReadNothingAndLogNothing) {

@@ -28,7 +28,7 @@ public:
             CFRelease(value_);
     }
     CFTypeRef get() const { return value_; }
-    template <class T> T as() const { return static_cast<T>(value_); }
+    template <class T> T as() const { return (T)(value_); }
     explicit operator bool() const { return value_ != nullptr; }
 
 private:
