@@ -139,15 +139,20 @@ bool DecodeUTF8(const uint8_t* p, size_t n, std::u16string& out, bool lenient) {
     char16_t* dst = out.data() + start;
     size_t i = 0;
     while (i < n) {
-        while (i + 8 <= n) { // ASCII, eight bytes at a time
-            uint64_t word;
-            std::memcpy(&word, p + i, 8);
-            if (word & 0x8080808080808080ULL)
+        while (i + 16 <= n) { // ASCII in blocks of 16 bytes, widened with vector instructions
+            uint8_t block[16];
+            std::memcpy(block, p + i, sizeof block);
+            uint8_t any = 0;
+            for (uint8_t byte : block)
+                any |= byte;
+            if (any >= 0x80)
                 break;
-            for (int k = 0; k < 8; ++k)
-                dst[k] = p[i + k];
-            dst += 8;
-            i += 8;
+            char16_t wide[16];
+            for (int k = 0; k < 16; ++k)
+                wide[k] = block[k];
+            std::memcpy(dst, wide, sizeof wide);
+            dst += 16;
+            i += 16;
         }
         if (i == n)
             break;
@@ -212,7 +217,7 @@ bool DecodeUTF32(const uint8_t* p, size_t n, bool bigEndian, bool external, std:
 // ---------------------------------------------------------------------------------------------
 // Encoding.
 
-/// UTF-16 to UTF-8 with the CFStringGetBytes rules; ASCII runs are copied four units at a time.
+/// UTF-16 to UTF-8 with the CFStringGetBytes rules; ASCII runs are copied in blocks.
 void EncodeUTF8Counted(std::u16string_view units, uint8_t lossByte, uint8_t* buffer,
                        size_t capacity, EncodeResult& result) {
     const char16_t* src = units.data();
@@ -223,16 +228,20 @@ void EncodeUTF8Counted(std::u16string_view units, uint8_t lossByte, uint8_t* buf
         if (buffer && capacity - pos < run)
             run = capacity - pos;
         size_t k = 0;
-        for (; k + 4 <= run; k += 4) {
-            uint64_t word;
-            std::memcpy(&word, src + i + k, 8);
-            if (word & 0xFF80FF80FF80FF80ULL)
+        // Blocks of 16 units: the fixed-size loops below compile to vector instructions.
+        for (; k + 16 <= run; k += 16) {
+            char16_t block[16];
+            std::memcpy(block, src + i + k, sizeof block);
+            char16_t any = 0;
+            for (char16_t unit : block)
+                any |= unit;
+            if (any >= 0x80)
                 break;
             if (buffer) {
-                buffer[pos + k] = uint8_t(src[i + k]);
-                buffer[pos + k + 1] = uint8_t(src[i + k + 1]);
-                buffer[pos + k + 2] = uint8_t(src[i + k + 2]);
-                buffer[pos + k + 3] = uint8_t(src[i + k + 3]);
+                uint8_t narrow[16];
+                for (int j = 0; j < 16; ++j)
+                    narrow[j] = uint8_t(block[j]);
+                std::memcpy(buffer + pos + k, narrow, sizeof narrow);
             }
         }
         for (; k < run && src[i + k] < 0x80; ++k)
