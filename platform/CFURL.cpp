@@ -651,8 +651,17 @@ CFURLRef CFURLCreateCopyDeletingLastPathComponent(CFAllocatorRef, CFURLRef url) 
 
 CFURLRef CFURLCreateStandardizedURL(CFURLRef url) {
     const __CFURL* object = Get(url);
-    return object ? CreateWithPath(object, RemoveDotSegments(object->Slice(object->parts.path)))
-                  : nullptr;
+    if (!object)
+        return nullptr;
+    std::string path = RemoveDotSegments(object->Slice(object->parts.path));
+    // Without an authority, a path must not start with "//" (it would read as one); without a
+    // scheme either, its first segment must not hold ':' (it would read as a scheme).
+    if (!object->parts.authority.present && path.compare(0, 2, "//") == 0)
+        path.insert(0, "/.");
+    else if (!object->parts.authority.present && !object->parts.scheme.present &&
+             path.find(':') < path.find('/'))
+        path.insert(0, "./");
+    return CreateWithPath(object, path);
 }
 
 CFStringRef CFURLCreateStringByReplacingPercentEscapes(CFAllocatorRef, CFStringRef string,

@@ -246,6 +246,9 @@ TEST(URLEditing, AppendDeleteAndStandardizeWorkOnTheOwnPath) {
     EXPECT_EQ(Bytes(Own(CFURLCreateStandardizedURL(messy.get())).get()), "http://h/a/c/");
     auto up = URL("../x/./../y");
     EXPECT_EQ(Bytes(Own(CFURLCreateStandardizedURL(up.get())).get()), "../y");
+    // Taking out the dots must not turn a path into an authority or a scheme.
+    EXPECT_EQ(Bytes(Own(CFURLCreateStandardizedURL(URL("./a:b").get())).get()), "./a:b");
+    EXPECT_EQ(Bytes(Own(CFURLCreateStandardizedURL(URL("file:/.//x").get())).get()), "file:/.//x");
 }
 
 TEST(URLEscapes, ReplacesEscapesExceptThoseLeftEscaped) {
