@@ -15,7 +15,7 @@ using glyphwell::runtime::CheckRange;
 using glyphwell::runtime::ElementReleaser;
 using glyphwell::runtime::kArrayKind;
 using glyphwell::runtime::ReportInvalidArgument;
-using Where = std::source_location;
+using Where = glyphwell::runtime::SourceLocation;
 
 /// An array: the element pointers in order, each holding the count its retain callback took.
 struct __CFArray final : CFObject {

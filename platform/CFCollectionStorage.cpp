@@ -10,7 +10,7 @@
 namespace glyphwell::runtime {
 
 // The compiler names the function with its whole signature; the log shows only its name.
-void ReportInvalidArgument(const char* condition, const std::source_location& where) {
+void ReportInvalidArgument(const char* condition, const glyphwell::runtime::SourceLocation& where) {
     std::string_view name = where.function_name();
     name = name.substr(0, name.find('('));
     if (size_t space = name.rfind(' '); space != std::string_view::npos)
@@ -18,7 +18,7 @@ void ReportInvalidArgument(const char* condition, const std::source_location& wh
     AssertionFailure(condition, std::string(name).c_str(), where.file_name(), int(where.line()));
 }
 
-bool CheckRange(CFRange range, CFIndex count, const std::source_location& where) {
+bool CheckRange(CFRange range, CFIndex count, const glyphwell::runtime::SourceLocation& where) {
     bool inside = range.location >= 0 && range.length >= 0 && range.location <= count &&
                   range.length <= count - range.location;
     if (!inside)

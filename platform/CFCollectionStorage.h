@@ -9,22 +9,43 @@
 #pragma once
 
 #include <cstddef>
-#include <source_location>
 #include <vector>
 
 #include "platform/CFRuntime.h"
 
 namespace glyphwell::runtime {
 
+/// Where a public function was called from: the part of SourceLocation the checks use,
+/// built on the compiler builtins so that it also works with compilers whose standard library
+/// lacks SourceLocation.
+class SourceLocation {
+public:
+    static constexpr SourceLocation current(const char* function = __builtin_FUNCTION(),
+                                            const char* file = __builtin_FILE(),
+                                            unsigned line = __builtin_LINE()) noexcept {
+        return SourceLocation(function, file, line);
+    }
+    constexpr const char* function_name() const noexcept { return function_; }
+    constexpr const char* file_name() const noexcept { return file_; }
+    constexpr unsigned line() const noexcept { return line_; }
+
+private:
+    constexpr SourceLocation(const char* function, const char* file, unsigned line) noexcept
+        : function_(function), file_(file), line_(line) {}
+    const char* function_;
+    const char* file_;
+    unsigned line_;
+};
+
 /// Reports a failed argument check through the assertion handler, naming the public function
 /// in which it happened.
-void ReportInvalidArgument(const char* condition, const std::source_location& where);
+void ReportInvalidArgument(const char* condition, const SourceLocation& where);
 
 /// The object behind `value` as kind T, or null (reported as `condition`) when `value` is null
 /// or of another kind.
 template <class T>
 T* CheckedObject(const void* value, CFTypeID kind, const char* condition,
-                 const std::source_location& where) {
+                 const SourceLocation& where) {
     T* object = AsMutable<T>(value, kind);
     if (!object)
         ReportInvalidArgument(condition, where);
@@ -32,7 +53,7 @@ T* CheckedObject(const void* value, CFTypeID kind, const char* condition,
 }
 
 /// Whether `range` lies inside a sequence of `count` elements; reported when it does not.
-bool CheckRange(CFRange range, CFIndex count, const std::source_location& where);
+bool CheckRange(CFRange range, CFIndex count, const SourceLocation& where);
 
 /// Gives back a destroyed container's counts on its elements. The first releaser on a thread
 /// calls the release callbacks at once; releasers created while it lives (by the destructors of

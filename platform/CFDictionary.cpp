@@ -15,7 +15,7 @@ using glyphwell::runtime::HashedTable;
 using glyphwell::runtime::kDictionaryKind;
 using glyphwell::runtime::PutMode;
 using glyphwell::runtime::ReportInvalidArgument;
-using Where = std::source_location;
+using Where = glyphwell::runtime::SourceLocation;
 
 /// A dictionary: a hashed table of pairs, each key and value holding the count its retain
 /// callback took.

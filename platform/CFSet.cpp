@@ -14,7 +14,7 @@ using glyphwell::runtime::HashedTable;
 using glyphwell::runtime::kSetKind;
 using glyphwell::runtime::PutMode;
 using glyphwell::runtime::ReportInvalidArgument;
-using Where = std::source_location;
+using Where = glyphwell::runtime::SourceLocation;
 
 /// A set: its members are the keys of a hashed table, each holding the count its retain
 /// callback took.
