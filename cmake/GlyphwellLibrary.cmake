@@ -19,6 +19,8 @@ function(glyphwell_test_suite name folder)
     add_executable(${name} ${sources})
     target_include_directories(${name} PRIVATE ${CMAKE_CURRENT_SOURCE_DIR})
     target_link_libraries(${name} PRIVATE ${ARGN} GTest::gtest GTest::gmock GTest::gtest_main)
+    set_target_properties(${name} PROPERTIES AUTOMOC ON)
+    # Widgets run on Qt's offscreen platform; nothing needs a display.
     gtest_discover_tests(${name} DISCOVERY_TIMEOUT 60
-        PROPERTIES ENVIRONMENT "GLYPHWELL_SOURCE_DIR=${PROJECT_SOURCE_DIR}")
+        PROPERTIES ENVIRONMENT "GLYPHWELL_SOURCE_DIR=${PROJECT_SOURCE_DIR};QT_QPA_PLATFORM=offscreen")
 endfunction()

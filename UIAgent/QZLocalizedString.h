@@ -1,0 +1,18 @@
+// User-visible texts: every text the agent shows goes through QZLocalizedString, which looks the
+// key up in the "Localized" translation table for the user's language; a key without a
+// translation shows as the key itself.
+#pragma once
+
+#include <QString>
+#include <initializer_list>
+
+/// The text for `key` in the user's language, or `key` itself.
+QString QZLocalizedString(const char* key);
+
+/// The text for `key` with its "%@" placeholders (or Qt's %1, %2, ...) filled with `arguments` in
+/// order. A text without placeholders is returned as is.
+QString QZLocalizedFormat(const char* key, std::initializer_list<QString> arguments);
+
+/// Loads the translations for the user's languages (QLocale::uiLanguages()) into the
+/// application; called once by main before any text is shown.
+void QZInstallTranslations();

@@ -1,0 +1,113 @@
+// Message ports: request/reply messaging between processes of one user over a Unix-domain stream
+// socket named after the port.
+//
+// Socket: $XDG_RUNTIME_DIR/<name>; without XDG_RUNTIME_DIR, /tmp/glyphwell-<uid>/<name> in a
+// directory created with mode 0700 and checked to be the user's own (owner, mode, not a symlink).
+// Frames, integers big-endian: request = int32 msgid, uint32 length, length bytes;
+// reply = uint32 length, length bytes. One connection carries any number of requests, one at a
+// time. Frames longer than kMessagePortMaxFrame close the connection.
+//
+// Local ports accept connections only from peers of the same user id (SO_PEERCRED). Creating a
+// local port whose name a live server answers on fails (null); a stale socket file (nothing
+// listening) is removed and the name taken over. When systemd passes a listening socket
+// (LISTEN_PID/LISTEN_FDS), the first local port created in the process serves it instead of
+// binding its own. A local port is served by adding its run-loop source to a run loop (see
+// CFRunLoop.h); its callback then runs on that loop's thread, nested inside any callback that
+// spins a nested loop, so a request arriving while another one waits for the user is answered
+// at once, and first.
+#pragma once
+
+#include <functional>
+#include <memory>
+#include <string>
+
+#include "platform/CFBase.h"
+#include "platform/CFDate.h"
+#include "platform/CFRunLoop.h"
+
+typedef struct __CFMessagePort* CFMessagePortRef;
+
+enum : SInt32 {
+    kCFMessagePortSuccess = 0,
+    kCFMessagePortSendTimeout = -1,
+    kCFMessagePortReceiveTimeout = -2,
+    kCFMessagePortIsInvalid = -3,
+    kCFMessagePortTransportError = -4,
+    kCFMessagePortBecameInvalidError = -5,
+};
+
+/// A timeout that never ends (users take their time).
+inline constexpr CFTimeInterval kCFMessagePortWaitForever = __builtin_huge_val();
+/// The largest request or reply body accepted.
+inline constexpr uint32_t kMessagePortMaxFrame = 64u << 20;
+
+struct CFMessagePortContext {
+    CFIndex version;
+    void* info;
+    const void* (*retain)(const void* info);
+    void (*release)(const void* info);
+    CFStringRef (*copyDescription)(const void* info);
+};
+
+/// Handles one request on a local port: returns the reply (a new reference that the port releases
+/// after sending it; null sends an empty reply).
+typedef CFDataRef (*CFMessagePortCallBack)(CFMessagePortRef local, SInt32 msgid, CFDataRef data,
+                                           void* info);
+
+CFTypeID CFMessagePortGetTypeID();
+
+/// A new local port listening under `name`, or null (one log line on the application log) when
+/// the name is taken by a live server or the socket cannot be made. `context->info` is passed to
+/// every callback; its retain/release callbacks are honoured when given.
+CFMessagePortRef CFMessagePortCreateLocal(CFAllocatorRef allocator, CFStringRef name,
+                                          CFMessagePortCallBack callout,
+                                          CFMessagePortContext* context, Boolean* shouldFreeInfo);
+/// A new remote port for `name`, or null when no server listens under it.
+CFMessagePortRef CFMessagePortCreateRemote(CFAllocatorRef allocator, CFStringRef name);
+/// A new run-loop source that serves the local port when added to a run loop.
+CFRunLoopSourceRef CFMessagePortCreateRunLoopSource(CFAllocatorRef allocator, CFMessagePortRef local,
+                                                    CFIndex order);
+
+/// Sends a request and, when `returnData` is not null, waits for the reply and stores it there (a
+/// new reference the caller releases). The timeouts are in seconds; kCFMessagePortWaitForever
+/// waits without limit. Returns kCFMessagePortSuccess or one of the error codes above:
+/// SendTimeout when the request could not be written in time, ReceiveTimeout when no reply came
+/// in time (the connection is then closed: a late reply is never mistaken for the next one),
+/// IsInvalid for an invalidated port, BecameInvalidError when the server closed the connection
+/// before replying, TransportError for any other socket failure.
+SInt32 CFMessagePortSendRequest(CFMessagePortRef remote, SInt32 msgid, CFDataRef data,
+                                CFTimeInterval sendTimeout, CFTimeInterval receiveTimeout,
+                                CFStringRef replyMode, CFDataRef* returnData);
+
+Boolean CFMessagePortIsValid(CFMessagePortRef port);
+/// Stops the port for good: a local port stops listening and removes its socket file (only when
+/// it is still the one it made); a remote port closes its connection.
+void CFMessagePortInvalidate(CFMessagePortRef port);
+Boolean CFMessagePortIsRemote(CFMessagePortRef port);
+/// The port's name, not retained.
+CFStringRef CFMessagePortGetName(CFMessagePortRef port);
+
+namespace glyphwell::port {
+
+/// The socket path for a port name (see above). Empty when it cannot be made safely (the
+/// fallback directory is not the user's own, or the path is too long for a socket address).
+std::string SocketPathForName(const std::string& name);
+
+/// One request being handled by a local port's callback. A callback that waits for the user
+/// keeps it and learns through it when its client went away (disconnected or died): the
+/// handler registered then runs once, on the run loop's thread, and the reply is discarded.
+class PendingRequest {
+public:
+    virtual ~PendingRequest() = default;
+    virtual bool IsWithdrawn() const = 0;
+    /// `handler` runs at most once; when the request is already withdrawn, it runs at once.
+    virtual void SetWithdrawalHandler(std::function<void()> handler) = 0;
+    /// The client's process id (from SO_PEERCRED).
+    virtual int ClientProcessID() const = 0;
+};
+
+/// Inside a callback: the request it is handling (the innermost, when callbacks nest); null
+/// outside any callback.
+std::shared_ptr<PendingRequest> CurrentRequest();
+
+} // namespace glyphwell::port
