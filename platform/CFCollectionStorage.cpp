@@ -2,23 +2,16 @@
 
 #include <algorithm>
 #include <cstdlib>
-#include <string>
-#include <string_view>
 
 #include "platform/Log.h"
 
 namespace glyphwell::runtime {
 
-// The compiler names the function with its whole signature; the log shows only its name.
-void ReportInvalidArgument(const char* condition, const glyphwell::runtime::SourceLocation& where) {
-    std::string_view name = where.function_name();
-    name = name.substr(0, name.find('('));
-    if (size_t space = name.rfind(' '); space != std::string_view::npos)
-        name.remove_prefix(space + 1);
-    AssertionFailure(condition, std::string(name).c_str(), where.file_name(), int(where.line()));
+void ReportInvalidArgument(const char* condition, const SourceLocation& where) {
+    AssertionFailure(condition, where.function_name(), where.file_name(), int(where.line()));
 }
 
-bool CheckRange(CFRange range, CFIndex count, const glyphwell::runtime::SourceLocation& where) {
+bool CheckRange(CFRange range, CFIndex count, const SourceLocation& where) {
     bool inside = range.location >= 0 && range.length >= 0 && range.location <= count &&
                   range.length <= count - range.location;
     if (!inside)

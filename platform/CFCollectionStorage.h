@@ -15,9 +15,9 @@
 
 namespace glyphwell::runtime {
 
-/// Where a public function was called from: the part of SourceLocation the checks use,
-/// built on the compiler builtins so that it also works with compilers whose standard library
-/// lacks SourceLocation.
+/// Where a public function was called from: the part of std::source_location the checks use,
+/// built on the compiler builtins, which every compiler we build with has (std::source_location
+/// does not compile with clang 14 over libstdc++ 12). The function is named without signature.
 class SourceLocation {
 public:
     static constexpr SourceLocation current(const char* function = __builtin_FUNCTION(),
