@@ -24,20 +24,23 @@
 
 namespace {
 
-/// The hash of utf8Hash over `length` bytes that hold no zero byte.
-uint32_t HashText(const unsigned char* text, size_t length) {
+/// The utf8Hash of the text at `text` up to its first zero byte or its first `limit` bytes,
+/// whichever is shorter; stores that text's length in `*length`. One pass finds both.
+uint32_t HashKey(const unsigned char* text, size_t limit, size_t* length) {
+    const unsigned char* const start = text;
     uint32_t hash = 0x9E3779B9u;
-    for (; length >= 2; text += 2, length -= 2) {
+    for (; limit >= 2 && text[0] && text[1]; text += 2, limit -= 2) {
         hash += text[0];
         const uint32_t mixed = (uint32_t(text[1]) << 11) ^ hash;
         hash = (hash << 16) ^ mixed;
         hash += hash >> 11;
     }
-    if (length == 1) {
-        hash += text[0];
+    if (limit >= 1 && text[0]) {
+        hash += *text++;
         hash ^= hash << 11;
         hash += hash >> 17;
     }
+    *length = size_t(text - start);
     hash ^= hash << 3;
     hash += hash >> 5;
     hash ^= hash << 2;
@@ -93,8 +96,10 @@ private:
     CFStringRef Insert(Entry* entry);
 
     std::atomic<const Table*> table_; ///< the current slot array; replaced under mutex_
-    std::mutex mutex_;                ///< serialises insertion and growth
-    size_t count_ = 0;                ///< entries in the table; guarded by mutex_
+    // The writers' state gets a cache line of its own, so that inserting does not slow down
+    // lock-free readers on other cores.
+    alignas(64) std::mutex mutex_; ///< serialises insertion and growth
+    size_t count_ = 0;             ///< entries in the table; guarded by mutex_
 };
 
 /// The string of the entry whose key is the `length` bytes at `key`, or null when `table` has
@@ -149,8 +154,9 @@ CFStringRef TCFStringUniquerImp::Insert(Entry* entry) {
 CFStringRef TCFStringUniquerImp::GetUniqueString(const char* bytes, CFIndex length) {
     if (!bytes || length <= 0)
         return nullptr;
-    const size_t keyLength = strnlen(bytes, size_t(length));
-    const uint32_t hash = HashText(reinterpret_cast<const unsigned char*>(bytes), keyLength);
+    size_t keyLength;
+    const uint32_t hash =
+        HashKey(reinterpret_cast<const unsigned char*>(bytes), size_t(length), &keyLength);
     if (CFStringRef found = Find(*table_.load(std::memory_order_acquire), bytes, keyLength, hash))
         return found;
 
@@ -219,8 +225,8 @@ TCFStringUniquerImp* TCFStringUniquer::CreateStringUniquer() {
 }
 
 CFHashCode utf8Hash(const void* key) {
-    const char* text = static_cast<const char*>(key);
-    return HashText(reinterpret_cast<const unsigned char*>(text), std::strlen(text));
+    size_t length;
+    return HashKey(static_cast<const unsigned char*>(key), SIZE_MAX, &length);
 }
 
 Boolean utf8Equal(const void* a, const void* b) {
