@@ -118,12 +118,22 @@ public:
 
 /// A mutable array of untyped references kept in ascending order by a three-way comparison
 /// (kCFCompareLessThan, kCFCompareEqualTo, kCFCompareGreaterThan) and its context.
+///
+/// It receives its reference by creating it: the only constructor makes a new, empty array of
+/// property values that the wrapper owns, so the array starts sorted and stays sorted as long as
+/// values enter through InsertUnique or Merge (InsertValueAtIndex trusts the caller's index).
 class TCFSortedArray : public TCFMutableArray {
 public:
-    /// Creates an empty array of property values ordered by `comparator`, which is called with
-    /// `context` (not retained; it must outlive the array); `capacity` 0 means unlimited.
+    /// Creates an empty array of property values ordered by `comparator` (non-null), which is
+    /// called with `context` (not retained; it must outlive the array); `capacity` 0 means
+    /// unlimited.
     TCFSortedArray(CFComparatorFunction comparator, void* context, CFIndex capacity = 0)
         : TCFMutableArray(capacity), comparator_(comparator), context_(context) {}
+
+    /// Inserts `value` at its sorted position (before the first greater element) unless an
+    /// element equal to it under the comparison is present; the array retains it. Returns true
+    /// when it inserted. The comparison is called with `value` as either argument.
+    bool InsertUnique(const void* value);
 
     /// The comparison that orders the array.
     CFComparatorFunction GetComparator() const { return comparator_; }
@@ -134,3 +144,11 @@ private:
     CFComparatorFunction comparator_;
     void* context_;
 };
+
+/// Appends to the array of `sorted` the stable merge of `first` and `second` (each sorted by the
+/// comparison of `sorted`; the result is sorted only if they are): on ties the element of
+/// `first` comes first, duplicates are kept, and the elements `sorted` held before stay in
+/// front, not merged with the new ones. A null input reads as empty. Does not retain `first` or
+/// `second`; the array retains what it receives. Either input may be the array of `sorted`
+/// itself: its elements are read up to its count on entry.
+void Merge(CFArrayRef first, CFArrayRef second, const TCFSortedArray& sorted);

@@ -1,9 +1,16 @@
 // Wrappers over dictionary values: TCFDict, a view that never owns its reference; TCFDictionary,
 // which owns one count of an immutable dictionary; TCFMutableDictionary, which creates and owns a
 // mutable one. Reading a null dictionary yields no pairs.
+//
+// Beyond single platform calls they compare and filter dictionaries (ContainsSubset,
+// CreateDictionaryFilteredByKey), copy the pairs of one into another (SetPairs), and keep
+// multi-value dictionaries, whose keys each map to a mutable array of values (AddMultiValue,
+// AddMultiValues). Keys and values are compared only with the property-value equality (CFEqual).
 #pragma once
 
 #include "cfutil/TCFRetained.h"
+#include "cfutil/TCFSet.h"
+#include "platform/CFArray.h"
 #include "platform/CFDictionary.h"
 #include "platform/CFString.h"
 
@@ -27,6 +34,21 @@ public:
         if (dictionary_)
             CFDictionaryGetKeysAndValues(dictionary_, keys, values);
     }
+    /// Calls function(key, value, context) once for each pair; nothing for null. The function
+    /// must not change this dictionary.
+    void ApplyFunction(CFDictionaryApplierFunction function, void* context) const {
+        if (dictionary_)
+            CFDictionaryApplyFunction(dictionary_, function, context);
+    }
+
+    /// True when every key of `other` is present here with an equal value (CFEqual). False when
+    /// this dictionary is null; true for an empty or null `other`. Does not retain.
+    bool ContainsSubset(CFDictionaryRef other) const;
+    /// The pairs whose key is a member of `keys`. Returns a new reference that the caller
+    /// releases: a new dictionary (empty when no key matches, also for a null dictionary), or,
+    /// when `keys` is null or empty, this dictionary itself with one more count (null for null),
+    /// without copying or filtering anything.
+    CFDictionaryRef CreateDictionaryFilteredByKey(CFSetRef keys) const;
 
 protected:
     CFDictionaryRef dictionary_;
@@ -68,4 +90,45 @@ public:
     void AddPair(CFStringRef key, const void* value) const {
         CFDictionaryAddValue(GetMutable(), key, value);
     }
+    /// SetPair for every pair of `other`, in the order its pairs are stored; nothing for a null
+    /// `other`. Does not retain `other`; this dictionary retains what it stores.
+    void SetPairs(CFDictionaryRef other) const;
+
+    /// Adds `value` to the array of values of `key`: the first value makes a new mutable array
+    /// of property values (held only by this dictionary), later ones are appended to it in
+    /// place, duplicates included. A present value that is not an array becomes the first
+    /// element of a new array, so that nothing is lost. The array retains `value`.
+    void AddMultiValue(const void* key, const void* value) const;
+    /// Appends every element of the array `values` to the array of values of `key`, in order.
+    /// When the key is absent a mutable copy of `values` is stored (a new empty array for a
+    /// null `values`); when its value is not an array, that value is kept in front of the copy.
+    /// A `values` that is not an array is added as one value (AddMultiValue). Does not retain
+    /// `values`; the arrays retain their elements.
+    void AddMultiValues(const void* key, CFArrayRef values) const;
+    /// AddMultiValues(key, array) for every pair of `other` (non-null; `other` may be this
+    /// dictionary); a value of `other` that is not an array is added as one value. Does not
+    /// retain `other`.
+    void AddMultiValues(CFDictionaryRef other) const;
+};
+
+/// The working state of CreateDictionaryFilteredByKey: the wanted keys and the dictionary of
+/// the pairs found so far.
+class KeyFilterContext {
+public:
+    /// Retains `keys` (null-safe) and creates an empty result with unlimited capacity.
+    explicit KeyFilterContext(CFSetRef keys) : keys_(keys) {}
+
+    /// True when `key` is a member of the wanted keys; false for a null key set.
+    bool ContainsValue(const void* key) const { return keys_.ContainsValue(key); }
+    /// Adds the pair to the result when the key is absent there; the result retains both.
+    void AddPair(const void* key, const void* value) const {
+        CFDictionaryAddValue(result_.GetMutable(), key, value);
+    }
+    /// Returns the result with its count, as an immutable reference; the caller releases it.
+    /// The context holds no result afterwards.
+    CFDictionaryRef OrphanResult() { return result_.Orphan(); }
+
+private:
+    TCFSet<const void*> keys_;
+    TCFMutableDictionary result_;
 };

@@ -4,6 +4,7 @@
 #pragma once
 
 #include "cfutil/TCFRetained.h"
+#include "platform/CFArray.h"
 #include "platform/CFSet.h"
 
 /// Owns one count of a set value and releases it when destroyed. Cannot be copied.
@@ -42,7 +43,12 @@ protected:
     CFSetRef set_;
 };
 
-/// Owns a mutable set of untyped references.
+/// Owns a mutable set of untyped references, with set algebra in place.
+///
+/// It receives its reference in one of two ways: the default constructor creates a new, empty
+/// set of property values, and the (set, kAdopted) constructor takes over the count of a mutable
+/// set the caller created (there is no retaining constructor, so two wrappers never share one
+/// set by accident). Either way it holds a non-null set, which the mutating operations require.
 class TCFMutableSet : public TCFSet<const void*> {
 public:
     /// Creates an empty set of property values (retained, compared with CFEqual and CFHash);
@@ -60,4 +66,17 @@ public:
     void AddValue(const void* value) const { CFSetAddValue(GetMutable(), value); }
     /// Removes the member equal to `value`, if any.
     void RemoveValue(const void* value) const { CFSetRemoveValue(GetMutable(), value); }
+
+    /// Adds every element of `array` in index order (AddValue each); a null array adds nothing.
+    /// Does not retain `array`.
+    void AddValues(CFArrayRef array) const;
+    /// Adds every member of `other`; a null `other`, or this set itself, changes nothing. Does
+    /// not retain `other`.
+    void Union(CFSetRef other) const;
+    /// Removes every member of `other`; a null `other` changes nothing, and this set itself
+    /// empties the set. Does not retain `other`.
+    void MinusSet(CFSetRef other) const;
+    /// Removes every member that `other` does not contain; a null `other` reads as the empty
+    /// set and so empties this one. Does not retain `other`.
+    void Intersect(CFSetRef other) const;
 };
