@@ -1,6 +1,10 @@
 #include "cfutil/TCFNumber.h"
 
+#include <locale.h>
+#include <stdlib.h>
+
 #include "cfutil/TCFRetained.h"
+#include "cfutil/TStackBuffer.h"
 
 template <> CFNumberRef TCFNumber::Create<SInt8>(SInt8 value) {
     return CFNumberCreate(kCFAllocatorDefault, kCFNumberCharType, &value);
@@ -9,6 +13,90 @@ template <> CFNumberRef TCFNumber::Create<SInt8>(SInt8 value) {
 template <> CFNumberRef TCFNumber::Create<SInt64>(SInt64 value) {
     static_assert(sizeof(SInt64) == sizeof(long), "kCFNumberLongType is 8 bytes");
     return CFNumberCreate(kCFAllocatorDefault, kCFNumberLongType, &value);
+}
+
+template <> CFNumberRef TCFNumber::Create<double>(double value) {
+    return CFNumberCreate(kCFAllocatorDefault, kCFNumberDoubleType, &value);
+}
+
+template <> CFNumberRef TCFNumber::Create<bool>(bool value) {
+    SInt32 integer = value ? 1 : 0;
+    return CFNumberCreate(kCFAllocatorDefault, kCFNumberIntType, &integer);
+}
+
+CFNumberRef TCFNumber::CreateFromBoolean(bool flag) {
+    // A function-local static is initialised exactly once, even under concurrent first calls.
+    // The pair is trivially destructible, so it outlives every caller and is never released.
+    struct SharedBooleans {
+        CFNumberRef numbers[2];
+    };
+    static const SharedBooleans shared{{Create<bool>(false), Create<bool>(true)}};
+    return TCFSafeRetain(shared.numbers[flag ? 1 : 0]);
+}
+
+namespace {
+
+/// The C locale, made once and never freed; null if the C library cannot make it.
+locale_t CLocale() {
+    static const locale_t locale = newlocale(LC_ALL_MASK, "C", locale_t(0));
+    return locale;
+}
+
+} // namespace
+
+CFNumberRef TCFNumber::CreateForString(CFStringRef string) {
+    locale_t cLocale = CLocale();
+    if (!string || !cLocale)
+        return nullptr;
+    CFIndex length = CFStringGetLength(string);
+    CFIndex maxSize = CFStringGetMaximumSizeForEncoding(length, kCFStringEncodingUTF8);
+    if (maxSize < 0)
+        return nullptr;
+    TStackBuffer<char, 30> text(uint64_t(maxSize) + 1);
+    // The byte count tells where the text really ends, so that a string holding U+0000 is not
+    // read as the number before it.
+    CFIndex used = 0;
+    if (CFStringGetBytes(string, CFRangeMake(0, length), kCFStringEncodingUTF8, 0, false,
+                         reinterpret_cast<UInt8*>(text.GetBuffer()), maxSize, &used) != length)
+        return nullptr;
+    text[uint64_t(used)] = '\0';
+    const char* begin = text.GetBuffer();
+    const char* end = begin + used;
+
+    char* stop = nullptr;
+    long integer = strtol_l(begin, &stop, 10, cLocale); // saturates out of range; accepted
+    if (stop != begin && stop == end)
+        return Create<SInt64>(integer);
+    double real = strtod_l(begin, &stop, cLocale);
+    if (stop != begin && stop == end)
+        return Create<double>(real);
+    return nullptr;
+}
+
+template <> void TCFNumber::GetCFNumberValue<unsigned long>(CFTypeRef number, unsigned long& out) {
+    if (number == kCFBooleanTrue) {
+        out = 1;
+        return;
+    }
+    if (number == kCFBooleanFalse) {
+        out = 0;
+        return;
+    }
+    SInt64 value = 0;
+    if (number && CFGetTypeID(number) == CFNumberGetTypeID())
+        CFNumberGetValue(static_cast<CFNumberRef>(number), kCFNumberLongType, &value);
+    out = static_cast<unsigned long>(value);
+}
+
+template <>
+bool TCFNumber::GetCFNumberValueSafely<unsigned long>(CFTypeRef value, unsigned long& out) {
+    if (!value ||
+        (CFGetTypeID(value) != CFNumberGetTypeID() && CFGetTypeID(value) != CFBooleanGetTypeID())) {
+        out = 0;
+        return false;
+    }
+    GetCFNumberValue(value, out);
+    return true;
 }
 
 TCFNumber::~TCFNumber() {
