@@ -28,15 +28,15 @@ Ref Parse(const std::string& text) {
     return Ref(TCFNumber::CreateForString(string.as<CFStringRef>()));
 }
 
-long LongOf(const Ref& number) {
+long LongOf(CFTypeRef number) {
     long value = 0;
-    CFNumberGetValue(number.as<CFNumberRef>(), kCFNumberLongType, &value);
+    CFNumberGetValue(static_cast<CFNumberRef>(number), kCFNumberLongType, &value);
     return value;
 }
 
-double DoubleOf(const Ref& number) {
+double DoubleOf(CFTypeRef number) {
     double value = 0;
-    CFNumberGetValue(number.as<CFNumberRef>(), kCFNumberDoubleType, &value);
+    CFNumberGetValue(static_cast<CFNumberRef>(number), kCFNumberDoubleType, &value);
     return value;
 }
 
@@ -70,48 +70,35 @@ TEST(NumberCreate, EachNativeTypeKeepsItsPlatformNumberType) {
     TCFAdopted<CFNumberRef> character(TCFNumber::Create<SInt8>(-5));
     TCFAdopted<CFNumberRef> integer(TCFNumber::Create<SInt64>(LONG_MIN));
     TCFAdopted<CFNumberRef> real(TCFNumber::Create<double>(2.25));
+    TCFNumber yes(true), no(false);
     EXPECT_EQ(CFNumberGetType(character), kCFNumberCharType);
     EXPECT_EQ(CFNumberGetType(integer), kCFNumberLongType);
     EXPECT_EQ(CFNumberGetType(real), kCFNumberDoubleType);
-    long integerValue = 0;
-    double realValue = 0;
-    EXPECT_TRUE(CFNumberGetValue(integer, kCFNumberLongType, &integerValue));
-    EXPECT_EQ(integerValue, LONG_MIN);
-    EXPECT_TRUE(CFNumberGetValue(real, kCFNumberDoubleType, &realValue));
-    EXPECT_EQ(realValue, 2.25);
-    EXPECT_EQ(CFGetRetainCount(real), 1);
+    EXPECT_EQ(CFNumberGetType(yes), kCFNumberIntType);
+    EXPECT_EQ(CFNumberGetByteSize(yes), 4);
+    EXPECT_EQ(LongOf(integer), LONG_MIN);
+    EXPECT_EQ(DoubleOf(real), 2.25);
+    EXPECT_EQ(LongOf(yes), 1);
+    EXPECT_EQ(LongOf(no), 0);
 }
 
-TEST(NumberCreate, BooleansAreFourByteIntegersZeroOrOne) {
-    for (bool flag : {false, true}) {
-        TCFNumber number(flag);
-        EXPECT_EQ(CFNumberGetType(number), kCFNumberIntType);
-        EXPECT_EQ(CFNumberGetByteSize(number), 4);
-        SInt32 value = -1;
-        CFNumberGetValue(number, kCFNumberSInt32Type, &value);
-        EXPECT_EQ(value, flag ? 1 : 0);
-    }
-}
-
-TEST(SharedBooleanNumbers, EachCallReturnsTheSameNumberWithOneMoreCount) {
+TEST(SharedBooleanNumbers, EachCallReturnsTheSameIntegerNumberWithOneMoreCount) {
     CFNumberRef first = TCFNumber::CreateFromBoolean(true);
     CFIndex count = CFGetRetainCount(first);
     CFNumberRef second = TCFNumber::CreateFromBoolean(true);
     EXPECT_EQ(first, second);
     EXPECT_EQ(CFGetRetainCount(first), count + 1);
-    EXPECT_NE(static_cast<CFTypeRef>(first), kCFBooleanTrue); // a number, not the boolean
+    EXPECT_NE(static_cast<CFTypeRef>(first), kCFBooleanTrue);
     EXPECT_EQ(CFNumberGetType(first), kCFNumberIntType);
-    long value = 0;
-    CFNumberGetValue(first, kCFNumberLongType, &value);
-    EXPECT_EQ(value, 1);
+    EXPECT_EQ(LongOf(first), 1);
     EXPECT_TRUE(TCFTypeRef::GetBooleanValue(first));
     CFRelease(first);
     CFRelease(second);
     EXPECT_EQ(CFGetRetainCount(first), count - 1); // the shared count stays
 
-    TCFAdopted<CFNumberRef> no(TCFNumber::CreateFromBoolean(false));
-    EXPECT_NE(static_cast<CFNumberRef>(no), first);
-    EXPECT_FALSE(TCFTypeRef::GetBooleanValue(no));
+    Ref no(TCFNumber::CreateFromBoolean(false));
+    EXPECT_NE(no.get(), first);
+    EXPECT_FALSE(TCFTypeRef::GetBooleanValue(no.get()));
 }
 
 TEST(SharedBooleanNumbers, ConcurrentFirstCallsAllGetTheSameNumber) {
@@ -121,82 +108,63 @@ TEST(SharedBooleanNumbers, ConcurrentFirstCallsAllGetTheSameNumber) {
         threads.emplace_back([&numbers, i] { numbers[i] = TCFNumber::CreateFromBoolean(i % 2); });
     for (std::thread& thread : threads)
         thread.join();
+    EXPECT_NE(numbers[0], numbers[1]);
     for (size_t i = 0; i < numbers.size(); ++i) {
         EXPECT_EQ(numbers[i], numbers[i % 2]);
         CFRelease(numbers[i]);
     }
-    EXPECT_NE(numbers[0], numbers[1]);
 }
 
 // ---------------------------------------------------------------------------------------------
 // Parsing strings
 
-TEST(NumberFromString, WholeNumbersBecomeLongs) {
-    for (auto [text, expected] : std::vector<std::pair<std::string, long>>{
-             {"42", 42}, {"-7", -7}, {"+5", 5}, {" \t42", 42}, {"0", 0}, {"007", 7}}) {
+TEST(NumberFromString, WholeNumbersBecomeLongsAndOthersDoubles) {
+    for (auto [text, expected] :
+         std::vector<std::pair<std::string, long>>{{"42", 42},
+                                                   {"-7", -7},
+                                                   {" \t+5", 5},
+                                                   {"007", 7},
+                                                   {"99999999999999999999", LONG_MAX},
+                                                   {"-99999999999999999999", LONG_MIN},
+                                                   {std::string(60, '0') + "42", 42}}) {
         Ref number = Parse(text);
         ASSERT_TRUE(number) << text;
         EXPECT_EQ(CFNumberGetType(number.as<CFNumberRef>()), kCFNumberLongType) << text;
-        EXPECT_EQ(LongOf(number), expected) << text;
+        EXPECT_EQ(LongOf(number.get()), expected) << text;
     }
-}
-
-TEST(NumberFromString, OtherNumbersBecomeDoubles) {
     for (auto [text, expected] : std::vector<std::pair<std::string, double>>{
-             {"3.5", 3.5}, {"1e3", 1000.0}, {"-0.25", -0.25}, {".5", 0.5}, {"2.", 2.0}}) {
+             {"3.5", 3.5}, {"1e3", 1000.0}, {"-.25", -0.25}, {"2.", 2.0}}) {
         Ref number = Parse(text);
         ASSERT_TRUE(number) << text;
         EXPECT_EQ(CFNumberGetType(number.as<CFNumberRef>()), kCFNumberDoubleType) << text;
-        EXPECT_EQ(DoubleOf(number), expected) << text;
+        EXPECT_EQ(DoubleOf(number.get()), expected) << text;
     }
 }
 
-TEST(NumberFromString, TrailingCharactersEmptyTextAndWordsAreRejected) {
-    for (const std::string text : {"42 ", "42\n", "", " ", "abc", "4 2", "1.5x", "3,5", "-", "+",
-                                   "\xEF\xBC\x94\xEF\xBC\x92" /* fullwidth 42 */}) {
+TEST(NumberFromString, TextBesidesTheNumberIsRejected) {
+    for (const std::string& text :
+         std::vector<std::string>{"42 ", "42\n", "", " ", "abc", "4 2", "1.5x", "3,5", "-",
+                                  "\xEF\xBC\x94\xEF\xBC\x92" /* fullwidth 42 */,
+                                  std::string("42\0x", 4), std::string("42\0", 3)}) {
         EXPECT_FALSE(Parse(text)) << '"' << text << '"';
     }
     EXPECT_EQ(TCFNumber::CreateForString(nullptr), nullptr);
 }
 
-TEST(NumberFromString, TextAfterAnEmbeddedNulIsNotIgnored) {
-    EXPECT_FALSE(Parse(std::string("42\0x", 4)));
-    EXPECT_FALSE(Parse(std::string("42\0", 3)));
-}
-
-TEST(NumberFromString, IntegersBeyondSixtyFourBitsSaturate) {
-    Ref largest = Parse("99999999999999999999");
-    Ref smallest = Parse("-99999999999999999999");
-    ASSERT_TRUE(largest);
-    ASSERT_TRUE(smallest);
-    EXPECT_EQ(CFNumberGetType(largest.as<CFNumberRef>()), kCFNumberLongType);
-    EXPECT_EQ(LongOf(largest), LONG_MAX);
-    EXPECT_EQ(LongOf(smallest), LONG_MIN);
-}
-
-TEST(NumberFromString, TextLongerThanTheInlineBufferIsParsed) {
-    Ref integer = Parse(std::string(60, '0') + "42");
-    Ref real = Parse("0." + std::string(60, '0') + "1e61");
-    ASSERT_TRUE(integer);
-    ASSERT_TRUE(real);
-    EXPECT_EQ(LongOf(integer), 42);
-    EXPECT_DOUBLE_EQ(DoubleOf(real), 1.0);
-}
-
 TEST_F(CommaDecimalLocale, DecimalPointIsAlwaysAFullStop) {
     Ref real = Parse("3.5");
     ASSERT_TRUE(real);
-    EXPECT_EQ(DoubleOf(real), 3.5);
+    EXPECT_EQ(DoubleOf(real.get()), 3.5);
     EXPECT_FALSE(Parse("3,5"));
 }
 
 // ---------------------------------------------------------------------------------------------
-// Truth values
+// Truth values and unsigned readings
 
 TEST(BooleanValue, StringsTrueAndYesInAnyCaseAreTrue) {
-    for (const char* text : {"true", "TRUE", "True", "YES", "yes", "Yes", "yEs"})
+    for (const char* text : {"true", "TRUE", "True", "YES", "yes", "yEs"})
         EXPECT_TRUE(TCFTypeRef::GetBooleanValue(Str(text).get())) << text;
-    for (const char* text : {"1", "false", "no", "", "true ", "truth", "y"})
+    for (const char* text : {"1", "false", "", "true ", "y"})
         EXPECT_FALSE(TCFTypeRef::GetBooleanValue(Str(text).get())) << text;
 }
 
@@ -216,9 +184,6 @@ TEST(BooleanValue, BooleansReadAsThemselvesAndOtherKindsAsFalse) {
     EXPECT_FALSE(TCFTypeRef::GetBooleanValue(Array({kCFBooleanTrue}).get()));
 }
 
-// ---------------------------------------------------------------------------------------------
-// Unsigned readings
-
 TEST(NumberValue, BooleansGiveOneAndZeroAndNumbersTheirSixtyFourBitValue) {
     unsigned long out = 99;
     TCFNumber::GetCFNumberValue(kCFBooleanTrue, out);
@@ -227,10 +192,6 @@ TEST(NumberValue, BooleansGiveOneAndZeroAndNumbersTheirSixtyFourBitValue) {
     EXPECT_EQ(out, 0UL);
     TCFNumber::GetCFNumberValue(Num(kCFNumberSInt8Type, SInt8(42)).get(), out);
     EXPECT_EQ(out, 42UL);
-    TCFNumber::GetCFNumberValue(Num(kCFNumberLongType, -1L).get(), out);
-    EXPECT_EQ(out, 0xFFFFFFFFFFFFFFFFUL);
-    TCFNumber::GetCFNumberValue(Num(kCFNumberDoubleType, 2.9).get(), out);
-    EXPECT_EQ(out, 2UL);
     TCFNumber::GetCFNumberValue(Num(kCFNumberDoubleType, -2.9).get(), out);
     EXPECT_EQ(out, 0xFFFFFFFFFFFFFFFEUL);
 }
@@ -246,6 +207,4 @@ TEST(NumberValue, SafeReadingRejectsOtherKindsWithZero) {
     EXPECT_EQ(out, 1UL);
     EXPECT_TRUE(TCFNumber::GetCFNumberValueSafely(Num(kCFNumberLongType, -1L).get(), out));
     EXPECT_EQ(out, 0xFFFFFFFFFFFFFFFFUL);
-    EXPECT_TRUE(TCFNumber::GetCFNumberValueSafely(kCFBooleanFalse, out));
-    EXPECT_EQ(out, 0UL);
 }
