@@ -15,6 +15,15 @@
 // CFRunLoop.h); its callback then runs on that loop's thread, nested inside any callback that
 // spins a nested loop, so a request arriving while another one waits for the user is answered
 // at once, and first.
+//
+// Each connection is served on its own: a foreign peer, a frame over the limit or a client that
+// disconnects in the middle of a frame closes that connection with one line on the application
+// log, and every other client goes on being served. While a connection's request is in the
+// callback, the port keeps reading that connection (holding up to 1 MiB of any later frames,
+// which are handled one at a time after the reply), so that the client's going away is seen at
+// once: the request is then withdrawn (see PendingRequest) and its reply discarded. Whole
+// frames that arrived before the client went away are still handled, withdrawn from the start.
+// Replies are written without blocking; a large reply goes out as the client reads it.
 #pragma once
 
 #include <functional>
@@ -58,15 +67,18 @@ CFTypeID CFMessagePortGetTypeID();
 
 /// A new local port listening under `name`, or null (one log line on the application log) when
 /// the name is taken by a live server or the socket cannot be made. `context->info` is passed to
-/// every callback; its retain/release callbacks are honoured when given.
+/// every callback; its retain/release callbacks are honoured when given. `*shouldFreeInfo`
+/// (when given) is set to false when the port keeps the info, true when no port was made.
+/// The request data given to the callback is never null (empty for an empty request).
 CFMessagePortRef CFMessagePortCreateLocal(CFAllocatorRef allocator, CFStringRef name,
                                           CFMessagePortCallBack callout,
                                           CFMessagePortContext* context, Boolean* shouldFreeInfo);
-/// A new remote port for `name`, or null when no server listens under it.
+/// A new remote port for `name`, connected, or null when no server listens under it.
 CFMessagePortRef CFMessagePortCreateRemote(CFAllocatorRef allocator, CFStringRef name);
-/// A new run-loop source that serves the local port when added to a run loop.
-CFRunLoopSourceRef CFMessagePortCreateRunLoopSource(CFAllocatorRef allocator, CFMessagePortRef local,
-                                                    CFIndex order);
+/// A new run-loop source that serves the local port when added to a run loop (the port's one
+/// source, retained again when asked twice); null for a remote or invalidated port.
+CFRunLoopSourceRef CFMessagePortCreateRunLoopSource(CFAllocatorRef allocator,
+                                                    CFMessagePortRef local, CFIndex order);
 
 /// Sends a request and, when `returnData` is not null, waits for the reply and stores it there (a
 /// new reference the caller releases). The timeouts are in seconds; kCFMessagePortWaitForever
@@ -74,14 +86,25 @@ CFRunLoopSourceRef CFMessagePortCreateRunLoopSource(CFAllocatorRef allocator, CF
 /// SendTimeout when the request could not be written in time, ReceiveTimeout when no reply came
 /// in time (the connection is then closed: a late reply is never mistaken for the next one),
 /// IsInvalid for an invalidated port, BecameInvalidError when the server closed the connection
-/// before replying, TransportError for any other socket failure.
+/// before replying, TransportError for any other socket failure (no server listens any more, a
+/// request over kMessagePortMaxFrame, a reply over it).
+///
+/// A remote port keeps one connection for all its requests (one at a time; concurrent callers
+/// wait for each other) and stays valid after every error but IsInvalid: a connection that
+/// failed, timed out or that the server dropped while idle is replaced by a new one on the next
+/// request. Without `returnData` the reply is not awaited and the connection is given up after
+/// the request has been written (the server sees its client go away). Timeouts of zero, below
+/// zero or NaN do not wait at all. Invalidating the port from another thread ends a waiting
+/// request with IsInvalid.
 SInt32 CFMessagePortSendRequest(CFMessagePortRef remote, SInt32 msgid, CFDataRef data,
                                 CFTimeInterval sendTimeout, CFTimeInterval receiveTimeout,
                                 CFStringRef replyMode, CFDataRef* returnData);
 
 Boolean CFMessagePortIsValid(CFMessagePortRef port);
-/// Stops the port for good: a local port stops listening and removes its socket file (only when
-/// it is still the one it made); a remote port closes its connection.
+/// Stops the port for good: a local port stops listening, removes its socket file (only when it
+/// is still the one it made; never a socket handed over by systemd), closes every connection
+/// (withdrawing the requests in progress) and leaves its run loop; a remote port closes its
+/// connection.
 void CFMessagePortInvalidate(CFMessagePortRef port);
 Boolean CFMessagePortIsRemote(CFMessagePortRef port);
 /// The port's name, not retained.
@@ -89,13 +112,15 @@ CFStringRef CFMessagePortGetName(CFMessagePortRef port);
 
 namespace glyphwell::port {
 
-/// The socket path for a port name (see above). Empty when it cannot be made safely (the
-/// fallback directory is not the user's own, or the path is too long for a socket address).
+/// The socket path for a port name (see above). Empty when it cannot be made safely: a name that
+/// is empty, ".", ".." or holds "/", a fallback directory that is not the user's own, or a path
+/// too long for a socket address. A relative XDG_RUNTIME_DIR counts as unset.
 std::string SocketPathForName(const std::string& name);
 
 /// One request being handled by a local port's callback. A callback that waits for the user
-/// keeps it and learns through it when its client went away (disconnected or died): the
-/// handler registered then runs once, on the run loop's thread, and the reply is discarded.
+/// keeps it and learns through it when its client went away (disconnected or died) or the port
+/// was invalidated: the handler registered then runs once, on the run loop's thread, and the
+/// reply is discarded. The object stays usable after the callback has returned.
 class PendingRequest {
 public:
     virtual ~PendingRequest() = default;

@@ -128,7 +128,8 @@ CFStringRef CFCopyTypeIDDescription(CFTypeID typeID) {
     using namespace glyphwell::runtime;
     static const char* const names[kKindCount] = {
         "",      "CFNull", "CFBoolean",   "CFNumber",    "CFString", "CFData",  "CFCharacterSet",
-        "CFArray", "CFSet", "CFDictionary", "CFURL",     "CFUUID",   "CFError", "CFDate"};
+        "CFArray", "CFSet", "CFDictionary", "CFURL",     "CFUUID",   "CFError", "CFDate",
+        "CFMessagePort", "CFRunLoopSource"};
     if (typeID == 0 || typeID >= kKindCount)
         return nullptr;
     return CFStringCreateWithCString(kCFAllocatorDefault, names[typeID], kCFStringEncodingUTF8);

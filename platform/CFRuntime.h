@@ -25,6 +25,8 @@ enum KindID : CFTypeID {
     kUUIDKind,
     kErrorKind,
     kDateKind,
+    kMessagePortKind,
+    kRunLoopSourceKind,
     kKindCount
 };
 

@@ -1,0 +1,1169 @@
+#include "platform/CFMessagePort.h"
+
+#include <fcntl.h>
+#include <poll.h>
+#include <sys/file.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/uio.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <cerrno>
+#include <chrono>
+#include <climits>
+#include <cmath>
+#include <cstdlib>
+#include <cstring>
+#include <map>
+#include <mutex>
+#include <vector>
+
+#include "platform/CFData.h"
+#include "platform/CFRunLoopInternal.h"
+#include "platform/CFRuntime.h"
+#include "platform/CFString.h"
+#include "platform/Log.h"
+#include "platform/MessagePortWire.h"
+
+using glyphwell::AppLog;
+using glyphwell::RunLoopDriver;
+using glyphwell::port::FrameAssembler;
+using glyphwell::runtime::CFObject;
+using glyphwell::runtime::kMessagePortKind;
+
+namespace {
+
+/// Bytes read from a socket per call.
+constexpr size_t kReadChunk = 64 * 1024;
+/// Read calls per readiness event, so that one busy client cannot hold the loop.
+constexpr int kReadsPerEvent = 16;
+/// Connections accepted per readiness event of the listening socket.
+constexpr int kAcceptsPerEvent = 64;
+/// While a connection's request is being handled or answered, at most this many bytes of its
+/// later frames are held; beyond it the connection is not read until the reply has gone out.
+constexpr size_t kReadAheadLimit = 1u << 20;
+
+std::string UTF8(CFStringRef string) {
+    if (!string)
+        return {};
+    const CFIndex length = CFStringGetLength(string);
+    CFIndex needed = 0;
+    if (CFStringGetBytes(string, CFRangeMake(0, length), kCFStringEncodingUTF8, 0, false, nullptr,
+                         0, &needed) != length)
+        return {};
+    std::string text(size_t(needed), '\0');
+    CFStringGetBytes(string, CFRangeMake(0, length), kCFStringEncodingUTF8, 0, false,
+                     reinterpret_cast<UInt8*>(text.data()), needed, &needed);
+    return text;
+}
+
+std::string ErrorText(int error) {
+    char buffer[128];
+    return strerror_r(error, buffer, sizeof buffer);
+}
+
+bool MakeAddress(const std::string& path, sockaddr_un* address) {
+    std::memset(address, 0, sizeof *address);
+    address->sun_family = AF_UNIX;
+    if (path.empty() || path.size() >= sizeof address->sun_path)
+        return false;
+    std::memcpy(address->sun_path, path.data(), path.size());
+    return true;
+}
+
+void CloseDescriptor(int descriptor) {
+    if (descriptor >= 0)
+        close(descriptor); // Linux releases the descriptor even when close reports EINTR
+}
+
+/// A point in time for poll-based waits. Zero, negative and NaN timeouts do not wait at all;
+/// kCFMessagePortWaitForever (and anything beyond ~30 years) waits without limit.
+class Deadline {
+public:
+    explicit Deadline(CFTimeInterval seconds) {
+        if (std::isnan(seconds) || seconds <= 0) {
+            end_ = std::chrono::steady_clock::now();
+        } else if (seconds > 1e9) {
+            forever_ = true;
+        } else {
+            end_ = std::chrono::steady_clock::now() +
+                   std::chrono::duration_cast<std::chrono::steady_clock::duration>(
+                       std::chrono::duration<double>(seconds));
+        }
+    }
+
+    /// Milliseconds left for poll(): -1 without limit, 0 once passed.
+    int RemainingMilliseconds() const {
+        if (forever_)
+            return -1;
+        const auto left = end_ - std::chrono::steady_clock::now();
+        if (left <= std::chrono::steady_clock::duration::zero())
+            return 0;
+        // Round up, so that a wait never ends just before the deadline.
+        const auto milliseconds =
+            std::chrono::duration_cast<std::chrono::milliseconds>(left).count() + 1;
+        return milliseconds > INT_MAX ? INT_MAX : int(milliseconds);
+    }
+
+private:
+    bool forever_ = false;
+    std::chrono::steady_clock::time_point end_;
+};
+
+/// Waits until `descriptor` reports `events` (or a hang-up or error). 1: ready, 0: deadline
+/// passed, -1: poll failed.
+int WaitFor(int descriptor, short events, const Deadline& deadline) {
+    for (;;) {
+        pollfd entry{descriptor, events, 0};
+        const int milliseconds = deadline.RemainingMilliseconds();
+        const int count = poll(&entry, 1, milliseconds);
+        if (count > 0)
+            return 1;
+        if (count == 0) {
+            if (milliseconds == 0 || deadline.RemainingMilliseconds() == 0)
+                return 0;
+            continue;
+        }
+        if (errno != EINTR)
+            return -1;
+    }
+}
+
+/// A connected stream socket to `path`, non-blocking after the connect; -1 when nothing
+/// listens there (or the connect fails otherwise).
+int ConnectTo(const std::string& path) {
+    sockaddr_un address;
+    if (!MakeAddress(path, &address))
+        return -1;
+    const int descriptor = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    if (descriptor < 0)
+        return -1;
+    if (connect(descriptor, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
+        bool connected = false;
+        if (errno == EINTR) {
+            // The connect goes on in the background: wait for it and ask how it ended.
+            pollfd entry{descriptor, POLLOUT, 0};
+            while (poll(&entry, 1, -1) < 0 && errno == EINTR) {
+            }
+            int error = 0;
+            socklen_t size = sizeof error;
+            connected =
+                getsockopt(descriptor, SOL_SOCKET, SO_ERROR, &error, &size) == 0 && error == 0;
+        }
+        if (!connected) {
+            CloseDescriptor(descriptor);
+            return -1;
+        }
+    }
+    const int flags = fcntl(descriptor, F_GETFL);
+    if (flags < 0 || fcntl(descriptor, F_SETFL, flags | O_NONBLOCK) != 0) {
+        CloseDescriptor(descriptor);
+        return -1;
+    }
+    return descriptor;
+}
+
+/// The request a local port's callback is handling, as its PendingRequest.
+class RequestState final : public glyphwell::port::PendingRequest {
+public:
+    RequestState(int processID, bool withdrawn) : processID_(processID), withdrawn_(withdrawn) {}
+
+    bool IsWithdrawn() const override {
+        std::lock_guard<std::mutex> lock(mutex_);
+        return withdrawn_;
+    }
+
+    void SetWithdrawalHandler(std::function<void()> handler) override {
+        {
+            std::lock_guard<std::mutex> lock(mutex_);
+            if (!withdrawn_) {
+                handler_ = std::move(handler);
+                return;
+            }
+        }
+        if (handler)
+            handler();
+    }
+
+    int ClientProcessID() const override { return processID_; }
+
+    /// Marks the request withdrawn and runs its handler (outside the lock: it may call back).
+    void Withdraw() {
+        std::function<void()> handler;
+        {
+            std::lock_guard<std::mutex> lock(mutex_);
+            if (withdrawn_)
+                return;
+            withdrawn_ = true;
+            handler.swap(handler_);
+        }
+        if (handler)
+            handler();
+    }
+
+private:
+    const int processID_;
+    mutable std::mutex mutex_;
+    bool withdrawn_;
+    std::function<void()> handler_;
+};
+
+/// The requests being handled on this thread, innermost last.
+thread_local std::vector<std::shared_ptr<RequestState>> currentRequests;
+
+/// One accepted client of a local port.
+struct Connection {
+    Connection() = default;
+    Connection(const Connection&) = delete;
+    Connection& operator=(const Connection&) = delete;
+    ~Connection() {
+        if (reply)
+            CFRelease(reply);
+    }
+
+    int descriptor = -1;
+    int processID = 0;
+    FrameAssembler input{FrameAssembler::Kind::Request, kMessagePortMaxFrame};
+    /// The client went away: the descriptor is closed, whole frames still held are served
+    /// withdrawn and their replies dropped.
+    bool peerGone = false;
+    bool busy = false; ///< one of its requests is in the callback
+    bool readPaused = false;
+    bool writeBlocked = false; ///< waiting for room in the socket buffer
+    std::shared_ptr<RequestState> current;
+
+    // The reply being written: a 4-byte header, then the body of `reply` (owned; may be null).
+    bool writing = false;
+    CFDataRef reply = nullptr;
+    uint8_t replyHeader[glyphwell::port::kReplyHeaderSize] = {};
+    size_t replyWritten = 0;
+    size_t replyTotal = 0;
+};
+
+using ConnectionPtr = std::shared_ptr<Connection>;
+
+std::mutex activationMutex;
+
+/// The listening socket systemd passed (LISTEN_PID/LISTEN_FDS), or -1. The variables are
+/// removed whenever present, so only the first port of the process gets the socket.
+int TakeActivationSocket(const std::string& portName) {
+    std::lock_guard<std::mutex> lock(activationMutex);
+    const char* pidText = getenv("LISTEN_PID");
+    const char* countText = getenv("LISTEN_FDS");
+    if (!pidText && !countText)
+        return -1;
+    auto parse = [](const char* text) -> long {
+        if (!text || !*text)
+            return -1;
+        char* end = nullptr;
+        errno = 0;
+        const long value = std::strtol(text, &end, 10);
+        return errno || *end ? -1 : value;
+    };
+    const long pid = parse(pidText);
+    const long count = parse(countText);
+    unsetenv("LISTEN_PID");
+    unsetenv("LISTEN_FDS");
+    unsetenv("LISTEN_FDNAMES");
+    if (pid != long(getpid()) || count < 1)
+        return -1;
+
+    constexpr int kFirstPassedDescriptor = 3;
+    int type = 0, listening = 0;
+    socklen_t size = sizeof type;
+    sockaddr_storage address{};
+    socklen_t addressSize = sizeof address;
+    const bool usable =
+        getsockopt(kFirstPassedDescriptor, SOL_SOCKET, SO_TYPE, &type, &size) == 0 &&
+        type == SOCK_STREAM &&
+        (size = sizeof listening,
+         getsockopt(kFirstPassedDescriptor, SOL_SOCKET, SO_ACCEPTCONN, &listening, &size) == 0) &&
+        listening &&
+        getsockname(kFirstPassedDescriptor, reinterpret_cast<sockaddr*>(&address), &addressSize) ==
+            0 &&
+        address.ss_family == AF_UNIX;
+    if (!usable) {
+        AppLog("message port %s: descriptor 3 from the service manager is not a listening Unix "
+               "stream socket; not using it",
+               portName.c_str());
+        return -1;
+    }
+    const int flags = fcntl(kFirstPassedDescriptor, F_GETFL);
+    fcntl(kFirstPassedDescriptor, F_SETFD, FD_CLOEXEC);
+    if (flags >= 0)
+        fcntl(kFirstPassedDescriptor, F_SETFL, flags | O_NONBLOCK);
+    return kFirstPassedDescriptor;
+}
+
+/// Binds and listens on `path`, taking over a stale socket file. Returns the listening socket
+/// and the file's identity, or -1 after one log line.
+int BindListeningSocket(const std::string& portName, const std::string& path, dev_t* device,
+                        ino_t* inode) {
+    sockaddr_un address;
+    if (!MakeAddress(path, &address))
+        return -1;
+    // Two servers starting at once must not both take over the same stale file: the check,
+    // unlink and bind run under a lock on a file beside the socket.
+    const std::string lockPath = path + ".lock";
+    const int lock = open(lockPath.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600);
+    if (lock >= 0)
+        while (flock(lock, LOCK_EX) != 0 && errno == EINTR) {
+        }
+    auto fail = [&](int descriptor) {
+        CloseDescriptor(descriptor);
+        CloseDescriptor(lock);
+        return -1;
+    };
+
+    struct stat status;
+    if (lstat(path.c_str(), &status) == 0) {
+        if (!S_ISSOCK(status.st_mode)) {
+            AppLog("message port %s: %s exists and is not a socket", portName.c_str(),
+                   path.c_str());
+            return fail(-1);
+        }
+        const int probe = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
+        if (probe < 0) {
+            AppLog("message port %s: socket: %s", portName.c_str(), ErrorText(errno).c_str());
+            return fail(-1);
+        }
+        const int result =
+            connect(probe, reinterpret_cast<const sockaddr*>(&address), sizeof address);
+        const int error = errno;
+        CloseDescriptor(probe);
+        if (result == 0 || error == EAGAIN || error == EINPROGRESS) {
+            AppLog("message port %s: the name is taken by a running server", portName.c_str());
+            return fail(-1);
+        }
+        if (error != ECONNREFUSED) {
+            AppLog("message port %s: cannot check %s: %s", portName.c_str(), path.c_str(),
+                   ErrorText(error).c_str());
+            return fail(-1);
+        }
+        // Nothing listens: a stale file left by a server that ended without removing it.
+        if (unlink(path.c_str()) != 0 && errno != ENOENT) {
+            AppLog("message port %s: cannot remove the stale socket %s: %s", portName.c_str(),
+                   path.c_str(), ErrorText(errno).c_str());
+            return fail(-1);
+        }
+    } else if (errno != ENOENT) {
+        AppLog("message port %s: cannot check %s: %s", portName.c_str(), path.c_str(),
+               ErrorText(errno).c_str());
+        return fail(-1);
+    }
+
+    const int descriptor = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
+    if (descriptor < 0) {
+        AppLog("message port %s: socket: %s", portName.c_str(), ErrorText(errno).c_str());
+        return fail(-1);
+    }
+    if (bind(descriptor, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
+        if (errno == EADDRINUSE)
+            AppLog("message port %s: the name is taken by a running server", portName.c_str());
+        else
+            AppLog("message port %s: cannot bind %s: %s", portName.c_str(), path.c_str(),
+                   ErrorText(errno).c_str());
+        return fail(descriptor);
+    }
+    chmod(path.c_str(), 0600);
+    if (listen(descriptor, SOMAXCONN) != 0 || stat(path.c_str(), &status) != 0) {
+        AppLog("message port %s: cannot listen on %s: %s", portName.c_str(), path.c_str(),
+               ErrorText(errno).c_str());
+        unlink(path.c_str());
+        return fail(descriptor);
+    }
+    *device = status.st_dev;
+    *inode = status.st_ino;
+    CloseDescriptor(lock);
+    return descriptor;
+}
+
+} // namespace
+
+// ---------------------------------------------------------------------------------------------
+// The port object
+
+struct __CFMessagePort final : CFObject {
+    __CFMessagePort(CFStringRef portName, std::string portNameText, bool isRemote)
+        : CFObject(kMessagePortKind), name(static_cast<CFStringRef>(CFRetain(portName))),
+          nameText(std::move(portNameText)), remote(isRemote) {}
+    ~__CFMessagePort() override;
+
+    bool Equals(const CFObject& other) const override { return this == &other; }
+    CFHashCode Hash() const override { return CFHashCode(reinterpret_cast<uintptr_t>(this) >> 4); }
+    std::string Description() const override {
+        return glyphwell::runtime::DescriptionPrefix(this, "CFMessagePort") +
+               "{name = " + nameText + (remote ? ", remote" : ", local") +
+               (valid ? ", valid}" : ", invalid}");
+    }
+
+    const CFStringRef name;
+    const std::string nameText;
+    const bool remote;
+    std::atomic<bool> valid{true};
+
+    // Local ports: used on the run loop's thread only.
+    int listenDescriptor = -1;
+    int spareDescriptor = -1; ///< given up to accept and refuse a client when out of descriptors
+    bool ownsSocketFile = false;
+    std::string socketPath;
+    dev_t socketDevice = 0;
+    ino_t socketInode = 0;
+    CFMessagePortCallBack callout = nullptr;
+    CFMessagePortContext context{};
+    RunLoopDriver* driver = nullptr;
+    __CFRunLoopSource* source = nullptr; ///< not retained: the source retains the port
+    std::map<int, ConnectionPtr> connections;
+    std::vector<uint8_t> readBuffer;
+
+    // Remote ports.
+    std::mutex requestMutex;    ///< one request at a time
+    std::mutex descriptorMutex; ///< guards `descriptor` against Invalidate on another thread
+    int descriptor = -1;
+    std::vector<uint8_t> receiveBuffer;
+
+    void Schedule(RunLoopDriver* newDriver);
+    void Cancel(RunLoopDriver* oldDriver);
+    void InvalidateLocal();
+    void InvalidateRemote();
+    void CloseRemoteDescriptor();
+    SInt32 Exchange(SInt32 msgid, CFDataRef data, CFTimeInterval sendTimeout,
+                    CFTimeInterval receiveTimeout, CFDataRef* returnData);
+
+private:
+    void ShutDownLocal();
+    void RemoveSocketFile();
+    void UpdateWatch(const ConnectionPtr& connection);
+    void OnListenEvent();
+    void OnConnectionEvent(const std::weak_ptr<Connection>& weak, bool readable, bool writable);
+    void ReadAvailable(const ConnectionPtr& connection);
+    void ServeQueued(const ConnectionPtr& connection);
+    CFDataRef Dispatch(const ConnectionPtr& connection, glyphwell::port::Frame& frame);
+    void StartReply(const ConnectionPtr& connection, CFDataRef reply);
+    void FlushReply(const ConnectionPtr& connection);
+    void PeerGone(const ConnectionPtr& connection);
+    void Drop(const ConnectionPtr& connection);
+    void CloseConnection(ConnectionPtr connection);
+
+    int RemoteDescriptor();
+    int Reconnect();
+};
+
+namespace {
+
+/// Keeps a port alive while a method of it runs code that may release it.
+class PortHold {
+public:
+    explicit PortHold(__CFMessagePort* port) : port_(port) { CFRetain(port_); }
+    ~PortHold() { CFRelease(port_); }
+    PortHold(const PortHold&) = delete;
+    PortHold& operator=(const PortHold&) = delete;
+
+private:
+    __CFMessagePort* port_;
+};
+
+__CFMessagePort* AsPort(CFTypeRef port) {
+    return glyphwell::runtime::AsMutable<__CFMessagePort>(port, kMessagePortKind);
+}
+
+/// The run-loop source of a local port.
+struct MessagePortSource final : __CFRunLoopSource {
+    MessagePortSource(__CFMessagePort* servedPort, CFIndex sourceOrder)
+        : __CFRunLoopSource(sourceOrder), port(servedPort) {
+        CFRetain(port);
+        port->source = this;
+    }
+    ~MessagePortSource() override {
+        port->source = nullptr;
+        CFRelease(port);
+    }
+
+    std::string Description() const override {
+        return glyphwell::runtime::DescriptionPrefix(this, "CFRunLoopSource") +
+               "{message port = " + port->nameText + "}";
+    }
+    void Schedule(RunLoopDriver* driver) override { port->Schedule(driver); }
+    void Cancel(RunLoopDriver* driver) override { port->Cancel(driver); }
+
+    __CFMessagePort* const port;
+};
+
+} // namespace
+
+__CFMessagePort::~__CFMessagePort() {
+    if (remote) {
+        CloseDescriptor(descriptor);
+    } else {
+        // A port with a request in its callback is retained by that dispatch, and a scheduled
+        // port by its source: nothing of this port is still running or watched here.
+        if (valid.exchange(false))
+            ShutDownLocal();
+        CloseDescriptor(spareDescriptor);
+        if (context.release && context.info)
+            context.release(context.info);
+    }
+    CFRelease(name);
+}
+
+// --- local ports: scheduling ----------------------------------------------------------------
+
+void __CFMessagePort::Schedule(RunLoopDriver* newDriver) {
+    if (!valid || remote || !newDriver)
+        return;
+    driver = newDriver;
+    driver->Watch(listenDescriptor, true, false, [this](bool, bool) { OnListenEvent(); });
+    for (const auto& [connectionDescriptor, connection] : connections)
+        UpdateWatch(connection);
+}
+
+void __CFMessagePort::Cancel(RunLoopDriver* oldDriver) {
+    if (oldDriver && oldDriver == driver) {
+        if (listenDescriptor >= 0)
+            driver->Unwatch(listenDescriptor);
+        for (const auto& [connectionDescriptor, connection] : connections)
+            driver->Unwatch(connectionDescriptor);
+    }
+    driver = nullptr;
+}
+
+void __CFMessagePort::UpdateWatch(const ConnectionPtr& connection) {
+    if (!driver || connection->descriptor < 0)
+        return;
+    const bool read = !connection->readPaused;
+    const bool write = connection->writeBlocked;
+    std::weak_ptr<Connection> weak = connection;
+    driver->Watch(connection->descriptor, read, write, [this, weak](bool readable, bool writable) {
+        OnConnectionEvent(weak, readable, writable);
+    });
+}
+
+// --- local ports: connections ---------------------------------------------------------------
+
+void __CFMessagePort::OnListenEvent() {
+    PortHold hold(this);
+    for (int accepted = 0; accepted < kAcceptsPerEvent && valid; ++accepted) {
+        int client = accept4(listenDescriptor, nullptr, nullptr, SOCK_NONBLOCK | SOCK_CLOEXEC);
+        if (client < 0) {
+            const int error = errno;
+            if (error == EINTR || error == ECONNABORTED)
+                continue;
+            if (error == EAGAIN || error == EWOULDBLOCK)
+                return;
+            if ((error == EMFILE || error == ENFILE) && spareDescriptor >= 0) {
+                // Out of descriptors: the waiting client would keep the socket readable and the
+                // loop spinning. Free the spare one to accept and refuse it.
+                CloseDescriptor(spareDescriptor);
+                client = accept4(listenDescriptor, nullptr, nullptr, SOCK_CLOEXEC);
+                CloseDescriptor(client);
+                spareDescriptor = open("/dev/null", O_RDONLY | O_CLOEXEC);
+                AppLog("message port %s: out of file descriptors; refused a connection",
+                       nameText.c_str());
+                continue;
+            }
+            AppLog("message port %s: cannot accept a connection: %s", nameText.c_str(),
+                   ErrorText(error).c_str());
+            return;
+        }
+        ucred credentials{};
+        socklen_t size = sizeof credentials;
+        if (getsockopt(client, SOL_SOCKET, SO_PEERCRED, &credentials, &size) != 0) {
+            AppLog("message port %s: cannot identify a client: %s", nameText.c_str(),
+                   ErrorText(errno).c_str());
+            CloseDescriptor(client);
+            continue;
+        }
+        if (credentials.uid != geteuid()) {
+            AppLog("message port %s: refused a connection from uid %u", nameText.c_str(),
+                   unsigned(credentials.uid));
+            CloseDescriptor(client);
+            continue;
+        }
+        auto connection = std::make_shared<Connection>();
+        connection->descriptor = client;
+        connection->processID = credentials.pid;
+        connections[client] = connection;
+        UpdateWatch(connection);
+    }
+}
+
+void __CFMessagePort::OnConnectionEvent(const std::weak_ptr<Connection>& weak, bool readable,
+                                        bool writable) {
+    ConnectionPtr connection = weak.lock();
+    if (!connection || connection->descriptor < 0)
+        return;
+    PortHold hold(this);
+    if (writable && connection->writing)
+        FlushReply(connection);
+    if (readable && connection->descriptor >= 0 && !connection->readPaused)
+        ReadAvailable(connection);
+    ServeQueued(connection);
+}
+
+void __CFMessagePort::ReadAvailable(const ConnectionPtr& connection) {
+    for (int reads = 0; reads < kReadsPerEvent; ++reads) {
+        if ((connection->busy || connection->writing) &&
+            connection->input.BufferedBytes() >= kReadAheadLimit) {
+            connection->readPaused = true;
+            UpdateWatch(connection);
+            return;
+        }
+        const ssize_t got =
+            recv(connection->descriptor, readBuffer.data(), readBuffer.size(), MSG_DONTWAIT);
+        if (got > 0) {
+            if (!connection->input.Append(readBuffer.data(), size_t(got))) {
+                AppLog("message port %s: closed a connection whose request announced %u bytes "
+                       "(the limit is %u)",
+                       nameText.c_str(), unsigned(connection->input.RefusedLength()),
+                       unsigned(kMessagePortMaxFrame));
+                Drop(connection);
+                return;
+            }
+            continue;
+        }
+        if (got < 0 && errno == EINTR)
+            continue;
+        if (got < 0 && (errno == EAGAIN || errno == EWOULDBLOCK))
+            return;
+        // End of stream, a reset, or a failed read: the client is gone.
+        PeerGone(connection);
+        return;
+    }
+}
+
+void __CFMessagePort::ServeQueued(const ConnectionPtr& connection) {
+    while (valid && !connection->busy && !connection->writing && connection->input.HasFrame()) {
+        glyphwell::port::Frame frame = connection->input.TakeFrame();
+        CFDataRef reply = Dispatch(connection, frame);
+        if (connection->descriptor < 0 || !valid) {
+            // Withdrawn meanwhile: nobody reads this reply.
+            if (reply)
+                CFRelease(reply);
+            continue;
+        }
+        StartReply(connection, reply);
+    }
+    if (connection->readPaused && !connection->busy && !connection->writing &&
+        connection->descriptor >= 0) {
+        connection->readPaused = false;
+        UpdateWatch(connection);
+    }
+}
+
+CFDataRef __CFMessagePort::Dispatch(const ConnectionPtr& connection,
+                                    glyphwell::port::Frame& frame) {
+    auto request = std::make_shared<RequestState>(connection->processID, connection->peerGone);
+    connection->busy = true;
+    connection->current = request;
+    CFDataRef data =
+        CFDataCreate(kCFAllocatorDefault, frame.body.data(), CFIndex(frame.body.size()));
+    frame.body = {};
+    currentRequests.push_back(request);
+    CFDataRef reply = callout ? callout(this, frame.msgid, data, context.info) : nullptr;
+    currentRequests.pop_back();
+    CFRelease(data);
+    connection->busy = false;
+    connection->current.reset();
+    return reply;
+}
+
+void __CFMessagePort::StartReply(const ConnectionPtr& connection, CFDataRef reply) {
+    const CFIndex length = reply ? CFDataGetLength(reply) : 0;
+    if (length > CFIndex(kMessagePortMaxFrame)) {
+        AppLog("message port %s: a reply of %ld bytes is over the limit; closing its connection",
+               nameText.c_str(), long(length));
+        CFRelease(reply);
+        Drop(connection);
+        return;
+    }
+    connection->reply = reply;
+    glyphwell::port::StoreBigEndian32(uint32_t(length), connection->replyHeader);
+    connection->replyWritten = 0;
+    connection->replyTotal = glyphwell::port::kReplyHeaderSize + size_t(length);
+    connection->writing = true;
+    FlushReply(connection);
+}
+
+void __CFMessagePort::FlushReply(const ConnectionPtr& connection) {
+    constexpr size_t headerSize = glyphwell::port::kReplyHeaderSize;
+    while (connection->replyWritten < connection->replyTotal) {
+        iovec pieces[2];
+        int count = 0;
+        const size_t written = connection->replyWritten;
+        if (written < headerSize)
+            pieces[count++] = {connection->replyHeader + written, headerSize - written};
+        const size_t bodyLength = connection->replyTotal - headerSize;
+        const size_t bodyWritten = written > headerSize ? written - headerSize : 0;
+        if (bodyWritten < bodyLength)
+            pieces[count++] = {const_cast<UInt8*>(CFDataGetBytePtr(connection->reply)) +
+                                   bodyWritten,
+                               bodyLength - bodyWritten};
+        msghdr message{};
+        message.msg_iov = pieces;
+        message.msg_iovlen = size_t(count);
+        const ssize_t sent = sendmsg(connection->descriptor, &message, MSG_NOSIGNAL | MSG_DONTWAIT);
+        if (sent > 0) {
+            connection->replyWritten += size_t(sent);
+            continue;
+        }
+        if (sent < 0 && errno == EINTR)
+            continue;
+        if (sent == 0 || errno == EAGAIN || errno == EWOULDBLOCK) {
+            if (!connection->writeBlocked) {
+                connection->writeBlocked = true;
+                UpdateWatch(connection);
+            }
+            return;
+        }
+        if (errno == EPIPE || errno == ECONNRESET) {
+            PeerGone(connection);
+        } else {
+            AppLog("message port %s: cannot send a reply: %s", nameText.c_str(),
+                   ErrorText(errno).c_str());
+            Drop(connection);
+        }
+        return;
+    }
+    if (connection->reply)
+        CFRelease(connection->reply);
+    connection->reply = nullptr;
+    connection->writing = false;
+    if (connection->writeBlocked) {
+        connection->writeBlocked = false;
+        UpdateWatch(connection);
+    }
+}
+
+void __CFMessagePort::PeerGone(const ConnectionPtr& connection) {
+    if (connection->input.IsMidFrame())
+        AppLog("message port %s: a client disconnected in the middle of a request",
+               nameText.c_str());
+    CloseConnection(connection);
+    connection->peerGone = true;
+    if (connection->current)
+        connection->current->Withdraw();
+}
+
+void __CFMessagePort::Drop(const ConnectionPtr& connection) {
+    connection->input.Clear();
+    CloseConnection(connection);
+    connection->peerGone = true;
+    if (connection->current)
+        connection->current->Withdraw();
+}
+
+void __CFMessagePort::CloseConnection(ConnectionPtr connection) {
+    // `connection` is a copy: erasing the map's entry must not destroy it under us.
+    if (connection->descriptor < 0)
+        return;
+    if (driver)
+        driver->Unwatch(connection->descriptor);
+    connections.erase(connection->descriptor);
+    CloseDescriptor(connection->descriptor);
+    connection->descriptor = -1;
+    if (connection->reply)
+        CFRelease(connection->reply);
+    connection->reply = nullptr;
+    connection->writing = false;
+    connection->writeBlocked = false;
+}
+
+// --- local ports: invalidation --------------------------------------------------------------
+
+void __CFMessagePort::RemoveSocketFile() {
+    if (!ownsSocketFile)
+        return;
+    ownsSocketFile = false;
+    struct stat status;
+    // Only the file this port made: another server may have taken the name over since.
+    if (lstat(socketPath.c_str(), &status) == 0 && status.st_dev == socketDevice &&
+        status.st_ino == socketInode)
+        unlink(socketPath.c_str());
+}
+
+void __CFMessagePort::ShutDownLocal() {
+    if (driver && listenDescriptor >= 0)
+        driver->Unwatch(listenDescriptor);
+    CloseDescriptor(listenDescriptor);
+    listenDescriptor = -1;
+    RemoveSocketFile();
+    std::vector<std::shared_ptr<RequestState>> pending;
+    std::vector<ConnectionPtr> open;
+    for (const auto& [connectionDescriptor, connection] : connections)
+        open.push_back(connection);
+    for (const ConnectionPtr& connection : open) {
+        if (connection->current)
+            pending.push_back(connection->current);
+        connection->input.Clear();
+        CloseConnection(connection);
+        connection->peerGone = true;
+    }
+    // Handlers last: they may call back into the port.
+    for (const auto& request : pending)
+        request->Withdraw();
+}
+
+void __CFMessagePort::InvalidateLocal() {
+    if (!valid.exchange(false))
+        return;
+    PortHold hold(this);
+    ShutDownLocal();
+    if (source) {
+        source->valid = false;
+        if (source->loop)
+            CFRunLoopRemoveSource(source->loop, source, kCFRunLoopCommonModes);
+    }
+    driver = nullptr;
+}
+
+// --- remote ports ---------------------------------------------------------------------------
+
+int __CFMessagePort::RemoteDescriptor() {
+    std::lock_guard<std::mutex> lock(descriptorMutex);
+    return descriptor;
+}
+
+void __CFMessagePort::CloseRemoteDescriptor() {
+    std::lock_guard<std::mutex> lock(descriptorMutex);
+    CloseDescriptor(descriptor);
+    descriptor = -1;
+}
+
+int __CFMessagePort::Reconnect() {
+    const int connected = ConnectTo(socketPath);
+    std::lock_guard<std::mutex> lock(descriptorMutex);
+    CloseDescriptor(descriptor);
+    descriptor = -1;
+    if (connected >= 0 && !valid) {
+        CloseDescriptor(connected);
+        return -1;
+    }
+    descriptor = connected;
+    return connected;
+}
+
+void __CFMessagePort::InvalidateRemote() {
+    if (!valid.exchange(false))
+        return;
+    {
+        // Wake a request waiting on another thread; it closes the descriptor itself.
+        std::lock_guard<std::mutex> lock(descriptorMutex);
+        if (descriptor >= 0)
+            shutdown(descriptor, SHUT_RDWR);
+    }
+    std::unique_lock<std::mutex> idle(requestMutex, std::try_to_lock);
+    if (idle.owns_lock())
+        CloseRemoteDescriptor();
+}
+
+namespace {
+
+enum class SendOutcome { Sent, Timeout, PeerClosed, Failed };
+
+SendOutcome SendFrame(int descriptor, const uint8_t* header, const UInt8* body, size_t bodyLength,
+                      const Deadline& deadline, bool* sentAny) {
+    constexpr size_t headerSize = glyphwell::port::kRequestHeaderSize;
+    const size_t total = headerSize + bodyLength;
+    size_t done = 0;
+    while (done < total) {
+        iovec pieces[2];
+        int count = 0;
+        if (done < headerSize)
+            pieces[count++] = {const_cast<uint8_t*>(header) + done, headerSize - done};
+        const size_t bodyDone = done > headerSize ? done - headerSize : 0;
+        if (bodyDone < bodyLength)
+            pieces[count++] = {const_cast<UInt8*>(body) + bodyDone, bodyLength - bodyDone};
+        msghdr message{};
+        message.msg_iov = pieces;
+        message.msg_iovlen = size_t(count);
+        const ssize_t sent = sendmsg(descriptor, &message, MSG_NOSIGNAL | MSG_DONTWAIT);
+        if (sent > 0) {
+            done += size_t(sent);
+            *sentAny = true;
+            continue;
+        }
+        if (sent < 0 && errno == EINTR)
+            continue;
+        if (sent == 0 || errno == EAGAIN || errno == EWOULDBLOCK) {
+            const int ready = WaitFor(descriptor, POLLOUT, deadline);
+            if (ready == 0)
+                return SendOutcome::Timeout;
+            if (ready < 0)
+                return SendOutcome::Failed;
+            continue;
+        }
+        return errno == EPIPE || errno == ECONNRESET ? SendOutcome::PeerClosed
+                                                     : SendOutcome::Failed;
+    }
+    return SendOutcome::Sent;
+}
+
+/// True when an idle connection can carry a request: nothing to read and no hang-up (a server
+/// that ended, or dropped the connection, leaves it readable).
+bool IsUsableIdleConnection(int descriptor) {
+    pollfd entry{descriptor, POLLIN, 0};
+    int count;
+    while ((count = poll(&entry, 1, 0)) < 0 && errno == EINTR) {
+    }
+    return count == 0;
+}
+
+} // namespace
+
+SInt32 __CFMessagePort::Exchange(SInt32 msgid, CFDataRef data, CFTimeInterval sendTimeout,
+                                 CFTimeInterval receiveTimeout, CFDataRef* returnData) {
+    const size_t bodyLength = data ? size_t(CFDataGetLength(data)) : 0;
+    const UInt8* body = data && bodyLength ? CFDataGetBytePtr(data) : nullptr;
+    uint8_t header[glyphwell::port::kRequestHeaderSize];
+    glyphwell::port::StoreBigEndian32(uint32_t(msgid), header);
+    glyphwell::port::StoreBigEndian32(uint32_t(bodyLength), header + 4);
+
+    const Deadline sendDeadline(sendTimeout);
+    int connection = RemoteDescriptor();
+    if (connection >= 0 && !IsUsableIdleConnection(connection)) {
+        CloseRemoteDescriptor();
+        connection = -1;
+    }
+    for (int attempt = 0;; ++attempt) {
+        bool fresh = false;
+        if (connection < 0) {
+            connection = Reconnect();
+            if (connection < 0)
+                return valid ? kCFMessagePortTransportError : kCFMessagePortIsInvalid;
+            fresh = true;
+        }
+        bool sentAny = false;
+        const SendOutcome outcome =
+            SendFrame(connection, header, body, bodyLength, sendDeadline, &sentAny);
+        if (outcome == SendOutcome::Sent)
+            break;
+        CloseRemoteDescriptor();
+        connection = -1;
+        if (!valid)
+            return kCFMessagePortIsInvalid;
+        // A kept connection that the server had dropped in the meantime: try a new one, once.
+        if (outcome == SendOutcome::PeerClosed && !sentAny && !fresh && attempt == 0)
+            continue;
+        switch (outcome) {
+        case SendOutcome::Timeout:
+            return kCFMessagePortSendTimeout;
+        case SendOutcome::PeerClosed:
+            return kCFMessagePortBecameInvalidError;
+        default:
+            return kCFMessagePortTransportError;
+        }
+    }
+
+    if (!returnData) {
+        // No one will read the reply: give the connection up so that it is never taken for
+        // the reply of a later request.
+        CloseRemoteDescriptor();
+        return kCFMessagePortSuccess;
+    }
+
+    const Deadline receiveDeadline(receiveTimeout);
+    FrameAssembler reply(FrameAssembler::Kind::Reply, kMessagePortMaxFrame);
+    if (receiveBuffer.empty())
+        receiveBuffer.resize(kReadChunk);
+    for (;;) {
+        const int ready = WaitFor(connection, POLLIN, receiveDeadline);
+        if (!valid) {
+            CloseRemoteDescriptor();
+            return kCFMessagePortIsInvalid;
+        }
+        if (ready == 0) {
+            CloseRemoteDescriptor();
+            return kCFMessagePortReceiveTimeout;
+        }
+        if (ready < 0) {
+            CloseRemoteDescriptor();
+            return kCFMessagePortTransportError;
+        }
+        const ssize_t got =
+            recv(connection, receiveBuffer.data(), receiveBuffer.size(), MSG_DONTWAIT);
+        if (got > 0) {
+            if (!reply.Append(receiveBuffer.data(), size_t(got))) {
+                CloseRemoteDescriptor();
+                return kCFMessagePortTransportError;
+            }
+            if (reply.HasFrame())
+                break;
+            continue;
+        }
+        if (got < 0 && (errno == EINTR || errno == EAGAIN || errno == EWOULDBLOCK))
+            continue;
+        const bool closedByServer = got == 0 || errno == ECONNRESET;
+        CloseRemoteDescriptor();
+        if (!valid)
+            return kCFMessagePortIsInvalid;
+        return closedByServer ? kCFMessagePortBecameInvalidError : kCFMessagePortTransportError;
+    }
+    glyphwell::port::Frame frame = reply.TakeFrame();
+    if (reply.BufferedBytes() != 0)
+        CloseRemoteDescriptor(); // more than one reply: the connection is out of step
+    *returnData = CFDataCreate(kCFAllocatorDefault, frame.body.data(), CFIndex(frame.body.size()));
+    return kCFMessagePortSuccess;
+}
+
+// ---------------------------------------------------------------------------------------------
+// Public operations
+
+CFTypeID CFMessagePortGetTypeID() {
+    return kMessagePortKind;
+}
+
+CFMessagePortRef CFMessagePortCreateLocal(CFAllocatorRef, CFStringRef name,
+                                          CFMessagePortCallBack callout,
+                                          CFMessagePortContext* context, Boolean* shouldFreeInfo) {
+    if (shouldFreeInfo)
+        *shouldFreeInfo = true;
+    GW_ASSERT(name != nullptr);
+    if (!name)
+        return nullptr;
+    const std::string text = UTF8(name);
+    const std::string path = glyphwell::port::SocketPathForName(text);
+
+    int listening = TakeActivationSocket(text);
+    bool ownsFile = false;
+    dev_t device = 0;
+    ino_t inode = 0;
+    if (listening < 0) {
+        if (path.empty()) {
+            AppLog("message port %s: no safe socket path for this name", text.c_str());
+            return nullptr;
+        }
+        listening = BindListeningSocket(text, path, &device, &inode);
+        if (listening < 0)
+            return nullptr;
+        ownsFile = true;
+    }
+
+    auto* port = new __CFMessagePort(name, text, false);
+    port->listenDescriptor = listening;
+    port->spareDescriptor = open("/dev/null", O_RDONLY | O_CLOEXEC);
+    port->ownsSocketFile = ownsFile;
+    port->socketPath = path;
+    port->socketDevice = device;
+    port->socketInode = inode;
+    port->callout = callout;
+    if (context) {
+        port->context = *context;
+        if (context->retain && context->info)
+            port->context.info = const_cast<void*>(context->retain(context->info));
+    }
+    port->readBuffer.resize(kReadChunk);
+    if (shouldFreeInfo)
+        *shouldFreeInfo = false;
+    return port;
+}
+
+CFMessagePortRef CFMessagePortCreateRemote(CFAllocatorRef, CFStringRef name) {
+    GW_ASSERT(name != nullptr);
+    if (!name)
+        return nullptr;
+    const std::string text = UTF8(name);
+    const std::string path = glyphwell::port::SocketPathForName(text);
+    if (path.empty())
+        return nullptr;
+    const int connection = ConnectTo(path);
+    if (connection < 0)
+        return nullptr;
+    auto* port = new __CFMessagePort(name, text, true);
+    port->socketPath = path;
+    port->descriptor = connection;
+    return port;
+}
+
+CFRunLoopSourceRef CFMessagePortCreateRunLoopSource(CFAllocatorRef, CFMessagePortRef local,
+                                                    CFIndex order) {
+    __CFMessagePort* port = AsPort(local);
+    GW_ASSERT(port != nullptr);
+    if (!port || port->remote || !port->valid)
+        return nullptr;
+    if (port->source) {
+        CFRetain(port->source);
+        return port->source;
+    }
+    return new MessagePortSource(port, order);
+}
+
+SInt32 CFMessagePortSendRequest(CFMessagePortRef remote, SInt32 msgid, CFDataRef data,
+                                CFTimeInterval sendTimeout, CFTimeInterval receiveTimeout,
+                                CFStringRef, CFDataRef* returnData) {
+    if (returnData)
+        *returnData = nullptr;
+    __CFMessagePort* port = AsPort(remote);
+    if (!port || !port->remote || !port->valid)
+        return kCFMessagePortIsInvalid;
+    if (data && CFDataGetLength(data) > CFIndex(kMessagePortMaxFrame))
+        return kCFMessagePortTransportError;
+    PortHold hold(port);
+    std::lock_guard<std::mutex> lock(port->requestMutex);
+    if (!port->valid)
+        return kCFMessagePortIsInvalid;
+    const SInt32 result = port->Exchange(msgid, data, sendTimeout, receiveTimeout, returnData);
+    if (!port->valid)
+        port->CloseRemoteDescriptor(); // what an Invalidate during the request left open
+    return result;
+}
+
+Boolean CFMessagePortIsValid(CFMessagePortRef port) {
+    const __CFMessagePort* object = AsPort(port);
+    return object && object->valid;
+}
+
+void CFMessagePortInvalidate(CFMessagePortRef port) {
+    __CFMessagePort* object = AsPort(port);
+    if (!object)
+        return;
+    if (object->remote)
+        object->InvalidateRemote();
+    else
+        object->InvalidateLocal();
+}
+
+Boolean CFMessagePortIsRemote(CFMessagePortRef port) {
+    const __CFMessagePort* object = AsPort(port);
+    return object && object->remote;
+}
+
+CFStringRef CFMessagePortGetName(CFMessagePortRef port) {
+    const __CFMessagePort* object = AsPort(port);
+    return object ? object->name : nullptr;
+}
+
+namespace glyphwell::port {
+
+std::string SocketPathForName(const std::string& name) {
+    if (name.empty() || name == "." || name == ".." || name.find('/') != std::string::npos ||
+        name.find('\0') != std::string::npos)
+        return {};
+    std::string directory;
+    const char* runtimeDirectory = getenv("XDG_RUNTIME_DIR");
+    if (runtimeDirectory && runtimeDirectory[0] == '/') {
+        directory = runtimeDirectory;
+        while (directory.size() > 1 && directory.back() == '/')
+            directory.pop_back();
+    } else {
+        const uid_t user = geteuid();
+        directory = "/tmp/glyphwell-" + std::to_string(user);
+        if (mkdir(directory.c_str(), 0700) != 0 && errno != EEXIST)
+            return {};
+        struct stat status;
+        if (lstat(directory.c_str(), &status) != 0 || !S_ISDIR(status.st_mode) ||
+            status.st_uid != user || (status.st_mode & 077) != 0)
+            return {};
+    }
+    std::string path = directory == "/" ? "/" + name : directory + "/" + name;
+    if (path.size() >= sizeof(sockaddr_un::sun_path))
+        return {};
+    return path;
+}
+
+std::shared_ptr<PendingRequest> CurrentRequest() {
+    return currentRequests.empty() ? nullptr : currentRequests.back();
+}
+
+} // namespace glyphwell::port

@@ -1,0 +1,80 @@
+// The message port's frames on the socket (internal to platform/). Requests are `int32 msgid,
+// uint32 length, length bytes`; replies `uint32 length, length bytes`; integers big-endian.
+//
+// FrameAssembler turns bytes received in pieces of any size back into whole frames. It never
+// trusts a length before checking it against its cap, and it allocates only for bytes that have
+// actually arrived, so a header announcing a large body costs nothing until the body comes.
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <deque>
+#include <vector>
+
+namespace glyphwell::port {
+
+inline constexpr size_t kRequestHeaderSize = 8;
+inline constexpr size_t kReplyHeaderSize = 4;
+
+inline void StoreBigEndian32(uint32_t value, uint8_t* out) {
+    out[0] = uint8_t(value >> 24);
+    out[1] = uint8_t(value >> 16);
+    out[2] = uint8_t(value >> 8);
+    out[3] = uint8_t(value);
+}
+
+inline uint32_t LoadBigEndian32(const uint8_t* in) {
+    return uint32_t(in[0]) << 24 | uint32_t(in[1]) << 16 | uint32_t(in[2]) << 8 | uint32_t(in[3]);
+}
+
+/// One whole frame. `msgid` is 0 for replies.
+struct Frame {
+    int32_t msgid = 0;
+    std::vector<uint8_t> body;
+};
+
+/// Reassembles request or reply frames from a byte stream.
+class FrameAssembler {
+public:
+    enum class Kind { Request, Reply };
+
+    /// Frames whose body is longer than `maxBody` are refused.
+    FrameAssembler(Kind kind, uint32_t maxBody);
+
+    /// Takes `length` bytes of the stream. Returns false when a frame announces a body longer
+    /// than the cap: the stream is then broken for good, everything held is dropped, and every
+    /// later call returns false without keeping anything.
+    bool Append(const uint8_t* bytes, size_t length);
+
+    bool HasFrame() const { return !frames_.empty(); }
+    /// Removes and returns the oldest whole frame. Call only when HasFrame().
+    Frame TakeFrame();
+
+    /// True when bytes of a frame that is not whole yet are held.
+    bool IsMidFrame() const { return headerFill_ != 0; }
+    /// Bytes held: whole frames not yet taken plus the frame in progress.
+    size_t BufferedBytes() const { return buffered_; }
+    bool Failed() const { return failed_; }
+    /// The body length the refused frame announced (valid once Failed()).
+    uint32_t RefusedLength() const { return refusedLength_; }
+    /// Drops everything held; a failed assembler stays failed.
+    void Clear();
+
+private:
+    size_t HeaderSize() const {
+        return kind_ == Kind::Request ? kRequestHeaderSize : kReplyHeaderSize;
+    }
+
+    Kind kind_;
+    uint32_t maxBody_;
+    uint8_t header_[kRequestHeaderSize] = {};
+    size_t headerFill_ = 0; ///< header bytes of the frame in progress; 0 between frames
+    uint32_t bodyLength_ = 0;
+    Frame current_;
+    std::deque<Frame> frames_;
+    size_t buffered_ = 0;
+    bool failed_ = false;
+    uint32_t refusedLength_ = 0;
+};
+
+} // namespace glyphwell::port
