@@ -1,8 +1,12 @@
 // Wrappers over data (byte buffer) values: TCFBlob, a view that never owns its reference, and
-// TCFData, which owns one count. Both read a null data reference as zero bytes.
+// TCFData, which owns one count. Both read a null data reference as zero bytes. A TCFData can
+// also be read from a whole file, and a TCFBlob written to one.
 #pragma once
 
+#include <cstddef>
+
 #include "platform/CFData.h"
+#include "platform/CFURL.h"
 
 /// A view of a data value: does not retain, does not release.
 class TCFBlob {
@@ -20,6 +24,12 @@ public:
     static const UInt8* GetDataPtr(CFDataRef data) {
         return data ? CFDataGetBytePtr(data) : nullptr;
     }
+    /// Writes the bytes to the file of `url` (its absolute POSIX path), created with mode 0644
+    /// (before the process's file-creation mask) or truncated. All bytes are written (a short
+    /// write is continued, an interrupted one retried). Returns 0 on success, else the errno
+    /// value of the failing open, write or close; EINVAL for a null URL or one without a POSIX
+    /// path.
+    int WriteToURL(CFURLRef url) const;
 
 protected:
     CFDataRef data_;
@@ -30,6 +40,14 @@ class TCFData : public TCFBlob {
 public:
     /// Retains `data` (null-safe).
     explicit TCFData(CFDataRef data);
+    /// Holds null.
+    explicit TCFData(std::nullptr_t) : TCFBlob(nullptr) {}
+    /// Reads the whole file of `url` (its absolute POSIX path) into a new data value. Holds null
+    /// when the URL is null, the item is not a regular file (its size property is absent, see
+    /// kCFURLFileSizeKey), the file is empty or cannot be opened or read, or its size cannot be
+    /// held in memory. The size is taken before reading: a file that shrank meanwhile gives the
+    /// bytes it still has, one that grew gives its first size's worth of bytes.
+    explicit TCFData(CFURLRef url);
     TCFData(const TCFData&) = delete;
     TCFData& operator=(const TCFData&) = delete;
     /// Releases the held data (null-safe).

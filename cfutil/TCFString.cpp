@@ -2,12 +2,6 @@
 
 #include "cfutil/TCFRetained.h"
 
-CFStringRef CFString::CopyAsString(UInt32 code) {
-    const char bytes[5] = {static_cast<char>(code >> 24), static_cast<char>(code >> 16),
-                           static_cast<char>(code >> 8), static_cast<char>(code), '\0'};
-    return CFStringCreateWithCString(kCFAllocatorDefault, bytes, kCFStringEncodingMacRoman);
-}
-
 UniChar TCFStr::GetCharacterAtIndex(CFIndex index) const {
     return string_ ? CFStringGetCharacterAtIndex(string_, index) : 0;
 }

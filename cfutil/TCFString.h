@@ -3,16 +3,8 @@
 // reading operation treats a null string as empty (length 0, no match, false).
 #pragma once
 
+#include "cfutil/CFStringUtilities.h"
 #include "platform/CFString.h"
-
-namespace CFString {
-
-/// A new string of the four bytes of `code`, most significant first, read as a C string in Mac
-/// Roman (so it stops at the first zero byte): 0x74657874 gives "text". Returns a new reference;
-/// the caller releases it.
-CFStringRef CopyAsString(UInt32 code);
-
-} // namespace CFString
 
 /// A view of a string value: does not retain, does not release.
 class TCFStr {
@@ -44,6 +36,23 @@ public:
     /// A new string of the units of `range` (kept inside the string by the caller), or null for
     /// null. Returns a new reference; the caller releases it.
     CFStringRef CreateSubstring(CFRange range) const;
+
+    /// `path` with a leading tilde expanded: "~" and "~/x" name the current user's home
+    /// directory, "~name" and "~name/x" the home directory of user `name`, both as given by the
+    /// password database (never $HOME), without a trailing slash ("/" excepted). Everything after
+    /// the user part is kept as it is. A path that does not start with "~", or that names a user
+    /// without a home directory, is returned itself, retained (a null path yields null).
+    /// Returns a new reference (possibly to `path`); the caller releases it.
+    static CFStringRef CreateStringByExpandingTildeInPath(CFStringRef path);
+    /// The language identifier without its regional suffix, which starts at the first "_" or,
+    /// when there is none, at the first "-": en_US gives en, pt-BR gives pt, en-US_POSIX gives
+    /// en-US. Identifiers starting with "zh" keep their suffix. The held string itself,
+    /// retained, when nothing is cut; null for null. Returns a new reference; the caller
+    /// releases it.
+    CFStringRef CreateSubstringWithoutRegionalSuffix() const;
+    /// The process-wide shared string with the held string's text (TCFStringUniquer), or null
+    /// for null. Does not retain: the uniquer owns the result for the life of the process.
+    CFStringRef GetUniqueString() const;
 
 protected:
     CFStringRef string_;

@@ -1,0 +1,135 @@
+#include "cfutil/CFUserDirectories.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <cstdlib>
+#include <cstring>
+#include <pwd.h>
+#include <string_view>
+#include <unistd.h>
+
+#include "cfutil/CFStringUtilities.h"
+
+namespace {
+
+/// The home directory of `user` (the current user when null) from the password database; false
+/// when there is no entry or its home is not an absolute path.
+bool HomeDirectoryPath(const char* user, std::string& home) {
+    long suggested = sysconf(_SC_GETPW_R_SIZE_MAX);
+    std::vector<char> buffer(suggested > 0 ? size_t(suggested) : 4096);
+    passwd entry{};
+    passwd* found = nullptr;
+    for (;;) {
+        int error = user ? getpwnam_r(user, &entry, buffer.data(), buffer.size(), &found)
+                         : getpwuid_r(getuid(), &entry, buffer.data(), buffer.size(), &found);
+        if (error != ERANGE)
+            break;
+        if (buffer.size() >= (size_t(1) << 20))
+            return false; // no sane entry needs more; give up rather than grow forever
+        buffer.resize(buffer.size() * 2);
+    }
+    if (!found || !found->pw_dir || found->pw_dir[0] != '/')
+        return false;
+    home = found->pw_dir;
+    return true;
+}
+
+/// The value of the environment variable `name` when it is an absolute path.
+const char* AbsolutePathVariable(const char* name) {
+    const char* value = getenv(name);
+    return value && value[0] == '/' ? value : nullptr;
+}
+
+/// `home` joined with the relative path `subdirectory`, with exactly one slash between them.
+std::string InHome(std::string home, const char* subdirectory) {
+    if (home.empty() || home.back() != '/')
+        home += '/';
+    return home + subdirectory;
+}
+
+/// The path that `name` stands for; false when it has none.
+bool ConfigurationPath(confstr_path_t name, std::string& path) {
+    const char* value = nullptr;
+    std::string home;
+    switch (name) {
+    case kUserRuntimeDirectory:
+        value = AbsolutePathVariable("XDG_RUNTIME_DIR");
+        break;
+    case kUserCacheDirectory:
+        value = AbsolutePathVariable("XDG_CACHE_HOME");
+        if (!value) {
+            if (!HomeDirectoryPath(nullptr, home))
+                return false;
+            path = InHome(home, ".cache");
+            return true;
+        }
+        break;
+    case kUserTemporaryDirectory:
+        value = AbsolutePathVariable("TMPDIR");
+        if (!value)
+            value = "/tmp";
+        break;
+    }
+    if (!value)
+        return false;
+    path = value;
+    return true;
+}
+
+void RemoveTrailingSlashes(std::string& path) {
+    while (path.size() > 1 && path.back() == '/')
+        path.pop_back();
+}
+
+} // namespace
+
+CFURLRef CFCopyHomeDirectoryURLForUser(CFStringRef user) {
+    std::string name;
+    if (user &&
+        (!CFString::GetUTF8(user, name) || name.empty() || name.find('\0') != std::string::npos))
+        return nullptr;
+    std::string home;
+    if (!HomeDirectoryPath(user ? name.c_str() : nullptr, home))
+        return nullptr;
+    return CFURLCreateFromFileSystemRepresentation(kCFAllocatorDefault,
+                                                   reinterpret_cast<const UInt8*>(home.data()),
+                                                   CFIndex(home.size()), true);
+}
+
+size_t GetConfigurationPath(confstr_path_t name, char* buffer, size_t length) {
+    std::string path;
+    if (!ConfigurationPath(name, path))
+        return 0;
+    if (length > 0) {
+        size_t copied = std::min(path.size(), length - 1);
+        memcpy(buffer, path.data(), copied);
+        buffer[copied] = '\0';
+    }
+    return path.size() + 1;
+}
+
+std::vector<std::string> GetDataDirectories() {
+    std::vector<std::string> directories;
+    if (const char* dataHome = AbsolutePathVariable("XDG_DATA_HOME")) {
+        directories.emplace_back(dataHome);
+    } else {
+        std::string home;
+        if (HomeDirectoryPath(nullptr, home))
+            directories.push_back(InHome(home, ".local/share"));
+    }
+
+    const char* dataDirs = getenv("XDG_DATA_DIRS");
+    if (!dataDirs || !*dataDirs)
+        dataDirs = "/usr/local/share:/usr/share";
+    std::string_view list(dataDirs);
+    while (!list.empty()) {
+        size_t colon = list.find(':');
+        std::string_view entry = list.substr(0, colon);
+        if (!entry.empty() && entry[0] == '/')
+            directories.emplace_back(entry);
+        list = colon == std::string_view::npos ? std::string_view() : list.substr(colon + 1);
+    }
+    for (std::string& directory : directories)
+        RemoveTrailingSlashes(directory);
+    return directories;
+}

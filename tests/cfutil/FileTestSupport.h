@@ -1,0 +1,87 @@
+// Test helpers for the file utilities: a temporary directory removed after each test, files
+// written into it, URLs and texts of values, and environment variables restored afterwards.
+#pragma once
+
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <map>
+#include <optional>
+#include <string>
+
+#include <gtest/gtest.h>
+
+#include "platform/PropertyValues.h"
+
+namespace glyphwell::testing {
+
+/// UTF-8 text of a string value, "<null>" for null.
+inline std::string TextOf(CFTypeRef value) {
+    if (!value)
+        return "<null>";
+    CFStringRef string = CFGetTypeID(value) == CFURLGetTypeID()
+                             ? CFURLGetString(static_cast<CFURLRef>(value))
+                             : static_cast<CFStringRef>(value);
+    char buffer[4096];
+    return CFStringGetCString(string, buffer, sizeof buffer, kCFStringEncodingUTF8) ? buffer
+                                                                                    : "<?>";
+}
+
+/// A new URL of the absolute path `path` (a directory URL when `isDirectory`).
+inline CFURLRef NewFileURL(const std::string& path, bool isDirectory = false) {
+    return CFURLCreateFromFileSystemRepresentation(
+        nullptr, reinterpret_cast<const UInt8*>(path.data()), CFIndex(path.size()), isDirectory);
+}
+
+/// A fresh directory under the system's temporary directory for each test (mkdtemp), and the
+/// environment variables a test changed put back as they were.
+class TemporaryDirectoryTest : public ::testing::Test {
+protected:
+    void SetUp() override {
+        std::string pattern =
+            (std::filesystem::temp_directory_path() / "glyphwell-XXXXXX").string();
+        ASSERT_NE(mkdtemp(pattern.data()), nullptr);
+        // The resolved form, so that expectations hold when the temporary directory is a link.
+        directory_ = std::filesystem::canonical(pattern).string();
+    }
+    void TearDown() override {
+        std::error_code ignored;
+        std::filesystem::remove_all(directory_, ignored);
+        for (const auto& [name, value] : savedEnvironment_) {
+            if (value)
+                setenv(name.c_str(), value->c_str(), 1);
+            else
+                unsetenv(name.c_str());
+        }
+    }
+
+    /// The path of `name` inside the temporary directory.
+    std::string PathOf(const std::string& name) const { return directory_ + "/" + name; }
+
+    /// Writes `contents` to `name` inside the temporary directory; returns its path.
+    std::string WriteFile(const std::string& name, const std::string& contents) {
+        std::string path = PathOf(name);
+        std::filesystem::create_directories(std::filesystem::path(path).parent_path());
+        std::ofstream(path, std::ios::binary) << contents;
+        return path;
+    }
+
+    /// Sets (or, with null, unsets) an environment variable until the end of the test.
+    void SetEnvironment(const std::string& name, const char* value) {
+        if (!savedEnvironment_.count(name)) {
+            const char* old = getenv(name.c_str());
+            savedEnvironment_[name] = old ? std::optional<std::string>(old) : std::nullopt;
+        }
+        if (value)
+            setenv(name.c_str(), value, 1);
+        else
+            unsetenv(name.c_str());
+    }
+
+    std::string directory_;
+
+private:
+    std::map<std::string, std::optional<std::string>> savedEnvironment_;
+};
+
+} // namespace glyphwell::testing
