@@ -160,7 +160,7 @@ TEST_F(Bookmarks, RecordsPathIdentityAndRequestedProperties) {
     put(uint64_t(status.st_dev), 8);
     put(uint64_t(status.st_ino), 8);
     put(1, 4);
-    std::string key = TextOf(kCFURLIsRegularFileKey);
+    std::string key = "kCFURLIsRegularFileKey"; // keys are stored by their text
     put(key.size(), 4);
     expected.insert(expected.end(), key.begin(), key.end());
     expected.push_back(0x03);
