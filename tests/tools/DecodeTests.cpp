@@ -1,0 +1,91 @@
+#include <gtest/gtest.h>
+
+#include <nlohmann/json.hpp>
+#include <sstream>
+
+#include "tools/Commands.h"
+
+namespace {
+
+struct Result {
+    int status;
+    std::string out;
+    std::string err;
+};
+
+Result Invoke(std::vector<std::string> arguments, const std::string& input) {
+    std::istringstream in(input);
+    std::ostringstream out, err;
+    const int status = glyphwell::tools::RunTool(arguments, in, out, err);
+    return {status, out.str(), err.str()};
+}
+
+std::string Bytes(const std::vector<int>& values) {
+    std::string bytes;
+    for (int v : values)
+        bytes += char(v);
+    return bytes;
+}
+
+} // namespace
+
+TEST(DecodeCommand, GivesBackTheEncodedJSONForEveryKind) {
+    const char* inputs[] = {
+        R"({"a":true,"b":false,"s":"text \u00e9 \ud83d\ude00","i":-42,"f":0.25})",
+        R"([1,[2,[3,[]]],{}])",
+        R"({"$number":-7,"$type":7})",
+        R"({"$number":1.5,"$type":5})",
+        R"({"$number":"NaN","$type":13})",
+        R"({"$number":9007199254740993,"$type":4})",
+        R"({"$data":"AAEC/w=="})",
+        R"({"$url":"file:///usr/share/fonts/a%20b.ttf"})",
+        R"({"$uuid":"00010203-0405-0607-0809-0a0b0c0d0e0f"})",
+        R"({"$set":["x"]})",
+        R"({"$dict":[[1,"one"],[{"$data":""},[]]]})",
+        R"({"$dict":[["$not a tag",1]]})",
+        R"({"$error":{"domain":"NSPOSIXErrorDomain","code":2}})",
+        R"({"$charset":[[0,0],[65,90],[65535,65537],[1114110,1114111]]})",
+    };
+    for (const char* input : inputs) {
+        const Result encoded = Invoke({"encode"}, input);
+        ASSERT_EQ(encoded.status, 0) << input << ": " << encoded.err;
+        const Result decoded = Invoke({"decode", "--compact"}, encoded.out);
+        EXPECT_EQ(decoded.status, 0) << input << ": " << decoded.err;
+        EXPECT_EQ(decoded.err, "") << input;
+        EXPECT_EQ(nlohmann::ordered_json::parse(decoded.out), nlohmann::ordered_json::parse(input))
+            << input << " came back as " << decoded.out;
+    }
+}
+
+TEST(DecodeCommand, PrintsTheReadersLinesAndFailsOnCorruption) {
+    // A dictionary claiming three pairs that holds two.
+    const std::string bytes =
+        Bytes({0, 0, 0, 0x10, 0, 0, 0, 3, 0, 0, 0, 7, 0, 0, 0, 1, 'a', 0, 0, 1, 3, 0, 0, 0, 1, 1,
+               0, 0, 0, 7, 0, 0, 0, 1, 'b', 0, 0, 1, 3, 0, 0, 0, 1, 0});
+    const Result result = Invoke({"decode", "--compact", "--expect", "dictionary"}, bytes);
+    EXPECT_EQ(result.status, 1);
+    EXPECT_EQ(result.out, "{\"a\":true,\"b\":false}\n");
+    EXPECT_EQ(result.err, "ERROR: Quzel got corrupted data. (cftype)\n"
+                          "*** don't how to resurrect type 99999\n"
+                          "*** ResurrectCFDictionary missing either a key or a value, truncating "
+                          "dictionary\n");
+}
+
+TEST(DecodeCommand, ExpectedKindMismatchPrintsNull) {
+    const std::string abc = Bytes({0, 0, 0, 7, 0, 0, 0, 3, 'a', 'b', 'c'});
+    const Result wrong = Invoke({"decode", "--expect", "dictionary"}, abc);
+    EXPECT_EQ(wrong.status, 1);
+    EXPECT_EQ(wrong.out, "null\n");
+    EXPECT_EQ(wrong.err, "Quzel encounters an unexpected type. (7, 16)\n");
+    const Result right = Invoke({"decode", "--expect", "string"}, abc);
+    EXPECT_EQ(right.status, 0);
+    EXPECT_EQ(right.out, "\"abc\"\n");
+}
+
+TEST(DecodeCommand, NullResultWithoutCorruptionStillFails) {
+    const Result empty = Invoke({"decode"}, Bytes({0, 0, 1, 2, 0, 0, 0, 0})); // a UUID of count 0
+    EXPECT_EQ(empty.status, 1);
+    EXPECT_EQ(empty.out, "null\n");
+    EXPECT_EQ(empty.err, "");
+    EXPECT_EQ(Invoke({"decode", "--expect", "bogus"}, "").status, 2);
+}
