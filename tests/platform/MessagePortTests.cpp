@@ -1,0 +1,702 @@
+// Message ports over real Unix-domain sockets: each test has its own runtime directory.
+#include <gtest/gtest.h>
+
+#include <fcntl.h>
+#include <grp.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+
+#include <chrono>
+#include <fstream>
+#include <future>
+#include <vector>
+
+#include "platform/CFMessagePort.h"
+#include "platform/CFRunLoop.h"
+#include "support/LogCapture.h"
+#include "support/PortTestSupport.h"
+
+using namespace glyphwell::testing;
+using glyphwell::PollRunLoopDriver;
+
+namespace {
+
+const char kName[] = "org.glyphwell.Test.Port";
+
+struct Reply {
+    SInt32 status;
+    std::string bytes;
+};
+
+/// One request through a new remote port for `name`.
+Reply Send(const std::string& name, SInt32 msgid, const std::string& body,
+           CFTimeInterval receiveTimeout = 10) {
+    CFStringRef portName = CreateCFString(name);
+    CFMessagePortRef remote = CFMessagePortCreateRemote(kCFAllocatorDefault, portName);
+    CFRelease(portName);
+    if (!remote)
+        return {-100, {}};
+    CFDataRef data = CreateCFData(body);
+    CFDataRef reply = nullptr;
+    const SInt32 status = CFMessagePortSendRequest(remote, msgid, data, 10, receiveTimeout,
+                                                   kCFRunLoopDefaultMode, &reply);
+    CFRelease(data);
+    CFRelease(remote);
+    Reply result{status, BytesOf(reply)};
+    if (reply)
+        CFRelease(reply);
+    return result;
+}
+
+std::future<Reply> SendLater(SInt32 msgid, const std::string& body) {
+    return std::async(std::launch::async, [msgid, body] { return Send(kName, msgid, body); });
+}
+
+bool IsReady(std::future<Reply>& reply) {
+    return reply.wait_for(std::chrono::seconds(0)) == std::future_status::ready;
+}
+
+/// A local port on the test's own thread; the test runs its driver.
+class LocalPort {
+public:
+    using Handler = std::function<CFDataRef(SInt32 msgid, CFDataRef data)>;
+
+    LocalPort(const std::string& name, Handler handler) : handler_(std::move(handler)) {
+        glyphwell::SetRunLoopDriver(&driver_);
+        CFStringRef portName = CreateCFString(name);
+        CFMessagePortContext context{0, this, nullptr, nullptr, nullptr};
+        port_ =
+            CFMessagePortCreateLocal(kCFAllocatorDefault, portName, Callback, &context, nullptr);
+        CFRelease(portName);
+        if (port_) {
+            CFRunLoopSourceRef source =
+                CFMessagePortCreateRunLoopSource(kCFAllocatorDefault, port_, 0);
+            CFRunLoopAddSource(CFRunLoopGetCurrent(), source, kCFRunLoopCommonModes);
+            CFRelease(source);
+        }
+    }
+    ~LocalPort() {
+        if (port_) {
+            CFMessagePortInvalidate(port_);
+            CFRelease(port_);
+        }
+        glyphwell::SetRunLoopDriver(nullptr);
+    }
+
+    CFMessagePortRef Port() const { return port_; }
+
+    /// Runs the loop until `done` holds; false when 10 s passed first.
+    bool RunUntil(const std::function<bool()>& done) {
+        const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(10);
+        while (!done()) {
+            if (std::chrono::steady_clock::now() > deadline)
+                return false;
+            driver_.RunOnce(10);
+        }
+        return true;
+    }
+
+private:
+    static CFDataRef Callback(CFMessagePortRef, SInt32 msgid, CFDataRef data, void* info) {
+        return static_cast<LocalPort*>(info)->handler_(msgid, data);
+    }
+
+    PollRunLoopDriver driver_;
+    Handler handler_;
+    CFMessagePortRef port_ = nullptr;
+};
+
+/// Replies with the request bytes, "@" and the msgid.
+CFDataRef EchoWithMsgid(SInt32 msgid, CFDataRef data) {
+    return CreateCFData(BytesOf(data) + "@" + std::to_string(msgid));
+}
+
+/// Waits up to 10 s for `count` log lines.
+bool WaitForLines(const LogCapture& log, size_t count) {
+    const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(10);
+    while (log.Texts().size() < count && std::chrono::steady_clock::now() < deadline)
+        std::this_thread::sleep_for(std::chrono::milliseconds(5));
+    return log.Texts().size() >= count;
+}
+
+/// Runs `body` in a child process as uid/gid 65534; returns its exit status, or -1.
+int RunAsNobody(const std::function<int()>& body) {
+    const pid_t child = fork();
+    if (child == 0) {
+        if (setgroups(0, nullptr) != 0 || setgid(65534) != 0 || setuid(65534) != 0)
+            _exit(100);
+        _exit(body());
+    }
+    int status = 0;
+    if (child < 0 || waitpid(child, &status, 0) != child || !WIFEXITED(status))
+        return -1;
+    return WEXITSTATUS(status);
+}
+
+/// Saves descriptor 3 (where systemd passes the first socket) and restores it when it ends.
+class PassedDescriptor {
+public:
+    PassedDescriptor() : saved_(fcntl(3, F_GETFD) >= 0 ? fcntl(3, F_DUPFD_CLOEXEC, 10) : -1) {}
+    ~PassedDescriptor() {
+        if (saved_ >= 0) {
+            dup2(saved_, 3);
+            close(saved_);
+        } else {
+            close(3);
+        }
+    }
+    PassedDescriptor(const PassedDescriptor&) = delete;
+    PassedDescriptor& operator=(const PassedDescriptor&) = delete;
+
+    /// Moves `descriptor` to 3.
+    static bool Install(int descriptor) {
+        if (descriptor == 3)
+            return true;
+        const bool moved = dup2(descriptor, 3) == 3;
+        close(descriptor);
+        return moved;
+    }
+
+private:
+    int saved_;
+};
+
+class MessagePortTest : public ::testing::Test {
+protected:
+    std::string SocketPath() const { return runtime_.Path() + "/" + kName; }
+
+    TemporaryRuntimeDirectory runtime_;
+};
+
+} // namespace
+
+TEST_F(MessagePortTest, RoundTripsManyRequestsOverOneRemotePort) {
+    PortServer server(kName, EchoWithMsgid);
+    ASSERT_TRUE(server.Started());
+    CFStringRef portName = CreateCFString(kName);
+    CFMessagePortRef remote = CFMessagePortCreateRemote(kCFAllocatorDefault, portName);
+    CFRelease(portName);
+    ASSERT_NE(remote, nullptr);
+    for (int i = 0; i < 100; ++i) {
+        CFDataRef data = CreateCFData("request " + std::to_string(i));
+        CFDataRef reply = nullptr;
+        ASSERT_EQ(
+            CFMessagePortSendRequest(remote, i - 50, data, 5, 5, kCFRunLoopDefaultMode, &reply),
+            kCFMessagePortSuccess);
+        EXPECT_EQ(BytesOf(reply), "request " + std::to_string(i) + "@" + std::to_string(i - 50));
+        CFRelease(data);
+        CFRelease(reply);
+    }
+    CFDataRef reply = nullptr;
+    ASSERT_EQ(CFMessagePortSendRequest(remote, 3, nullptr, 5, 5, kCFRunLoopDefaultMode, &reply),
+              kCFMessagePortSuccess);
+    EXPECT_EQ(BytesOf(reply), "@3");
+    CFRelease(reply);
+    CFRelease(remote);
+}
+
+TEST_F(MessagePortTest, AnswersPipelinedFramesInOrderWithExactBytes) {
+    PortServer server(kName, EchoWithMsgid);
+    ASSERT_TRUE(server.Started());
+    const int client = RawConnect(SocketPath());
+    ASSERT_GE(client, 0);
+    // msgid 1 with "ab", then msgid -1 with no body, in one write.
+    ASSERT_TRUE(RawWrite(client, std::string("\x00\x00\x00\x01\x00\x00\x00\x02"
+                                             "ab"
+                                             "\xFF\xFF\xFF\xFF\x00\x00\x00\x00",
+                                             18)));
+    EXPECT_EQ(RawRead(client, 15), std::string("\x00\x00\x00\x04"
+                                               "ab@1"
+                                               "\x00\x00\x00\x03"
+                                               "@-1",
+                                               15));
+    close(client);
+}
+
+TEST_F(MessagePortTest, PortsAndSourcesArePropertyValues) {
+    LocalPort local(kName, EchoWithMsgid);
+    ASSERT_NE(local.Port(), nullptr);
+    EXPECT_EQ(CFGetTypeID(local.Port()), CFMessagePortGetTypeID());
+    CFStringRef kind = CFCopyTypeIDDescription(CFMessagePortGetTypeID());
+    CFStringRef expected = CFSTR("CFMessagePort");
+    EXPECT_TRUE(CFEqual(kind, expected));
+    CFRelease(kind);
+    EXPECT_FALSE(CFMessagePortIsRemote(local.Port()));
+    CFStringRef name = CreateCFString(kName);
+    EXPECT_TRUE(CFEqual(CFMessagePortGetName(local.Port()), name));
+    CFRelease(name);
+
+    // The port has one source, which the run loop holds.
+    CFRunLoopSourceRef source =
+        CFMessagePortCreateRunLoopSource(kCFAllocatorDefault, local.Port(), 0);
+    CFRunLoopSourceRef again =
+        CFMessagePortCreateRunLoopSource(kCFAllocatorDefault, local.Port(), 0);
+    EXPECT_EQ(source, again);
+    CFRelease(again);
+    EXPECT_EQ(CFGetTypeID(source), CFRunLoopSourceGetTypeID());
+    EXPECT_TRUE(CFRunLoopContainsSource(CFRunLoopGetCurrent(), source, kCFRunLoopCommonModes));
+
+    // Invalidating stops listening, removes the socket file and leaves the run loop.
+    CFMessagePortInvalidate(local.Port());
+    EXPECT_FALSE(CFMessagePortIsValid(local.Port()));
+    EXPECT_FALSE(CFRunLoopSourceIsValid(source));
+    EXPECT_FALSE(CFRunLoopContainsSource(CFRunLoopGetCurrent(), source, kCFRunLoopCommonModes));
+    EXPECT_NE(access(SocketPath().c_str(), F_OK), 0);
+    EXPECT_EQ(CFMessagePortCreateRunLoopSource(kCFAllocatorDefault, local.Port(), 0), nullptr);
+    CFRelease(source);
+}
+
+TEST_F(MessagePortTest, NestedRequestFromAnotherClientIsAnsweredFirst) {
+    std::vector<std::string> events;
+    std::shared_ptr<glyphwell::port::PendingRequest> outer;
+    std::future<Reply> inner;
+    LocalPort* server = nullptr;
+    LocalPort local(kName, [&](SInt32 msgid, CFDataRef) -> CFDataRef {
+        if (msgid == 2) {
+            events.push_back("inner handled");
+            EXPECT_NE(glyphwell::port::CurrentRequest(), outer);
+            return CreateCFData("inner");
+        }
+        outer = glyphwell::port::CurrentRequest();
+        events.push_back("outer entered");
+        // The callback waits, as an alert does, in a loop nested on the same driver.
+        inner = SendLater(2, "");
+        EXPECT_TRUE(server->RunUntil([&] { return IsReady(inner); }));
+        events.push_back("inner answered");
+        EXPECT_EQ(glyphwell::port::CurrentRequest(), outer);
+        return CreateCFData("outer");
+    });
+    server = &local;
+    ASSERT_NE(local.Port(), nullptr);
+
+    std::future<Reply> first = SendLater(1, "");
+    ASSERT_TRUE(local.RunUntil([&] { return IsReady(first); }));
+    EXPECT_EQ(first.get().bytes, "outer");
+    EXPECT_EQ(inner.get().bytes, "inner");
+    EXPECT_EQ(events,
+              (std::vector<std::string>{"outer entered", "inner handled", "inner answered"}));
+    EXPECT_EQ(glyphwell::port::CurrentRequest(), nullptr);
+}
+
+TEST_F(MessagePortTest, LaterFramesOfABusyConnectionWaitForItsReply) {
+    std::vector<std::string> events;
+    LocalPort* server = nullptr;
+    LocalPort local(kName, [&](SInt32 msgid, CFDataRef) -> CFDataRef {
+        events.push_back("enter " + std::to_string(msgid));
+        if (msgid == 1) {
+            // Spin the loop a while: the second frame has arrived but must not be handled.
+            int rounds = 0;
+            server->RunUntil([&] { return ++rounds > 20; });
+        }
+        events.push_back("leave " + std::to_string(msgid));
+        return CreateCFData(msgid == 1 ? "A" : "B");
+    });
+    server = &local;
+    const int client = RawConnect(SocketPath());
+    ASSERT_GE(client, 0);
+    ASSERT_TRUE(RawWrite(client, RequestFrame(1, "") + RequestFrame(2, "")));
+    ASSERT_TRUE(local.RunUntil([&] { return events.size() == 4; }));
+    EXPECT_EQ(events, (std::vector<std::string>{"enter 1", "leave 1", "enter 2", "leave 2"}));
+    EXPECT_EQ(RawRead(client, 10), std::string("\x00\x00\x00\x01"
+                                               "A"
+                                               "\x00\x00\x00\x01"
+                                               "B",
+                                               10));
+    close(client);
+}
+
+TEST_F(MessagePortTest, ClientLeavingWithdrawsItsRequestAndItsReplyIsDropped) {
+    LogCapture log;
+    int client = -1;
+    int withdrawals = 0;
+    bool returned = false;
+    std::shared_ptr<glyphwell::port::PendingRequest> request;
+    LocalPort* server = nullptr;
+    LocalPort local(kName, [&](SInt32 msgid, CFDataRef) -> CFDataRef {
+        if (msgid != 7)
+            return CreateCFData("still serving");
+        request = glyphwell::port::CurrentRequest();
+        request->SetWithdrawalHandler([&] { ++withdrawals; });
+        close(client); // the client gives up while its question is up
+        EXPECT_TRUE(server->RunUntil([&] { return request->IsWithdrawn(); }));
+        returned = true;
+        return CreateCFData("nobody reads this");
+    });
+    server = &local;
+    client = RawConnect(SocketPath());
+    ASSERT_GE(client, 0);
+    ASSERT_TRUE(RawWrite(client, RequestFrame(7, "question")));
+    ASSERT_TRUE(local.RunUntil([&] { return returned; }));
+
+    EXPECT_EQ(withdrawals, 1);
+    EXPECT_EQ(request->ClientProcessID(), getpid());
+    // A handler set after the withdrawal runs at once.
+    bool late = false;
+    request->SetWithdrawalHandler([&] { late = true; });
+    EXPECT_TRUE(late);
+
+    std::future<Reply> other = SendLater(1, "");
+    ASSERT_TRUE(local.RunUntil([&] { return IsReady(other); }));
+    EXPECT_EQ(other.get().bytes, "still serving");
+    EXPECT_TRUE(log.Texts().empty());
+}
+
+TEST_F(MessagePortTest, RefusesAPeerOfAnotherUserWithOneLogLine) {
+    if (geteuid() != 0)
+        GTEST_SKIP() << "needs root to run a client as another user";
+    LogCapture log;
+    LocalPort local(kName, EchoWithMsgid);
+    ASSERT_NE(local.Port(), nullptr);
+    // Open the directory and socket to everyone: the peer check is what must refuse.
+    ASSERT_EQ(chmod(runtime_.Path().c_str(), 0711), 0);
+    ASSERT_EQ(chmod(SocketPath().c_str(), 0666), 0);
+
+    const std::string path = SocketPath();
+    const pid_t child = fork();
+    if (child == 0) {
+        if (setgroups(0, nullptr) != 0 || setgid(65534) != 0 || setuid(65534) != 0)
+            _exit(100);
+        const int client = RawConnect(path);
+        if (client < 0)
+            _exit(2);
+        RawWrite(client, RequestFrame(1, "x"));
+        _exit(RawSeesClose(client) ? 0 : 1);
+    }
+    ASSERT_GT(child, 0);
+    int status = 0;
+    ASSERT_TRUE(local.RunUntil([&] { return waitpid(child, &status, WNOHANG) == child; }));
+    ASSERT_TRUE(WIFEXITED(status));
+    EXPECT_EQ(WEXITSTATUS(status), 0) << "0: closed without a reply, 1: answered, 2: no connect";
+
+    std::future<Reply> own = SendLater(4, "mine");
+    ASSERT_TRUE(local.RunUntil([&] { return IsReady(own); }));
+    EXPECT_EQ(own.get().bytes, "mine@4");
+    EXPECT_EQ(log.Texts(), (std::vector<std::string>{
+                               "message port org.glyphwell.Test.Port: refused a connection from "
+                               "uid 65534"}));
+}
+
+TEST_F(MessagePortTest, ClosesAConnectionWhoseFrameIsOverTheLimit) {
+    LogCapture log;
+    PortServer server(kName, EchoWithMsgid);
+    ASSERT_TRUE(server.Started());
+    const int client = RawConnect(SocketPath());
+    ASSERT_GE(client, 0);
+    // Length 64 MiB + 1.
+    ASSERT_TRUE(RawWrite(client, std::string("\x00\x00\x00\x01\x04\x00\x00\x01", 8)));
+    EXPECT_TRUE(RawSeesClose(client));
+    close(client);
+
+    EXPECT_EQ(Send(kName, 2, "next").bytes, "next@2");
+    EXPECT_EQ(log.Texts(), (std::vector<std::string>{
+                               "message port org.glyphwell.Test.Port: closed a connection whose "
+                               "request announced 67108865 bytes (the limit is 67108864)"}));
+}
+
+TEST_F(MessagePortTest, ClientDisconnectingMidFrameIsClosedWithOneLogLineEach) {
+    LogCapture log;
+    std::atomic<int> handled{0};
+    PortServer server(kName, [&](SInt32 msgid, CFDataRef data) {
+        ++handled;
+        return EchoWithMsgid(msgid, data);
+    });
+    ASSERT_TRUE(server.Started());
+    const std::string truncated[] = {
+        std::string("\x00\x00\x00\x01\x00\x00\x00\x0A"
+                    "abc",
+                    11),                                    // body cut short
+        std::string("\x00\x00\x00\x01\x00", 5),             // header cut short
+        std::string("\x00\x00\x00\x01\x04\x00\x00\x00", 8), // exactly the limit, then gone
+    };
+    for (const std::string& bytes : truncated) {
+        const int client = RawConnect(SocketPath());
+        ASSERT_GE(client, 0);
+        ASSERT_TRUE(RawWrite(client, bytes));
+        close(client);
+    }
+    ASSERT_TRUE(WaitForLines(log, 3));
+    EXPECT_EQ(Send(kName, 3, "whole").bytes, "whole@3");
+    EXPECT_EQ(handled, 1);
+    const std::string line =
+        "message port org.glyphwell.Test.Port: a client disconnected in the middle of a request";
+    EXPECT_EQ(log.Texts(), (std::vector<std::string>{line, line, line}));
+}
+
+TEST_F(MessagePortTest, WritesALargeReplyWithoutHoldingUpOtherClients) {
+    std::string large(8u << 20, '\0');
+    for (size_t i = 0; i < large.size(); ++i)
+        large[i] = char(i * 7 + (i >> 12));
+    PortServer server(kName, [&](SInt32 msgid, CFDataRef data) {
+        return msgid == 9 ? CreateCFData(large) : EchoWithMsgid(msgid, data);
+    });
+    ASSERT_TRUE(server.Started());
+    const int slowReader = RawConnect(SocketPath());
+    ASSERT_GE(slowReader, 0);
+    ASSERT_TRUE(RawWrite(slowReader, RequestFrame(9, "")));
+    std::this_thread::sleep_for(std::chrono::milliseconds(50));
+
+    EXPECT_EQ(Send(kName, 1, "quick", 5).bytes, "quick@1");
+    const std::string received = RawRead(slowReader, 4 + large.size(), 10000);
+    ASSERT_EQ(received.size(), 4 + large.size());
+    EXPECT_EQ(received.substr(0, 4), std::string("\x00\x80\x00\x00", 4));
+    EXPECT_TRUE(received.compare(4, std::string::npos, large) == 0);
+    close(slowReader);
+}
+
+TEST_F(MessagePortTest, TakesOverAStaleSocketFile) {
+    const int stale = RawListen(SocketPath());
+    ASSERT_GE(stale, 0);
+    close(stale); // the file stays, nothing listens
+    PortServer server(kName, EchoWithMsgid);
+    ASSERT_TRUE(server.Started());
+    EXPECT_EQ(Send(kName, 1, "x").bytes, "x@1");
+}
+
+TEST_F(MessagePortTest, LeavesAFileThatIsNotASocketAlone) {
+    LogCapture log;
+    std::ofstream(SocketPath()) << "keep me";
+    CFStringRef name = CreateCFString(kName);
+    EXPECT_EQ(CFMessagePortCreateLocal(kCFAllocatorDefault, name, nullptr, nullptr, nullptr),
+              nullptr);
+    CFRelease(name);
+    EXPECT_EQ(log.Texts(),
+              (std::vector<std::string>{"message port org.glyphwell.Test.Port: " + SocketPath() +
+                                        " exists and is not a socket"}));
+    std::ifstream kept(SocketPath());
+    std::string text;
+    std::getline(kept, text);
+    EXPECT_EQ(text, "keep me");
+}
+
+TEST_F(MessagePortTest, NameTakenByALiveServerGivesNull) {
+    LogCapture log;
+    CFStringRef name = CreateCFString(kName);
+    CFMessagePortRef first =
+        CFMessagePortCreateLocal(kCFAllocatorDefault, name, nullptr, nullptr, nullptr);
+    ASSERT_NE(first, nullptr);
+    Boolean shouldFreeInfo = false;
+    EXPECT_EQ(
+        CFMessagePortCreateLocal(kCFAllocatorDefault, name, nullptr, nullptr, &shouldFreeInfo),
+        nullptr);
+    EXPECT_TRUE(shouldFreeInfo);
+    EXPECT_EQ(log.Texts(), (std::vector<std::string>{"message port org.glyphwell.Test.Port: the "
+                                                     "name is taken by a running server"}));
+    EXPECT_EQ(access(SocketPath().c_str(), F_OK), 0) << "the live server's socket stays";
+
+    CFMessagePortInvalidate(first);
+    CFRelease(first);
+    CFMessagePortRef next =
+        CFMessagePortCreateLocal(kCFAllocatorDefault, name, nullptr, nullptr, &shouldFreeInfo);
+    EXPECT_NE(next, nullptr);
+    EXPECT_FALSE(shouldFreeInfo);
+    CFRelease(next);
+    CFRelease(name);
+}
+
+TEST_F(MessagePortTest, ReceiveTimeoutLeavesThePortUsableForTheNextRequest) {
+    PortServer server(kName, [](SInt32 msgid, CFDataRef data) {
+        if (msgid == 5)
+            std::this_thread::sleep_for(std::chrono::milliseconds(300));
+        return EchoWithMsgid(msgid, data);
+    });
+    ASSERT_TRUE(server.Started());
+    CFStringRef name = CreateCFString(kName);
+    CFMessagePortRef remote = CFMessagePortCreateRemote(kCFAllocatorDefault, name);
+    CFRelease(name);
+    ASSERT_NE(remote, nullptr);
+    CFDataRef slow = CreateCFData("slow");
+    CFDataRef marker = CreateCFData("not cleared");
+    CFDataRef reply = marker;
+    EXPECT_EQ(CFMessagePortSendRequest(remote, 5, slow, 1, 0.05, kCFRunLoopDefaultMode, &reply),
+              kCFMessagePortReceiveTimeout);
+    EXPECT_EQ(reply, nullptr);
+    EXPECT_TRUE(CFMessagePortIsValid(remote));
+
+    // The late reply to "slow" is never taken for this one's.
+    CFDataRef fast = CreateCFData("fast");
+    ASSERT_EQ(CFMessagePortSendRequest(remote, 6, fast, 1, kCFMessagePortWaitForever,
+                                       kCFRunLoopDefaultMode, &reply),
+              kCFMessagePortSuccess);
+    EXPECT_EQ(BytesOf(reply), "fast@6");
+    CFRelease(reply);
+    CFRelease(slow);
+    CFRelease(fast);
+    CFRelease(marker);
+    CFRelease(remote);
+}
+
+TEST_F(MessagePortTest, ReportsEachWayAServerCanFail) {
+    const int listener = RawListen(SocketPath());
+    ASSERT_GE(listener, 0);
+    CFStringRef name = CreateCFString(kName);
+    CFMessagePortRef remote = CFMessagePortCreateRemote(kCFAllocatorDefault, name);
+    CFRelease(name);
+    ASSERT_NE(remote, nullptr);
+    CFDataRef data = CreateCFData("x");
+    CFDataRef reply = nullptr;
+
+    // A server that reads the request and closes without replying.
+    std::thread server([listener] {
+        const int connection = accept(listener, nullptr, nullptr);
+        RawRead(connection, 9);
+        close(connection);
+    });
+    EXPECT_EQ(CFMessagePortSendRequest(remote, 1, data, 1, kCFMessagePortWaitForever,
+                                       kCFRunLoopDefaultMode, &reply),
+              kCFMessagePortBecameInvalidError);
+    server.join();
+    EXPECT_TRUE(CFMessagePortIsValid(remote));
+
+    // A server that never reads: a request too large for the socket buffers cannot be sent.
+    CFDataRef large = CreateCFData(std::string(16u << 20, 'x'));
+    EXPECT_EQ(CFMessagePortSendRequest(remote, 1, large, 0.1, 1, kCFRunLoopDefaultMode, &reply),
+              kCFMessagePortSendTimeout);
+    CFRelease(large);
+
+    // Nothing listens any more.
+    close(listener);
+    EXPECT_EQ(CFMessagePortSendRequest(remote, 1, data, 1, 1, kCFRunLoopDefaultMode, &reply),
+              kCFMessagePortTransportError);
+
+    CFMessagePortInvalidate(remote);
+    EXPECT_FALSE(CFMessagePortIsValid(remote));
+    EXPECT_EQ(CFMessagePortSendRequest(remote, 1, data, 1, 1, kCFRunLoopDefaultMode, &reply),
+              kCFMessagePortIsInvalid);
+    EXPECT_EQ(reply, nullptr);
+    CFRelease(data);
+    CFRelease(remote);
+
+    name = CreateCFString("org.glyphwell.Test.Nobody");
+    EXPECT_EQ(CFMessagePortCreateRemote(kCFAllocatorDefault, name), nullptr);
+    CFRelease(name);
+}
+
+TEST_F(MessagePortTest, ServesTheListeningSocketHandedOverBySystemd) {
+    PassedDescriptor passed;
+    ASSERT_TRUE(PassedDescriptor::Install(RawListen(SocketPath())));
+    setenv("LISTEN_PID", std::to_string(getpid()).c_str(), 1);
+    setenv("LISTEN_FDS", "1", 1);
+    setenv("LISTEN_FDNAMES", "glyphwell-ui-agent.socket", 1);
+
+    {
+        PortServer server(kName, EchoWithMsgid);
+        ASSERT_TRUE(server.Started());
+        EXPECT_EQ(getenv("LISTEN_PID"), nullptr);
+        EXPECT_EQ(getenv("LISTEN_FDS"), nullptr);
+        EXPECT_EQ(getenv("LISTEN_FDNAMES"), nullptr);
+        EXPECT_EQ(Send(kName, 8, "activated").bytes, "activated@8");
+    }
+    // The socket belongs to the service manager: its file stays.
+    EXPECT_EQ(access(SocketPath().c_str(), F_OK), 0);
+    EXPECT_LT(fcntl(3, F_GETFD), 0) << "the port closed its descriptor";
+}
+
+TEST_F(MessagePortTest, IgnoresAHandOverThatIsNotForItOrNotUsable) {
+    LogCapture log;
+    PassedDescriptor passed;
+    int pair[2];
+    ASSERT_EQ(socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, pair), 0);
+    close(pair[1]);
+    ASSERT_TRUE(PassedDescriptor::Install(pair[0]));
+
+    // Meant for another process: not used, and the variables are gone.
+    setenv("LISTEN_PID", std::to_string(getpid() + 1).c_str(), 1);
+    setenv("LISTEN_FDS", "1", 1);
+    {
+        PortServer server(kName, EchoWithMsgid);
+        ASSERT_TRUE(server.Started());
+        EXPECT_EQ(getenv("LISTEN_PID"), nullptr);
+        EXPECT_EQ(Send(kName, 1, "own").bytes, "own@1");
+    }
+    EXPECT_TRUE(log.Texts().empty());
+
+    // For this process, but descriptor 3 is not a listening socket: the port binds its own.
+    setenv("LISTEN_PID", std::to_string(getpid()).c_str(), 1);
+    setenv("LISTEN_FDS", "1", 1);
+    {
+        PortServer server(kName, EchoWithMsgid);
+        ASSERT_TRUE(server.Started());
+        EXPECT_EQ(Send(kName, 2, "own").bytes, "own@2");
+    }
+    EXPECT_EQ(log.Texts(), (std::vector<std::string>{
+                               "message port org.glyphwell.Test.Port: descriptor 3 from the "
+                               "service manager is not a listening Unix stream socket; not "
+                               "using it"}));
+    EXPECT_GE(fcntl(3, F_GETFD), 0) << "a descriptor the port did not take stays open";
+}
+
+TEST_F(MessagePortTest, SocketPathNeedsASafeNameAndDirectory) {
+    using glyphwell::port::SocketPathForName;
+    EXPECT_EQ(SocketPathForName(kName), runtime_.Path() + "/" + kName);
+    EXPECT_EQ(SocketPathForName(""), "");
+    EXPECT_EQ(SocketPathForName(".."), "");
+    EXPECT_EQ(SocketPathForName("a/b"), "");
+    EXPECT_EQ(SocketPathForName(std::string(120, 'n')), "");
+
+    if (geteuid() != 0)
+        GTEST_SKIP() << "the fallback directory cases need root to run as another user";
+    const std::string fallback = "/tmp/glyphwell-65534";
+    struct stat status;
+    if (lstat(fallback.c_str(), &status) == 0)
+        GTEST_SKIP() << fallback << " exists already";
+    // Without a runtime directory (or with a relative one) the fallback directory is used.
+    auto pathAsNobody = [] {
+        setenv("XDG_RUNTIME_DIR", "relative", 1);
+        return glyphwell::port::SocketPathForName("n") == "/tmp/glyphwell-65534/n" ? 0 : 1;
+    };
+    EXPECT_EQ(RunAsNobody(pathAsNobody), 0);
+    ASSERT_EQ(lstat(fallback.c_str(), &status), 0);
+    EXPECT_TRUE(S_ISDIR(status.st_mode));
+    EXPECT_EQ(status.st_mode & 07777, 0700u);
+    EXPECT_EQ(status.st_uid, 65534u);
+
+    ASSERT_EQ(chmod(fallback.c_str(), 0755), 0); // open to others
+    EXPECT_EQ(RunAsNobody(pathAsNobody), 1);
+    ASSERT_EQ(rmdir(fallback.c_str()), 0);
+
+    ASSERT_EQ(mkdir(fallback.c_str(), 0700), 0); // someone else's
+    EXPECT_EQ(RunAsNobody(pathAsNobody), 1);
+    ASSERT_EQ(rmdir(fallback.c_str()), 0);
+
+    ASSERT_EQ(symlink("/tmp", fallback.c_str()), 0);
+    EXPECT_EQ(RunAsNobody(pathAsNobody), 1);
+    ASSERT_EQ(unlink(fallback.c_str()), 0);
+}
+
+TEST_F(MessagePortTest, AnswersEveryRequestOfManyConcurrentClients) {
+    constexpr int kClients = 200;
+    constexpr int kRequestsEach = 50;
+    std::atomic<int> handled{0};
+    PortServer server(kName, [&](SInt32, CFDataRef) -> CFDataRef {
+        ++handled;
+        return nullptr; // unknown message ids get an empty reply
+    });
+    ASSERT_TRUE(server.Started());
+    std::atomic<int> answered{0};
+    std::vector<std::thread> clients;
+    for (int c = 0; c < kClients; ++c) {
+        clients.emplace_back([&, c] {
+            CFStringRef name = CreateCFString(kName);
+            CFMessagePortRef remote = CFMessagePortCreateRemote(kCFAllocatorDefault, name);
+            CFRelease(name);
+            if (!remote)
+                return;
+            for (int r = 0; r < kRequestsEach; ++r) {
+                CFDataRef data = CreateCFData(std::to_string(c) + "/" + std::to_string(r));
+                CFDataRef reply = nullptr;
+                if (CFMessagePortSendRequest(remote, 1000 + r, data, 30, 30, kCFRunLoopDefaultMode,
+                                             &reply) == kCFMessagePortSuccess &&
+                    reply && CFDataGetLength(reply) == 0)
+                    ++answered;
+                if (reply)
+                    CFRelease(reply);
+                CFRelease(data);
+            }
+            CFRelease(remote);
+        });
+    }
+    for (std::thread& client : clients)
+        client.join();
+    EXPECT_EQ(answered, kClients * kRequestsEach);
+    EXPECT_EQ(handled, kClients * kRequestsEach);
+}

@@ -1,0 +1,176 @@
+// The poll driver and the per-thread run loop that local ports are served through.
+#include <gtest/gtest.h>
+
+#include <unistd.h>
+
+#include <future>
+#include <thread>
+
+#include "platform/CFMessagePort.h"
+#include "platform/CFRunLoop.h"
+#include "platform/MessagePortWire.h"
+#include "support/PortTestSupport.h"
+
+using glyphwell::PollRunLoopDriver;
+
+namespace {
+
+struct Pipe {
+    Pipe() {
+        int ends[2];
+        if (pipe(ends) == 0) {
+            read = ends[0];
+            write = ends[1];
+        }
+    }
+    ~Pipe() {
+        close(read);
+        close(write);
+    }
+    int read = -1, write = -1;
+};
+
+} // namespace
+
+TEST(PollRunLoopDriver, RunOnceReturnsAtOnceWhenNothingIsWatched) {
+    PollRunLoopDriver driver;
+    EXPECT_FALSE(driver.RunOnce(-1));
+}
+
+TEST(PollRunLoopDriver, NeverCallsACallbackUnwatchedEarlierInTheSameRound) {
+    PollRunLoopDriver driver;
+    Pipe first, second;
+    ASSERT_EQ(write(first.write, "x", 1), 1);
+    ASSERT_EQ(write(second.write, "x", 1), 1);
+    int oldCalls = 0, newCalls = 0;
+    // Whichever runs first replaces the other's registration: neither the old callback nor the
+    // new one may run for that descriptor in this round, although it was ready.
+    auto replaceOther = [&](int other) {
+        ++oldCalls;
+        driver.Unwatch(other);
+        driver.Watch(other, true, false, [&](bool, bool) { ++newCalls; });
+    };
+    driver.Watch(first.read, true, false, [&](bool, bool) { replaceOther(second.read); });
+    driver.Watch(second.read, true, false, [&](bool, bool) { replaceOther(first.read); });
+    ASSERT_TRUE(driver.RunOnce(1000));
+    EXPECT_EQ(oldCalls, 1);
+    EXPECT_EQ(newCalls, 0);
+    ASSERT_TRUE(driver.RunOnce(1000));
+    EXPECT_EQ(newCalls, 1);
+}
+
+TEST(PollRunLoopDriver, CallbackMayRunANestedRound) {
+    PollRunLoopDriver driver;
+    Pipe outer, inner;
+    std::vector<std::string> events;
+    driver.Watch(outer.read, true, false, [&](bool readable, bool) {
+        EXPECT_TRUE(readable);
+        char byte;
+        ASSERT_EQ(read(outer.read, &byte, 1), 1);
+        events.push_back("outer");
+        ASSERT_EQ(write(inner.write, "y", 1), 1);
+        driver.RunOnce(1000);
+        events.push_back("outer done");
+    });
+    driver.Watch(inner.read, true, false, [&](bool, bool) {
+        char byte;
+        ASSERT_EQ(read(inner.read, &byte, 1), 1);
+        events.push_back("inner");
+    });
+    ASSERT_EQ(write(outer.write, "x", 1), 1);
+    ASSERT_TRUE(driver.RunOnce(1000));
+    EXPECT_EQ(events, (std::vector<std::string>{"outer", "inner", "outer done"}));
+}
+
+TEST(PollRunLoopDriver, WakeEndsAWaitFromAnotherThread) {
+    PollRunLoopDriver driver;
+    Pipe idle;
+    bool called = false;
+    driver.Watch(idle.read, true, false, [&](bool, bool) { called = true; });
+    std::thread waker([&] {
+        std::this_thread::sleep_for(std::chrono::milliseconds(50));
+        driver.Wake();
+    });
+    EXPECT_TRUE(driver.RunOnce(-1));
+    waker.join();
+    EXPECT_FALSE(called);
+}
+
+TEST(RunLoop, SourcesAreServedByWhicheverDriverIsInstalled) {
+    glyphwell::testing::TemporaryRuntimeDirectory runtime;
+    CFStringRef name = glyphwell::testing::CreateCFString("org.glyphwell.Test.Loop");
+    CFMessagePortRef port =
+        CFMessagePortCreateLocal(kCFAllocatorDefault, name, nullptr, nullptr, nullptr);
+    CFRelease(name);
+    ASSERT_NE(port, nullptr);
+    CFRunLoopSourceRef source = CFMessagePortCreateRunLoopSource(kCFAllocatorDefault, port, 0);
+    CFRunLoopAddSource(CFRunLoopGetCurrent(), source, kCFRunLoopCommonModes);
+    CFRunLoopAddSource(CFRunLoopGetCurrent(), source, kCFRunLoopCommonModes); // no-op
+
+    PollRunLoopDriver first, second;
+    EXPECT_FALSE(first.RunOnce(0));
+    glyphwell::SetRunLoopDriver(&first);
+    EXPECT_TRUE(first.RunOnce(0));
+    glyphwell::SetRunLoopDriver(&second);
+    EXPECT_FALSE(first.RunOnce(0)) << "the source left the old driver";
+
+    const int client = glyphwell::testing::RawConnect(runtime.Path() + "/org.glyphwell.Test.Loop");
+    ASSERT_GE(client, 0);
+    ASSERT_TRUE(glyphwell::testing::RawWrite(client, glyphwell::testing::RequestFrame(1, "")));
+    std::string reply;
+    for (int round = 0; round < 100 && reply.size() < 4; ++round) {
+        second.RunOnce(10);
+        reply += glyphwell::testing::RawRead(client, 4 - reply.size(), 0);
+    }
+    EXPECT_EQ(reply, std::string("\x00\x00\x00\x00", 4)) << "a port without callback replies empty";
+    close(client);
+
+    CFRunLoopRemoveSource(CFRunLoopGetCurrent(), source, kCFRunLoopCommonModes);
+    EXPECT_FALSE(second.RunOnce(0));
+    glyphwell::SetRunLoopDriver(nullptr);
+    CFRelease(source);
+    CFRelease(port);
+}
+
+TEST(FrameAssembler, ReassemblesFramesSplitAtAnyByte) {
+    const std::string stream("\x00\x00\x00\x05\x00\x00\x00\x03"
+                             "abc"
+                             "\x80\x00\x00\x00\x00\x00\x00\x00",
+                             19);
+    for (size_t piece = 1; piece <= stream.size(); ++piece) {
+        glyphwell::port::FrameAssembler assembler(glyphwell::port::FrameAssembler::Kind::Request,
+                                                  16);
+        for (size_t at = 0; at < stream.size(); at += piece) {
+            const size_t length = std::min(piece, stream.size() - at);
+            ASSERT_TRUE(
+                assembler.Append(reinterpret_cast<const uint8_t*>(stream.data()) + at, length));
+        }
+        ASSERT_TRUE(assembler.HasFrame());
+        glyphwell::port::Frame frame = assembler.TakeFrame();
+        EXPECT_EQ(frame.msgid, 5);
+        EXPECT_EQ(std::string(frame.body.begin(), frame.body.end()), "abc");
+        ASSERT_TRUE(assembler.HasFrame());
+        frame = assembler.TakeFrame();
+        EXPECT_EQ(frame.msgid, INT32_MIN);
+        EXPECT_TRUE(frame.body.empty());
+        EXPECT_FALSE(assembler.HasFrame());
+        EXPECT_FALSE(assembler.IsMidFrame());
+        EXPECT_EQ(assembler.BufferedBytes(), 0u);
+    }
+}
+
+TEST(FrameAssembler, RefusesALengthOverItsCapForGood) {
+    const uint8_t atCap[] = {0, 0, 0, 16};
+    const uint8_t over[] = {0, 0, 0, 17, 'x'};
+    glyphwell::port::FrameAssembler accepting(glyphwell::port::FrameAssembler::Kind::Reply, 16);
+    EXPECT_TRUE(accepting.Append(atCap, sizeof atCap));
+    EXPECT_TRUE(accepting.IsMidFrame());
+    EXPECT_FALSE(accepting.Failed());
+    glyphwell::port::FrameAssembler refusing(glyphwell::port::FrameAssembler::Kind::Reply, 16);
+    EXPECT_FALSE(refusing.Append(over, sizeof over));
+    EXPECT_TRUE(refusing.Failed());
+    EXPECT_EQ(refusing.RefusedLength(), 17u);
+    EXPECT_EQ(refusing.BufferedBytes(), 0u);
+    EXPECT_FALSE(refusing.Append(atCap, sizeof atCap));
+    EXPECT_FALSE(refusing.HasFrame());
+}
