@@ -30,6 +30,20 @@ void ReleaseElements(ElementTable& table, long count) {
         TCFSafeRelease(table[i]);
 }
 
+/// Reads the `count` elements of an array or set into `table`. One missing element loses them
+/// all: false, with the elements read so far released.
+bool ResurrectElements(TCFResurrectContext& context, long count, ElementTable& table) {
+    for (long i = 0; i < count; ++i) {
+        ReserveElement(table, static_cast<unsigned long>(i), count);
+        table[i] = context.Resurrect(kTCFTypeAny);
+        if (!table[i]) {
+            ReleaseElements(table, i);
+            return false;
+        }
+    }
+    return true;
+}
+
 /// True when `length` is that of a bitmap representation: the BMP and up to 16 more planes.
 bool IsPlausibleBitmapLength(uint32_t length) {
     return length >= 8192 && (length - 8192) % 8193 == 0 && (length - 8192) / 8193 <= 16;
@@ -293,14 +307,8 @@ long TCFResurrectContext::ContainerCount(const char* label) {
 __CFArray const* TCFResurrectContext::ResurrectCFArray() {
     const long count = ContainerCount("cfarray");
     ElementTable table(0);
-    for (long i = 0; i < count; ++i) {
-        ReserveElement(table, static_cast<unsigned long>(i), count);
-        table[i] = Resurrect(kTCFTypeAny);
-        if (!table[i]) {
-            ReleaseElements(table, i);
-            return nullptr;
-        }
-    }
+    if (!ResurrectElements(*this, count, table))
+        return nullptr;
     CFArrayRef array =
         CFArrayCreate(kCFAllocatorDefault, table.GetBuffer(), count, &kCFTypeArrayCallBacks);
     ReleaseElements(table, count);
@@ -310,14 +318,8 @@ __CFArray const* TCFResurrectContext::ResurrectCFArray() {
 __CFSet const* TCFResurrectContext::ResurrectCFSet() {
     const long count = ContainerCount("cfarray");
     ElementTable table(0);
-    for (long i = 0; i < count; ++i) {
-        ReserveElement(table, static_cast<unsigned long>(i), count);
-        table[i] = Resurrect(kTCFTypeAny);
-        if (!table[i]) {
-            ReleaseElements(table, i);
-            return nullptr;
-        }
-    }
+    if (!ResurrectElements(*this, count, table))
+        return nullptr;
     CFSetRef set = CFSetCreate(kCFAllocatorDefault, table.GetBuffer(), count, &kCFTypeSetCallBacks);
     ReleaseElements(table, count);
     return set;
