@@ -1,0 +1,102 @@
+// The "Localized" table: Qt translations whose context is "Localized" and whose source texts are
+// the keys. The compiled tables are embedded under :/translations as Localized_<language>.qm.
+#include "UIAgent/QZLocalizedString.h"
+
+#include <QCoreApplication>
+#include <QFile>
+#include <QLocale>
+#include <QPointer>
+#include <QTranslator>
+#include <vector>
+
+QString QZLocalizedString(const char* key) {
+    // translate() answers the source text, that is the key, when no table holds it.
+    return QCoreApplication::translate("Localized", key);
+}
+
+/// Fills the placeholders of `format` in one pass, so that an argument that itself holds a
+/// placeholder (an application called "%@") is shown as it is. Placeholders: "%@" takes the next
+/// argument; "%N$@" and Qt's "%N" (N from 1 to 99) take argument N; "%%" is a percent sign. A
+/// placeholder without an argument, and anything else after a "%", is kept as written.
+static QString FillPlaceholders(const QString& format, const std::vector<QString>& arguments) {
+    QString result;
+    result.reserve(format.size());
+    size_t next = 0;
+    const qsizetype length = format.size();
+    qsizetype i = 0;
+    while (i < length) {
+        const QChar c = format[i];
+        if (c != u'%' || i + 1 == length) {
+            result += c;
+            ++i;
+            continue;
+        }
+        const QChar d = format[i + 1];
+        if (d == u'%') {
+            result += u'%';
+            i += 2;
+            continue;
+        }
+        if (d == u'@') {
+            if (next < arguments.size())
+                result += arguments[next++];
+            else
+                result += QStringLiteral("%@");
+            i += 2;
+            continue;
+        }
+        if (d.isDigit() && d != u'0') {
+            qsizetype end = i + 1;
+            size_t number = 0;
+            while (end < length && end < i + 3 && format[end].isDigit()) {
+                number = number * 10 + static_cast<size_t>(format[end].digitValue());
+                ++end;
+            }
+            // "%N$@" is the positional object placeholder; a bare "%N" is Qt's.
+            if (end + 1 < length && format[end] == u'$' && format[end + 1] == u'@')
+                end += 2;
+            if (number <= arguments.size())
+                result += arguments[number - 1];
+            else
+                result += format.mid(i, end - i);
+            i = end;
+            continue;
+        }
+        result += c;
+        ++i;
+    }
+    return result;
+}
+
+QString QZLocalizedFormat(const char* key, std::initializer_list<QString> arguments) {
+    return FillPlaceholders(QZLocalizedString(key), std::vector<QString>(arguments));
+}
+
+QString QZTranslationFileFor(const QLocale& locale) {
+    // QTranslator::load walks the locale's languages in order of preference and, for each, the
+    // shorter forms of its name (zh_Hans_CN, zh_Hans, zh), so a probe translator finds the file.
+    QTranslator probe;
+    if (probe.load(locale, QStringLiteral("Localized"), QStringLiteral("_"),
+                   QStringLiteral(":/translations")))
+        return probe.filePath();
+    // No table for any of the user's languages: English texts rather than bare keys.
+    const QString english = QStringLiteral(":/translations/Localized_en.qm");
+    return QFile::exists(english) ? english : QString();
+}
+
+void QZInstallTranslations() {
+    // Parented to the application, so it goes with it; the pointer notices.
+    static QPointer<QTranslator> translator;
+    if (!QCoreApplication::instance())
+        return;
+    if (translator) {
+        QCoreApplication::removeTranslator(translator);
+        delete translator.data();
+    }
+    const QString file = QZTranslationFileFor(QLocale());
+    if (file.isEmpty())
+        return;
+    translator = new QTranslator(QCoreApplication::instance());
+    if (translator->load(file))
+        QCoreApplication::installTranslator(translator);
+}

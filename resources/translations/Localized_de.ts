@@ -1,0 +1,122 @@
+<?xml version="1.0" encoding="utf-8"?>
+<!DOCTYPE TS>
+<TS version="2.1" language="de_DE" sourcelanguage="en_US">
+<context>
+    <name>Localized</name>
+    <message>
+        <source>QZ_HEADLINE_FONT</source>
+        <extracomment>Headline of the font-use alert. %1: application name, %2: font name.</extracomment>
+        <translation>%1 möchte die Schrift „%2“ verwenden, die nicht installiert ist.</translation>
+    </message>
+    <message>
+        <source>QZ_HEADLINE_FONT_VOLUME</source>
+        <extracomment>Headline of the font-use alert when the font file lies on another volume. %1: application name, %2: font name, %3: volume name.</extracomment>
+        <translation>%1 möchte die Schrift „%2“ verwenden, die nicht installiert ist, aber auf dem Volume „%3“ gefunden wurde.</translation>
+    </message>
+    <message>
+        <source>QZ_DETAIL_FONT_NOT_INSTALLED</source>
+        <extracomment>Detail text of the font-use alert.</extracomment>
+        <translation>Die Schrift ist nicht installiert, aber eine Schriftdatei, die sie enthält, wurde gefunden. Wenn Sie es erlauben, kann das Programm die Schrift verwenden.</translation>
+    </message>
+    <message>
+        <source>QZ_BUTTON_ALLOW</source>
+        <extracomment>Button: let the application use the font.</extracomment>
+        <translation>Erlauben</translation>
+    </message>
+    <message>
+        <source>QZ_BUTTON_DISALLOW</source>
+        <extracomment>Button: do not let the application use the font.</extracomment>
+        <translation>Nicht erlauben</translation>
+    </message>
+    <message>
+        <source>QZ_BUTTON_SHOW_IN_FINDER</source>
+        <extracomment>Button: show the font files in the file manager; the question stays.</extracomment>
+        <translation>Im Dateimanager zeigen</translation>
+    </message>
+    <message>
+        <source>QZ_DO_NOT_WARN_APPLICATION</source>
+        <extracomment>Checkbox of the font-use alert. %1: application name.</extracomment>
+        <translation>Für %1 nicht mehr fragen</translation>
+    </message>
+    <message>
+        <source>QZ_AUTO_ACTIVATION_HELP_ANCHOR</source>
+        <extracomment>Not shown: the anchor of the help page section opened by the alert's help button. Keep it as it is.</extracomment>
+        <translation>auto-activation</translation>
+    </message>
+    <message>
+        <source>QZ_CURRENT_APPLICATION</source>
+        <extracomment>Stands for the application name when none is known; used inside the other texts.</extracomment>
+        <translation>Das aktuelle Programm</translation>
+    </message>
+    <message>
+        <source>QZ_HEADLINE_NEEDS_TO_DOWNLOAD_FONT_NAME</source>
+        <extracomment>Headline of the download alert for one font. %1: application name, %2: font name.</extracomment>
+        <translation>%1 muss die Schrift „%2“ herunterladen.</translation>
+    </message>
+    <message>
+        <source>QZ_HEADLINE_NEEDS_TO_DOWNLOAD</source>
+        <extracomment>Headline of the download alert for several fonts. %1: application name.</extracomment>
+        <translation>%1 muss Schriften herunterladen.</translation>
+    </message>
+    <message>
+        <source>QZ_DETAIL_FONT_SIZE</source>
+        <extracomment>Detail text of the download alert for one font. %1: font name, %2: size (such as 12.3 MB).</extracomment>
+        <translation>Die Schrift „%1“ ist %2 groß. Möchten Sie sie herunterladen?</translation>
+    </message>
+    <message>
+        <source>QZ_DETAIL_DOWNLOAD_SIZE</source>
+        <extracomment>Detail text of the download alert for several fonts. %1: total size (such as 12.3 MB).</extracomment>
+        <translation>Der Download umfasst insgesamt %1. Möchten Sie die Schriften herunterladen?</translation>
+    </message>
+    <message>
+        <source>Skip</source>
+        <extracomment>Button of the download alert: do not download.</extracomment>
+        <translation>Überspringen</translation>
+    </message>
+    <message>
+        <source>Download</source>
+        <extracomment>Button of the download alert: download the fonts.</extracomment>
+        <translation>Herunterladen</translation>
+    </message>
+    <message>
+        <source>QZ_PREPARING_TO_DOWNLOAD</source>
+        <extracomment>Status line of the download window before the first font.</extracomment>
+        <translation>Download wird vorbereitet …</translation>
+    </message>
+    <message>
+        <source>QZ_PREPARING_TO_DOWNLOAD_FONT</source>
+        <extracomment>Status line of the download window. %1: font name.</extracomment>
+        <translation>Download von „%1“ wird vorbereitet …</translation>
+    </message>
+    <message>
+        <source>QZ_DOWNLOADING_FONT</source>
+        <extracomment>Status line of the download window. %1: font name.</extracomment>
+        <translation>„%1“ wird heruntergeladen …</translation>
+    </message>
+    <message>
+        <source>%1$@ of %2$@</source>
+        <extracomment>Size line of the download window. %1: size downloaded so far, %2: total size.</extracomment>
+        <translation>%1 von %2</translation>
+    </message>
+    <message>
+        <source>Continue Download</source>
+        <extracomment>Button: go on with the download after an error or while offline.</extracomment>
+        <translation>Download fortsetzen</translation>
+    </message>
+    <message>
+        <source>Cancel</source>
+        <extracomment>Button: stop the download.</extracomment>
+        <translation>Abbrechen</translation>
+    </message>
+    <message>
+        <source>Network is not connected.</source>
+        <extracomment>Headline of the offline alert.</extracomment>
+        <translation>Keine Netzwerkverbindung.</translation>
+    </message>
+    <message>
+        <source>You are not connected to the Internet. Do you want to cancel downloading?</source>
+        <extracomment>Detail text of the offline alert; its default button is Cancel.</extracomment>
+        <translation>Sie sind nicht mit dem Internet verbunden. Möchten Sie den Download abbrechen?</translation>
+    </message>
+</context>
+</TS>

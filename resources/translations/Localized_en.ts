@@ -1,0 +1,122 @@
+<?xml version="1.0" encoding="utf-8"?>
+<!DOCTYPE TS>
+<TS version="2.1" language="en_US" sourcelanguage="en_US">
+<context>
+    <name>Localized</name>
+    <message>
+        <source>QZ_HEADLINE_FONT</source>
+        <extracomment>Headline of the font-use alert. %1: application name, %2: font name.</extracomment>
+        <translation>%1 wants to use the font “%2”, which is not installed.</translation>
+    </message>
+    <message>
+        <source>QZ_HEADLINE_FONT_VOLUME</source>
+        <extracomment>Headline of the font-use alert when the font file lies on another volume. %1: application name, %2: font name, %3: volume name.</extracomment>
+        <translation>%1 wants to use the font “%2”, which is not installed but was found on the volume “%3”.</translation>
+    </message>
+    <message>
+        <source>QZ_DETAIL_FONT_NOT_INSTALLED</source>
+        <extracomment>Detail text of the font-use alert.</extracomment>
+        <translation>The font is not installed, but a font file that contains it was found. If you allow it, the application can use the font.</translation>
+    </message>
+    <message>
+        <source>QZ_BUTTON_ALLOW</source>
+        <extracomment>Button: let the application use the font.</extracomment>
+        <translation>Allow</translation>
+    </message>
+    <message>
+        <source>QZ_BUTTON_DISALLOW</source>
+        <extracomment>Button: do not let the application use the font.</extracomment>
+        <translation>Don’t Allow</translation>
+    </message>
+    <message>
+        <source>QZ_BUTTON_SHOW_IN_FINDER</source>
+        <extracomment>Button: show the font files in the file manager; the question stays.</extracomment>
+        <translation>Show in File Manager</translation>
+    </message>
+    <message>
+        <source>QZ_DO_NOT_WARN_APPLICATION</source>
+        <extracomment>Checkbox of the font-use alert. %1: application name.</extracomment>
+        <translation>Don’t ask again for %1</translation>
+    </message>
+    <message>
+        <source>QZ_AUTO_ACTIVATION_HELP_ANCHOR</source>
+        <extracomment>Not shown: the anchor of the help page section opened by the alert's help button. Keep it as it is.</extracomment>
+        <translation>auto-activation</translation>
+    </message>
+    <message>
+        <source>QZ_CURRENT_APPLICATION</source>
+        <extracomment>Stands for the application name when none is known; used inside the other texts.</extracomment>
+        <translation>The current application</translation>
+    </message>
+    <message>
+        <source>QZ_HEADLINE_NEEDS_TO_DOWNLOAD_FONT_NAME</source>
+        <extracomment>Headline of the download alert for one font. %1: application name, %2: font name.</extracomment>
+        <translation>%1 needs to download the font “%2”.</translation>
+    </message>
+    <message>
+        <source>QZ_HEADLINE_NEEDS_TO_DOWNLOAD</source>
+        <extracomment>Headline of the download alert for several fonts. %1: application name.</extracomment>
+        <translation>%1 needs to download fonts.</translation>
+    </message>
+    <message>
+        <source>QZ_DETAIL_FONT_SIZE</source>
+        <extracomment>Detail text of the download alert for one font. %1: font name, %2: size (such as 12.3 MB).</extracomment>
+        <translation>The font “%1” is %2. Do you want to download it?</translation>
+    </message>
+    <message>
+        <source>QZ_DETAIL_DOWNLOAD_SIZE</source>
+        <extracomment>Detail text of the download alert for several fonts. %1: total size (such as 12.3 MB).</extracomment>
+        <translation>The download is %1 in total. Do you want to download the fonts?</translation>
+    </message>
+    <message>
+        <source>Skip</source>
+        <extracomment>Button of the download alert: do not download.</extracomment>
+        <translation>Skip</translation>
+    </message>
+    <message>
+        <source>Download</source>
+        <extracomment>Button of the download alert: download the fonts.</extracomment>
+        <translation>Download</translation>
+    </message>
+    <message>
+        <source>QZ_PREPARING_TO_DOWNLOAD</source>
+        <extracomment>Status line of the download window before the first font.</extracomment>
+        <translation>Preparing to download…</translation>
+    </message>
+    <message>
+        <source>QZ_PREPARING_TO_DOWNLOAD_FONT</source>
+        <extracomment>Status line of the download window. %1: font name.</extracomment>
+        <translation>Preparing to download “%1”…</translation>
+    </message>
+    <message>
+        <source>QZ_DOWNLOADING_FONT</source>
+        <extracomment>Status line of the download window. %1: font name.</extracomment>
+        <translation>Downloading “%1”…</translation>
+    </message>
+    <message>
+        <source>%1$@ of %2$@</source>
+        <extracomment>Size line of the download window. %1: size downloaded so far, %2: total size.</extracomment>
+        <translation>%1 of %2</translation>
+    </message>
+    <message>
+        <source>Continue Download</source>
+        <extracomment>Button: go on with the download after an error or while offline.</extracomment>
+        <translation>Continue Download</translation>
+    </message>
+    <message>
+        <source>Cancel</source>
+        <extracomment>Button: stop the download.</extracomment>
+        <translation>Cancel</translation>
+    </message>
+    <message>
+        <source>Network is not connected.</source>
+        <extracomment>Headline of the offline alert.</extracomment>
+        <translation>Network is not connected.</translation>
+    </message>
+    <message>
+        <source>You are not connected to the Internet. Do you want to cancel downloading?</source>
+        <extracomment>Detail text of the offline alert; its default button is Cancel.</extracomment>
+        <translation>You are not connected to the Internet. Do you want to cancel downloading?</translation>
+    </message>
+</context>
+</TS>

@@ -1,0 +1,122 @@
+<?xml version="1.0" encoding="utf-8"?>
+<!DOCTYPE TS>
+<TS version="2.1" language="fr_FR" sourcelanguage="en_US">
+<context>
+    <name>Localized</name>
+    <message>
+        <source>QZ_HEADLINE_FONT</source>
+        <extracomment>Headline of the font-use alert. %1: application name, %2: font name.</extracomment>
+        <translation>%1 souhaite utiliser la police « %2 », qui n’est pas installée.</translation>
+    </message>
+    <message>
+        <source>QZ_HEADLINE_FONT_VOLUME</source>
+        <extracomment>Headline of the font-use alert when the font file lies on another volume. %1: application name, %2: font name, %3: volume name.</extracomment>
+        <translation>%1 souhaite utiliser la police « %2 », qui n’est pas installée mais a été trouvée sur le volume « %3 ».</translation>
+    </message>
+    <message>
+        <source>QZ_DETAIL_FONT_NOT_INSTALLED</source>
+        <extracomment>Detail text of the font-use alert.</extracomment>
+        <translation>La police n’est pas installée, mais un fichier de police qui la contient a été trouvé. Si vous l’autorisez, l’application pourra utiliser cette police.</translation>
+    </message>
+    <message>
+        <source>QZ_BUTTON_ALLOW</source>
+        <extracomment>Button: let the application use the font.</extracomment>
+        <translation>Autoriser</translation>
+    </message>
+    <message>
+        <source>QZ_BUTTON_DISALLOW</source>
+        <extracomment>Button: do not let the application use the font.</extracomment>
+        <translation>Ne pas autoriser</translation>
+    </message>
+    <message>
+        <source>QZ_BUTTON_SHOW_IN_FINDER</source>
+        <extracomment>Button: show the font files in the file manager; the question stays.</extracomment>
+        <translation>Afficher dans le gestionnaire de fichiers</translation>
+    </message>
+    <message>
+        <source>QZ_DO_NOT_WARN_APPLICATION</source>
+        <extracomment>Checkbox of the font-use alert. %1: application name.</extracomment>
+        <translation>Ne plus demander pour %1</translation>
+    </message>
+    <message>
+        <source>QZ_AUTO_ACTIVATION_HELP_ANCHOR</source>
+        <extracomment>Not shown: the anchor of the help page section opened by the alert's help button. Keep it as it is.</extracomment>
+        <translation>auto-activation</translation>
+    </message>
+    <message>
+        <source>QZ_CURRENT_APPLICATION</source>
+        <extracomment>Stands for the application name when none is known; used inside the other texts.</extracomment>
+        <translation>L’application actuelle</translation>
+    </message>
+    <message>
+        <source>QZ_HEADLINE_NEEDS_TO_DOWNLOAD_FONT_NAME</source>
+        <extracomment>Headline of the download alert for one font. %1: application name, %2: font name.</extracomment>
+        <translation>%1 doit télécharger la police « %2 ».</translation>
+    </message>
+    <message>
+        <source>QZ_HEADLINE_NEEDS_TO_DOWNLOAD</source>
+        <extracomment>Headline of the download alert for several fonts. %1: application name.</extracomment>
+        <translation>%1 doit télécharger des polices.</translation>
+    </message>
+    <message>
+        <source>QZ_DETAIL_FONT_SIZE</source>
+        <extracomment>Detail text of the download alert for one font. %1: font name, %2: size (such as 12.3 MB).</extracomment>
+        <translation>La police « %1 » occupe %2. Voulez-vous la télécharger ?</translation>
+    </message>
+    <message>
+        <source>QZ_DETAIL_DOWNLOAD_SIZE</source>
+        <extracomment>Detail text of the download alert for several fonts. %1: total size (such as 12.3 MB).</extracomment>
+        <translation>Le téléchargement représente %1 au total. Voulez-vous télécharger les polices ?</translation>
+    </message>
+    <message>
+        <source>Skip</source>
+        <extracomment>Button of the download alert: do not download.</extracomment>
+        <translation>Ignorer</translation>
+    </message>
+    <message>
+        <source>Download</source>
+        <extracomment>Button of the download alert: download the fonts.</extracomment>
+        <translation>Télécharger</translation>
+    </message>
+    <message>
+        <source>QZ_PREPARING_TO_DOWNLOAD</source>
+        <extracomment>Status line of the download window before the first font.</extracomment>
+        <translation>Préparation du téléchargement…</translation>
+    </message>
+    <message>
+        <source>QZ_PREPARING_TO_DOWNLOAD_FONT</source>
+        <extracomment>Status line of the download window. %1: font name.</extracomment>
+        <translation>Préparation du téléchargement de « %1 »…</translation>
+    </message>
+    <message>
+        <source>QZ_DOWNLOADING_FONT</source>
+        <extracomment>Status line of the download window. %1: font name.</extracomment>
+        <translation>Téléchargement de « %1 »…</translation>
+    </message>
+    <message>
+        <source>%1$@ of %2$@</source>
+        <extracomment>Size line of the download window. %1: size downloaded so far, %2: total size.</extracomment>
+        <translation>%1 sur %2</translation>
+    </message>
+    <message>
+        <source>Continue Download</source>
+        <extracomment>Button: go on with the download after an error or while offline.</extracomment>
+        <translation>Poursuivre le téléchargement</translation>
+    </message>
+    <message>
+        <source>Cancel</source>
+        <extracomment>Button: stop the download.</extracomment>
+        <translation>Annuler</translation>
+    </message>
+    <message>
+        <source>Network is not connected.</source>
+        <extracomment>Headline of the offline alert.</extracomment>
+        <translation>Le réseau n’est pas connecté.</translation>
+    </message>
+    <message>
+        <source>You are not connected to the Internet. Do you want to cancel downloading?</source>
+        <extracomment>Detail text of the offline alert; its default button is Cancel.</extracomment>
+        <translation>Vous n’êtes pas connecté à Internet. Voulez-vous annuler le téléchargement ?</translation>
+    </message>
+</context>
+</TS>

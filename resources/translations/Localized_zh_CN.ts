@@ -1,0 +1,122 @@
+<?xml version="1.0" encoding="utf-8"?>
+<!DOCTYPE TS>
+<TS version="2.1" language="zh_CN" sourcelanguage="en_US">
+<context>
+    <name>Localized</name>
+    <message>
+        <source>QZ_HEADLINE_FONT</source>
+        <extracomment>Headline of the font-use alert. %1: application name, %2: font name.</extracomment>
+        <translation>“%1”想要使用未安装的字体“%2”。</translation>
+    </message>
+    <message>
+        <source>QZ_HEADLINE_FONT_VOLUME</source>
+        <extracomment>Headline of the font-use alert when the font file lies on another volume. %1: application name, %2: font name, %3: volume name.</extracomment>
+        <translation>“%1”想要使用未安装的字体“%2”，该字体位于卷“%3”上。</translation>
+    </message>
+    <message>
+        <source>QZ_DETAIL_FONT_NOT_INSTALLED</source>
+        <extracomment>Detail text of the font-use alert.</extracomment>
+        <translation>该字体尚未安装，但已找到包含该字体的字体文件。如果允许，该应用程序即可使用此字体。</translation>
+    </message>
+    <message>
+        <source>QZ_BUTTON_ALLOW</source>
+        <extracomment>Button: let the application use the font.</extracomment>
+        <translation>允许</translation>
+    </message>
+    <message>
+        <source>QZ_BUTTON_DISALLOW</source>
+        <extracomment>Button: do not let the application use the font.</extracomment>
+        <translation>不允许</translation>
+    </message>
+    <message>
+        <source>QZ_BUTTON_SHOW_IN_FINDER</source>
+        <extracomment>Button: show the font files in the file manager; the question stays.</extracomment>
+        <translation>在文件管理器中显示</translation>
+    </message>
+    <message>
+        <source>QZ_DO_NOT_WARN_APPLICATION</source>
+        <extracomment>Checkbox of the font-use alert. %1: application name.</extracomment>
+        <translation>不再针对“%1”询问</translation>
+    </message>
+    <message>
+        <source>QZ_AUTO_ACTIVATION_HELP_ANCHOR</source>
+        <extracomment>Not shown: the anchor of the help page section opened by the alert's help button. Keep it as it is.</extracomment>
+        <translation>auto-activation</translation>
+    </message>
+    <message>
+        <source>QZ_CURRENT_APPLICATION</source>
+        <extracomment>Stands for the application name when none is known; used inside the other texts.</extracomment>
+        <translation>当前应用程序</translation>
+    </message>
+    <message>
+        <source>QZ_HEADLINE_NEEDS_TO_DOWNLOAD_FONT_NAME</source>
+        <extracomment>Headline of the download alert for one font. %1: application name, %2: font name.</extracomment>
+        <translation>“%1”需要下载字体“%2”。</translation>
+    </message>
+    <message>
+        <source>QZ_HEADLINE_NEEDS_TO_DOWNLOAD</source>
+        <extracomment>Headline of the download alert for several fonts. %1: application name.</extracomment>
+        <translation>“%1”需要下载字体。</translation>
+    </message>
+    <message>
+        <source>QZ_DETAIL_FONT_SIZE</source>
+        <extracomment>Detail text of the download alert for one font. %1: font name, %2: size (such as 12.3 MB).</extracomment>
+        <translation>字体“%1”的大小为 %2。要下载吗？</translation>
+    </message>
+    <message>
+        <source>QZ_DETAIL_DOWNLOAD_SIZE</source>
+        <extracomment>Detail text of the download alert for several fonts. %1: total size (such as 12.3 MB).</extracomment>
+        <translation>下载总大小为 %1。要下载这些字体吗？</translation>
+    </message>
+    <message>
+        <source>Skip</source>
+        <extracomment>Button of the download alert: do not download.</extracomment>
+        <translation>跳过</translation>
+    </message>
+    <message>
+        <source>Download</source>
+        <extracomment>Button of the download alert: download the fonts.</extracomment>
+        <translation>下载</translation>
+    </message>
+    <message>
+        <source>QZ_PREPARING_TO_DOWNLOAD</source>
+        <extracomment>Status line of the download window before the first font.</extracomment>
+        <translation>正在准备下载…</translation>
+    </message>
+    <message>
+        <source>QZ_PREPARING_TO_DOWNLOAD_FONT</source>
+        <extracomment>Status line of the download window. %1: font name.</extracomment>
+        <translation>正在准备下载“%1”…</translation>
+    </message>
+    <message>
+        <source>QZ_DOWNLOADING_FONT</source>
+        <extracomment>Status line of the download window. %1: font name.</extracomment>
+        <translation>正在下载“%1”…</translation>
+    </message>
+    <message>
+        <source>%1$@ of %2$@</source>
+        <extracomment>Size line of the download window. %1: size downloaded so far, %2: total size.</extracomment>
+        <translation>%1 / %2</translation>
+    </message>
+    <message>
+        <source>Continue Download</source>
+        <extracomment>Button: go on with the download after an error or while offline.</extracomment>
+        <translation>继续下载</translation>
+    </message>
+    <message>
+        <source>Cancel</source>
+        <extracomment>Button: stop the download.</extracomment>
+        <translation>取消</translation>
+    </message>
+    <message>
+        <source>Network is not connected.</source>
+        <extracomment>Headline of the offline alert.</extracomment>
+        <translation>网络未连接。</translation>
+    </message>
+    <message>
+        <source>You are not connected to the Internet. Do you want to cancel downloading?</source>
+        <extracomment>Detail text of the offline alert; its default button is Cancel.</extracomment>
+        <translation>您尚未连接到互联网。要取消下载吗？</translation>
+    </message>
+</context>
+</TS>

@@ -1,0 +1,81 @@
+// The Qt run-loop driver: readiness reaches the callback, also from nested loops, and callbacks
+// may unwatch their own descriptor.
+#include <QEventLoop>
+#include <QTimer>
+#include <fcntl.h>
+#include <unistd.h>
+
+#include "UIAgent/QZQtRunLoopDriver.h"
+#include "tests/UIAgent/QtTestEnvironment.h"
+
+namespace {
+
+using glyphwell::testing::SpinUntil;
+using namespace std::chrono_literals;
+
+class Pipe {
+public:
+    Pipe() { EXPECT_EQ(pipe2(ends, O_NONBLOCK | O_CLOEXEC), 0); }
+    ~Pipe() {
+        close(ends[0]);
+        close(ends[1]);
+    }
+    void Put() { EXPECT_EQ(write(ends[1], "x", 1), 1); }
+    bool Take() {
+        char byte;
+        return read(ends[0], &byte, 1) == 1;
+    }
+    int ends[2] = {-1, -1};
+};
+
+TEST(QtRunLoopDriver, ReadinessReachesTheCallbackUntilUnwatched) {
+    QZQtRunLoopDriver driver;
+    Pipe pipe;
+    int reads = 0, writes = 0;
+    driver.Watch(pipe.ends[0], true, false, [&](bool readable, bool writable) {
+        reads += readable;
+        writes += writable;
+        pipe.Take();
+    });
+    pipe.Put();
+    ASSERT_TRUE(SpinUntil([&] { return reads == 1; }));
+    EXPECT_EQ(writes, 0);
+
+    // Write interest on the other end: an empty pipe is writable at once.
+    bool writable = false;
+    driver.Watch(pipe.ends[1], false, true, [&](bool, bool w) {
+        writable = w;
+        driver.Watch(pipe.ends[1], false, false, [](bool, bool) {});
+    });
+    ASSERT_TRUE(SpinUntil([&] { return writable; }));
+
+    driver.Unwatch(pipe.ends[0]);
+    pipe.Put();
+    SpinUntil([] { return false; }, 50ms);
+    EXPECT_EQ(reads, 1);
+}
+
+TEST(QtRunLoopDriver, CallbacksNestAndMayUnwatchThemselves) {
+    QZQtRunLoopDriver driver;
+    Pipe first, second;
+    std::vector<std::string> order;
+    driver.Watch(first.ends[0], true, false, [&](bool, bool) {
+        first.Take();
+        driver.Unwatch(first.ends[0]);
+        order.push_back("first begins");
+        // A modal alert's nested loop: the second descriptor is served inside it.
+        second.Put();
+        SpinUntil([&] { return order.size() == 2; });
+        order.push_back("first ends");
+    });
+    driver.Watch(second.ends[0], true, false, [&](bool, bool) {
+        second.Take();
+        order.push_back("second");
+    });
+    first.Put();
+    ASSERT_TRUE(SpinUntil([&] { return order.size() == 3; }));
+    EXPECT_EQ(order, (std::vector<std::string>{"first begins", "second", "first ends"}));
+    EXPECT_EQ(driver.WatchedCount(), 1u);
+}
+
+} // namespace
