@@ -1,6 +1,7 @@
 // URLs: the reference text exactly as given (UTF-8) and an optional base URL. uriparser checks
 // that the text is an RFC 3986 reference and resolves it against its base; the parts of a
 // reference are found with the RFC's own split (appendix B), which is exact for valid text.
+#include <algorithm>
 #include "platform/CFURL.h"
 
 #include <uriparser/Uri.h>
@@ -312,8 +313,26 @@ CFURLRef CreateURL(std::string text, CFURLRef base) {
     GW_ASSERT(base == nullptr || CFGetTypeID(base) == kURLKind);
     if (base && CFGetTypeID(base) != kURLKind)
         base = nullptr;
-    if (!text::IsValidUTF8(reinterpret_cast<const uint8_t*>(text.data()), text.size()) ||
-        !ParsedReference(text).ok())
+    if (!text::IsValidUTF8(reinterpret_cast<const uint8_t*>(text.data()), text.size()))
+        return nullptr;
+    // International text (an IRI) becomes its URI: each byte of a non-ASCII character is
+    // percent-encoded (RFC 3987, section 3.1), so that such a URL is kept, not refused.
+    if (std::any_of(text.begin(), text.end(), [](char c) { return (unsigned char)c >= 0x80; })) {
+        static const char digits[] = "0123456789ABCDEF";
+        std::string encoded;
+        for (char c : text) {
+            const unsigned char byte = static_cast<unsigned char>(c);
+            if (byte < 0x80) {
+                encoded += c;
+            } else {
+                encoded += '%';
+                encoded += digits[byte >> 4];
+                encoded += digits[byte & 15];
+            }
+        }
+        text = std::move(encoded);
+    }
+    if (!ParsedReference(text).ok())
         return nullptr;
     if (Split(text).scheme.present)
         base = nullptr;

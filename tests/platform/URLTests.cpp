@@ -129,10 +129,19 @@ TEST(URL, KeepsItsOwnStringAndHandsOutTheSameURLWhenAlreadyAbsolute) {
 }
 
 TEST(URL, RejectsBytesThatAreNotAReference) {
-    for (const char* text : {"a b", "%zz", "http://a/\xC3", "caf\xC3\xA9", "x\x01", ":no-scheme"})
+    for (const char* text : {"a b", "%zz", "http://a/\xC3", "x\x01", ":no-scheme"})
         EXPECT_FALSE(URL(text)) << text;
     using namespace std::string_literals;
     EXPECT_FALSE(URL("a\0b"s));
+}
+
+TEST(URL, InternationalTextIsKeptPercentEncoded) {
+    auto url = URL("file:///Schriften/Gr\xC3\xBC\xC3\x9F" "e.ttf");
+    ASSERT_TRUE(url);
+    EXPECT_EQ(Bytes(url.get()), "file:///Schriften/Gr%C3%BC%C3%9Fe.ttf");
+    UInt8 path[64] = {};
+    ASSERT_TRUE(CFURLGetFileSystemRepresentation(url.get(), true, path, sizeof path));
+    EXPECT_EQ(std::string(reinterpret_cast<char*>(path)), "/Schriften/Gr\xC3\xBC\xC3\x9F" "e.ttf");
 }
 
 TEST(URL, EmptyBytesGiveAnEmptyRelativeURL) {
