@@ -7,13 +7,14 @@
 
 #include "serialization/TCFFlattenContext.h"
 #include "serialization/TCFResurrectContext.h"
+#include "tools/SendCommand.h"
 #include "tools/TaggedJSON.h"
 
 namespace glyphwell::tools {
 
 namespace {
 
-const char kUsage[] =
+const char kCodecUsage[] =
     "usage: glyphwell <command> [options]\n"
     "\n"
     "commands:\n"
@@ -21,8 +22,9 @@ const char kUsage[] =
     "  decode [FILE|-] [--expect KIND] [--compact]\n"
     "                                     flattened bytes (file or stdin) to tagged JSON;\n"
     "                                     KIND: any (default), string, number, boolean, data,\n"
-    "                                     charset, array, dictionary, set, url, uuid, error\n"
-    "  help                               this text\n";
+    "                                     charset, array, dictionary, set, url, uuid, error\n";
+const std::string kUsage =
+    std::string(kCodecUsage) + kSendUsage + "  help                               this text\n";
 
 /// Reads the whole input named by `path` ("-" or empty: `in`). False with a message on failure.
 bool ReadInput(const std::string& path, std::istream& in, std::string* text, std::string* error) {
@@ -248,6 +250,12 @@ int RunTool(const std::vector<std::string>& arguments, std::istream& in, std::os
         return RunEncode(rest, in, out, err);
     if (command == "decode")
         return RunDecode(rest, in, out, err);
+    if (command == "send")
+        return RunSend(rest, in, out, err);
+    if (command == "ask-activation")
+        return RunAskActivation(rest, in, out, err);
+    if (command == "ask-download")
+        return RunAskDownload(rest, in, out, err);
     if (command == "help" || command == "--help" || command == "-h") {
         out << kUsage;
         return 0;

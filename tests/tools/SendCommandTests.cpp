@@ -1,0 +1,146 @@
+// The verbs that talk to a port: against a local port served on a thread of the test.
+#include <gtest/gtest.h>
+
+#include <nlohmann/json.hpp>
+#include <sstream>
+
+#include "support/PortTestSupport.h"
+#include "tools/Commands.h"
+
+using namespace glyphwell::testing;
+
+namespace {
+
+const char kName[] = "org.glyphwell.Test.Tool";
+
+struct Result {
+    int status;
+    std::string out;
+    std::string err;
+};
+
+Result Invoke(std::vector<std::string> arguments, const std::string& input = "") {
+    std::istringstream in(input);
+    std::ostringstream out, err;
+    const int status = glyphwell::tools::RunTool(arguments, in, out, err);
+    return {status, out.str(), err.str()};
+}
+
+/// A server that replies with the request's own bytes and remembers the last message id.
+class EchoServer {
+public:
+    EchoServer()
+        : server_(kName, [this](SInt32 msgid, CFDataRef data) -> CFDataRef {
+              lastMsgid = msgid;
+              lastLength = CFDataGetLength(data);
+              std::lock_guard<std::mutex> lock(mutex_);
+              return reply_.empty() ? CFDataCreateCopy(kCFAllocatorDefault, data)
+                                    : CreateCFData(reply_);
+          }) {}
+
+    bool Started() const { return server_.Started(); }
+    /// Answers later requests with these bytes instead.
+    void SetReply(const std::string& bytes) {
+        std::lock_guard<std::mutex> lock(mutex_);
+        reply_ = bytes;
+    }
+
+    std::atomic<SInt32> lastMsgid{0};
+    std::atomic<CFIndex> lastLength{-1};
+
+private:
+    std::mutex mutex_;
+    std::string reply_;
+    PortServer server_;
+};
+
+class SendCommandTest : public ::testing::Test {
+protected:
+    TemporaryRuntimeDirectory runtime_;
+};
+
+} // namespace
+
+TEST_F(SendCommandTest, PrintsTheReplyToATaggedJSONRequest) {
+    EchoServer server;
+    ASSERT_TRUE(server.Started());
+    const Result result = Invoke({"send", "--msgid", "-7", "--name", kName, "--compact"},
+                                 R"({"a": [1, {"$data": "3q0="}]})");
+    EXPECT_EQ(result.status, 0) << result.err;
+    EXPECT_EQ(result.out, "{\"a\":[1,{\"$data\":\"3q0=\"}]}\n");
+    EXPECT_EQ(result.err, "");
+    EXPECT_EQ(server.lastMsgid, -7);
+}
+
+TEST_F(SendCommandTest, SaysSoWhenTheReplyIsEmpty) {
+    EchoServer server;
+    ASSERT_TRUE(server.Started());
+    const Result result = Invoke({"send", "--msgid", "99", "--empty", "--name", kName});
+    EXPECT_EQ(result.status, 0);
+    EXPECT_EQ(result.out, "");
+    EXPECT_EQ(result.err, "glyphwell send: the reply is empty\n");
+    EXPECT_EQ(server.lastMsgid, 99);
+    EXPECT_EQ(server.lastLength, 0);
+}
+
+TEST_F(SendCommandTest, FailsWhenNothingListensOrTheReplyIsUnreadable) {
+    Result result = Invoke({"send", "--msgid", "1", "--name", kName}, "{}");
+    EXPECT_EQ(result.status, 1);
+    EXPECT_EQ(result.err, "glyphwell send: nothing answers on the port org.glyphwell.Test.Tool\n");
+
+    EchoServer server;
+    ASSERT_TRUE(server.Started());
+    server.SetReply("xyz");
+    result = Invoke({"send", "--msgid", "1", "--name", kName}, "{}");
+    EXPECT_EQ(result.status, 1);
+    const std::string last = "glyphwell send: the reply is not a readable value\n";
+    ASSERT_GE(result.err.size(), last.size());
+    EXPECT_EQ(result.err.substr(result.err.size() - last.size()), last);
+}
+
+TEST_F(SendCommandTest, AskActivationBuildsTheMessageId1Request) {
+    const Result result =
+        Invoke({"ask-activation", "--dry-run", "--compact", "--font", "Example-Bold", "--app",
+                "Writer", "--bundle", "/usr/share/applications/writer.desktop", "--candidate",
+                "/fonts/A Font.otf", "/fonts/b.ttf"});
+    ASSERT_EQ(result.status, 0) << result.err;
+    EXPECT_EQ(nlohmann::json::parse(result.out), nlohmann::json::parse(R"({
+        "QZUIPropertyApplicationName": "Writer",
+        "QZUIPropertyBundleURL": {"$url": "file:///usr/share/applications/writer.desktop"},
+        "QZUIPropertyFontName": "Example-Bold",
+        "QZUIPropertyRequestDictionary": {"NSFontNameAttribute": "Example-Bold"},
+        "QZUIPropertyCandidateFontURLs": [{"$url": "file:///fonts/A%20Font.otf"},
+                                          {"$url": "file:///fonts/b.ttf"}]
+    })"));
+}
+
+TEST_F(SendCommandTest, AskDownloadSendsTheMessageId2Request) {
+    EchoServer server;
+    ASSERT_TRUE(server.Started());
+    const Result result = Invoke({"ask-download", "--name", kName, "--compact", "--font",
+                                  "ExampleSans-Regular:Example Sans", "Other-Bold", "--app",
+                                  "Writer", "--pid", "4242", "--suppress"});
+    ASSERT_EQ(result.status, 0) << result.err;
+    EXPECT_EQ(server.lastMsgid, 2);
+    EXPECT_EQ(nlohmann::json::parse(result.out), nlohmann::json::parse(R"({
+        "QZUIPropertyApplicationName": "Writer",
+        "QZUIPropertyProcessID": {"$number": 4242, "$type": 9},
+        "QZUIPropertyFontProperties": [
+            {"NSFontNameAttribute": "ExampleSans-Regular", "NSFontFamilyAttribute": "Example Sans"},
+            {"NSFontNameAttribute": "Other-Bold"}
+        ],
+        "QZUIPropertySuppress": true
+    })"));
+}
+
+TEST_F(SendCommandTest, RejectsIncompleteCommandLines) {
+    EXPECT_EQ(Invoke({"send", "--name", kName}, "{}").err, "glyphwell send: --msgid is required\n");
+    EXPECT_EQ(Invoke({"send", "--msgid", "4294967296"}).status, 2);
+    EXPECT_EQ(Invoke({"send", "--msgid", "1", "--timeout", "soon"}).err,
+              "glyphwell send: --timeout takes seconds or \"forever\", not soon\n");
+    EXPECT_EQ(Invoke({"ask-activation", "--font", "X"}).err,
+              "glyphwell ask-activation: give the font files with --candidate\n");
+    EXPECT_EQ(Invoke({"ask-download", "--font"}).status, 2);
+    EXPECT_EQ(Invoke({"ask-download", "--font", ":Family"}).err,
+              "glyphwell ask-download: :Family has no PostScript name\n");
+}
