@@ -3,7 +3,7 @@
 #include <QSocketNotifier>
 #include <cerrno>
 #include <cstring>
-#include <sys/pidfd.h>
+#include <sys/syscall.h>
 #include <unistd.h>
 
 #include "platform/Log.h"
@@ -11,7 +11,8 @@
 QZProcessWatch::QZProcessWatch(pid_t pid, QObject* parent) : QObject(parent), pid_(pid) {
     if (pid <= 0)
         return;
-    pidfd_ = pidfd_open(pid, 0);
+    // Through syscall(2): the C library's header for it lacks C++ linkage on some systems.
+    pidfd_ = int(syscall(SYS_pidfd_open, pid, 0));
     if (pidfd_ < 0) {
         // ESRCH: the process is gone already, which is not a fault of ours.
         if (errno != ESRCH)
