@@ -42,7 +42,12 @@ struct QZQtRunLoopDriver::Entry {
 
 QZQtRunLoopDriver::QZQtRunLoopDriver() = default;
 
-QZQtRunLoopDriver::~QZQtRunLoopDriver() = default;
+QZQtRunLoopDriver::~QZQtRunLoopDriver() {
+    for (auto& [descriptor, entry] : entries_) {
+        Entry::Retire(entry->reader);
+        Entry::Retire(entry->writer);
+    }
+}
 
 void QZQtRunLoopDriver::Watch(int descriptor, bool read, bool write, Callback onEvent) {
     std::shared_ptr<Entry>& slot = entries_[descriptor];
@@ -56,10 +61,11 @@ void QZQtRunLoopDriver::Watch(int descriptor, bool read, bool write, Callback on
     auto make = [&](QSocketNotifier::Type type, bool readable) {
         auto* notifier = new QSocketNotifier(descriptor, type);
         QObject::connect(notifier, &QSocketNotifier::activated, notifier, [weak, readable] {
-            std::shared_ptr<Entry> alive = weak.lock();
-            if (!alive)
+            std::shared_ptr<Callback> callback;
+            if (std::shared_ptr<Entry> alive = weak.lock())
+                callback = alive->callback;
+            if (!callback)
                 return;
-            std::shared_ptr<Callback> callback = alive->callback;
             ++sCallbacksRunning;
             (*callback)(readable, !readable);
             --sCallbacksRunning;
@@ -77,7 +83,13 @@ void QZQtRunLoopDriver::Watch(int descriptor, bool read, bool write, Callback on
 }
 
 void QZQtRunLoopDriver::Unwatch(int descriptor) {
-    // Erasing destroys the entry, which retires its notifiers; a callback of this descriptor
-    // that is running keeps its own reference to the callback object.
-    entries_.erase(descriptor);
+    auto found = entries_.find(descriptor);
+    if (found == entries_.end())
+        return;
+    // The notifiers go now, even when a callback of this descriptor is still running (a request
+    // waiting for the user holds its connection's entry): the descriptor is about to be closed,
+    // and a notifier left on it would be polled closed.
+    Entry::Retire(found->second->reader);
+    Entry::Retire(found->second->writer);
+    entries_.erase(found);
 }

@@ -3,6 +3,7 @@
 #include <QCheckBox>
 #include <QEvent>
 #include <QMessageBox>
+#include <QPointer>
 #include <QTimer>
 #include <atomic>
 #include <functional>
@@ -282,31 +283,44 @@ TEST_F(DispatchTest, AClientThatGivesUpWithdrawsItsQuestionAndTheOthersGoOn) {
     Ref outerRequest = ActivationRequest("Impatient Application");
     Ref innerRequest = ActivationRequest("Patient Application");
 
+    // Requests are handled inside whatever loop runs, so the test acts from the event loop.
+    std::unique_ptr<Client> patient;
+    QPointer<QMessageBox> outerAlert;
+    bool innerUpWhenOuterWent = false;
+    qint64 countWhenOuterWent = 0;
+    WhenAlertAppears(nullptr, [&](QMessageBox* outer) {
+        outerAlert = outer;
+        patient = std::make_unique<Client>(1, innerRequest.get(), kCFMessagePortWaitForever);
+        WhenAlertAppears(outer, [&](QMessageBox* inner) {
+            // The impatient client gives up: its alert goes at once, the other one stays.
+            auto* poll = new QTimer;
+            QObject::connect(poll, &QTimer::timeout, [&, poll, inner] {
+                if (outerAlert && outerAlert->isVisible())
+                    return;
+                poll->stop();
+                poll->deleteLater();
+                innerUpWhenOuterWent = inner->isVisible();
+                countWhenOuterWent = controller_.alertCount();
+                Click(inner, "QZ_BUTTON_ALLOW");
+            });
+            poll->start(10);
+        });
+    });
     // The impatient client waits 1.5 s for its answer, then closes its connection.
     Client impatient(1, outerRequest.get(), 1.5);
-    QMessageBox* outerAlert = nullptr;
-    ASSERT_TRUE(SpinUntil([&] { return (outerAlert = glyphwell::testing::AlertOnScreen()); }));
-    Client patient(1, innerRequest.get(), kCFMessagePortWaitForever);
-    QMessageBox* innerAlert = nullptr;
-    ASSERT_TRUE(SpinUntil([&] {
-        innerAlert = glyphwell::testing::AlertOnScreen();
-        return innerAlert && innerAlert != outerAlert;
-    }));
+    ASSERT_TRUE(SpinUntil(
+        [&] {
+            return impatient.Done() && patient && patient->Done() && controller_.alertCount() == 0;
+        },
+        20s));
 
-    // The impatient client gives up: its alert goes at once, the other one stays.
-    ASSERT_TRUE(SpinUntil([&] { return impatient.Done(); }));
+    EXPECT_TRUE(innerUpWhenOuterWent);
+    EXPECT_EQ(countWhenOuterWent, 2);
     EXPECT_EQ(impatient.Status(), kCFMessagePortReceiveTimeout);
-    ASSERT_TRUE(SpinUntil([&] { return !outerAlert->isVisible(); }, 2s));
-    EXPECT_TRUE(innerAlert->isVisible());
-    EXPECT_EQ(controller_.alertCount(), 2);
-
-    Click(innerAlert, "QZ_BUTTON_ALLOW");
-    ASSERT_TRUE(SpinUntil([&] { return patient.Done(); }));
-    EXPECT_EQ(patient.Status(), kCFMessagePortSuccess);
-    ASSERT_NE(patient.Reply(), nullptr);
-    EXPECT_EQ(ToHex(patient.Reply()), Expected({Hex("00 00 00 10  00 00 00 03"), kResultKey, kYes,
-                                                kSuppressKey, kNo, kCandidatesKey, kOneFontURL}));
-    ASSERT_TRUE(SpinUntil([&] { return controller_.alertCount() == 0; }));
+    EXPECT_EQ(patient->Status(), kCFMessagePortSuccess);
+    ASSERT_NE(patient->Reply(), nullptr);
+    EXPECT_EQ(ToHex(patient->Reply()), Expected({Hex("00 00 00 10  00 00 00 03"), kResultKey, kYes,
+                                                 kSuppressKey, kNo, kCandidatesKey, kOneFontURL}));
     EXPECT_EQ(counts_, (std::vector<qint64>{1, 2, 1, 0}));
 }
 

@@ -78,4 +78,40 @@ TEST(QtRunLoopDriver, CallbacksNestAndMayUnwatchThemselves) {
     EXPECT_EQ(driver.WatchedCount(), 1u);
 }
 
+TEST(QtRunLoopDriver, ADescriptorUnwatchedWhileItsCallbackWaitsIsNoLongerPolled) {
+    // Regression: a request waiting for the user keeps its connection's callback running; when
+    // the client goes away meanwhile, the port unwatches and closes the descriptor, and Qt warned
+    // about polling a closed socket.
+    static std::vector<std::string> warnings;
+    warnings.clear();
+    QtMessageHandler previous =
+        qInstallMessageHandler([](QtMsgType, const QMessageLogContext&, const QString& text) {
+            warnings.push_back(text.toStdString());
+        });
+    QZQtRunLoopDriver driver;
+    auto* waiting = new Pipe;
+    Pipe other;
+    bool unwatched = false;
+    driver.Watch(waiting->ends[0], true, false, [&](bool, bool) {
+        if (!waiting->Take())
+            return;
+        // The user takes a while; meanwhile the descriptor goes away.
+        other.Put();
+        SpinUntil([&] { return unwatched; });
+        SpinUntil([] { return false; }, 50ms);
+    });
+    driver.Watch(other.ends[0], true, false, [&](bool, bool) {
+        other.Take();
+        driver.Unwatch(waiting->ends[0]);
+        delete waiting;
+        unwatched = true;
+    });
+    Pipe* const first = waiting;
+    first->Put();
+    ASSERT_TRUE(SpinUntil([&] { return unwatched; }));
+    SpinUntil([] { return false; }, 100ms);
+    qInstallMessageHandler(previous);
+    EXPECT_EQ(warnings, std::vector<std::string>{});
+}
+
 } // namespace
