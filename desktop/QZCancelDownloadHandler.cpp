@@ -22,7 +22,9 @@ struct __QZCancelDownloadHandler : glyphwell::runtime::CFObject {
     const std::function<void()> cancel; ///< never changed after creation, so calls need no lock
 };
 
-CFTypeID QZCancelDownloadHandlerGetTypeID() { return kCancelDownloadHandlerKind; }
+CFTypeID QZCancelDownloadHandlerGetTypeID() {
+    return kCancelDownloadHandlerKind;
+}
 
 QZCancelDownloadHandlerRef QZCancelDownloadHandlerCreate(std::function<void()> cancel) {
     if (!cancel)
