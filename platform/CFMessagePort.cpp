@@ -59,6 +59,43 @@ std::string UTF8(CFStringRef string) {
     return text;
 }
 
+/// A data object adopting a frame's body (no copy); empty for an empty body.
+CFDataRef CreateDataAdopting(glyphwell::port::FrameBody& body) {
+    const size_t length = body.Size();
+    UInt8* bytes = body.Release();
+    if (!bytes)
+        return CFDataCreate(kCFAllocatorDefault, nullptr, 0);
+    return CFDataCreateWithBytesNoCopy(kCFAllocatorDefault, bytes, CFIndex(length),
+                                       kCFAllocatorMalloc);
+}
+
+/// Receives into `assembler`: straight into the body in progress when there is one, else
+/// through `buffer`. Returns what recv returned (errno set when negative; 0 is the end of the
+/// stream); `*drained` tells that fewer bytes came than there was room for, so that the socket
+/// had nothing more at that moment. A refused frame leaves `assembler` Failed().
+ssize_t ReceiveInto(int descriptor, FrameAssembler& assembler, std::vector<uint8_t>& buffer,
+                    bool* drained) {
+    *drained = false;
+    size_t room = 0;
+    uint8_t* target = assembler.BodyRoom(&room);
+    if (assembler.Failed())
+        return 1;
+    const bool direct = target != nullptr;
+    if (!direct) {
+        target = buffer.data();
+        room = buffer.size();
+    }
+    const ssize_t got = recv(descriptor, target, room, MSG_DONTWAIT);
+    if (got > 0) {
+        *drained = size_t(got) < room;
+        if (direct)
+            assembler.CommitBody(size_t(got));
+        else
+            assembler.Append(buffer.data(), size_t(got));
+    }
+    return got;
+}
+
 std::string ErrorText(int error) {
     char buffer[128];
     return strerror_r(error, buffer, sizeof buffer);
@@ -610,10 +647,11 @@ void __CFMessagePort::ReadAvailable(const ConnectionPtr& connection) {
             UpdateWatch(connection);
             return;
         }
+        bool drained = false;
         const ssize_t got =
-            recv(connection->descriptor, readBuffer.data(), readBuffer.size(), MSG_DONTWAIT);
+            ReceiveInto(connection->descriptor, connection->input, readBuffer, &drained);
         if (got > 0) {
-            if (!connection->input.Append(readBuffer.data(), size_t(got))) {
+            if (connection->input.Failed()) {
                 AppLog("message port %s: closed a connection whose request announced %u bytes "
                        "(the limit is %u)",
                        nameText.c_str(), unsigned(connection->input.RefusedLength()),
@@ -621,6 +659,8 @@ void __CFMessagePort::ReadAvailable(const ConnectionPtr& connection) {
                 Drop(connection);
                 return;
             }
+            if (drained)
+                return; // the next readiness event brings the rest, or the end of the stream
             continue;
         }
         if (got < 0 && errno == EINTR)
@@ -657,9 +697,7 @@ CFDataRef __CFMessagePort::Dispatch(const ConnectionPtr& connection,
     auto request = std::make_shared<RequestState>(connection->processID, connection->peerGone);
     connection->busy = true;
     connection->current = request;
-    CFDataRef data =
-        CFDataCreate(kCFAllocatorDefault, frame.body.data(), CFIndex(frame.body.size()));
-    frame.body = {};
+    CFDataRef data = CreateDataAdopting(frame.body);
     currentRequests.push_back(request);
     CFDataRef reply = callout ? callout(this, frame.msgid, data, context.info) : nullptr;
     currentRequests.pop_back();
@@ -981,10 +1019,10 @@ SInt32 __CFMessagePort::Exchange(SInt32 msgid, CFDataRef data, CFTimeInterval se
             CloseRemoteDescriptor();
             return kCFMessagePortTransportError;
         }
-        const ssize_t got =
-            recv(connection, receiveBuffer.data(), receiveBuffer.size(), MSG_DONTWAIT);
+        bool drained = false;
+        const ssize_t got = ReceiveInto(connection, reply, receiveBuffer, &drained);
         if (got > 0) {
-            if (!reply.Append(receiveBuffer.data(), size_t(got))) {
+            if (reply.Failed()) {
                 CloseRemoteDescriptor();
                 return kCFMessagePortTransportError;
             }
@@ -1003,7 +1041,7 @@ SInt32 __CFMessagePort::Exchange(SInt32 msgid, CFDataRef data, CFTimeInterval se
     glyphwell::port::Frame frame = reply.TakeFrame();
     if (reply.BufferedBytes() != 0)
         CloseRemoteDescriptor(); // more than one reply: the connection is out of step
-    *returnData = CFDataCreate(kCFAllocatorDefault, frame.body.data(), CFIndex(frame.body.size()));
+    *returnData = CreateDataAdopting(frame.body);
     return kCFMessagePortSuccess;
 }
 

@@ -7,6 +7,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstdint>
+#include <deque>
 #include <unordered_map>
 #include <vector>
 
@@ -41,6 +42,16 @@ struct PollRunLoopDriver::State {
     bool pollSetDirty = true;
     std::vector<pollfd> pollSet;
     std::vector<uint64_t> pollSerials;
+
+    // Each RunOnce works on its own copy of the poll set, since a nested RunOnce may rebuild
+    // it; the copies are kept per nesting depth so that their memory is reused. (A deque: a
+    // nested call adding a level must not move the levels in use.)
+    struct Round {
+        std::vector<pollfd> ready;
+        std::vector<uint64_t> serials;
+    };
+    std::deque<Round> rounds;
+    size_t depth = 0;
 
     void RebuildPollSet() {
         pollSet.clear();
@@ -100,9 +111,18 @@ bool PollRunLoopDriver::RunOnce(int timeoutMs) {
         return false;
     if (state.pollSetDirty)
         state.RebuildPollSet();
-    // Nested RunOnce calls rebuild the shared set: work on a copy.
-    std::vector<pollfd> ready = state.pollSet;
-    const std::vector<uint64_t> serials = state.pollSerials;
+    if (state.rounds.size() <= state.depth)
+        state.rounds.emplace_back();
+    State::Round& round = state.rounds[state.depth];
+    round.ready = state.pollSet;
+    round.serials = state.pollSerials;
+    std::vector<pollfd>& ready = round.ready;
+    const std::vector<uint64_t>& serials = round.serials;
+    struct DepthGuard {
+        size_t& depth;
+        explicit DepthGuard(size_t& value) : depth(value) { ++depth; }
+        ~DepthGuard() { --depth; }
+    } guard(state.depth);
 
     int count = poll(ready.data(), nfds_t(ready.size()), timeoutMs < 0 ? -1 : timeoutMs);
     if (count <= 0)

@@ -3,13 +3,14 @@
 //
 // FrameAssembler turns bytes received in pieces of any size back into whole frames. It never
 // trusts a length before checking it against its cap, and it allocates only for bytes that have
-// actually arrived, so a header announcing a large body costs nothing until the body comes.
+// arrived (at most twice those, at least 64 KiB), so a header announcing a large body costs
+// little until the body comes. Bodies live in malloc'd memory that a data object can adopt
+// without a copy, and large bodies can be received straight into place (BodyRoom).
 #pragma once
 
 #include <cstddef>
 #include <cstdint>
 #include <deque>
-#include <vector>
 
 namespace glyphwell::port {
 
@@ -27,10 +28,35 @@ inline uint32_t LoadBigEndian32(const uint8_t* in) {
     return uint32_t(in[0]) << 24 | uint32_t(in[1]) << 16 | uint32_t(in[2]) << 8 | uint32_t(in[3]);
 }
 
+/// A frame's body in malloc'd memory.
+class FrameBody {
+public:
+    FrameBody() = default;
+    ~FrameBody();
+    FrameBody(FrameBody&& other) noexcept;
+    FrameBody& operator=(FrameBody&& other) noexcept;
+    FrameBody(const FrameBody&) = delete;
+    FrameBody& operator=(const FrameBody&) = delete;
+
+    const uint8_t* Data() const { return bytes_; }
+    size_t Size() const { return size_; }
+    /// Gives up the bytes: malloc'd memory the caller frees, null when empty.
+    uint8_t* Release();
+
+private:
+    friend class FrameAssembler;
+    /// Makes the capacity at least `capacity`; false when memory runs out.
+    bool Reserve(size_t capacity);
+
+    uint8_t* bytes_ = nullptr;
+    size_t size_ = 0;
+    size_t capacity_ = 0;
+};
+
 /// One whole frame. `msgid` is 0 for replies.
 struct Frame {
     int32_t msgid = 0;
-    std::vector<uint8_t> body;
+    FrameBody body;
 };
 
 /// Reassembles request or reply frames from a byte stream.
@@ -42,9 +68,17 @@ public:
     FrameAssembler(Kind kind, uint32_t maxBody);
 
     /// Takes `length` bytes of the stream. Returns false when a frame announces a body longer
-    /// than the cap: the stream is then broken for good, everything held is dropped, and every
-    /// later call returns false without keeping anything.
+    /// than the cap (or its memory cannot be had): the stream is then broken for good,
+    /// everything held is dropped, and every later call returns false without keeping anything.
     bool Append(const uint8_t* bytes, size_t length);
+
+    /// While a frame's body is being received: where up to `*room` more bytes of it can be
+    /// received in place, to be followed by CommitBody with the count received. Null between
+    /// frames (receive into a buffer and Append), and after a failure.
+    /// NOTE: the pointer is valid until the next call that is not CommitBody.
+    uint8_t* BodyRoom(size_t* room);
+    /// Counts `count` bytes received at BodyRoom (`count` <= the room it gave).
+    void CommitBody(size_t count);
 
     bool HasFrame() const { return !frames_.empty(); }
     /// Removes and returns the oldest whole frame. Call only when HasFrame().
@@ -64,6 +98,11 @@ private:
     size_t HeaderSize() const {
         return kind_ == Kind::Request ? kRequestHeaderSize : kReplyHeaderSize;
     }
+    bool InBody() const { return !failed_ && headerFill_ == HeaderSize(); }
+    /// Grows the body in progress so that `wanted` more bytes fit (within its announced length).
+    bool MakeRoom(size_t wanted);
+    void Fail(uint32_t length);
+    void FinishFrameIfWhole();
 
     Kind kind_;
     uint32_t maxBody_;

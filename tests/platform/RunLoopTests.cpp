@@ -148,11 +148,12 @@ TEST(FrameAssembler, ReassemblesFramesSplitAtAnyByte) {
         ASSERT_TRUE(assembler.HasFrame());
         glyphwell::port::Frame frame = assembler.TakeFrame();
         EXPECT_EQ(frame.msgid, 5);
-        EXPECT_EQ(std::string(frame.body.begin(), frame.body.end()), "abc");
+        EXPECT_EQ(std::string(reinterpret_cast<const char*>(frame.body.Data()), frame.body.Size()),
+                  "abc");
         ASSERT_TRUE(assembler.HasFrame());
         frame = assembler.TakeFrame();
         EXPECT_EQ(frame.msgid, INT32_MIN);
-        EXPECT_TRUE(frame.body.empty());
+        EXPECT_EQ(frame.body.Size(), 0u);
         EXPECT_FALSE(assembler.HasFrame());
         EXPECT_FALSE(assembler.IsMidFrame());
         EXPECT_EQ(assembler.BufferedBytes(), 0u);
@@ -173,4 +174,33 @@ TEST(FrameAssembler, RefusesALengthOverItsCapForGood) {
     EXPECT_EQ(refusing.BufferedBytes(), 0u);
     EXPECT_FALSE(refusing.Append(atCap, sizeof atCap));
     EXPECT_FALSE(refusing.HasFrame());
+}
+
+TEST(FrameAssembler, ReceivesABodyInPlaceWithMemoryFollowingWhatArrived) {
+    glyphwell::port::FrameAssembler assembler(glyphwell::port::FrameAssembler::Kind::Request,
+                                              1u << 20);
+    size_t room = 0;
+    EXPECT_EQ(assembler.BodyRoom(&room), nullptr) << "no body between frames";
+    const uint8_t header[] = {0, 0, 0, 9, 0, 3, 0x0D, 0x40}; // 200,000 bytes
+    ASSERT_TRUE(assembler.Append(header, sizeof header));
+    size_t received = 0;
+    while (!assembler.HasFrame()) {
+        uint8_t* target = assembler.BodyRoom(&room);
+        ASSERT_NE(target, nullptr);
+        ASSERT_GT(room, 0u);
+        EXPECT_LE(room, std::max<size_t>(65536, 2 * received)) << "room beyond what arrived";
+        const size_t count = std::min<size_t>(room, 1000);
+        for (size_t i = 0; i < count; ++i)
+            target[i] = uint8_t((received + i) % 251);
+        assembler.CommitBody(count);
+        received += count;
+    }
+    glyphwell::port::Frame frame = assembler.TakeFrame();
+    EXPECT_EQ(frame.msgid, 9);
+    ASSERT_EQ(frame.body.Size(), 200000u);
+    bool same = true;
+    for (size_t i = 0; i < frame.body.Size(); ++i)
+        same = same && frame.body.Data()[i] == uint8_t(i % 251);
+    EXPECT_TRUE(same);
+    EXPECT_EQ(assembler.BufferedBytes(), 0u);
 }
