@@ -163,3 +163,21 @@ TEST_F(CatalogTest, ABrokenCatalogCountsAsEmptyAndIsLoggedOnceUntilItChanges) {
 }
 
 } // namespace
+
+namespace {
+
+TEST(CatalogSample, TheDocumentedSampleIsAValidCatalog) {
+    QFile sample(qEnvironmentVariable("GLYPHWELL_SOURCE_DIR") +
+                 "/resources/catalog/downloadable-fonts.sample.json");
+    ASSERT_TRUE(sample.open(QIODevice::ReadOnly));
+    const QByteArray bytes = sample.readAll();
+    LogCapture log;
+    const auto catalog = QZDownloadableFontCatalog::Parse(
+        std::string_view(bytes.constData(), size_t(bytes.size())), "sample");
+    EXPECT_TRUE(log.Texts().empty());
+    ASSERT_EQ(catalog.assets.size(), 2u);
+    EXPECT_EQ(catalog.assets[0].fonts.size(), 2u);
+    EXPECT_EQ(catalog.assets[0].fonts[0].localizedFamilyNames.at("de"), "Beispiel Sans");
+}
+
+} // namespace
