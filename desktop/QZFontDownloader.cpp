@@ -290,6 +290,9 @@ std::string TransferFailureReason(const Transfer& transfer, CURL* easy, CURLcode
         curl_easy_getinfo(easy, CURLINFO_RESPONSE_CODE, &status);
         return Text("The server answered with the HTTP status %1.", QString::number(status));
     }
+    if (code == CURLE_UNSUPPORTED_PROTOCOL)
+        return Text("Fonts are downloaded only from https, http and file addresses, and "
+                    "redirected only to https and http ones.");
     if (code == CURLE_PARTIAL_FILE)
         return Text("The connection ended after %1 of %2 bytes.", transfer.written,
                     transfer.expectedSize);
@@ -336,6 +339,8 @@ std::string QZFontFileBaseName(const std::string& localID) {
             name += char(c);
         }
     }
+    if (name.empty())
+        name = "font";
     if (changed)
         name += "-" + SHA256Hex(localID).substr(0, 16);
     return name;

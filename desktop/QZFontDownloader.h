@@ -75,9 +75,9 @@ QZFontDownloadResult QZDownloadFontAsset(const QZFontAssetDownload& asset,
 std::string QZFontInstallDirectory();
 
 /// The file name, without extension, of the asset `localID`: its letters, digits, '-', '_' and
-/// '.' kept, any other byte made '_', no leading '.', at most 80 bytes; when anything had to
-/// change (or the identifier is empty), "-" and 16 hexadecimal digits of the identifier's
-/// SHA-256 follow, so that different identifiers keep different names.
+/// '.' kept, any other byte made '_', no leading '.', at most 80 bytes ("font" for an empty
+/// identifier); when anything had to change, "-" and the first 16 hexadecimal digits of the
+/// identifier's SHA-256 follow, so that different identifiers keep different names.
 std::string QZFontFileBaseName(const std::string& localID);
 
 /// The extension of a font file from its first bytes: ".ttf", ".otf", ".ttc", ".woff", ".woff2",

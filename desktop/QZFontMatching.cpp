@@ -44,7 +44,12 @@ bool IsConfiguredFontDirectory(FcConfig* config, const std::string& directory) {
 
 /// Writes the cache of `directory` afresh. Called under the lock.
 void RescanDirectoryCache(FcConfig* config, const std::string& directory) {
-    FcCache* cache = FcDirCacheRescan(reinterpret_cast<const FcChar8*>(directory.c_str()), config);
+    const auto* path = reinterpret_cast<const FcChar8*>(directory.c_str());
+    // A rescan keeps the fonts of an existing cache and reads only what changed; a directory
+    // without a cache is scanned whole.
+    FcCache* cache = FcDirCacheRescan(path, config);
+    if (!cache)
+        cache = FcDirCacheRead(path, FcTrue, config);
     if (cache)
         FcDirCacheUnload(cache);
     else

@@ -1,0 +1,538 @@
+// Font matching with downloads, with real parts: a catalog of copies of the installed DejaVu
+// fonts served from a loopback HTTP server, and fontconfig pointed at a private configuration
+// that knows only a temporary user font folder, so that those fonts are not installed before the
+// test downloads them.
+#include <QDir>
+#include <QFile>
+#include <QTemporaryDir>
+#include <condition_variable>
+#include <cstdio>
+#include <fontconfig/fontconfig.h>
+#include <mutex>
+#include <openssl/evp.h>
+#include <thread>
+
+#include "desktop/QZFontDownloader.h"
+#include "desktop/QZFontMatching.h"
+#include "desktop/QZFontService.h"
+#include "platform/CFError.h"
+#include "platform/CFNumber.h"
+#include "tests/desktop/DesktopTestEnvironment.h"
+#include "tests/support/LoopbackHTTPServer.h"
+#include "tests/support/Values.h"
+
+namespace {
+
+using glyphwell::testing::Dict;
+using glyphwell::testing::LoopbackHTTPServer;
+using glyphwell::testing::Ref;
+using glyphwell::testing::Str;
+using std::chrono::milliseconds;
+
+const QString kDejaVu = QStringLiteral("/usr/share/fonts/truetype/dejavu/");
+constexpr auto kRunTimeout = std::chrono::seconds(20);
+
+std::string ReadFile(const QString& path) {
+    QFile file(path);
+    if (!file.open(QIODevice::ReadOnly))
+        return {};
+    const QByteArray bytes = file.readAll();
+    return std::string(bytes.constData(), size_t(bytes.size()));
+}
+
+/// SHA-256 in hexadecimal, computed here with OpenSSL rather than by the code under test.
+std::string SHA256Of(const std::string& bytes) {
+    unsigned char digest[EVP_MAX_MD_SIZE];
+    unsigned int length = 0;
+    EVP_Digest(bytes.data(), bytes.size(), digest, &length, EVP_sha256(), nullptr);
+    std::string hex;
+    for (unsigned int i = 0; i < length; ++i) {
+        char pair[3];
+        std::snprintf(pair, sizeof pair, "%02x", digest[i]);
+        hex += pair;
+    }
+    return hex;
+}
+
+std::string Utf8(CFTypeRef value) {
+    if (!value || CFGetTypeID(value) != CFStringGetTypeID())
+        return {};
+    return glyphwell::Describe(value);
+}
+
+int64_t Int64(CFTypeRef value) {
+    int64_t number = -1;
+    if (value && CFGetTypeID(value) == CFNumberGetTypeID())
+        CFNumberGetValue(static_cast<CFNumberRef>(value), kCFNumberSInt64Type, &number);
+    return number;
+}
+
+/// What one callback carried.
+struct Event {
+    uint32_t state = 0;
+    std::vector<std::string> names;   ///< PostScript names of the descriptors
+    std::vector<std::string> matched; ///< PostScript names of the result (state 1)
+    std::vector<std::string> matchedFamilies;
+    int64_t downloaded = -1;
+    int64_t total = -1;
+    bool hasCancelHandler = false;
+    std::string errorDomain;
+    CFIndex errorCode = 0;
+    std::string failureReason;
+};
+
+std::vector<std::string> Names(CFTypeRef array, CFStringRef key) {
+    std::vector<std::string> names;
+    if (!array || CFGetTypeID(array) != CFArrayGetTypeID())
+        return names;
+    for (CFIndex i = 0; i < CFArrayGetCount(static_cast<CFArrayRef>(array)); ++i)
+        names.push_back(Utf8(CFDictionaryGetValue(
+            static_cast<CFDictionaryRef>(CFArrayGetValueAtIndex(static_cast<CFArrayRef>(array), i)),
+            key)));
+    return names;
+}
+
+Event Read(uint32_t state, CFDictionaryRef progress) {
+    Event event;
+    event.state = state;
+    event.names = Names(CFDictionaryGetValue(progress, kCTFontDescriptorMatchingDescriptors),
+                        CFSTR("NSFontNameAttribute"));
+    const void* result = CFDictionaryGetValue(progress, kCTFontDescriptorMatchingResult);
+    event.matched = Names(result, CFSTR("NSFontNameAttribute"));
+    event.matchedFamilies = Names(result, CFSTR("NSFontFamilyAttribute"));
+    event.downloaded =
+        Int64(CFDictionaryGetValue(progress, kCTFontDescriptorMatchingTotalDownloadedSize));
+    event.total = Int64(CFDictionaryGetValue(progress, kCTFontDescriptorMatchingTotalAssetSize));
+    const void* handler =
+        CFDictionaryGetValue(progress, kCTFontDescriptorMatchingCancelDownloadHandler);
+    event.hasCancelHandler = handler && CFGetTypeID(handler) == QZCancelDownloadHandlerGetTypeID();
+    if (const void* error = CFDictionaryGetValue(progress, kCTFontDescriptorMatchingError)) {
+        auto* cfError = static_cast<CFErrorRef>(const_cast<void*>(error));
+        event.errorDomain = Utf8(CFErrorGetDomain(cfError));
+        event.errorCode = CFErrorGetCode(cfError);
+        Ref userInfo(CFErrorCopyUserInfo(cfError));
+        event.failureReason = Utf8(CFDictionaryGetValue(userInfo.as<CFDictionaryRef>(),
+                                                        kCFErrorLocalizedFailureReasonKey));
+    }
+    return event;
+}
+
+/// Records every callback of one run; `answer` decides each reply (true by default). The run
+/// has ended once state 1 was seen or an answer was false.
+class Recorder {
+public:
+    using Answer = std::function<bool(const Event&, CFTypeRef cancelHandler)>;
+
+    explicit Recorder(Answer answer = {}) : shared_(std::make_shared<Shared>()) {
+        shared_->answer = std::move(answer);
+    }
+
+    QZFontDescriptorProgressHandler Handler() const {
+        return [shared = shared_](QZFontDescriptorMatchingState state, CFDictionaryRef progress) {
+            Event event = Read(state, progress);
+            const bool answer =
+                !shared->answer ||
+                shared->answer(
+                    event,
+                    CFDictionaryGetValue(progress, kCTFontDescriptorMatchingCancelDownloadHandler));
+            std::lock_guard<std::mutex> lock(shared->mutex);
+            shared->ended = state == kCTFontDescriptorMatchingDidFinish || !answer;
+            shared->events.push_back(std::move(event));
+            shared->changed.notify_all();
+            return answer;
+        };
+    }
+
+    bool WaitForEnd() const {
+        std::unique_lock<std::mutex> lock(shared_->mutex);
+        return shared_->changed.wait_for(lock, kRunTimeout, [this] { return shared_->ended; });
+    }
+    std::vector<Event> Events() const {
+        std::lock_guard<std::mutex> lock(shared_->mutex);
+        return shared_->events;
+    }
+    /// The states in order, runs of state 5 folded into one.
+    std::vector<uint32_t> States() const {
+        std::vector<uint32_t> states;
+        for (const Event& event : Events())
+            if (states.empty() || event.state != 5 || states.back() != 5)
+                states.push_back(event.state);
+        return states;
+    }
+
+private:
+    struct Shared {
+        Answer answer;
+        std::mutex mutex;
+        std::condition_variable changed;
+        std::vector<Event> events;
+        bool ended = false;
+    };
+    std::shared_ptr<Shared> shared_;
+};
+
+/// A resource sent `chunk` bytes at a time with `pause` after each.
+LoopbackHTTPServer::Resource Throttled(size_t chunk, milliseconds pause) {
+    LoopbackHTTPServer::Resource resource;
+    resource.chunkSize = chunk;
+    resource.pauseBetweenChunks = pause;
+    return resource;
+}
+
+/// A resource whose connection is closed after `bytes` bytes of the body.
+LoopbackHTTPServer::Resource Dropped(size_t bytes) {
+    LoopbackHTTPServer::Resource resource;
+    resource.dropAfter = bytes;
+    return resource;
+}
+
+class FontServiceTest : public ::testing::Test {
+protected:
+    void SetUp() override {
+        ASSERT_TRUE(root_.isValid());
+        ASSERT_TRUE(server_.IsListening());
+        fonts_ = root_.path() + "/data/fonts";
+        QDir().mkpath(fonts_);
+        QDir().mkpath(root_.path() + "/system");
+        QFile config(root_.path() + "/fonts.conf");
+        ASSERT_TRUE(config.open(QIODevice::WriteOnly));
+        config.write(("<?xml version=\"1.0\"?>\n<!DOCTYPE fontconfig SYSTEM \"fonts.dtd\">\n"
+                      "<fontconfig>\n  <dir>" +
+                      fonts_ + "</dir>\n  <cachedir>" + root_.path() +
+                      "/cache/fontconfig</cachedir>\n</fontconfig>\n")
+                         .toUtf8());
+        config.close();
+        qputenv("XDG_DATA_HOME", (root_.path() + "/data").toUtf8());
+        qputenv("XDG_DATA_DIRS", (root_.path() + "/system").toUtf8());
+        qputenv("XDG_CACHE_HOME", (root_.path() + "/cache").toUtf8());
+        qputenv("FONTCONFIG_FILE", (root_.path() + "/fonts.conf").toUtf8());
+        ASSERT_TRUE(QZReloadFontConfiguration());
+        ASSERT_FALSE(QZIsFontInstalled("DejaVuSans-Bold"));
+    }
+    void TearDown() override {
+        for (const char* name :
+             {"XDG_DATA_HOME", "XDG_DATA_DIRS", "XDG_CACHE_HOME", "FONTCONFIG_FILE"})
+            qunsetenv(name);
+        QZReloadFontConfiguration();
+    }
+
+    /// Serves the DejaVu file `file` at "/<file>" with `resource`'s delivery settings and
+    /// returns its catalog entry holding `postScriptName`. `sha256` and `size` replace the
+    /// file's own when given.
+    std::string ServeFont(const QString& file, const std::string& localID,
+                          const std::string& postScriptName,
+                          LoopbackHTTPServer::Resource resource = {}, std::string sha256 = {},
+                          int64_t size = -1) {
+        resource.body = ReadFile(kDejaVu + file);
+        EXPECT_FALSE(resource.body.empty()) << file.toStdString();
+        if (sha256.empty())
+            sha256 = SHA256Of(resource.body);
+        if (size < 0)
+            size = int64_t(resource.body.size());
+        const std::string path = "/" + file.toStdString();
+        server_.Serve(path, resource);
+        return "{\"LocalID\": \"" + localID + "\", \"url\": \"" + server_.URL(path) +
+               "\", \"size\": " + std::to_string(size) + ", \"sha256\": \"" + sha256 +
+               "\", \"fonts\": [{\"postScriptName\": \"" + postScriptName + "\"}]}";
+    }
+    void WriteCatalog(const std::vector<std::string>& assets) {
+        std::string text = "{\"assets\": [";
+        for (size_t i = 0; i < assets.size(); ++i)
+            text += (i ? ", " : "") + assets[i];
+        text += "]}";
+        QDir().mkpath(root_.path() + "/data/glyphwell");
+        QFile file(root_.path() + "/data/glyphwell/downloadable-fonts.json");
+        ASSERT_TRUE(file.open(QIODevice::WriteOnly));
+        file.write(text.data(), qint64(text.size()));
+    }
+    static Ref Descriptors(std::initializer_list<const char*> names) {
+        std::vector<Ref> dictionaries;
+        for (const char* name : names)
+            dictionaries.push_back(Dict({{Str("NSFontNameAttribute").get(), Str(name).get()}}));
+        std::vector<const void*> values;
+        for (const Ref& dictionary : dictionaries)
+            values.push_back(dictionary.get());
+        return Ref(
+            CFArrayCreate(nullptr, values.data(), CFIndex(values.size()), &kCFTypeArrayCallBacks));
+    }
+    /// Every entry of the download folder, hidden ones included.
+    QStringList DownloadFolder() const {
+        return QDir(fonts_ + "/glyphwell")
+            .entryList(QDir::Files | QDir::Hidden | QDir::NoDotAndDotDot, QDir::Name);
+    }
+    /// Waits until the download folder holds nothing (the run ends without a last callback).
+    bool WaitForEmptyDownloadFolder() const {
+        const auto deadline = std::chrono::steady_clock::now() + kRunTimeout;
+        while (!DownloadFolder().isEmpty() && std::chrono::steady_clock::now() < deadline)
+            std::this_thread::sleep_for(milliseconds(10));
+        return DownloadFolder().isEmpty();
+    }
+    /// What another application finds: fc-list with the same environment.
+    static std::string ListedFile(const std::string& postScriptName) {
+        const std::string command =
+            "fc-list --format '%{file}\\n' ':postscriptname=" + postScriptName + "'";
+        FILE* pipe = popen(command.c_str(), "r");
+        if (!pipe)
+            return {};
+        std::string output;
+        char buffer[512];
+        while (size_t n = fread(buffer, 1, sizeof buffer, pipe))
+            output.append(buffer, n);
+        pclose(pipe);
+        return output;
+    }
+
+    QTemporaryDir root_;
+    QString fonts_;
+    LoopbackHTTPServer server_;
+};
+
+TEST_F(FontServiceTest, DownloadsInstallsAndMatchesAMissingFont) {
+    const std::string original = ReadFile(kDejaVu + "DejaVuSans-Bold.ttf");
+    WriteCatalog({ServeFont("DejaVuSans-Bold.ttf", "org.dejavu.SansBold", "DejaVuSans-Bold",
+                            Throttled(64 * 1024, milliseconds(20)))});
+    Recorder recorder;
+    ASSERT_TRUE(QZMatchFontDescriptorsWithProgressHandler(
+        Descriptors({"DejaVuSans-Bold"}).as<CFArrayRef>(), nullptr, recorder.Handler()));
+    ASSERT_TRUE(recorder.WaitForEnd());
+
+    EXPECT_EQ(recorder.States(), (std::vector<uint32_t>{0, 2, 4, 5, 6, 7, 1}));
+    const std::vector<Event> events = recorder.Events();
+    const int64_t size = int64_t(original.size());
+    int64_t previous = 0;
+    for (const Event& event : events) {
+        EXPECT_TRUE(event.hasCancelHandler) << "state " << event.state;
+        if (event.state >= 2 && event.state <= 7) {
+            EXPECT_EQ(event.names, std::vector<std::string>{"DejaVuSans-Bold"});
+        }
+        if (event.state >= 4 && event.state <= 6) {
+            EXPECT_EQ(event.total, size);
+            EXPECT_GE(event.downloaded, previous);
+            previous = event.downloaded;
+        }
+    }
+    EXPECT_EQ(events[2].downloaded, 0);
+    EXPECT_EQ(events[events.size() - 4].downloaded, size); // the last state 5
+    EXPECT_EQ(events[events.size() - 3].downloaded, size); // state 6
+    EXPECT_EQ(events.back().matched, std::vector<std::string>{"DejaVuSans-Bold"});
+    EXPECT_EQ(events.back().matchedFamilies, std::vector<std::string>{"DejaVu Sans"});
+
+    const QString installed = fonts_ + "/glyphwell/org.dejavu.SansBold.ttf";
+    EXPECT_EQ(DownloadFolder(), QStringList{"org.dejavu.SansBold.ttf"});
+    EXPECT_TRUE(ReadFile(installed) == original);
+    const std::optional<QZInstalledFont> found = QZFindInstalledFont("DejaVuSans-Bold");
+    ASSERT_TRUE(found);
+    EXPECT_EQ(found->file, installed.toStdString());
+    EXPECT_EQ(ListedFile("DejaVuSans-Bold"), installed.toStdString() + "\n");
+    // Another application starting now reads the folder from the cache instead of scanning it.
+    FcConfig* fresh = FcInitLoadConfig();
+    FcCache* cache = FcDirCacheLoad(
+        reinterpret_cast<const FcChar8*>((fonts_ + "/glyphwell").toUtf8().constData()), fresh,
+        nullptr);
+    ASSERT_NE(cache, nullptr);
+    EXPECT_EQ(FcCacheNumFont(cache), 1);
+    FcDirCacheUnload(cache);
+    FcConfigDestroy(fresh);
+}
+
+TEST_F(FontServiceTest, MatchesAnInstalledFontWithoutDownloading) {
+    ASSERT_TRUE(QFile::copy(kDejaVu + "DejaVuSerif.ttf", fonts_ + "/DejaVuSerif.ttf"));
+    ASSERT_TRUE(QZReloadFontConfiguration());
+    WriteCatalog({ServeFont("DejaVuSerif.ttf", "serif", "DejaVuSerif")});
+    Recorder recorder;
+    QZMatchFontDescriptorsWithProgressHandler(Descriptors({"DejaVuSerif"}).as<CFArrayRef>(),
+                                              nullptr, recorder.Handler());
+    ASSERT_TRUE(recorder.WaitForEnd());
+
+    EXPECT_EQ(recorder.States(), (std::vector<uint32_t>{0, 2, 7, 1}));
+    EXPECT_EQ(recorder.Events().back().matched, std::vector<std::string>{"DejaVuSerif"});
+    EXPECT_EQ(server_.RequestCount("/DejaVuSerif.ttf"), 0);
+    EXPECT_TRUE(DownloadFolder().isEmpty());
+}
+
+TEST_F(FontServiceTest, CancelHandlerAbortsTheTransferAndFinishesWithoutAFile) {
+    // At 1 KiB per 50 ms the whole file would take half a minute, longer than the wait.
+    WriteCatalog({ServeFont("DejaVuSans-Bold.ttf", "bold", "DejaVuSans-Bold",
+                            Throttled(1024, milliseconds(50)))});
+    std::thread canceller;
+    std::once_flag cancelOnce;
+    Recorder recorder([&](const Event& event, CFTypeRef cancelHandler) {
+        if (event.state == kCTFontDescriptorMatchingDownloading) {
+            // Like the window's Cancel button: another thread calls the kept handler.
+            std::call_once(cancelOnce, [&] {
+                CFRetain(cancelHandler);
+                canceller = std::thread([cancelHandler] {
+                    QZCancelDownloadHandlerInvoke(cancelHandler);
+                    CFRelease(cancelHandler);
+                });
+            });
+        }
+        return true;
+    });
+    QZMatchFontDescriptorsWithProgressHandler(
+        Descriptors({"DejaVuSans-Bold", "DejaVuSerif"}).as<CFArrayRef>(), nullptr,
+        recorder.Handler());
+    const bool ended = recorder.WaitForEnd();
+    if (canceller.joinable())
+        canceller.join();
+    ASSERT_TRUE(ended);
+
+    EXPECT_EQ(recorder.States(), (std::vector<uint32_t>{0, 2, 4, 5, 1}));
+    EXPECT_TRUE(recorder.Events().back().matched.empty());
+    EXPECT_TRUE(DownloadFolder().isEmpty()) << DownloadFolder().join(", ").toStdString();
+    EXPECT_FALSE(QZIsFontInstalled("DejaVuSans-Bold"));
+}
+
+TEST_F(FontServiceTest, FalseAnswerEndsTheRunAndRemovesThePartialFile) {
+    WriteCatalog({ServeFont("DejaVuSans-Bold.ttf", "bold", "DejaVuSans-Bold",
+                            Throttled(1024, milliseconds(50)))});
+    Recorder recorder([](const Event& event, CFTypeRef) {
+        return event.state != kCTFontDescriptorMatchingDownloading;
+    });
+    QZMatchFontDescriptorsWithProgressHandler(Descriptors({"DejaVuSans-Bold"}).as<CFArrayRef>(),
+                                              nullptr, recorder.Handler());
+    ASSERT_TRUE(recorder.WaitForEnd());
+    EXPECT_TRUE(WaitForEmptyDownloadFolder()) << DownloadFolder().join(", ").toStdString();
+    // Nothing is reported after the false answer.
+    std::this_thread::sleep_for(milliseconds(200));
+    EXPECT_EQ(recorder.States(), (std::vector<uint32_t>{0, 2, 4, 5}));
+}
+
+TEST_F(FontServiceTest, ChecksumMismatchFailsAndTheRunGoesOnToTheNextFont) {
+    WriteCatalog(
+        {ServeFont("DejaVuSans-Bold.ttf", "bold", "DejaVuSans-Bold", {}, std::string(64, '0')),
+         ServeFont("DejaVuSerif.ttf", "serif", "DejaVuSerif"),
+         ServeFont("DejaVuSansMono.ttf", "mono", "DejaVuSansMono")});
+    Recorder recorder;
+    QZMatchFontDescriptorsWithProgressHandler(
+        Descriptors({"DejaVuSans-Bold", "NotInTheCatalog", "DejaVuSerif"}).as<CFArrayRef>(),
+        nullptr, recorder.Handler());
+    ASSERT_TRUE(recorder.WaitForEnd());
+
+    EXPECT_EQ(recorder.States(), (std::vector<uint32_t>{0, 2, 4, 5, 8, 2, 8, 2, 4, 5, 6, 7, 1}));
+    std::vector<Event> failures;
+    for (const Event& event : recorder.Events())
+        if (event.state == kCTFontDescriptorMatchingDidFailWithError)
+            failures.push_back(event);
+    ASSERT_EQ(failures.size(), 2u);
+    EXPECT_EQ(failures[0].names, std::vector<std::string>{"DejaVuSans-Bold"});
+    EXPECT_EQ(failures[0].errorDomain, "QZFontDownloadErrorDomain");
+    EXPECT_EQ(failures[0].errorCode, 2);
+    EXPECT_EQ(failures[0].failureReason,
+              "The downloaded file is damaged: its SHA-256 checksum is not the expected one.");
+    EXPECT_EQ(failures[1].names, std::vector<std::string>{"NotInTheCatalog"});
+    EXPECT_EQ(failures[1].errorCode, 1);
+    EXPECT_EQ(failures[1].failureReason, "No downloadable font has this name.");
+    // The byte count goes on from the failed asset's full size.
+    const int64_t boldSize = int64_t(ReadFile(kDejaVu + "DejaVuSans-Bold.ttf").size());
+    const int64_t serifSize = int64_t(ReadFile(kDejaVu + "DejaVuSerif.ttf").size());
+    for (const Event& event : recorder.Events())
+        if (event.state == kCTFontDescriptorMatchingDidFinishDownloading) {
+            EXPECT_EQ(event.downloaded, boldSize + serifSize);
+        }
+    EXPECT_EQ(recorder.Events().back().matched, std::vector<std::string>{"DejaVuSerif"});
+    EXPECT_EQ(DownloadFolder(), QStringList{"serif.ttf"});
+}
+
+TEST_F(FontServiceTest, DroppedConnectionFailsWithTheBytesReceived) {
+    const std::string size = std::to_string(ReadFile(kDejaVu + "DejaVuSans-Bold.ttf").size());
+    WriteCatalog({ServeFont("DejaVuSans-Bold.ttf", "bold", "DejaVuSans-Bold", Dropped(10000))});
+    Recorder recorder([](const Event& event, CFTypeRef) {
+        return event.state != kCTFontDescriptorMatchingDidFailWithError;
+    });
+    QZMatchFontDescriptorsWithProgressHandler(
+        Descriptors({"DejaVuSans-Bold", "DejaVuSerif"}).as<CFArrayRef>(), nullptr,
+        recorder.Handler());
+    ASSERT_TRUE(recorder.WaitForEnd());
+
+    // The false answer to the failure ends the run: no second font, no finish.
+    EXPECT_EQ(recorder.States(), (std::vector<uint32_t>{0, 2, 4, 5, 8}));
+    EXPECT_EQ(recorder.Events().back().failureReason,
+              "The connection ended after 10000 of " + size + " bytes.");
+    EXPECT_TRUE(WaitForEmptyDownloadFolder());
+}
+
+/// QZDownloadFontAsset on its own, into the download folder.
+class FontDownloaderTest : public FontServiceTest {
+protected:
+    QZFontDownloadResult Download(const std::string& url, const std::string& body,
+                                  const std::string& localID = "asset") {
+        return QZDownloadFontAsset({localID, url, body.size(), SHA256Of(body)},
+                                   QZFontInstallDirectory(), {}, nullptr);
+    }
+};
+
+TEST_F(FontDownloaderTest, FetchesFileURLsIntoANameMadeFromTheLocalID) {
+    const std::string body = ReadFile(kDejaVu + "DejaVuSansMono.ttf");
+    const QZFontDownloadResult result =
+        Download("file://" + (kDejaVu + "DejaVuSansMono.ttf").toStdString(), body, "../fonts/Mono");
+    ASSERT_EQ(result.outcome, QZFontDownloadOutcome::Installed) << result.failureReason;
+    const std::string expected = (fonts_ + "/glyphwell/_._fonts_Mono-").toStdString() +
+                                 SHA256Of("../fonts/Mono").substr(0, 16) + ".ttf";
+    EXPECT_EQ(result.path, expected);
+    EXPECT_TRUE(ReadFile(QString::fromStdString(expected)) == body);
+    EXPECT_TRUE(QZIsFontInstalled("DejaVuSansMono"));
+}
+
+TEST_F(FontDownloaderTest, FailuresSayWhyAndLeaveNoFile) {
+    const std::string serif = ReadFile(kDejaVu + "DejaVuSerif.ttf");
+    const std::string serifSize = std::to_string(serif.size());
+    const std::string notAFont(4096, 'x');
+    LoopbackHTTPServer::Resource resource;
+    resource.body = serif;
+    server_.Serve("/serif", resource);
+    resource.body = notAFont;
+    server_.Serve("/not-a-font", resource);
+    resource.body.clear();
+    resource.redirectTo = "file://" + (kDejaVu + "DejaVuSerif.ttf").toStdString();
+    server_.Serve("/to-file", resource);
+    struct Case {
+        std::string url;
+        std::string body; ///< gives the expected size and SHA-256
+        std::string reason;
+    };
+    const std::vector<Case> cases = {
+        {server_.URL("/missing"), serif, "The server answered with the HTTP status 404."},
+        {server_.URL("/serif"), serif + "!",
+         "The server offers " + serifSize + " bytes, but the font should have " +
+             std::to_string(serif.size() + 1) + " bytes."},
+        {server_.URL("/not-a-font"), notAFont, "The downloaded file is not a font."},
+        // A redirect never reaches a local file.
+        {server_.URL("/to-file"), serif,
+         "Fonts are downloaded only from https, http and file addresses, and redirected only to "
+         "https and http ones."},
+        {"ftp://127.0.0.1/font.ttf", serif,
+         "Fonts are downloaded only from https, http and file addresses, and redirected only to "
+         "https and http ones."},
+        {"file:///nonexistent/font.ttf", serif,
+         "The download failed: Couldn't open file /nonexistent/font.ttf"},
+    };
+    for (const Case& test : cases) {
+        SCOPED_TRACE(test.url);
+        const QZFontDownloadResult result = Download(test.url, test.body);
+        EXPECT_EQ(result.outcome, QZFontDownloadOutcome::Failed);
+        EXPECT_EQ(result.failureReason, test.reason);
+        EXPECT_TRUE(DownloadFolder().isEmpty()) << DownloadFolder().join(", ").toStdString();
+    }
+}
+
+TEST(FontFileNames, KeepSafeLocalIDsAndMarkChangedOnesWithAHash) {
+    EXPECT_EQ(QZFontFileBaseName("org.dejavu.Sans-Bold_2"), "org.dejavu.Sans-Bold_2");
+    EXPECT_EQ(QZFontFileBaseName("../evil/x"), "_._evil_x-5d952ef7fe8a27f6");
+    EXPECT_EQ(QZFontFileBaseName(".hidden"), "_hidden-1692419006a88aab");
+    EXPECT_EQ(QZFontFileBaseName(""), "font-e3b0c44298fc1c14");
+    EXPECT_EQ(QZFontFileBaseName(std::string(100, 'a')),
+              std::string(80, 'a') + "-2816597888e4a0d3");
+}
+
+TEST(FontFileNames, ExtensionComesFromTheFileSignature) {
+    const unsigned char trueType[] = {0, 1, 0, 0, 0x12};
+    EXPECT_EQ(QZFontFileExtension(trueType, sizeof trueType), ".ttf");
+    EXPECT_EQ(QZFontFileExtension(reinterpret_cast<const unsigned char*>("OTTO"), 4), ".otf");
+    EXPECT_EQ(QZFontFileExtension(reinterpret_cast<const unsigned char*>("ttcf"), 4), ".ttc");
+    EXPECT_EQ(QZFontFileExtension(reinterpret_cast<const unsigned char*>("wOF2"), 4), ".woff2");
+    EXPECT_EQ(QZFontFileExtension(reinterpret_cast<const unsigned char*>("<htm"), 4), ".font");
+    EXPECT_EQ(QZFontFileExtension(trueType, 3), ".font");
+}
+
+} // namespace

@@ -1,0 +1,195 @@
+// A small HTTP/1.1 server on 127.0.0.1 for tests and benchmarks: serves byte strings by path with
+// a Content-Length, and on demand sends slowly, drops the connection part-way, or redirects.
+// Each connection gets its own thread and is closed after one response. Not a general server:
+// it reads the request line only and answers GET and HEAD alike (HEAD without a body).
+#pragma once
+
+#include <arpa/inet.h>
+#include <cerrno>
+#include <chrono>
+#include <condition_variable>
+#include <cstring>
+#include <map>
+#include <memory>
+#include <mutex>
+#include <netinet/in.h>
+#include <string>
+#include <sys/socket.h>
+#include <thread>
+#include <unistd.h>
+#include <vector>
+
+namespace glyphwell::testing {
+
+class LoopbackHTTPServer {
+public:
+    struct Resource {
+        std::string body;
+        /// Bytes sent per write, and the pause after each write but the last.
+        size_t chunkSize = 1 << 20;
+        std::chrono::milliseconds pauseBetweenChunks{0};
+        /// Close the connection once this many body bytes were sent (the full Content-Length is
+        /// announced all the same).
+        size_t dropAfter = std::string::npos;
+        /// When set: answer "302 Found" with this Location instead of the body.
+        std::string redirectTo;
+    };
+
+    /// Listens on 127.0.0.1, on a port the kernel chooses.
+    LoopbackHTTPServer() {
+        listener_ = socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
+        sockaddr_in address{};
+        address.sin_family = AF_INET;
+        address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+        socklen_t length = sizeof address;
+        if (listener_ < 0 || bind(listener_, reinterpret_cast<sockaddr*>(&address), length) != 0 ||
+            listen(listener_, 16) != 0 ||
+            getsockname(listener_, reinterpret_cast<sockaddr*>(&address), &length) != 0)
+            return;
+        port_ = ntohs(address.sin_port);
+        acceptor_ = std::thread([this] { AcceptLoop(); });
+    }
+
+    /// Stops accepting, ends the responses in progress at their next write, and joins.
+    ~LoopbackHTTPServer() {
+        {
+            std::lock_guard<std::mutex> lock(mutex_);
+            stopping_ = true;
+        }
+        stopped_.notify_all();
+        if (listener_ >= 0)
+            shutdown(listener_, SHUT_RDWR);
+        if (acceptor_.joinable())
+            acceptor_.join();
+        for (std::thread& connection : connections_)
+            connection.join();
+        if (listener_ >= 0)
+            close(listener_);
+    }
+
+    LoopbackHTTPServer(const LoopbackHTTPServer&) = delete;
+    LoopbackHTTPServer& operator=(const LoopbackHTTPServer&) = delete;
+
+    bool IsListening() const { return port_ != 0; }
+
+    /// Serves `resource` at `path` ("/name") from now on.
+    void Serve(const std::string& path, Resource resource) {
+        std::lock_guard<std::mutex> lock(mutex_);
+        resources_[path] = std::make_shared<const Resource>(std::move(resource));
+    }
+
+    std::string URL(const std::string& path) const {
+        return "http://127.0.0.1:" + std::to_string(port_) + path;
+    }
+
+    /// How many requests named `path` so far.
+    int RequestCount(const std::string& path) const {
+        std::lock_guard<std::mutex> lock(mutex_);
+        const auto found = requestCounts_.find(path);
+        return found == requestCounts_.end() ? 0 : found->second;
+    }
+
+private:
+    void AcceptLoop() {
+        for (;;) {
+            const int connection = accept4(listener_, nullptr, nullptr, SOCK_CLOEXEC);
+            if (connection < 0) {
+                const int error = errno;
+                std::lock_guard<std::mutex> lock(mutex_);
+                if (stopping_ || (error != EINTR && error != ECONNABORTED))
+                    return;
+                continue;
+            }
+            std::lock_guard<std::mutex> lock(mutex_);
+            connections_.emplace_back([this, connection] {
+                Respond(connection);
+                close(connection);
+            });
+        }
+    }
+
+    /// Sends all of `bytes`; false when the peer went away.
+    static bool SendAll(int fd, const char* bytes, size_t count) {
+        while (count > 0) {
+            const ssize_t sent = send(fd, bytes, count, MSG_NOSIGNAL);
+            if (sent < 0 && errno == EINTR)
+                continue;
+            if (sent <= 0)
+                return false;
+            bytes += sent;
+            count -= size_t(sent);
+        }
+        return true;
+    }
+
+    void Respond(int fd) {
+        std::string request;
+        char buffer[4096];
+        while (request.find("\r\n\r\n") == std::string::npos && request.size() < 65536) {
+            const ssize_t received = recv(fd, buffer, sizeof buffer, 0);
+            if (received <= 0)
+                return;
+            request.append(buffer, size_t(received));
+        }
+        const size_t methodEnd = request.find(' ');
+        const size_t pathEnd = request.find(' ', methodEnd + 1);
+        if (methodEnd == std::string::npos || pathEnd == std::string::npos)
+            return;
+        const bool head = request.compare(0, methodEnd, "HEAD") == 0;
+        const std::string path = request.substr(methodEnd + 1, pathEnd - methodEnd - 1);
+        std::shared_ptr<const Resource> shared;
+        {
+            std::lock_guard<std::mutex> lock(mutex_);
+            ++requestCounts_[path];
+            const auto entry = resources_.find(path);
+            if (entry != resources_.end())
+                shared = entry->second;
+        }
+        if (!shared) {
+            const std::string notFound = "HTTP/1.1 404 Not Found\r\nContent-Length: 0\r\n"
+                                         "Connection: close\r\n\r\n";
+            SendAll(fd, notFound.data(), notFound.size());
+            return;
+        }
+        const Resource& resource = *shared;
+        if (!resource.redirectTo.empty()) {
+            const std::string redirect = "HTTP/1.1 302 Found\r\nLocation: " + resource.redirectTo +
+                                         "\r\nContent-Length: 0\r\nConnection: close\r\n\r\n";
+            SendAll(fd, redirect.data(), redirect.size());
+            return;
+        }
+        const std::string header = "HTTP/1.1 200 OK\r\nContent-Type: application/octet-stream\r\n"
+                                   "Content-Length: " +
+                                   std::to_string(resource.body.size()) +
+                                   "\r\nConnection: close\r\n\r\n";
+        if (!SendAll(fd, header.data(), header.size()) || head)
+            return;
+        const size_t end = std::min(resource.body.size(), resource.dropAfter);
+        for (size_t offset = 0; offset < end;) {
+            const size_t count = std::min(resource.chunkSize, end - offset);
+            if (!SendAll(fd, resource.body.data() + offset, count))
+                return;
+            offset += count;
+            if (offset < end && resource.pauseBetweenChunks.count() > 0) {
+                std::unique_lock<std::mutex> lock(mutex_);
+                if (stopped_.wait_for(lock, resource.pauseBetweenChunks,
+                                      [this] { return stopping_; }))
+                    return;
+            }
+        }
+        // A drop ends the connection at once, without the rest of the announced body.
+        shutdown(fd, SHUT_RDWR);
+    }
+
+    int listener_ = -1;
+    unsigned short port_ = 0;
+    std::thread acceptor_;
+    mutable std::mutex mutex_;
+    std::condition_variable stopped_;
+    bool stopping_ = false;
+    std::vector<std::thread> connections_;
+    std::map<std::string, std::shared_ptr<const Resource>> resources_;
+    std::map<std::string, int> requestCounts_;
+};
+
+} // namespace glyphwell::testing
