@@ -7,6 +7,13 @@
 // still probing it reads valid memory; it may miss a recent entry, and a miss always falls back
 // to the locked path, which decides. So two threads asking for the same new text get one string.
 //
+// A string becomes a shared constant (immortal: retain and release no longer count) as it enters
+// the table, under the lock and before the store that publishes it, so no other thread can see
+// it before the flag is set; the flag never changes afterwards. The reader retains and releases
+// every string it hands out, and on a shared string those are plain loads instead of atomic
+// read-modify-writes. A string made by a thread that lost the race to enter the same text is
+// still counted and is released normally.
+//
 // Every allocation stays reachable from the instance (held by a static pointer) for the life of
 // the process, so leak checkers do not report the table at exit.
 #include "cfutil/TCFStringUniquer.h"
@@ -20,6 +27,7 @@
 #include <string>
 
 #include "cfutil/TStackBuffer.h"
+#include "platform/CFRuntime.h"
 #include "platform/Log.h"
 
 namespace {
@@ -52,7 +60,7 @@ uint32_t HashKey(const unsigned char* text, size_t limit, size_t* length) {
 /// One table entry, allocated in one block with its private, zero-terminated key copy right
 /// after it. Written once before it is published, never changed or freed afterwards.
 struct Entry {
-    CFStringRef string; ///< holds the creation's count and the table's own
+    CFStringRef string; ///< a shared constant once entered: never destroyed
     uint32_t hash;
     size_t length; ///< key bytes, without the terminating zero
 
@@ -116,8 +124,9 @@ CFStringRef TCFStringUniquerImp::Find(const Table& table, const char* key, size_
     }
 }
 
-/// Enters `entry` unless its key is already present. Returns the string now in the table for
-/// that key; when it is not `entry`'s, `entry` was not entered and stays the caller's.
+/// Enters `entry` unless its key is already present, making its string a shared constant.
+/// Returns the string now in the table for that key; when it is not `entry`'s, `entry` was not
+/// entered and stays the caller's, its string still counted.
 CFStringRef TCFStringUniquerImp::Insert(Entry* entry) {
     std::lock_guard<std::mutex> lock(mutex_);
     const Table* table = table_.load(std::memory_order_relaxed);
@@ -140,6 +149,9 @@ CFStringRef TCFStringUniquerImp::Insert(Entry* entry) {
         table = grown;
     }
 
+    // Only this thread knows the string yet: the flag is set before the release store below.
+    const_cast<glyphwell::runtime::CFObject*>(glyphwell::runtime::AsObject(entry->string))
+        ->MakeImmortal();
     size_t slot = table->Home(entry->hash);
     while (table->slots[slot].load(std::memory_order_relaxed))
         slot = (slot + 1) & table->mask;
@@ -178,10 +190,7 @@ CFStringRef TCFStringUniquerImp::GetUniqueString(const char* bytes, CFIndex leng
     }
 
     CFStringRef unique = Insert(entry);
-    if (unique == entry->string) {
-        // The table keeps the creation's count and takes one of its own: never given back.
-        CFRetain(unique);
-    } else {
+    if (unique != entry->string) {
         // Another thread entered the same key first; its string is the one handed out.
         CFRelease(entry->string);
         std::free(entry);

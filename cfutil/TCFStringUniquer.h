@@ -6,6 +6,10 @@
 // removed: every string handed out lives, unchanged, for the rest of the process and may be used
 // on any thread without further locking. Lookups of texts already present take no lock.
 //
+// The strings handed out are shared constants, like CFSTR strings: CFRetain and CFRelease do not
+// count on them and CFGetRetainCount reports the largest index, so callers may retain and release
+// them as usual at no cost.
+//
 // NOTE: the key is the text up to its first zero byte, while a new string is made from all the
 // bytes given. Two texts that agree up to an embedded zero byte therefore yield the one string
 // made for whichever of them came first.

@@ -127,6 +127,18 @@ TEST(StringUniquer, ReadsNoFurtherThanTheLengthWithoutATerminator) {
     EXPECT_EQ(Unique("xyz"), unique);
 }
 
+TEST(StringUniquer, HandsOutSharedConstantsThatReleaseDoesNotDestroy) {
+    CFStringRef unique = Unique("shared-constant");
+    ASSERT_NE(unique, nullptr);
+    EXPECT_EQ(CFGetRetainCount(unique), 0x7fffffffffffffffL);
+    for (int i = 0; i < 3; ++i)
+        CFRelease(unique); // more releases than anyone retained: still alive
+    CFRetain(unique);
+    EXPECT_EQ(CFGetRetainCount(unique), 0x7fffffffffffffffL);
+    EXPECT_EQ(Units(unique), u"shared-constant");
+    EXPECT_EQ(Unique("shared-constant"), unique);
+}
+
 TEST(StringUniquer, InvalidUtf8IsLoggedEveryTimeAndNotEntered) {
     LogCapture log;
     EXPECT_EQ(Unique("\xC3("), nullptr);
