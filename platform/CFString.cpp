@@ -2,6 +2,7 @@
 #include "platform/CFString.h"
 
 #include <algorithm>
+#include <atomic>
 #include <climits>
 #include <cstdarg>
 #include <cstring>
@@ -23,17 +24,34 @@ struct __CFString final : public CFObject {
     bool Equals(const CFObject& other) const override {
         return units == static_cast<const __CFString&>(other).units;
     }
-    /// FNV-1a over the units.
+    /// FNV-1a over the units. An immutable string computes it once and keeps it, so that every
+    /// dictionary it becomes a key of does not hash it again; a mutable one computes it each time.
     CFHashCode Hash() const override {
+        if (isMutable)
+            return HashUnits();
+        // Relaxed is enough: every thread computes the same value, and 0 means "not yet" (a
+        // string whose hash is 0 just computes it each time).
+        CFHashCode h = cachedHash.load(std::memory_order_relaxed);
+        if (h == 0) {
+            h = HashUnits();
+            cachedHash.store(h, std::memory_order_relaxed);
+        }
+        return h;
+    }
+    std::string Description() const override { return text::EncodeUTF8Lossy(units); }
+
+    CFHashCode HashUnits() const {
         CFHashCode h = 0xcbf29ce484222325ULL;
         for (char16_t unit : units)
             h = (h ^ unit) * 0x100000001b3ULL;
         return h;
     }
-    std::string Description() const override { return text::EncodeUTF8Lossy(units); }
 
     std::u16string units;
     const bool isMutable;
+    /// The hash of an immutable string once computed, else 0. Immutable strings are shared
+    /// between threads (the uniquer's, constants), hence atomic.
+    mutable std::atomic<CFHashCode> cachedHash{0};
 };
 
 namespace {

@@ -309,6 +309,15 @@ TEST(StringValue, EqualityHashDescriptionAndFormat) {
     EXPECT_FALSE(CFEqual(immutable.get(), CFSTR("cafe")));
     EXPECT_EQ(CFGetTypeID(immutable.get()), CFStringGetTypeID());
 
+    // The hash follows a mutable string's edits; an immutable string's stays (it is kept).
+    auto edited = Own(CFStringCreateMutableCopy(nullptr, 0, CFSTR("caf")));
+    const CFHashCode before = CFHash(edited.get());
+    EXPECT_EQ(before, CFHash(CFSTR("caf")));
+    CFStringAppendCharacters(edited.get(), reinterpret_cast<const UniChar*>(u"\u00E9"), 1);
+    EXPECT_NE(CFHash(edited.get()), before);
+    EXPECT_EQ(CFHash(edited.get()), CFHash(immutable.get()));
+    EXPECT_EQ(CFHash(immutable.get()), CFHash(immutable.get()));
+
     auto description = Own(CFCopyDescription(immutable.get()));
     EXPECT_TRUE(CFEqual(description.get(), immutable.get()));
 
