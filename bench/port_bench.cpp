@@ -181,8 +181,8 @@ void BM_PortRoundTrip(benchmark::State& state) {
     CFDataRef body = RequestBody(size_t(state.range(0)));
     for (auto _ : state) {
         CFDataRef reply = nullptr;
-        const SInt32 status =
-            CFMessagePortSendRequest(remote, 0x7A11, body, 10, 10, kCFRunLoopDefaultMode, &reply);
+        const SInt32 status = CFMessagePortSendRequest(
+            remote, 0x7A11, body, 10, kCFMessagePortWaitForever, kCFRunLoopDefaultMode, &reply);
         if (status != kCFMessagePortSuccess) {
             state.SkipWithError("a request failed");
             break;

@@ -9,6 +9,7 @@
 #include <sys/un.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <atomic>
 #include <cerrno>
 #include <chrono>
@@ -72,9 +73,10 @@ CFDataRef CreateDataAdopting(glyphwell::port::FrameBody& body) {
 /// Receives into `assembler`: straight into the body in progress when there is one, else
 /// through `buffer`. Returns what recv returned (errno set when negative; 0 is the end of the
 /// stream); `*drained` tells that fewer bytes came than there was room for, so that the socket
-/// had nothing more at that moment. A refused frame leaves `assembler` Failed().
+/// had nothing more at that moment. A refused frame leaves `assembler` Failed(). `blocking`
+/// waits for bytes (on a blocking socket); otherwise the call returns at once.
 ssize_t ReceiveInto(int descriptor, FrameAssembler& assembler, std::vector<uint8_t>& buffer,
-                    bool* drained) {
+                    bool* drained, bool blocking = false) {
     *drained = false;
     size_t room = 0;
     uint8_t* target = assembler.BodyRoom(&room);
@@ -85,7 +87,7 @@ ssize_t ReceiveInto(int descriptor, FrameAssembler& assembler, std::vector<uint8
         target = buffer.data();
         room = buffer.size();
     }
-    const ssize_t got = recv(descriptor, target, room, MSG_DONTWAIT);
+    const ssize_t got = recv(descriptor, target, room, blocking ? 0 : MSG_DONTWAIT);
     if (got > 0) {
         *drained = size_t(got) < room;
         if (direct)
@@ -131,6 +133,8 @@ public:
         }
     }
 
+    bool IsForever() const { return forever_; }
+
     /// Milliseconds left for poll(): -1 without limit, 0 once passed.
     int RemainingMilliseconds() const {
         if (forever_)
@@ -168,8 +172,8 @@ int WaitFor(int descriptor, short events, const Deadline& deadline) {
     }
 }
 
-/// A connected stream socket to `path`, non-blocking after the connect; -1 when nothing
-/// listens there (or the connect fails otherwise).
+/// A connected stream socket to `path`, or -1 when nothing listens there (or the connect fails
+/// otherwise). The socket blocks; each call says whether it may wait (MSG_DONTWAIT).
 int ConnectTo(const std::string& path) {
     sockaddr_un address;
     if (!MakeAddress(path, &address))
@@ -193,11 +197,6 @@ int ConnectTo(const std::string& path) {
             CloseDescriptor(descriptor);
             return -1;
         }
-    }
-    const int flags = fcntl(descriptor, F_GETFL);
-    if (flags < 0 || fcntl(descriptor, F_SETFL, flags | O_NONBLOCK) != 0) {
-        CloseDescriptor(descriptor);
-        return -1;
     }
     return descriptor;
 }
@@ -306,6 +305,9 @@ int TakeActivationSocket(const std::string& portName) {
     unsetenv("LISTEN_FDNAMES");
     if (pid != long(getpid()) || count < 1)
         return -1;
+    // Like every descriptor of ours, the passed ones are not inherited by child processes.
+    for (long passed = 0; passed < std::min(count, 64L); ++passed)
+        fcntl(3 + int(passed), F_SETFD, FD_CLOEXEC);
 
     constexpr int kFirstPassedDescriptor = 3;
     int type = 0, listening = 0;
@@ -328,7 +330,6 @@ int TakeActivationSocket(const std::string& portName) {
         return -1;
     }
     const int flags = fcntl(kFirstPassedDescriptor, F_GETFL);
-    fcntl(kFirstPassedDescriptor, F_SETFD, FD_CLOEXEC);
     if (flags >= 0)
         fcntl(kFirstPassedDescriptor, F_SETFL, flags | O_NONBLOCK);
     return kFirstPassedDescriptor;
@@ -444,6 +445,7 @@ struct __CFMessagePort final : CFObject {
     // Local ports: used on the run loop's thread only.
     int listenDescriptor = -1;
     int spareDescriptor = -1; ///< given up to accept and refuse a client when out of descriptors
+    int lastAcceptError = 0;  ///< the accept failure already logged, until an accept succeeds
     bool ownsSocketFile = false;
     std::string socketPath;
     dev_t socketDevice = 0;
@@ -600,10 +602,14 @@ void __CFMessagePort::OnListenEvent() {
                        nameText.c_str());
                 continue;
             }
-            AppLog("message port %s: cannot accept a connection: %s", nameText.c_str(),
-                   ErrorText(error).c_str());
+            // The socket stays readable: say it once, not on every round of the loop.
+            if (error != lastAcceptError)
+                AppLog("message port %s: cannot accept a connection: %s", nameText.c_str(),
+                       ErrorText(error).c_str());
+            lastAcceptError = error;
             return;
         }
+        lastAcceptError = 0;
         ucred credentials{};
         socklen_t size = sizeof credentials;
         if (getsockopt(client, SOL_SOCKET, SO_PEERCRED, &credentials, &size) != 0) {
@@ -938,16 +944,6 @@ SendOutcome SendFrame(int descriptor, const uint8_t* header, const UInt8* body, 
     return SendOutcome::Sent;
 }
 
-/// True when an idle connection can carry a request: nothing to read and no hang-up (a server
-/// that ended, or dropped the connection, leaves it readable).
-bool IsUsableIdleConnection(int descriptor) {
-    pollfd entry{descriptor, POLLIN, 0};
-    int count;
-    while ((count = poll(&entry, 1, 0)) < 0 && errno == EINTR) {
-    }
-    return count == 0;
-}
-
 } // namespace
 
 SInt32 __CFMessagePort::Exchange(SInt32 msgid, CFDataRef data, CFTimeInterval sendTimeout,
@@ -959,11 +955,9 @@ SInt32 __CFMessagePort::Exchange(SInt32 msgid, CFDataRef data, CFTimeInterval se
     glyphwell::port::StoreBigEndian32(uint32_t(bodyLength), header + 4);
 
     const Deadline sendDeadline(sendTimeout);
+    // A kept connection that the server has dropped since (it ended while idle) fails the
+    // send with EPIPE before any byte goes out; a new connection is then tried once.
     int connection = RemoteDescriptor();
-    if (connection >= 0 && !IsUsableIdleConnection(connection)) {
-        CloseRemoteDescriptor();
-        connection = -1;
-    }
     for (int attempt = 0;; ++attempt) {
         bool fresh = false;
         if (connection < 0) {
@@ -981,7 +975,6 @@ SInt32 __CFMessagePort::Exchange(SInt32 msgid, CFDataRef data, CFTimeInterval se
         connection = -1;
         if (!valid)
             return kCFMessagePortIsInvalid;
-        // A kept connection that the server had dropped in the meantime: try a new one, once.
         if (outcome == SendOutcome::PeerClosed && !sentAny && !fresh && attempt == 0)
             continue;
         switch (outcome) {
@@ -1005,22 +998,27 @@ SInt32 __CFMessagePort::Exchange(SInt32 msgid, CFDataRef data, CFTimeInterval se
     FrameAssembler reply(FrameAssembler::Kind::Reply, kMessagePortMaxFrame);
     if (receiveBuffer.empty())
         receiveBuffer.resize(kReadChunk);
+    // Without a limit the receive simply blocks (an Invalidate on another thread ends it by
+    // shutting the socket down); with one, poll keeps the deadline.
+    const bool blocking = receiveDeadline.IsForever();
     for (;;) {
-        const int ready = WaitFor(connection, POLLIN, receiveDeadline);
+        if (!blocking) {
+            const int ready = WaitFor(connection, POLLIN, receiveDeadline);
+            if (ready == 0 && valid) {
+                CloseRemoteDescriptor();
+                return kCFMessagePortReceiveTimeout;
+            }
+            if (ready < 0 && valid) {
+                CloseRemoteDescriptor();
+                return kCFMessagePortTransportError;
+            }
+        }
         if (!valid) {
             CloseRemoteDescriptor();
             return kCFMessagePortIsInvalid;
         }
-        if (ready == 0) {
-            CloseRemoteDescriptor();
-            return kCFMessagePortReceiveTimeout;
-        }
-        if (ready < 0) {
-            CloseRemoteDescriptor();
-            return kCFMessagePortTransportError;
-        }
         bool drained = false;
-        const ssize_t got = ReceiveInto(connection, reply, receiveBuffer, &drained);
+        const ssize_t got = ReceiveInto(connection, reply, receiveBuffer, &drained, blocking);
         if (got > 0) {
             if (reply.Failed()) {
                 CloseRemoteDescriptor();

@@ -571,6 +571,46 @@ TEST_F(MessagePortTest, ReportsEachWayAServerCanFail) {
     CFRelease(name);
 }
 
+TEST_F(MessagePortTest, InvalidatingARemotePortEndsTheRequestWaitingOnIt) {
+    std::atomic<int> entered{0}, released{0};
+    PortServer server(kName, [&](SInt32 msgid, CFDataRef data) {
+        const int request = ++entered;
+        while (released < request)
+            std::this_thread::sleep_for(std::chrono::milliseconds(5));
+        return EchoWithMsgid(msgid, data);
+    });
+    struct ReleaseAll { // ends before the server, whatever happens
+        std::atomic<int>& released;
+        ~ReleaseAll() { released = 1 << 30; }
+    } releaseAll{released};
+    ASSERT_TRUE(server.Started());
+    // Once with a blocking wait, once with a poll-based one.
+    for (CFTimeInterval timeout : {kCFMessagePortWaitForever, 60.0}) {
+        CFStringRef name = CreateCFString(kName);
+        CFMessagePortRef remote = CFMessagePortCreateRemote(kCFAllocatorDefault, name);
+        CFRelease(name);
+        ASSERT_NE(remote, nullptr);
+        const int before = entered;
+        std::future<SInt32> waiting = std::async(std::launch::async, [remote, timeout] {
+            CFDataRef reply = nullptr;
+            const SInt32 status = CFMessagePortSendRequest(remote, 1, nullptr, 1, timeout,
+                                                           kCFRunLoopDefaultMode, &reply);
+            if (reply)
+                CFRelease(reply);
+            return status;
+        });
+        const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(10);
+        while (entered == before && std::chrono::steady_clock::now() < deadline)
+            std::this_thread::sleep_for(std::chrono::milliseconds(5));
+        ASSERT_GT(entered, before) << "the request never reached the server";
+        CFMessagePortInvalidate(remote);
+        ASSERT_EQ(waiting.wait_for(std::chrono::seconds(5)), std::future_status::ready);
+        EXPECT_EQ(waiting.get(), kCFMessagePortIsInvalid);
+        CFRelease(remote);
+        released = entered.load(); // the server may take the next request
+    }
+}
+
 TEST_F(MessagePortTest, ServesTheListeningSocketHandedOverBySystemd) {
     PassedDescriptor passed;
     ASSERT_TRUE(PassedDescriptor::Install(RawListen(SocketPath())));
