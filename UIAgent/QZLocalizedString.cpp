@@ -4,6 +4,8 @@
 
 #include <QCoreApplication>
 #include <QFile>
+#include <QFileInfo>
+#include <QLibraryInfo>
 #include <QLocale>
 #include <QPointer>
 #include <QTranslator>
@@ -84,19 +86,36 @@ QString QZTranslationFileFor(const QLocale& locale) {
     return QFile::exists(english) ? english : QString();
 }
 
-void QZInstallTranslations() {
-    // Parented to the application, so it goes with it; the pointer notices.
-    static QPointer<QTranslator> translator;
-    if (!QCoreApplication::instance())
-        return;
-    if (translator) {
-        QCoreApplication::removeTranslator(translator);
-        delete translator.data();
+/// Replaces the translator in `slot` with one loaded from `file`; an empty or unreadable file
+/// leaves none.
+static void InstallTranslator(QPointer<QTranslator>& slot, const QString& file) {
+    if (slot) {
+        QCoreApplication::removeTranslator(slot);
+        delete slot.data();
     }
-    const QString file = QZTranslationFileFor(QLocale());
     if (file.isEmpty())
         return;
-    translator = new QTranslator(QCoreApplication::instance());
-    if (translator->load(file))
-        QCoreApplication::installTranslator(translator);
+    // Parented to the application, so it goes with it; the pointer notices.
+    slot = new QTranslator(QCoreApplication::instance());
+    if (slot->load(file))
+        QCoreApplication::installTranslator(slot);
+}
+
+void QZInstallTranslations() {
+    static QPointer<QTranslator> table;
+    static QPointer<QTranslator> qtTexts;
+    if (!QCoreApplication::instance())
+        return;
+    const QString file = QZTranslationFileFor(QLocale());
+    InstallTranslator(table, file);
+    // Qt's own texts (the standard Help button, for one) in the same language as the table.
+    const QString language = QFileInfo(file).completeBaseName().mid(int(qstrlen("Localized_")));
+    QString qtFile;
+    if (!language.isEmpty()) {
+        const QString candidate = QLibraryInfo::path(QLibraryInfo::TranslationsPath) +
+                                  QStringLiteral("/qtbase_") + language + QStringLiteral(".qm");
+        if (QFile::exists(candidate))
+            qtFile = candidate;
+    }
+    InstallTranslator(qtTexts, qtFile);
 }

@@ -11,6 +11,8 @@
 #include "UIAgent/QZQtRunLoopDriver.h"
 #include "UIAgent/QZTerminationRequests.h"
 #include "UIAgent/QZUIController.h"
+#include "desktop/QZDownloadableFontCatalog.h"
+#include "desktop/QZFontMatching.h"
 
 int main(int argc, char** argv) {
     QApplication application(argc, argv);
@@ -20,6 +22,8 @@ int main(int argc, char** argv) {
     // Alerts come and go; the agent's life is the controller's business.
     QApplication::setQuitOnLastWindowClosed(false);
     QZInstallTranslations();
+    // Fonts that are installed already are never offered for download.
+    QZSetInstalledFontCheck(QZIsFontInstalled);
 
     QZQtRunLoopDriver driver;
     glyphwell::SetRunLoopDriver(&driver);

@@ -118,5 +118,15 @@
         <extracomment>Detail text of the offline alert; its default button is Cancel.</extracomment>
         <translation>Sie sind nicht mit dem Internet verbunden. Möchten Sie den Download abbrechen?</translation>
     </message>
+    <message>
+        <source>This question closes without an answer in %@.</source>
+        <extracomment>Countdown under the font-use alert. %1: the time left, such as 1:59.</extracomment>
+        <translation>Diese Frage wird in %1 ohne Antwort geschlossen.</translation>
+    </message>
+    <message>
+        <source>Help</source>
+        <extracomment>Title of the help window of the font-use alert.</extracomment>
+        <translation>Hilfe</translation>
+    </message>
 </context>
 </TS>

@@ -118,5 +118,15 @@
         <extracomment>Detail text of the offline alert; its default button is Cancel.</extracomment>
         <translation>You are not connected to the Internet. Do you want to cancel downloading?</translation>
     </message>
+    <message>
+        <source>This question closes without an answer in %@.</source>
+        <extracomment>Countdown under the font-use alert. %1: the time left, such as 1:59.</extracomment>
+        <translation>This question closes without an answer in %1.</translation>
+    </message>
+    <message>
+        <source>Help</source>
+        <extracomment>Title of the help window of the font-use alert.</extracomment>
+        <translation>Help</translation>
+    </message>
 </context>
 </TS>

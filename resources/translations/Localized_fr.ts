@@ -118,5 +118,15 @@
         <extracomment>Detail text of the offline alert; its default button is Cancel.</extracomment>
         <translation>Vous n’êtes pas connecté à Internet. Voulez-vous annuler le téléchargement ?</translation>
     </message>
+    <message>
+        <source>This question closes without an answer in %@.</source>
+        <extracomment>Countdown under the font-use alert. %1: the time left, such as 1:59.</extracomment>
+        <translation>Cette question se fermera sans réponse dans %1.</translation>
+    </message>
+    <message>
+        <source>Help</source>
+        <extracomment>Title of the help window of the font-use alert.</extracomment>
+        <translation>Aide</translation>
+    </message>
 </context>
 </TS>

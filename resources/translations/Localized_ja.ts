@@ -118,5 +118,15 @@
         <extracomment>Detail text of the offline alert; its default button is Cancel.</extracomment>
         <translation>インターネットに接続されていません。ダウンロードをキャンセルしますか？</translation>
     </message>
+    <message>
+        <source>This question closes without an answer in %@.</source>
+        <extracomment>Countdown under the font-use alert. %1: the time left, such as 1:59.</extracomment>
+        <translation>この確認は %1 後に応答なしで閉じられます。</translation>
+    </message>
+    <message>
+        <source>Help</source>
+        <extracomment>Title of the help window of the font-use alert.</extracomment>
+        <translation>ヘルプ</translation>
+    </message>
 </context>
 </TS>

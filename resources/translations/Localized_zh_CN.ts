@@ -118,5 +118,15 @@
         <extracomment>Detail text of the offline alert; its default button is Cancel.</extracomment>
         <translation>您尚未连接到互联网。要取消下载吗？</translation>
     </message>
+    <message>
+        <source>This question closes without an answer in %@.</source>
+        <extracomment>Countdown under the font-use alert. %1: the time left, such as 1:59.</extracomment>
+        <translation>此询问将在 %1 后自动关闭且不作答复。</translation>
+    </message>
+    <message>
+        <source>Help</source>
+        <extracomment>Title of the help window of the font-use alert.</extracomment>
+        <translation>帮助</translation>
+    </message>
 </context>
 </TS>
