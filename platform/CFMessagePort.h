@@ -22,7 +22,8 @@
 // callback, the port keeps reading that connection (holding up to 1 MiB of any later frames,
 // which are handled one at a time after the reply), so that the client's going away is seen at
 // once: the request is then withdrawn (see PendingRequest) and its reply discarded. Whole
-// frames that arrived before the client went away are still handled, withdrawn from the start.
+// frames that arrived before the client went away are still handled (withdrawn from the start
+// when the end of the stream was seen before them); an incomplete one is dropped.
 // Replies are written without blocking; a large reply goes out as the client reads it.
 #pragma once
 
