@@ -25,6 +25,9 @@ constexpr long kConnectTimeoutSeconds = 30;
 constexpr long kStallTimeoutSeconds = 60;
 /// The longest wait in the transfer loop; Cancel() wakes it sooner.
 constexpr int kPollTimeoutMilliseconds = 1000;
+/// libcurl's receive buffer: its largest size, so that a large asset costs fewer callbacks and
+/// system calls.
+constexpr long kReceiveBufferSize = 512 * 1024;
 
 std::string Text(const char* sourceText) {
     return QCoreApplication::translate("QZFontDownloader", sourceText).toStdString();
@@ -341,8 +344,10 @@ std::string QZFontFileBaseName(const std::string& localID) {
     }
     if (name.empty())
         name = "font";
-    if (changed)
-        name += "-" + SHA256Hex(localID).substr(0, 16);
+    if (changed) {
+        name += '-';
+        name.append(SHA256Hex(localID), 0, 16);
+    }
     return name;
 }
 
@@ -409,6 +414,7 @@ QZFontDownloadResult QZDownloadFontAsset(const QZFontAssetDownload& asset,
     curl_easy_setopt(easy, CURLOPT_LOW_SPEED_LIMIT, 1L);
     curl_easy_setopt(easy, CURLOPT_LOW_SPEED_TIME, kStallTimeoutSeconds);
     curl_easy_setopt(easy, CURLOPT_MAXFILESIZE_LARGE, curl_off_t(asset.size));
+    curl_easy_setopt(easy, CURLOPT_BUFFERSIZE, kReceiveBufferSize);
     curl_easy_setopt(easy, CURLOPT_USERAGENT, "Glyphwell font downloader");
     curl_easy_setopt(easy, CURLOPT_ERRORBUFFER, detail);
     curl_easy_setopt(easy, CURLOPT_WRITEFUNCTION, WriteBody);
@@ -461,6 +467,5 @@ QZFontDownloadResult QZDownloadFontAsset(const QZFontAssetDownload& asset,
         unlink(path.c_str());
         return Failure(Text("The downloaded file is not a font."));
     }
-    glyphwell::AppLog("Installed the font asset %s as %s", asset.localID.c_str(), path.c_str());
     return {QZFontDownloadOutcome::Installed, path, {}};
 }
