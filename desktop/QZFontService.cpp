@@ -298,7 +298,7 @@ void MatchingRun::Run() {
 
 bool QZMatchFontDescriptorsWithProgressHandler(CFArrayRef descriptors, CFSetRef,
                                                QZFontDescriptorProgressHandler handler) {
-    if (!descriptors || !handler)
+    if (!descriptors || CFGetTypeID(descriptors) != CFArrayGetTypeID() || !handler)
         return false;
     auto run = std::make_unique<MatchingRun>(descriptors, std::move(handler));
     try {

@@ -8,38 +8,33 @@
 // "NSFontNameAttribute" and, when fontconfig knows it, its "NSFontFamilyAttribute".
 //
 // The states of one run, in order:
-//   0 DidBegin                                   once
-//   for each descriptor that has a PostScript name, in array order:
-//     2 WillBeginQuerying
-//     7 DidMatch                                 when the font is installed already
-//     or 4 WillBeginDownloading, 5 Downloading (repeatedly), 6 DidFinishDownloading, 7 DidMatch
-//     or 8 DidFailWithError                      instead of 7 (and of 6, when the transfer
-//                                                failed), when the font cannot be downloaded,
-//                                                the transfer fails or its file does not match
-//   1 DidFinish                                  once, also after a cancellation
+//   0 DidBegin, once.
+//   For each descriptor that has a PostScript name, in array order:
+//     2 WillBeginQuerying; then
+//     7 DidMatch at once when the font is installed already; or
+//     4 WillBeginDownloading, 5 Downloading (repeatedly: when the first bytes arrive, at most
+//       every 0.1 s, and when the last ones did), 6 DidFinishDownloading (the file is checked
+//       and installed), 7 DidMatch; or
+//     8 DidFailWithError in place of what is left of these when the font has no catalog asset,
+//       the transfer fails, or the file does not match its catalog entry.
+//   1 DidFinish, once, also after a cancellation.
 // State 3 (stalled) is never reported. A handler answer of false ends the run at once: no later
 // callback, the transfer in flight aborted and its file removed.
 //
-// Progress dictionary keys (values are property values; the dictionary is valid during the call;
-// retain what you keep):
-//   kCTFontDescriptorMatchingCancelDownloadHandler  every state: a QZCancelDownloadHandlerRef
-//   kCTFontDescriptorMatchingDescriptors            every state: an array of descriptors: all the
-//                                                   requested ones in states 0 and 1; in states 2
-//                                                   to 8 the one concerned (in state 7 the
-//                                                   matched font's new dictionary)
-//   kCTFontDescriptorMatchingTotalDownloadedSize    states 4, 5, 6: SInt64 number, bytes of this
-//                                                   run's assets received so far (assets that
-//                                                   ended count with their full size)
-//   kCTFontDescriptorMatchingTotalAssetSize         states 4, 5, 6: SInt64 number, total bytes of
-//                                                   the assets this run set out to download
-//   kCTFontDescriptorMatchingResult                 state 1: the array of matched fonts' new
-//                                                   dictionaries, in the order matched
-//   kCTFontDescriptorMatchingError                  state 8: a CFError of
-//   kQZFontDownloadErrorDomain
-//                                                   whose user info holds a description and a
-//                                                   failure reason
-//                                                   (kCFErrorLocalizedDescriptionKey,
-//                                                   kCFErrorLocalizedFailureReasonKey)
+// Progress dictionary keys (property values, valid during the call; retain what you keep):
+// - kCTFontDescriptorMatchingCancelDownloadHandler, every state: a QZCancelDownloadHandlerRef.
+// - kCTFontDescriptorMatchingDescriptors, every state: an array of descriptors; in states 0 and
+//   1 all the requested ones, in states 2 to 8 the one concerned (in state 7 the matched font's
+//   new dictionary).
+// - kCTFontDescriptorMatchingTotalDownloadedSize, states 4 to 6: an SInt64 number, the bytes of
+//   this run's assets received so far (an asset that ended, whatever its outcome, counts whole).
+// - kCTFontDescriptorMatchingTotalAssetSize, states 4 to 6: an SInt64 number, the total bytes of
+//   the assets that this run downloads.
+// - kCTFontDescriptorMatchingResult, state 1: the array of the matched fonts' new dictionaries,
+//   in the order matched.
+// - kCTFontDescriptorMatchingError, state 8: an error of the domain kQZFontDownloadErrorDomain;
+//   its user info holds a description (kCFErrorLocalizedDescriptionKey) and a failure reason
+//   (kCFErrorLocalizedFailureReasonKey), both sentences for the user.
 //
 // Cancel handler: calling it (QZCancelDownloadHandlerInvoke, from any thread, at any time, also
 // after the run ended) aborts the transfer in flight at once and removes its file; the run then
@@ -85,7 +80,8 @@ enum : CFIndex {
 };
 
 /// Called with each state and its progress dictionary, on the run's worker thread, one call at a
-/// time; true lets the run go on, false ends it.
+/// time; true lets the run go on, false ends it. It must not throw. During states 4 to 6 the
+/// transfer waits while the handler runs.
 using QZFontDescriptorProgressHandler =
     std::function<bool(QZFontDescriptorMatchingState state, CFDictionaryRef progressParameter)>;
 
@@ -93,7 +89,7 @@ using QZFontDescriptorProgressHandler =
 /// thread and returns at once; the run reports to `handler` as described above. The descriptors
 /// are copied (the array is retained, not the caller's); `mandatoryAttributes` is not used and
 /// may be null. Elements that are not dictionaries with a non-empty string "NSFontNameAttribute"
-/// are passed over without a callback. False, with no callback ever, when `descriptors` is null
-/// or `handler` is empty.
+/// are passed over without a callback. False, with no callback ever, when `descriptors` is not
+/// an array, `handler` is empty or no thread can be started.
 bool QZMatchFontDescriptorsWithProgressHandler(CFArrayRef descriptors, CFSetRef mandatoryAttributes,
                                                QZFontDescriptorProgressHandler handler);
