@@ -89,31 +89,6 @@ void HandleAutoActivation(CFDictionaryRef request, CFMutableDataRef reply) {
     FlattenReply(reply, answer);
 }
 
-/// The descriptors of the fonts to download: one {"NSFontNameAttribute": name} per element of
-/// the request's font list, in order. Elements that are not dictionaries or hold no font name
-/// are skipped. Returns a new reference; the caller releases it.
-CFArrayRef CreateFontDescriptors(CFDictionaryRef request) {
-    TCFMutableArray descriptors(0);
-    CFTypeRef fonts = TCFDict(request).GetValue(kQZUIPropertyFontProperties);
-    if (!IsKind(fonts, CFArrayGetTypeID()))
-        return descriptors.Orphan();
-    TCFDeque<CFTypeRef> elements(static_cast<CFArrayRef>(fonts));
-    for (CFIndex i = 0; i < elements.GetCount(); ++i) {
-        CFTypeRef element = elements.At(i);
-        if (!IsKind(element, CFDictionaryGetTypeID()))
-            continue;
-        CFTypeRef name =
-            TCFDict(static_cast<CFDictionaryRef>(element)).GetValue(NSFontNameAttribute);
-        if (!IsKind(name, CFStringGetTypeID()))
-            continue;
-        const void* keys[] = {NSFontNameAttribute};
-        const void* values[] = {name};
-        TCFDictionary descriptor(keys, values, 1);
-        descriptors.Append(static_cast<CFDictionaryRef>(descriptor));
-    }
-    return descriptors.Orphan();
-}
-
 /// Message id 2.
 void HandleFontDownload(CFDictionaryRef request, CFMutableDataRef reply) {
     const bool flag = TCFTypeRef::GetBooleanValue(TCFDict(request).GetValue(kQZUIPropertySuppress));
@@ -144,7 +119,7 @@ void HandleFontDownload(CFDictionaryRef request, CFMutableDataRef reply) {
 
     bool result = false;
     if (shouldDownload) {
-        TCFAdopted<CFArrayRef> descriptors(CreateFontDescriptors(request));
+        TCFAdopted<CFArrayRef> descriptors(QZCreateFontDescriptors(request));
         result = QZRunFontDownload(descriptors, localizedNames) != 0;
     }
 
@@ -191,4 +166,26 @@ CFDataRef QZUIAgentHandleMessage(CFMessagePortRef, SInt32 msgid, CFDataRef data,
     if (controller)
         controller->setAlertCount(controller->alertCount() - 1);
     return reply;
+}
+
+CFArrayRef QZCreateFontDescriptors(CFDictionaryRef request) {
+    TCFMutableArray descriptors(0);
+    CFTypeRef fonts = TCFDict(request).GetValue(kQZUIPropertyFontProperties);
+    if (!IsKind(fonts, CFArrayGetTypeID()))
+        return descriptors.Orphan();
+    TCFDeque<CFTypeRef> elements(static_cast<CFArrayRef>(fonts));
+    for (CFIndex i = 0; i < elements.GetCount(); ++i) {
+        CFTypeRef element = elements.At(i);
+        if (!IsKind(element, CFDictionaryGetTypeID()))
+            continue;
+        CFTypeRef name =
+            TCFDict(static_cast<CFDictionaryRef>(element)).GetValue(NSFontNameAttribute);
+        if (!IsKind(name, CFStringGetTypeID()))
+            continue;
+        const void* keys[] = {NSFontNameAttribute};
+        const void* values[] = {name};
+        TCFDictionary descriptor(keys, values, 1);
+        descriptors.Append(static_cast<CFDictionaryRef>(descriptor));
+    }
+    return descriptors.Orphan();
 }

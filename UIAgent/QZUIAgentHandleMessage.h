@@ -14,9 +14,18 @@
 // port discards the reply).
 #pragma once
 
+#include "platform/CFArray.h"
+#include "platform/CFDictionary.h"
 #include "platform/CFMessagePort.h"
 
 /// Handles one request. `info` is the QZUIController whose count is raised during the call (may
 /// be null: nothing is counted); `data` may be null or empty. Returns a new mutable data object,
 /// never null, which the caller (the port) releases.
 CFDataRef QZUIAgentHandleMessage(CFMessagePortRef local, SInt32 msgid, CFDataRef data, void* info);
+
+/// The descriptors of the fonts a message id 2 `request` asks to download: one
+/// {"NSFontNameAttribute": name} per element of its QZUIPropertyFontProperties, in order; only
+/// the name is carried over. Elements that are not dictionaries or hold no string name are
+/// skipped; a request without the array (or null) gives an empty array. Returns a new reference;
+/// the caller releases it.
+CFArrayRef QZCreateFontDescriptors(CFDictionaryRef request);

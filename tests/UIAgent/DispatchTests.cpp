@@ -1,9 +1,12 @@
 // Request dispatch: replies byte for byte, the unknown-id line, the count around every request,
 // nesting of a request inside a running alert, and withdrawal when a client goes away.
 #include <QCheckBox>
+#include <QDir>
 #include <QEvent>
+#include <QFile>
 #include <QMessageBox>
 #include <QPointer>
+#include <QTemporaryDir>
 #include <QTimer>
 #include <atomic>
 #include <functional>
@@ -241,6 +244,54 @@ TEST_F(DispatchTest, ARequestArrivingWhileAnAlertIsUpIsHandledInsideItAndAnswere
                         kCandidatesKey, kOneFontURL}));
     EXPECT_EQ(counts_, (std::vector<qint64>{1, 2, 1, 0}));
     EXPECT_EQ(timerArmed_, (std::vector<bool>{false, false, false, true}));
+}
+
+TEST_F(DispatchTest, FontDescriptorsCarryOnlyTheNameAndSkipElementsWithoutOne) {
+    Ref regular = Str("Example-Regular");
+    Ref bold = Str("Example-Bold");
+    Ref family = Str("Example");
+    Ref seven = Num(kCFNumberSInt32Type, SInt32(7));
+    Ref full = Dict({{NSFontNameAttribute, regular.get()}, {NSFontFamilyAttribute, family.get()}});
+    Ref nameless = Dict({{NSFontFamilyAttribute, family.get()}});
+    Ref numberName = Dict({{NSFontNameAttribute, seven.get()}});
+    Ref plain = Dict({{NSFontNameAttribute, bold.get()}});
+    Ref fonts = Array({full.get(), nameless.get(), family.get(), numberName.get(), plain.get()});
+    Ref request = Dict({{kQZUIPropertyFontProperties, fonts.get()}});
+
+    Ref descriptors(QZCreateFontDescriptors(request.as<CFDictionaryRef>()));
+    Ref regularOnly = Dict({{NSFontNameAttribute, regular.get()}});
+    Ref expected = Array({regularOnly.get(), plain.get()});
+    EXPECT_TRUE(CFEqual(descriptors.get(), expected.get()));
+
+    Ref none(QZCreateFontDescriptors(nullptr));
+    EXPECT_EQ(CFArrayGetCount(none.as<CFArrayRef>()), 0);
+}
+
+TEST_F(DispatchTest, AnAgreedDownloadIsAnsweredNothingMatchedUntilFontsCanBeDownloaded) {
+    QTemporaryDir data;
+    ASSERT_TRUE(data.isValid());
+    qputenv("XDG_DATA_HOME", data.path().toUtf8());
+    qputenv("XDG_DATA_DIRS", data.filePath("none").toUtf8());
+    QDir().mkpath(data.filePath("glyphwell"));
+    QFile catalog(data.filePath("glyphwell/downloadable-fonts.json"));
+    ASSERT_TRUE(catalog.open(QIODevice::WriteOnly));
+    catalog.write(R"({"assets": [{"LocalID": "A", "url": "https://fonts.example/A", "size": 5000,
+        "sha256": "0000000000000000000000000000000000000000000000000000000000000000",
+        "fonts": [{"postScriptName": "Example-Regular"}]}]})");
+    catalog.close();
+
+    Ref name = Str("Example-Regular");
+    Ref font = Dict({{NSFontNameAttribute, name.get()}});
+    Ref fonts = Array({font.get()});
+    Ref request = Dict({{kQZUIPropertyFontProperties, fonts.get()}});
+    ShownWindows shown;
+    WhenAlertAppears(nullptr, [](QMessageBox* alert) { Click(alert, "Download"); });
+    EXPECT_EQ(ToHex(Handle(2, request.get()).as<CFDataRef>()),
+              Expected({Hex("00 00 00 10  00 00 00 02"), kResultKey, kNo, kSuppressKey, kNo}));
+    EXPECT_EQ(shown.count, 1);
+    EXPECT_EQ(counts_, (std::vector<qint64>{1, 0}));
+    qunsetenv("XDG_DATA_HOME");
+    qunsetenv("XDG_DATA_DIRS");
 }
 
 /// Sends `request` as message `msgid` from another thread, through the agent's socket.
