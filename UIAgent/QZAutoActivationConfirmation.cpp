@@ -90,6 +90,8 @@ struct QZAutoActivationConfirmation::Widgets : QObject {
 
     explicit Widgets(QZAutoActivationConfirmation* confirmation) : owner(confirmation) {
         timeout.setSingleShot(true);
+        // Precise, so that the countdown, read from the timer, says what will happen.
+        timeout.setTimerType(Qt::PreciseTimer);
         tick.setInterval(1000);
     }
 
@@ -158,7 +160,8 @@ QZAutoActivationConfirmation::QZAutoActivationConfirmation(CFDictionaryRef prope
 }
 
 QZAutoActivationConfirmation::~QZAutoActivationConfirmation() {
-    QApplication::instance()->removeEventFilter(widgets_.get());
+    if (QCoreApplication* application = QApplication::instance())
+        application->removeEventFilter(widgets_.get());
     session_.reset();
     const int sampleFontId = widgets_->sampleFontId;
     widgets_.reset();
@@ -241,7 +244,6 @@ void QZAutoActivationConfirmation::setupAlert() {
 
     widgets_->countdown = new QLabel(alert);
     widgets_->countdown->setTextFormat(Qt::PlainText);
-    widgets_->countdown->setEnabled(false); // drawn as secondary text
     updateCountdown();
 
     arrangeExtraWidgets();

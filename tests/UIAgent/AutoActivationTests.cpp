@@ -135,8 +135,10 @@ TEST_F(AutoActivationTest, KeyboardInputRestartsTheTimeout) {
     Confirmation confirmation(Request(OneCandidate()).as<CFDictionaryRef>());
     confirmation.setTimeout(500ms);
     bool upAfterFirstDeadline = false;
-    QTimer::singleShot(300ms, [&] { QTest::keyClick(confirmation.alert(), Qt::Key_Shift); });
-    QTimer::singleShot(700ms, [&] { upAfterFirstDeadline = confirmation.alert()->isVisible(); });
+    QTimer::singleShot(300ms, confirmation.alert(),
+                       [&] { QTest::keyClick(confirmation.alert(), Qt::Key_Shift); });
+    QTimer::singleShot(700ms, confirmation.alert(),
+                       [&] { upAfterFirstDeadline = confirmation.alert()->isVisible(); });
     confirmation.showAlert();
     EXPECT_TRUE(upAfterFirstDeadline);
     EXPECT_FALSE(confirmation.shouldActivate());
@@ -154,7 +156,7 @@ TEST_F(AutoActivationTest, RegressionTimeoutOfAnAnsweredAlertNeverEndsALaterOne)
 
     Confirmation later(Request(OneCandidate()).as<CFDictionaryRef>());
     bool laterUpAfterEarlierDeadlines = false;
-    QTimer::singleShot(800ms, [&] {
+    QTimer::singleShot(800ms, later.alert(), [&] {
         laterUpAfterEarlierDeadlines = later.alert()->isVisible();
         later.buttonWithTag(2000)->click();
     });
@@ -168,11 +170,11 @@ TEST_F(AutoActivationTest, WithdrawEndsItsOwnAlertEvenBelowANestedOne) {
     Confirmation inner(Request(OneCandidate()).as<CFDictionaryRef>());
     std::vector<std::string> returned;
     bool innerUp = false, outerHidden = false;
-    QTimer::singleShot(100ms, [&] {
+    QTimer::singleShot(100ms, outer.alert(), [&] {
         inner.showAlert();
         returned.push_back("inner");
     });
-    QTimer::singleShot(300ms, [&] {
+    QTimer::singleShot(300ms, outer.alert(), [&] {
         outer.withdraw();
         outerHidden = !outer.alert()->isVisible();
         innerUp = inner.alert()->isVisible();

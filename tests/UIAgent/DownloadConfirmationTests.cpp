@@ -113,15 +113,15 @@ protected:
 TEST_F(DownloadConfirmationTest, DownloadAnswersYesAndReturnPressesTheDefaultSkip) {
     Confirmation yes(Request({regular_.get()}).as<CFDictionaryRef>());
     EXPECT_EQ(yes.buttons().size(), 2);
-    QTimer::singleShot(100ms, [&] { yes.buttonWithTag(2000)->click(); });
+    QTimer::singleShot(100ms, &yes, [&] { yes.buttonWithTag(2000)->click(); });
     yes.showAlert();
     EXPECT_TRUE(yes.shouldDownload());
     EXPECT_FALSE(yes.suppressFurtherAlerts());
 
     Confirmation no(Request({regular_.get()}).as<CFDictionaryRef>());
     EXPECT_EQ(no.defaultButton()->text(), "Skip");
-    QTimer::singleShot(100ms, [&] { QTest::keyClick(&no, Qt::Key_Return); });
-    QTimer::singleShot(5s, [&] { no.withdraw(); }); // in case Return did nothing
+    QTimer::singleShot(100ms, &no, [&] { QTest::keyClick(&no, Qt::Key_Return); });
+    QTimer::singleShot(5s, &no, [&] { no.withdraw(); }); // in case Return did nothing
     no.showAlert();
     EXPECT_FALSE(no.shouldDownload());
     EXPECT_EQ(no.clickedButton(), no.buttonWithTag(2001));
@@ -134,12 +134,13 @@ TEST_F(DownloadConfirmationTest, ExitOfTheRequestingProcessWithdrawsTheAlertAndN
     QObject::connect(&confirmation, &Confirmation::requestingApplicationTerminated,
                      [&] { ++terminations; });
     bool upAfterBystanderExit = false;
-    QTimer::singleShot(100ms, [&] { bystander.Kill(); });
-    QTimer::singleShot(500ms, [&] {
+    QTimer::singleShot(100ms, &confirmation, [&] { bystander.Kill(); });
+    QTimer::singleShot(500ms, &confirmation, [&] {
         upAfterBystanderExit = confirmation.isVisible();
         requester.Kill();
     });
-    QTimer::singleShot(10s, [&] { confirmation.buttonWithTag(2000)->click(); }); // failsafe
+    QTimer::singleShot(10s, &confirmation,
+                       [&] { confirmation.buttonWithTag(2000)->click(); }); // failsafe
     confirmation.showAlert();
 
     EXPECT_TRUE(upAfterBystanderExit);
@@ -153,9 +154,9 @@ TEST_F(DownloadConfirmationTest, RegressionProcessExitEndsItsOwnAlertNotTheNeste
     Confirmation outer(Request({regular_.get()}, requester.pid()).as<CFDictionaryRef>());
     Confirmation inner(Request({regular_.get()}).as<CFDictionaryRef>());
     bool innerUp = false, outerHidden = false;
-    QTimer::singleShot(100ms, [&] { inner.showAlert(); });
-    QTimer::singleShot(300ms, [&] { requester.Kill(); });
-    QTimer::singleShot(800ms, [&] {
+    QTimer::singleShot(100ms, &outer, [&] { inner.showAlert(); });
+    QTimer::singleShot(300ms, &outer, [&] { requester.Kill(); });
+    QTimer::singleShot(800ms, &outer, [&] {
         innerUp = inner.isVisible();
         outerHidden = !outer.isVisible();
         inner.buttonWithTag(2000)->click();

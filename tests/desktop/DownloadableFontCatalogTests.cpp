@@ -169,7 +169,8 @@ namespace {
 TEST(CatalogSample, TheDocumentedSampleIsAValidCatalog) {
     QFile sample(qEnvironmentVariable("GLYPHWELL_SOURCE_DIR") +
                  "/resources/catalog/downloadable-fonts.sample.json");
-    ASSERT_TRUE(sample.open(QIODevice::ReadOnly));
+    ASSERT_TRUE(sample.open(QIODevice::ReadOnly))
+        << "GLYPHWELL_SOURCE_DIR must name the source tree (the test registration sets it)";
     const QByteArray bytes = sample.readAll();
     LogCapture log;
     const auto catalog = QZDownloadableFontCatalog::Parse(
