@@ -218,6 +218,7 @@ void QZAutoActivationConfirmation::setupAlert() {
     // The help button must not end the question, but every button of a message box closes it:
     // this one is cut off from the box's handling and opens the help itself.
     widgets_->help = alert->addButton(QMessageBox::Help);
+    widgets_->help->setText(QZLocalizedString("Help"));
     if (auto* box = alert->findChild<QDialogButtonBox*>())
         QObject::disconnect(widgets_->help, &QAbstractButton::clicked, box, nullptr);
     QObject::connect(widgets_->help, &QAbstractButton::clicked, widgets_.get(),

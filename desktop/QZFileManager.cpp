@@ -7,16 +7,19 @@
 #include "platform/Log.h"
 
 QDBusConnection QZCurrentSessionBus() {
-    // One named connection per address: the name carries the address, so a changed address
-    // makes a new connection, and the same address reuses the open one.
+    // The address is read here rather than left to the D-Bus library, which keeps the session
+    // address it saw first for the life of the process. One named connection per address: a
+    // changed address makes a new connection, the same address reuses the open one.
     const QString address = qEnvironmentVariable("DBUS_SESSION_BUS_ADDRESS");
+    if (address.isEmpty())
+        return QDBusConnection::sessionBus();
     const QString name = QStringLiteral("glyphwell-session-bus:") + address;
     QDBusConnection existing(name);
     if (existing.isConnected())
         return existing;
     // A connection under this name that lost its bus is dropped, so that a new one is made.
     QDBusConnection::disconnectFromBus(name);
-    return QDBusConnection::connectToBus(QDBusConnection::SessionBus, name);
+    return QDBusConnection::connectToBus(address, name);
 }
 
 void QZRevealInFileManager(const QStringList& uris, const QString& startupId, QDBusConnection bus) {

@@ -13,10 +13,10 @@ inline constexpr char kQZFileManagerService[] = "org.freedesktop.FileManager1";
 inline constexpr char kQZFileManagerPath[] = "/org/freedesktop/FileManager1";
 inline constexpr char kQZFileManagerInterface[] = "org.freedesktop.FileManager1";
 
-/// The session bus at the address that DBUS_SESSION_BUS_ADDRESS holds now (the platform's
-/// default address when it is unset). Unlike QDBusConnection::sessionBus(), which keeps the
-/// address of its first use, a changed address gives a connection to the new bus. The
-/// connection may be disconnected when there is no bus.
+/// The session bus at the address that DBUS_SESSION_BUS_ADDRESS holds now; when it is unset or
+/// empty, QDBusConnection::sessionBus() (the platform's default address). Unlike
+/// QDBusConnection::sessionBus(), which keeps the address of its first use, a changed address
+/// gives a connection to the new bus. The connection may be disconnected when there is no bus.
 QDBusConnection QZCurrentSessionBus();
 
 /// Activates the file manager and, once the activation has answered (successfully or not), asks
