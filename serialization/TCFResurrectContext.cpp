@@ -61,9 +61,28 @@ private:
     unsigned& depth_;
 };
 
+/// The shared empty string (CFSTR looks its text up under a lock on every use).
+CFStringRef EmptyString() {
+    static const CFStringRef empty = CFSTR("");
+    return empty;
+}
+
+/// A string whose `length` bytes run past the end of the stream: StreamInData reads them as
+/// that many zero bytes and reports "data"; the string is made from those bytes.
+CFStringRef ResurrectTruncatedString(TCFResurrectContext& context, long length) {
+    TStackBuffer<unsigned char, 30> text(static_cast<unsigned long>(length) + 1);
+    context.StreamInData(text.GetBuffer(), 1, length);
+    text[static_cast<unsigned long>(length)] = 0;
+    CFStringRef unique =
+        TCFStringUniquer().GetUniqueString(reinterpret_cast<const char*>(text.GetBuffer()), length);
+    return TCFSafeRetain(unique);
+}
+
 } // namespace
 
-void* ConvertToNative(void* value, long size) { return ConvertToBigEndian(value, size); }
+void* ConvertToNative(void* value, long size) {
+    return ConvertToBigEndian(value, size);
+}
 
 TCFResurrectContext::TCFResurrectContext(unsigned char const* bytes, unsigned long length)
     : cursor(bytes), end(bytes ? bytes + length : nullptr), corrupted(false) {}
@@ -111,8 +130,8 @@ long TCFResurrectContext::StreamInCFIndex() {
 
 void TCFResurrectContext::StreamInData(void* destination, unsigned long size, long count) {
     unsigned long total = 0;
-    const bool sized = count >= 0 && !__builtin_mul_overflow(size, static_cast<unsigned long>(count),
-                                                             &total);
+    const bool sized =
+        count >= 0 && !__builtin_mul_overflow(size, static_cast<unsigned long>(count), &total);
     if (!sized || !BytesAvailable(total)) {
         if (sized)
             std::memset(destination, 0, total);
@@ -212,22 +231,24 @@ void const* TCFResurrectContext::Resurrect(TCFType expected) {
 __CFString const* TCFResurrectContext::ResurrectCFString() {
     const long length = StreamInCFIndex();
     if (length == 0)
-        return CFSTR("");
+        return EmptyString();
     if (length < 0 || length > kTCFMaxStringLength) {
         ResurrectionError("cfstr");
-        return CFSTR("");
+        return EmptyString();
     }
-    TStackBuffer<unsigned char, 30> text(static_cast<unsigned long>(length) + 1);
-    StreamInData(text.GetBuffer(), 1, length);
-    text[static_cast<unsigned long>(length)] = 0;
+    if (!BytesAvailable(static_cast<unsigned long>(length)))
+        return ResurrectTruncatedString(*this, length);
+    // The uniquer reads the text in place: it reads no further than the length it is given,
+    // and a text already seen makes no copy at all.
+    const char* bytes = reinterpret_cast<const char*>(cursor);
+    cursor += length;
     // A byte-order mark is not part of the text.
-    const char* bytes = reinterpret_cast<const char*>(text.GetBuffer());
     long count = length;
     if (count >= 3 && std::memcmp(bytes, "\xEF\xBB\xBF", 3) == 0) {
         bytes += 3;
         count -= 3;
         if (count == 0)
-            return CFSTR("");
+            return EmptyString();
     }
     CFStringRef unique = TCFStringUniquer().GetUniqueString(bytes, count);
     return TCFSafeRetain(unique);
@@ -334,8 +355,9 @@ __CFDictionary const* TCFResurrectContext::ResurrectCFDictionary() {
         keys[i] = Resurrect(kTCFTypeAny);
         values[i] = Resurrect(kTCFTypeAny);
         if (!keys[i] || !values[i]) {
-            CFLog(kCFLogLevelError,
-                  "*** ResurrectCFDictionary missing either a key or a value, truncating dictionary");
+            CFLog(
+                kCFLogLevelError,
+                "*** ResurrectCFDictionary missing either a key or a value, truncating dictionary");
             TCFSafeRelease(keys[i]);
             TCFSafeRelease(values[i]);
             count = i;
@@ -353,10 +375,12 @@ __CFDictionary const* TCFResurrectContext::ResurrectCFDictionary() {
 __CFURL const* TCFResurrectContext::ResurrectCFURL() {
     const long length = StreamInCFIndex();
     if (length == 0)
-        return CFURLCreateWithBytes(kCFAllocatorDefault, nullptr, 0, kCFStringEncodingUTF8, nullptr);
+        return CFURLCreateWithBytes(kCFAllocatorDefault, nullptr, 0, kCFStringEncodingUTF8,
+                                    nullptr);
     if (length < 0 || length > kTCFMaxStringLength) {
         ResurrectionError("cfurl");
-        return CFURLCreateWithBytes(kCFAllocatorDefault, nullptr, 0, kCFStringEncodingUTF8, nullptr);
+        return CFURLCreateWithBytes(kCFAllocatorDefault, nullptr, 0, kCFStringEncodingUTF8,
+                                    nullptr);
     }
     TStackBuffer<unsigned char, 30> bytes(static_cast<unsigned long>(length));
     StreamInData(bytes.GetBuffer(), 1, length);

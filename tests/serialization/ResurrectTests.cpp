@@ -1,5 +1,7 @@
 #include <gtest/gtest.h>
 
+#include <cstring>
+#include <memory>
 #include <string>
 #include <vector>
 
@@ -17,7 +19,9 @@ const char kCorrupt[] = "ERROR: Quzel got corrupted data. (";
 const char kTruncating[] =
     "*** ResurrectCFDictionary missing either a key or a value, truncating dictionary";
 
-std::string Corrupt(const std::string& label) { return kCorrupt + label + ")"; }
+std::string Corrupt(const std::string& label) {
+    return kCorrupt + label + ")";
+}
 
 /// Reads `bytes` with `read` and keeps the result and the log lines.
 struct Read {
@@ -46,7 +50,8 @@ Read Dictionary(const std::vector<uint8_t>& bytes) {
 
 std::string Text(CFTypeRef string) {
     char buffer[256] = {};
-    CFStringGetCString(static_cast<CFStringRef>(string), buffer, sizeof buffer, kCFStringEncodingUTF8);
+    CFStringGetCString(static_cast<CFStringRef>(string), buffer, sizeof buffer,
+                       kCFStringEncodingUTF8);
     return buffer;
 }
 
@@ -109,6 +114,18 @@ TEST(ResurrectStrings, ShortBodyIsReadAsZeroBytes) {
     EXPECT_EQ(CFStringGetLength(read.value.as<CFStringRef>()), 3);
     EXPECT_EQ(CFStringGetCharacterAtIndex(read.value.as<CFStringRef>(), 0), 0);
     EXPECT_EQ(read.log, Lines{Corrupt("data")});
+}
+
+TEST(ResurrectStrings, TextEndingTheBytesIsReadWithoutPassingTheEnd) {
+    // Exactly the eleven bytes on the heap, with no terminator after the text: the text is read
+    // in place, and the sanitizer would report a read past the block.
+    const unsigned char stream[] = {0, 0, 0, 7, 0, 0, 0, 3, 'e', 'n', 'd'};
+    std::unique_ptr<unsigned char[]> bytes(new unsigned char[sizeof stream]);
+    std::memcpy(bytes.get(), stream, sizeof stream);
+    TCFResurrectContext context(bytes.get(), sizeof stream);
+    Ref value(context.RetrieveCFString());
+    EXPECT_EQ(Text(value.get()), "end");
+    EXPECT_FALSE(context.IsCorrupted());
 }
 
 TEST(ResurrectStrings, LengthsOutsideTheLimitsGiveTheEmptyString) {
@@ -287,7 +304,8 @@ TEST(ResurrectCharacterSets, DecompressesOnlyPlausibleBitmaps) {
     EXPECT_TRUE(CFEqual(good.value.get(), set.get()));
 
     // A header claiming 16 bytes of output: decompressible, but no bitmap representation.
-    const Read implausible = Any(Hex("00 00 00 1B 00 00 00 0C 00 00 00 00 10 00 00 00 00 00 08 00"));
+    const Read implausible =
+        Any(Hex("00 00 00 1B 00 00 00 0C 00 00 00 00 10 00 00 00 00 00 08 00"));
     EXPECT_FALSE(implausible.value);
     EXPECT_TRUE(implausible.log.empty());
     const Read garbage = Any(Hex("00 00 00 11 00 00 00 02 00 00 00 1B 00 00 00 02 01 02 00 00 01 "
