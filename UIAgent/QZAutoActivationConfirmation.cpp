@@ -10,7 +10,6 @@
 #include <QLabel>
 #include <QMessageBox>
 #include <QPushButton>
-#include <QStyle>
 #include <QTextBrowser>
 #include <QTimer>
 #include <QUrl>

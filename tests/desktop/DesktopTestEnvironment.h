@@ -2,12 +2,8 @@
 // need an event loop. Runs on Qt's offscreen platform.
 #pragma once
 
-#include <QEventLoop>
 #include <QGuiApplication>
-#include <QTimer>
-#include <chrono>
 #include <cstdlib>
-#include <functional>
 #include <gtest/gtest.h>
 
 namespace glyphwell::testing {
@@ -32,21 +28,5 @@ private:
 
 inline ::testing::Environment* const kDesktopTestEnvironment =
     ::testing::AddGlobalTestEnvironment(new DesktopTestEnvironment);
-
-/// Runs the event loop until `done` answers true or `timeout` has passed; returns `done()`.
-inline bool SpinEventsUntil(const std::function<bool()>& done,
-                            std::chrono::milliseconds timeout = std::chrono::seconds(10)) {
-    QEventLoop loop;
-    QTimer poll;
-    QObject::connect(&poll, &QTimer::timeout, &loop, [&] {
-        if (done())
-            loop.quit();
-    });
-    QTimer::singleShot(timeout, &loop, &QEventLoop::quit);
-    poll.start(5);
-    if (!done())
-        loop.exec();
-    return done();
-}
 
 } // namespace glyphwell::testing

@@ -1,5 +1,6 @@
-// The process-exit watch and the file-manager reveal over a private session bus.
-#include <csignal>
+// The process-exit watch and the file-manager reveal when they have nothing to work with (the
+// alert tests drive both for real: a dying child process, a stand-in file manager on a private
+// bus).
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -7,43 +8,10 @@
 #include "desktop/QZProcessWatch.h"
 #include "tests/desktop/DesktopTestEnvironment.h"
 #include "tests/support/LogCapture.h"
-#include "tests/support/PrivateSessionBus.h"
 
 namespace {
 
-using glyphwell::testing::FileManagerStandIn;
 using glyphwell::testing::LogCapture;
-using glyphwell::testing::PrivateSessionBus;
-using glyphwell::testing::SpinEventsUntil;
-
-/// A child that waits until it is killed.
-pid_t StartPausedChild() {
-    const pid_t child = fork();
-    if (child == 0) {
-        for (;;)
-            pause();
-    }
-    return child;
-}
-
-TEST(ProcessWatch, ReportsTheExitOfTheWatchedProcessOnce) {
-    const pid_t child = StartPausedChild();
-    ASSERT_GT(child, 0);
-    QZProcessWatch watch(child);
-    std::vector<pid_t> reported;
-    QObject::connect(&watch, &QZProcessWatch::processExited,
-                     [&](pid_t pid) { reported.push_back(pid); });
-    EXPECT_TRUE(watch.isWatching());
-
-    kill(child, SIGKILL);
-    EXPECT_TRUE(SpinEventsUntil([&] { return !reported.empty(); }));
-    // A zombie keeps the descriptor readable; the report still comes once.
-    SpinEventsUntil([] { return false; }, std::chrono::milliseconds(100));
-    waitpid(child, nullptr, 0);
-    EXPECT_EQ(reported, std::vector<pid_t>{child});
-    EXPECT_TRUE(watch.hasExited());
-    EXPECT_FALSE(watch.isWatching());
-}
 
 TEST(ProcessWatch, WatchesNothingForInvalidOrVanishedProcessesWithoutLogging) {
     const pid_t child = fork();
@@ -59,25 +27,6 @@ TEST(ProcessWatch, WatchesNothingForInvalidOrVanishedProcessesWithoutLogging) {
         EXPECT_FALSE(watch.hasExited()) << pid;
     }
     EXPECT_TRUE(log.Texts().empty());
-}
-
-TEST(FileManagerReveal, ActivatesTheFileManagerThenShowsTheItems) {
-    PrivateSessionBus bus;
-    ASSERT_FALSE(bus.address().isEmpty()) << "dbus-daemon did not start";
-    FileManagerStandIn fileManager(bus.address());
-    ASSERT_TRUE(fileManager.registered());
-
-    QZRevealInFileManager({QStringLiteral("file:///fonts/A.ttf"), QStringLiteral("file:///B.otf")},
-                          QStringLiteral("startup-1"));
-    ASSERT_TRUE(SpinEventsUntil([&] { return fileManager.calls().size() >= 2; }));
-
-    const auto& calls = fileManager.calls();
-    ASSERT_EQ(calls.size(), 2u);
-    EXPECT_EQ(calls[0].member, QStringLiteral("Introspect"));
-    EXPECT_EQ(calls[1].member, QStringLiteral("ShowItems"));
-    EXPECT_EQ(calls[1].uris, QStringList({QStringLiteral("file:///fonts/A.ttf"),
-                                          QStringLiteral("file:///B.otf")}));
-    EXPECT_EQ(calls[1].startupId, QStringLiteral("startup-1"));
 }
 
 TEST(FileManagerReveal, WithoutASessionBusLogsOneLineAndSendsNothing) {
