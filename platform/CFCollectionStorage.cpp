@@ -95,8 +95,16 @@ size_t HashedTable::HomeSlot(CFHashCode hash) const noexcept {
 }
 
 CFIndex HashedTable::Find(const void* key, CFHashCode hash) const {
-    if (slots_.empty())
+    if (slots_.empty()) {
+        // A small table has no index: compare the stored hashes one by one.
+        for (size_t position = 0; position < entries_.size(); ++position) {
+            const HashedEntry& entry = entries_[position];
+            if (entry.hash == hash && entry.key != RemovedKey() &&
+                CallEqual(equalCallBack_, entry.key, key))
+                return CFIndex(position);
+        }
         return -1;
+    }
     // The index is at most half full, so the probe always reaches an empty slot.
     const size_t mask = slots_.size() - 1;
     for (size_t slot = HomeSlot(hash);; slot = (slot + 1) & mask) {
@@ -119,14 +127,17 @@ void HashedTable::PlaceInIndex(CFHashCode hash, size_t position) {
 }
 
 void HashedTable::Append(const void* key, const void* value, CFHashCode hash) {
-    // Every entry, removed or not, holds one slot; keep at most half of the slots in use. The
-    // new index leaves room for half as many entries again, so regrowth stays amortised O(1)
-    // even when removals and additions alternate.
-    if (2 * (entries_.size() + 1) > slots_.size())
+    // Every entry, removed or not, holds one slot; keep at most half of the slots in use (a
+    // small table: at most kLargestUnindexed entries). The new index leaves room for half as
+    // many entries again, so regrowth stays amortised O(1) even when removals and additions
+    // alternate.
+    const size_t needed = entries_.size() + 1;
+    if (slots_.empty() ? needed > kLargestUnindexed : 2 * needed > slots_.size())
         Rebuild(size_t(liveCount_) + size_t(liveCount_) / 2 + 1);
     entries_.push_back(HashedEntry{key, value, hash});
     ++liveCount_;
-    PlaceInIndex(hash, entries_.size() - 1);
+    if (!slots_.empty())
+        PlaceInIndex(hash, entries_.size() - 1);
 }
 
 HashedEntry HashedTable::Remove(CFIndex position) {
@@ -154,7 +165,11 @@ std::vector<HashedEntry> HashedTable::TakeAll() noexcept {
 }
 
 void HashedTable::Reserve(CFIndex count) {
-    if (count > 0 && 2 * size_t(count) > slots_.size())
+    if (count <= 0)
+        return;
+    if (slots_.empty() && size_t(count) <= kLargestUnindexed)
+        entries_.reserve(size_t(count));
+    else if (2 * size_t(count) > slots_.size())
         Rebuild(size_t(count));
 }
 
@@ -164,6 +179,12 @@ void HashedTable::Rebuild(size_t count) {
         removedCount_ = 0;
     }
     count = std::max(count, entries_.size());
+    if (count <= kLargestUnindexed) {
+        std::vector<size_t>().swap(slots_); // small again: give the index back
+        slotShift_ = 64;
+        entries_.reserve(count);
+        return;
+    }
     size_t size = 8;
     unsigned shift = 61;
     while (size < 2 * count) {

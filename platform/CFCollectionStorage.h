@@ -5,7 +5,9 @@
 // The hashed table differs from std::unordered_map in two ways the containers need: entries are
 // kept in insertion order (a dense vector, enumerated front to back), and keys are hashed and
 // compared through the container's callbacks. An open-addressing index maps hashes to entry
-// positions; removal marks the entry and compacts once marked entries outnumber live ones.
+// positions; removal marks the entry and compacts once marked entries outnumber live ones. A
+// small table (up to 8 entries, the common case for the values of a request) has no index and
+// is searched by comparing the stored hashes, which saves the index's allocation and upkeep.
 #pragma once
 
 #include <cstddef>
@@ -137,6 +139,9 @@ public:
     }
 
 private:
+    /// The most entries (removed ones included) a table keeps without an index.
+    static constexpr size_t kLargestUnindexed = 8;
+
     /// Marks a removed entry; its address cannot be a caller's key.
     static const void* RemovedKey() noexcept;
     /// Drops removed entries and rebuilds the index with room for `count` live entries.
@@ -147,7 +152,8 @@ private:
     CFHashCallBack hashCallBack_;
     CFEqualCallBack equalCallBack_;
     std::vector<HashedEntry> entries_; ///< insertion order, removed entries included
-    std::vector<size_t> slots_;        ///< entry position + 1, 0 for an empty slot; power of two
+    std::vector<size_t> slots_;        ///< entry position + 1, 0 for an empty slot; power of two;
+                                       ///< empty while the table is small
     unsigned slotShift_ = 64;          ///< 64 - log2(slots_.size())
     CFIndex liveCount_ = 0;
     size_t removedCount_ = 0;

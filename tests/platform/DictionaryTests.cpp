@@ -218,6 +218,39 @@ TEST(CFDictionary, LargeDictionaryFindsEveryKey) {
     EXPECT_EQ(CFGetRetainCount(valueRefs[1]), 1);
 }
 
+TEST(CFDictionary, LookupsHoldWhileGrowingAndShrinkingAcrossEightPairs) {
+    // Small dictionaries are searched without an index and get one past eight pairs (removed
+    // pairs count until compacted); every lookup must agree with a plain model throughout.
+    const int keyCount = 20;
+    std::vector<Owned<CFNumberRef>> keys;
+    for (int i = 0; i < keyCount; ++i)
+        keys.push_back(MakeInt(i));
+    auto dictionary = makeMutable();
+    std::vector<bool> present(keyCount, false);
+    uint32_t state = 12345;
+    for (int step = 0; step < 3000; ++step) {
+        state = state * 1664525u + 1013904223u;
+        const int key = int(state >> 16) % keyCount;
+        // Add more often while small and remove more often while large, to cross 8 both ways.
+        const bool add = int((state >> 8) & 15) >= int(CFDictionaryGetCount(dictionary.get()));
+        if (add) {
+            CFDictionarySetValue(dictionary.get(), keys[size_t(key)].get(), kCFBooleanTrue);
+            present[size_t(key)] = true;
+        } else {
+            CFDictionaryRemoveValue(dictionary.get(), keys[size_t(key)].get());
+            present[size_t(key)] = false;
+        }
+        CFIndex expected = 0;
+        for (int i = 0; i < keyCount; ++i) {
+            auto probe = MakeInt(i); // an equal key, not the same object
+            ASSERT_EQ(CFDictionaryContainsKey(dictionary.get(), probe.get()), present[size_t(i)])
+                << "step " << step << ", key " << i;
+            expected += present[size_t(i)];
+        }
+        ASSERT_EQ(CFDictionaryGetCount(dictionary.get()), expected);
+    }
+}
+
 TEST(CFDictionary, ChangingImmutableDictionaryIsReportedAndIgnored) {
     auto dictionary = makeDictionary({});
     LogCapture log;
