@@ -40,6 +40,11 @@ struct ReleaseQueue {
 };
 thread_local ReleaseQueue releaseQueue{};
 
+/// Destroys an object whose last count was already given back.
+void DestroyObject(CFAllocatorRef, const void* value) {
+    delete AsObject(value);
+}
+
 } // namespace
 
 ElementReleaser::ElementReleaser() noexcept : outermost_(!releaseQueue.active) {
@@ -61,6 +66,16 @@ ElementReleaser::~ElementReleaser() {
 void ElementReleaser::Release(CFReleaseCallBack release, const void* value) {
     if (!release)
         return;
+    // The standard callback (CFRelease, shared by every kCFType... callbacks record): give the
+    // count back now. Only destroying the value, which may release a container's elements in
+    // turn, has to wait its turn; a shared constant or a value still held elsewhere needs
+    // nothing more, and never enters the queue.
+    if (release == kCFTypeArrayCallBacks.release && value) {
+        const CFObject* object = AsObject(value);
+        if (object->IsImmortal() || !object->ReleaseShouldDestroy())
+            return;
+        release = DestroyObject;
+    }
     if (!outermost_) {
         ReleaseQueue& queue = releaseQueue;
         if (queue.count == queue.capacity) {

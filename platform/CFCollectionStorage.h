@@ -68,7 +68,8 @@ public:
     ElementReleaser(const ElementReleaser&) = delete;
     ElementReleaser& operator=(const ElementReleaser&) = delete;
 
-    /// Calls `release` for `value` now or later; a null callback does nothing.
+    /// Calls `release` for `value` now or later; a null callback does nothing. With the standard
+    /// callback the count is given back at once, and only the destruction may wait.
     void Release(CFReleaseCallBack release, const void* value);
 
 private:
