@@ -63,16 +63,14 @@ ElementReleaser::~ElementReleaser() {
     releaseQueue = ReleaseQueue{};
 }
 
-void ElementReleaser::Release(CFReleaseCallBack release, const void* value) {
+void ElementReleaser::ReleaseCounted(CFReleaseCallBack release, const void* value) {
     if (!release)
         return;
     // The standard callback (CFRelease, shared by every kCFType... callbacks record): give the
     // count back now. Only destroying the value, which may release a container's elements in
-    // turn, has to wait its turn; a shared constant or a value still held elsewhere needs
-    // nothing more, and never enters the queue.
+    // turn, has to wait its turn; a value still held elsewhere never enters the queue.
     if (release == kCFTypeArrayCallBacks.release && value) {
-        const CFObject* object = AsObject(value);
-        if (object->IsImmortal() || !object->ReleaseShouldDestroy())
+        if (!AsObject(value)->ReleaseShouldDestroy())
             return;
         release = DestroyObject;
     }

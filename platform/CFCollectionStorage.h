@@ -70,9 +70,17 @@ public:
 
     /// Calls `release` for `value` now or later; a null callback does nothing. With the standard
     /// callback the count is given back at once, and only the destruction may wait.
-    void Release(CFReleaseCallBack release, const void* value);
+    void Release(CFReleaseCallBack release, const void* value) {
+        // The standard callback has nothing to do for a shared constant (most elements of a
+        // request read back): skip the call.
+        if (release == kCFTypeArrayCallBacks.release && value && AsObject(value)->IsImmortal())
+            return;
+        ReleaseCounted(release, value);
+    }
 
 private:
+    void ReleaseCounted(CFReleaseCallBack release, const void* value);
+
     bool outermost_;
 };
 
