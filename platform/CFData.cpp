@@ -36,6 +36,9 @@ struct __CFData final : CFObject {
     /// Replaces the bytes of `range` (inside the data) with `newLength` bytes from `newBytes`,
     /// or zero bytes when `newBytes` is null. `newBytes` may point into this object's bytes.
     void Replace(CFRange range, const UInt8* newBytes, CFIndex newLength);
+    /// Appends `newLength` bytes from `newBytes`, or zero bytes when it is null: Replace at the
+    /// end, without its general bookkeeping unless the bytes come from this object's own block.
+    void Append(const UInt8* newBytes, CFIndex newLength);
 
     const bool isMutable;
     const bool freeBytes;
@@ -105,6 +108,20 @@ void __CFData::Replace(CFRange range, const UInt8* newBytes, CFIndex newLength) 
             std::memset(bytes + range.location, 0, size_t(newLength));
     }
     length = newTotal;
+}
+
+void __CFData::Append(const UInt8* newBytes, CFIndex newLength) {
+    std::less<const UInt8*> before;
+    if (newBytes && bytes && !before(newBytes, bytes) && before(newBytes, bytes + capacity)) {
+        Replace(CFRangeMake(length, 0), newBytes, newLength); // growing may move them
+        return;
+    }
+    Reserve(length + newLength);
+    if (newBytes)
+        std::memcpy(bytes + length, newBytes, size_t(newLength));
+    else
+        std::memset(bytes + length, 0, size_t(newLength));
+    length += newLength;
 }
 
 namespace {
@@ -219,7 +236,7 @@ void CFDataSetLength(CFMutableDataRef data, CFIndex length) {
         object->length = length;
         return;
     }
-    object->Replace(CFRangeMake(object->length, 0), nullptr, length - object->length);
+    object->Append(nullptr, length - object->length);
 }
 
 void CFDataIncreaseLength(CFMutableDataRef data, CFIndex extraLength) {
@@ -230,7 +247,7 @@ void CFDataIncreaseLength(CFMutableDataRef data, CFIndex extraLength) {
     GW_ASSERT(extraLength <= PTRDIFF_MAX - object->length);
     if (extraLength > PTRDIFF_MAX - object->length)
         return;
-    object->Replace(CFRangeMake(object->length, 0), nullptr, extraLength);
+    object->Append(nullptr, extraLength);
 }
 
 void CFDataAppendBytes(CFMutableDataRef data, const UInt8* bytes, CFIndex length) {
@@ -241,7 +258,7 @@ void CFDataAppendBytes(CFMutableDataRef data, const UInt8* bytes, CFIndex length
     GW_ASSERT(length <= PTRDIFF_MAX - object->length);
     if (length > PTRDIFF_MAX - object->length)
         return;
-    object->Replace(CFRangeMake(object->length, 0), bytes, length);
+    object->Append(bytes, length);
 }
 
 void CFDataReplaceBytes(CFMutableDataRef data, CFRange range, const UInt8* newBytes,
