@@ -9,11 +9,49 @@
 #include "cfutil/TCFRetained.h"
 #include "cfutil/TStackBuffer.h"
 
-static_assert(std::endian::native == std::endian::little, "the writer swaps on a little-endian host");
+static_assert(std::endian::native == std::endian::little,
+              "the writer swaps on a little-endian host");
 
 namespace {
 
-CFIndex LengthOf(CFDataRef data) { return data ? CFDataGetLength(data) : 0; }
+CFIndex LengthOf(CFDataRef data) {
+    return data ? CFDataGetLength(data) : 0;
+}
+
+/// Stores `value` big-endian at `bytes`.
+void Put32(UInt8* bytes, uint32_t value) {
+    value = __builtin_bswap32(value);
+    std::memcpy(bytes, &value, 4);
+}
+
+/// Appends a type id and the index field after it (the low 32 bits of `index`) in one append:
+/// the head of every value but the error's.
+void StreamOutHead(CFMutableDataRef stream, TCFType type, long index) {
+    UInt8 head[8];
+    Put32(head, type);
+    Put32(head + 4, static_cast<uint32_t>(index));
+    CFDataAppendBytes(stream, head, 8);
+}
+
+/// The platform's kind ids, fetched once: Flatten compares each value's kind with them in turn.
+struct KindIDs {
+    CFTypeID string = CFStringGetTypeID();
+    CFTypeID number = CFNumberGetTypeID();
+    CFTypeID boolean = CFBooleanGetTypeID();
+    CFTypeID dictionary = CFDictionaryGetTypeID();
+    CFTypeID array = CFArrayGetTypeID();
+    CFTypeID data = CFDataGetTypeID();
+    CFTypeID characterSet = CFCharacterSetGetTypeID();
+    CFTypeID set = CFSetGetTypeID();
+    CFTypeID url = CFURLGetTypeID();
+    CFTypeID uuid = CFUUIDGetTypeID();
+    CFTypeID error = CFErrorGetTypeID();
+};
+
+const KindIDs& Kinds() {
+    static const KindIDs ids;
+    return ids;
+}
 
 } // namespace
 
@@ -53,41 +91,48 @@ TCFFlattenContext::TCFFlattenContext(__CFData* buffer, bool adopt)
         CFRetain(stream);
 }
 
-TCFFlattenContext::~TCFFlattenContext() { TCFSafeRelease(stream); }
+TCFFlattenContext::~TCFFlattenContext() {
+    TCFSafeRelease(stream);
+}
 
-__CFData* TCFFlattenContext::GetStream() const { return stream; }
+__CFData* TCFFlattenContext::GetStream() const {
+    return stream;
+}
 
 const UInt8* TCFFlattenContext::GetBytePtr() const {
     return stream ? CFDataGetBytePtr(stream) : nullptr;
 }
 
-CFIndex TCFFlattenContext::GetLength() const { return LengthOf(stream); }
+CFIndex TCFFlattenContext::GetLength() const {
+    return LengthOf(stream);
+}
 
 void TCFFlattenContext::Flatten(void const* value) {
     if (!value || !valid)
         return;
     const CFTypeID kind = CFGetTypeID(value);
-    if (kind == CFStringGetTypeID())
+    const KindIDs& kinds = Kinds();
+    if (kind == kinds.string)
         FlattenCFString(static_cast<CFStringRef>(value));
-    else if (kind == CFNumberGetTypeID())
+    else if (kind == kinds.number)
         FlattenCFNumber(static_cast<CFNumberRef>(value));
-    else if (kind == CFBooleanGetTypeID())
+    else if (kind == kinds.boolean)
         FlattenCFBoolean(static_cast<CFBooleanRef>(value));
-    else if (kind == CFDictionaryGetTypeID())
+    else if (kind == kinds.dictionary)
         FlattenCFDictionary(static_cast<CFDictionaryRef>(value));
-    else if (kind == CFArrayGetTypeID())
+    else if (kind == kinds.array)
         FlattenCFArray(static_cast<CFArrayRef>(value));
-    else if (kind == CFDataGetTypeID())
+    else if (kind == kinds.data)
         FlattenCFData(static_cast<CFDataRef>(value));
-    else if (kind == CFCharacterSetGetTypeID())
+    else if (kind == kinds.characterSet)
         FlattenCFCharacterSet(static_cast<CFCharacterSetRef>(value));
-    else if (kind == CFSetGetTypeID())
+    else if (kind == kinds.set)
         FlattenCFSet(static_cast<CFSetRef>(value));
-    else if (kind == CFURLGetTypeID())
+    else if (kind == kinds.url)
         FlattenCFURL(static_cast<CFURLRef>(value));
-    else if (kind == CFUUIDGetTypeID())
+    else if (kind == kinds.uuid)
         FlattenCFUUID(static_cast<CFUUIDRef>(value));
-    else if (kind == CFErrorGetTypeID())
+    else if (kind == kinds.error)
         FlattenCFError(static_cast<CFErrorRef>(const_cast<void*>(value)));
     else {
         CFLog(kCFLogLevelError, "*** don't know how to flatten type %lu (object %@)", kind, value);
@@ -98,66 +143,75 @@ void TCFFlattenContext::Flatten(void const* value) {
 }
 
 void TCFFlattenContext::FlattenCFString(__CFString const* string) {
-    StreamOutTCFTypeID(kTCFTypeString);
     const CFIndex length = CFStringGetLength(string);
     if (length <= kTCFMaxStringLength) {
+        // One conversion, straight into the buffer: make room for the type id, the count and
+        // the longest UTF-8 form the text can have, convert, then cut back to what was written.
+        const CFIndex start = CFDataGetLength(stream);
+        const CFIndex room = CFStringGetMaximumSizeForEncoding(length, kCFStringEncodingUTF8);
+        CFDataIncreaseLength(stream, 8 + room);
+        UInt8* const value = CFDataGetMutableBytePtr(stream) + start;
         CFIndex byteCount = 0;
-        const CFRange whole = CFRangeMake(0, length);
+        const CFIndex converted =
+            CFStringGetBytes(string, CFRangeMake(0, length), kCFStringEncodingUTF8, 0, true,
+                             value + 8, room, &byteCount);
         // The reader takes at most kTCFMaxStringLength bytes of text: a longer text would make
         // the whole stream unreadable, so it fails here like an overlong one.
-        if (CFStringGetBytes(string, whole, kCFStringEncodingUTF8, 0, true, nullptr, 0,
-                             &byteCount) == length &&
-            byteCount <= kTCFMaxStringLength) {
-            TStackBuffer<unsigned char, 30> utf8(byteCount);
-            CFStringGetBytes(string, whole, kCFStringEncodingUTF8, 0, true, utf8.GetBuffer(),
-                             byteCount, &byteCount);
-            StreamOutCFIndex(byteCount);
-            StreamOut(utf8.GetBuffer(), 1, byteCount);
+        if (converted == length && byteCount <= kTCFMaxStringLength) {
+            Put32(value, kTCFTypeString);
+            Put32(value + 4, static_cast<uint32_t>(byteCount));
+            CFDataSetLength(stream, start + 8 + byteCount);
             return;
         }
+        CFDataSetLength(stream, start);
     }
     glyphwell::SystemLog(LOG_ERR, "ERROR: Quzel::TCFFlattenContext::FlattenCFString failed.");
-    StreamOutCFIndex(0);
+    StreamOutHead(stream, kTCFTypeString, 0);
 }
 
 void TCFFlattenContext::FlattenCFNumber(__CFNumber const* number) {
-    StreamOutTCFTypeID(kTCFTypeNumber);
     const CFNumberType type = CFNumberGetType(number);
     CFIndex width = CFNumberGetByteSize(number);
-    StreamOutCFIndex(type);
     // The value model has no number wider than 8 bytes; should one appear, its width is written
     // as 0 rather than reading past the value buffer (the reader rejects it either way).
     if (width < 0 || width > 8)
         width = 0;
-    StreamOutCFIndex(width);
-    UInt8 value[8] = {};
-    if (width > 0)
+    // Type id, type code, width and the value, big-endian, in one append.
+    UInt8 bytes[20] = {};
+    Put32(bytes, kTCFTypeNumber);
+    Put32(bytes + 4, static_cast<uint32_t>(type));
+    Put32(bytes + 8, static_cast<uint32_t>(width));
+    if (width > 0) {
+        UInt8 value[8] = {};
         CFNumberGetValue(number, type, value);
-    StreamOut(value, static_cast<unsigned long>(width), 1);
+        ConvertToBigEndian(value, width);
+        std::memcpy(bytes + 12, value, static_cast<size_t>(width));
+    }
+    CFDataAppendBytes(stream, bytes, 12 + width);
 }
 
 void TCFFlattenContext::FlattenCFBoolean(__CFBoolean const* boolean) {
-    StreamOutTCFTypeID(kTCFTypeBoolean);
-    StreamOutCFIndex(1);
-    const UInt8 byte = CFBooleanGetValue(boolean) ? 1 : 0;
-    StreamOut(&byte, 1, 1);
+    UInt8 bytes[9];
+    Put32(bytes, kTCFTypeBoolean);
+    Put32(bytes + 4, 1);
+    bytes[8] = CFBooleanGetValue(boolean) ? 1 : 0;
+    CFDataAppendBytes(stream, bytes, 9);
 }
 
 void TCFFlattenContext::FlattenCFData(__CFData const* data) {
-    StreamOutTCFTypeID(kTCFTypeData);
     const CFIndex length = CFDataGetLength(data);
-    StreamOutCFIndex(length);
+    StreamOutHead(stream, kTCFTypeData, length);
     if (length > 0)
         StreamOut(CFDataGetBytePtr(data), 1, length);
 }
 
 void TCFFlattenContext::FlattenCFCharacterSet(__CFCharacterSet const* set) {
     StreamOutTCFTypeID(kTCFTypeCharacterSet);
-    TCFAdopted<CFDataRef> bitmap(CFCharacterSetCreateBitmapRepresentation(kCFAllocatorDefault, set));
-    TCFAdopted<CFDataRef> compressed(
-        bitmap ? QZCreateCompressedBitmapRepresentation(CFDataGetBytePtr(bitmap),
-                                                        CFDataGetLength(bitmap))
-               : nullptr);
+    TCFAdopted<CFDataRef> bitmap(
+        CFCharacterSetCreateBitmapRepresentation(kCFAllocatorDefault, set));
+    TCFAdopted<CFDataRef> compressed(bitmap ? QZCreateCompressedBitmapRepresentation(
+                                                  CFDataGetBytePtr(bitmap), CFDataGetLength(bitmap))
+                                            : nullptr);
     const CFIndex length = compressed ? CFDataGetLength(compressed) : 0;
     StreamOutCFIndex(length);
     if (length > 0)
@@ -165,25 +219,22 @@ void TCFFlattenContext::FlattenCFCharacterSet(__CFCharacterSet const* set) {
 }
 
 void TCFFlattenContext::FlattenCFArray(__CFArray const* array) {
-    StreamOutTCFTypeID(kTCFTypeArray);
     const CFIndex count = CFArrayGetCount(array);
-    StreamOutCFIndex(count);
+    StreamOutHead(stream, kTCFTypeArray, count);
     if (count != 0)
         CFArrayApplyFunction(array, CFRangeMake(0, count), FlattenArrayElement, this);
 }
 
 void TCFFlattenContext::FlattenCFDictionary(__CFDictionary const* dictionary) {
-    StreamOutTCFTypeID(kTCFTypeDictionary);
     const CFIndex count = CFDictionaryGetCount(dictionary);
-    StreamOutCFIndex(count);
+    StreamOutHead(stream, kTCFTypeDictionary, count);
     if (count != 0)
         CFDictionaryApplyFunction(dictionary, FlattenDictionaryElement, this);
 }
 
 void TCFFlattenContext::FlattenCFSet(__CFSet const* set) {
-    StreamOutTCFTypeID(kTCFTypeSet);
     const CFIndex count = CFSetGetCount(set);
-    StreamOutCFIndex(count);
+    StreamOutHead(stream, kTCFTypeSet, count);
     if (count != 0)
         CFSetApplyFunction(set, FlattenSetElement, this);
 }
@@ -244,7 +295,9 @@ void TCFFlattenContext::StreamOut32bitEntity(unsigned int value) {
     CFDataAppendBytes(stream, reinterpret_cast<const UInt8*>(&bigEndian), 4);
 }
 
-void TCFFlattenContext::StreamOutTCFTypeID(TCFType type) { StreamOut32bitEntity(type); }
+void TCFFlattenContext::StreamOutTCFTypeID(TCFType type) {
+    StreamOut32bitEntity(type);
+}
 
 void TCFFlattenContext::StreamOutCFIndex(long index) {
     StreamOut32bitEntity(static_cast<unsigned int>(index));
@@ -302,7 +355,9 @@ CFIndex TCFFlattenContext::EstimateCFNumberSize(__CFNumber const* number) {
     return CFNumberGetByteSize(number) + 12;
 }
 
-CFIndex TCFFlattenContext::EstimateCFBooleanSize(__CFBoolean const*) { return 9; }
+CFIndex TCFFlattenContext::EstimateCFBooleanSize(__CFBoolean const*) {
+    return 9;
+}
 
 CFIndex TCFFlattenContext::EstimateCFDataSize(__CFData const* data) {
     return CFDataGetLength(data) + 8;
@@ -353,7 +408,9 @@ CFIndex TCFFlattenContext::EstimateCFURLSize(__CFURL const* url) {
     return 8 + (length > 0 ? length : 0);
 }
 
-CFIndex TCFFlattenContext::EstimateCFUUIDSize(__CFUUID const*) { return 24; }
+CFIndex TCFFlattenContext::EstimateCFUUIDSize(__CFUUID const*) {
+    return 24;
+}
 
 CFIndex TCFFlattenContext::EstimateCFErrorSize(__CFError* error) {
     return EstimateCFStringSize(CFErrorGetDomain(error)) + 8;
