@@ -2,7 +2,11 @@
 
 #include <iconv.h>
 
+#include <bit>
 #include <cstring>
+
+static_assert(std::endian::native == std::endian::little,
+              "UTF-16 in host order is little-endian, and the encoder narrows words as such");
 
 namespace glyphwell::text {
 namespace {
@@ -217,9 +221,87 @@ bool DecodeUTF32(const uint8_t* p, size_t n, bool bigEndian, bool external, std:
 // ---------------------------------------------------------------------------------------------
 // Encoding.
 
+/// EncodeUTF8Counted into a buffer with room for the longest form (3 bytes per unit), so no
+/// unit can run out of space: one tight loop, no capacity checks. This is the stream writer's
+/// case, and the same rules give the same bytes.
+void EncodeUTF8WithRoom(std::u16string_view units, uint8_t lossByte, uint8_t* buffer,
+                        EncodeResult& result) {
+    const char16_t* src = units.data();
+    const size_t n = units.size();
+    size_t i = 0, pos = 0;
+    while (i < n) {
+        // ASCII in blocks of 16 units (the fixed-size loops compile to vector instructions),
+        // then of 4 units within a 64-bit word.
+        while (i + 16 <= n) {
+            char16_t block[16];
+            std::memcpy(block, src + i, sizeof block);
+            char16_t any = 0;
+            for (char16_t unit : block)
+                any |= unit;
+            if (any >= 0x80)
+                break;
+            uint8_t narrow[16];
+            for (int j = 0; j < 16; ++j)
+                narrow[j] = uint8_t(block[j]);
+            std::memcpy(buffer + pos, narrow, sizeof narrow);
+            i += 16;
+            pos += 16;
+        }
+        while (i + 4 <= n) {
+            uint64_t word;
+            std::memcpy(&word, src + i, sizeof word);
+            if (word & 0xFF80FF80FF80FF80ull)
+                break;
+            // Units u0..u3 at bits 0, 16, 32 and 48 (little-endian host) become bytes 0..3.
+            const uint64_t pairs = (word | word >> 8) & 0x0000FFFF0000FFFFull;
+            const uint32_t four = uint32_t(pairs | pairs >> 16);
+            std::memcpy(buffer + pos, &four, sizeof four);
+            i += 4;
+            pos += 4;
+        }
+        if (i == n)
+            break;
+        const uint32_t c = src[i];
+        if (c < 0x80) {
+            buffer[pos++] = uint8_t(c);
+            ++i;
+        } else if (c < 0x800) {
+            buffer[pos] = uint8_t(0xC0 | c >> 6);
+            buffer[pos + 1] = uint8_t(0x80 | (c & 0x3F));
+            pos += 2;
+            ++i;
+        } else if (!IsSurrogate(c)) {
+            buffer[pos] = uint8_t(0xE0 | c >> 12);
+            buffer[pos + 1] = uint8_t(0x80 | (c >> 6 & 0x3F));
+            buffer[pos + 2] = uint8_t(0x80 | (c & 0x3F));
+            pos += 3;
+            ++i;
+        } else if (IsHighSurrogate(c) && i + 1 < n && IsLowSurrogate(src[i + 1])) {
+            const uint32_t pair = 0x10000 + ((c - 0xD800) << 10) + (src[i + 1] - 0xDC00);
+            buffer[pos] = uint8_t(0xF0 | pair >> 18);
+            buffer[pos + 1] = uint8_t(0x80 | (pair >> 12 & 0x3F));
+            buffer[pos + 2] = uint8_t(0x80 | (pair >> 6 & 0x3F));
+            buffer[pos + 3] = uint8_t(0x80 | (pair & 0x3F));
+            pos += 4;
+            i += 2;
+        } else if (lossByte != 0) { // an unpaired surrogate
+            buffer[pos++] = lossByte;
+            ++i;
+        } else {
+            break;
+        }
+    }
+    result.unitsConverted = i;
+    result.bytes = pos;
+}
+
 /// UTF-16 to UTF-8 with the CFStringGetBytes rules; ASCII runs are copied in blocks.
 void EncodeUTF8Counted(std::u16string_view units, uint8_t lossByte, uint8_t* buffer,
                        size_t capacity, EncodeResult& result) {
+    if (buffer && capacity / 3 >= units.size()) {
+        EncodeUTF8WithRoom(units, lossByte, buffer, result);
+        return;
+    }
     const char16_t* src = units.data();
     const size_t n = units.size();
     size_t i = 0, pos = 0;
