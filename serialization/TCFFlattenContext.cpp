@@ -142,28 +142,56 @@ void TCFFlattenContext::Flatten(void const* value) {
     }
 }
 
+namespace {
+
+/// The most UTF-8 bytes one UTF-16 unit can need (a surrogate pair needs 4 for its 2 units).
+constexpr CFIndex kUTF8BytesPerUnit = 3;
+/// Texts whose head and longest UTF-8 form fit in this many bytes are converted on the stack.
+constexpr CFIndex kShortStringRoom = 128;
+
+/// Converts the whole of `string` (`length` units) to UTF-8 at `text`, which has room for
+/// kUTF8BytesPerUnit bytes per unit, and stores the byte count in `*byteCount`. False when the
+/// text cannot be written: a unit without a UTF-8 form, or more bytes than a reader takes.
+bool ConvertText(CFStringRef string, CFIndex length, UInt8* text, CFIndex* byteCount) {
+    const CFIndex converted =
+        CFStringGetBytes(string, CFRangeMake(0, length), kCFStringEncodingUTF8, 0, true, text,
+                         kUTF8BytesPerUnit * length, byteCount);
+    // The reader takes at most kTCFMaxStringLength bytes of text: a longer text would make the
+    // whole stream unreadable, so it fails here like an overlong one.
+    return converted == length && *byteCount <= kTCFMaxStringLength;
+}
+
+} // namespace
+
 void TCFFlattenContext::FlattenCFString(__CFString const* string) {
     const CFIndex length = CFStringGetLength(string);
+    // Each text is converted once. A short one is converted on the stack behind its head and
+    // appended in one call; a longer one straight into the buffer, after room is made for its
+    // longest UTF-8 form, which is then cut back to what was written.
     if (length <= kTCFMaxStringLength) {
-        // One conversion, straight into the buffer: make room for the type id, the count and
-        // the longest UTF-8 form the text can have, convert, then cut back to what was written.
-        const CFIndex start = CFDataGetLength(stream);
-        const CFIndex room = CFStringGetMaximumSizeForEncoding(length, kCFStringEncodingUTF8);
-        CFDataIncreaseLength(stream, 8 + room);
-        UInt8* const value = CFDataGetMutableBytePtr(stream) + start;
+        const CFIndex room = 8 + kUTF8BytesPerUnit * length;
         CFIndex byteCount = 0;
-        const CFIndex converted =
-            CFStringGetBytes(string, CFRangeMake(0, length), kCFStringEncodingUTF8, 0, true,
-                             value + 8, room, &byteCount);
-        // The reader takes at most kTCFMaxStringLength bytes of text: a longer text would make
-        // the whole stream unreadable, so it fails here like an overlong one.
-        if (converted == length && byteCount <= kTCFMaxStringLength) {
-            Put32(value, kTCFTypeString);
-            Put32(value + 4, static_cast<uint32_t>(byteCount));
-            CFDataSetLength(stream, start + 8 + byteCount);
-            return;
+        if (room <= kShortStringRoom) {
+            UInt8 value[kShortStringRoom];
+            if (ConvertText(string, length, value + 8, &byteCount)) {
+                Put32(value, kTCFTypeString);
+                Put32(value + 4, static_cast<uint32_t>(byteCount));
+                CFDataAppendBytes(stream, value, 8 + byteCount);
+                return;
+            }
+        } else {
+            const CFIndex start = CFDataGetLength(stream);
+            CFDataIncreaseLength(stream, room);
+            UInt8* const value = CFDataGetMutableBytePtr(stream) + start;
+            const bool converted = ConvertText(string, length, value + 8, &byteCount);
+            if (converted) {
+                Put32(value, kTCFTypeString);
+                Put32(value + 4, static_cast<uint32_t>(byteCount));
+            }
+            CFDataSetLength(stream, converted ? start + 8 + byteCount : start);
+            if (converted)
+                return;
         }
-        CFDataSetLength(stream, start);
     }
     glyphwell::SystemLog(LOG_ERR, "ERROR: Quzel::TCFFlattenContext::FlattenCFString failed.");
     StreamOutHead(stream, kTCFTypeString, 0);
