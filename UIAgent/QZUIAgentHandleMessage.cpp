@@ -120,7 +120,7 @@ void HandleFontDownload(CFDictionaryRef request, CFMutableDataRef reply) {
     bool result = false;
     if (shouldDownload) {
         TCFAdopted<CFArrayRef> descriptors(QZCreateFontDescriptors(request));
-        result = QZRunFontDownload(descriptors, localizedNames) != 0;
+        result = QZRunFontDownload(descriptors, localizedNames, confirmation.get()) != 0;
     }
 
     TCFNumber resultNumber(static_cast<SInt8>(result ? 1 : 0));

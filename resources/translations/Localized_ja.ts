@@ -94,6 +94,16 @@
         <translation>「%1」をダウンロード中…</translation>
     </message>
     <message>
+        <source>QZ_DOWNLOADING_FONTS</source>
+        <extracomment>Status line of the download window when the font being downloaded has no name.</extracomment>
+        <translation>フォントをダウンロード中…</translation>
+    </message>
+    <message>
+        <source>QZ_DOWNLOAD_WINDOW_TITLE</source>
+        <extracomment>Title of the download window.</extracomment>
+        <translation>フォントのダウンロード</translation>
+    </message>
+    <message>
         <source>%1$@ of %2$@</source>
         <extracomment>Size line of the download window. %1: size downloaded so far, %2: total size.</extracomment>
         <translation>%2 中 %1</translation>

@@ -165,12 +165,12 @@ TEST_F(DispatchTest, DownloadRequestsWithoutAnythingToDownloadAreAnsweredNoWitho
 TEST_F(DispatchTest, ADownloadRequestThatSaysNotToAskShowsNoAlertAndPassesItsSuppressBack) {
     ShownWindows shown;
     Ref name = Str("Example-Regular");
-    Ref font = Dict({{NSFontNameAttribute, name.get()}});
     Ref nameless = Dict({{NSFontFamilyAttribute, name.get()}});
-    Ref fonts = Array({nameless.get(), font.get()});
+    Ref fonts = Array({nameless.get()});
     Ref request =
         Dict({{kQZUIPropertySuppress, kCFBooleanTrue}, {kQZUIPropertyFontProperties, fonts.get()}});
-    // No font is downloaded yet, so nothing is matched: Result 0.
+    // No font is named, so nothing is downloaded or matched: Result 0 (the download itself is
+    // tested in DownloadWindowTests.cpp).
     EXPECT_EQ(ToHex(Handle(2, request.get()).as<CFDataRef>()),
               Expected({Hex("00 00 00 10  00 00 00 02"), kResultKey, kNo, kSuppressKey, kYes}));
     // A number that answers true counts as the flag too.
@@ -265,33 +265,6 @@ TEST_F(DispatchTest, FontDescriptorsCarryOnlyTheNameAndSkipElementsWithoutOne) {
 
     Ref none(QZCreateFontDescriptors(nullptr));
     EXPECT_EQ(CFArrayGetCount(none.as<CFArrayRef>()), 0);
-}
-
-TEST_F(DispatchTest, AnAgreedDownloadIsAnsweredNothingMatchedUntilFontsCanBeDownloaded) {
-    QTemporaryDir data;
-    ASSERT_TRUE(data.isValid());
-    qputenv("XDG_DATA_HOME", data.path().toUtf8());
-    qputenv("XDG_DATA_DIRS", data.filePath("none").toUtf8());
-    QDir().mkpath(data.filePath("glyphwell"));
-    QFile catalog(data.filePath("glyphwell/downloadable-fonts.json"));
-    ASSERT_TRUE(catalog.open(QIODevice::WriteOnly));
-    catalog.write(R"({"assets": [{"LocalID": "A", "url": "https://fonts.example/A", "size": 5000,
-        "sha256": "0000000000000000000000000000000000000000000000000000000000000000",
-        "fonts": [{"postScriptName": "Example-Regular"}]}]})");
-    catalog.close();
-
-    Ref name = Str("Example-Regular");
-    Ref font = Dict({{NSFontNameAttribute, name.get()}});
-    Ref fonts = Array({font.get()});
-    Ref request = Dict({{kQZUIPropertyFontProperties, fonts.get()}});
-    ShownWindows shown;
-    WhenAlertAppears(nullptr, [](QMessageBox* alert) { Click(alert, "Download"); });
-    EXPECT_EQ(ToHex(Handle(2, request.get()).as<CFDataRef>()),
-              Expected({Hex("00 00 00 10  00 00 00 02"), kResultKey, kNo, kSuppressKey, kNo}));
-    EXPECT_EQ(shown.count, 1);
-    EXPECT_EQ(counts_, (std::vector<qint64>{1, 0}));
-    qunsetenv("XDG_DATA_HOME");
-    qunsetenv("XDG_DATA_DIRS");
 }
 
 /// Sends `request` as message `msgid` from another thread, through the agent's socket.

@@ -52,6 +52,8 @@ const Key kKeys[] = {
     {"QZ_PREPARING_TO_DOWNLOAD", 0},
     {"QZ_PREPARING_TO_DOWNLOAD_FONT", 1},
     {"QZ_DOWNLOADING_FONT", 1},
+    {"QZ_DOWNLOADING_FONTS", 0},
+    {"QZ_DOWNLOAD_WINDOW_TITLE", 0},
     {"%1$@ of %2$@", 2},
     {"Continue Download", 0},
     {"Cancel", 0},

@@ -1,0 +1,487 @@
+// The progress window on the whole message id 2 road, with real parts: requests flattened as a
+// client sends them go through the dispatcher, the confirmation is answered by its button, the
+// fonts (copies of the DejaVu fonts) come from a loopback HTTP server listed in a temporary
+// catalog, and fontconfig is pointed at a private configuration so that they are not installed
+// before the test. A tap on the matching's callbacks records the states and can hold the worker
+// at one state, so that the window is looked at, cancelled or withdrawn mid-transfer at a known
+// point.
+#include <QDir>
+#include <QFile>
+#include <QLabel>
+#include <QProgressBar>
+#include <QPushButton>
+#include <QTemporaryDir>
+#include <condition_variable>
+#include <cstdio>
+#include <mutex>
+#include <openssl/evp.h>
+
+#include "UIAgent/FontDownloadWindowController.h"
+#include "UIAgent/QZFontDownloadConfirmation.h"
+#include "UIAgent/QZLocalizedString.h"
+#include "UIAgent/QZNetworkCheck.h"
+#include "desktop/QZFontMatching.h"
+#include "tests/UIAgent/AlertTestSupport.h"
+#include "tests/UIAgent/DownloadTestSupport.h"
+#include "tests/UIAgent/QtTestEnvironment.h"
+#include "tests/support/LoopbackHTTPServer.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+using namespace glyphwell::testing;
+using Controller = FontDownloadWindowController;
+
+// DejaVuSansMono.ttf has 343140 bytes, DejaVuSansMono-Bold.ttf 334268.
+const QString kDejaVu = QStringLiteral("/usr/share/fonts/truetype/dejavu/");
+
+std::string ReadFile(const QString& path) {
+    QFile file(path);
+    if (!file.open(QIODevice::ReadOnly))
+        return {};
+    const QByteArray bytes = file.readAll();
+    return std::string(bytes.constData(), size_t(bytes.size()));
+}
+
+/// SHA-256 in hexadecimal, computed here with OpenSSL.
+std::string SHA256Of(const std::string& bytes) {
+    unsigned char digest[EVP_MAX_MD_SIZE];
+    unsigned int length = 0;
+    EVP_Digest(bytes.data(), bytes.size(), digest, &length, EVP_sha256(), nullptr);
+    std::string hex;
+    for (unsigned int i = 0; i < length; ++i) {
+        char pair[3];
+        std::snprintf(pair, sizeof pair, "%02x", digest[i]);
+        hex += pair;
+    }
+    return hex;
+}
+
+bool Online(QZNetworkReachabilityFlags* flags) {
+    *flags = kQZNetworkReachabilityFlagsReachable;
+    return true;
+}
+
+bool Offline(QZNetworkReachabilityFlags* flags) {
+    *flags = 0;
+    return true;
+}
+
+/// The matching's callbacks as the tap sees them (worker thread), and a gate that holds the
+/// worker at the first callback of one state until the test lets it go.
+class Callbacks {
+public:
+    Controller::ProgressTap Tap() {
+        return [this](QZFontDescriptorMatchingState state, CFDictionaryRef) {
+            std::unique_lock<std::mutex> lock(mutex_);
+            states_.push_back(state);
+            if (int(state) != holdAt_ || released_)
+                return;
+            holding_ = true;
+            changed_.wait_for(lock, 20s, [this] { return released_; });
+            released_ = true; // held once, also when nobody came
+            holding_ = false;
+        };
+    }
+    /// Holds the worker at the first callback of `state`.
+    void HoldAt(QZFontDescriptorMatchingState state) {
+        std::lock_guard<std::mutex> lock(mutex_);
+        holdAt_ = int(state);
+    }
+    bool Holding() const {
+        std::lock_guard<std::mutex> lock(mutex_);
+        return holding_;
+    }
+    void Release() {
+        {
+            std::lock_guard<std::mutex> lock(mutex_);
+            released_ = true;
+        }
+        changed_.notify_all();
+    }
+    /// The states in order, runs of state 5 folded into one.
+    std::vector<uint32_t> States() const {
+        std::lock_guard<std::mutex> lock(mutex_);
+        std::vector<uint32_t> folded;
+        for (uint32_t state : states_)
+            if (folded.empty() || state != 5 || folded.back() != 5)
+                folded.push_back(state);
+        return folded;
+    }
+
+private:
+    mutable std::mutex mutex_;
+    std::condition_variable changed_;
+    std::vector<uint32_t> states_;
+    int holdAt_ = -1;
+    bool holding_ = false;
+    bool released_ = false;
+};
+
+/// Watches the progress window from the event loop: how often it was shown, the bar after each
+/// change of its value, and the window when it was hidden.
+class WindowWatch : public QObject {
+public:
+    int windowsShown = 0; ///< top-level windows of any kind
+    int progressWindowsShown = 0;
+    std::vector<std::string> bar; ///< "value/maximum" after each value change
+    bool hidden = false;
+    std::string statusWhenHidden;
+    bool timerRunningWhenHidden = false;
+
+protected:
+    bool eventFilter(QObject* watched, QEvent* event) override {
+        if (!watched->isWidgetType() || !static_cast<QWidget*>(watched)->isWindow())
+            return false;
+        auto* window = static_cast<QWidget*>(watched);
+        if (event->type() == QEvent::Show) {
+            ++windowsShown;
+            if (window->objectName() == QLatin1String("FontDownloadWindow")) {
+                ++progressWindowsShown;
+                auto* progress = window->findChild<QProgressBar*>("progressIndicator");
+                connect(progress, &QProgressBar::valueChanged, this, [this, progress](int value) {
+                    bar.push_back(std::to_string(value) + "/" +
+                                  std::to_string(progress->maximum()));
+                });
+            }
+        } else if (event->type() == QEvent::Hide && !hidden &&
+                   window->objectName() == QLatin1String("FontDownloadWindow")) {
+            hidden = true;
+            statusWhenHidden =
+                window->findChild<QLabel*>("mainStatusTextField")->text().toStdString();
+            auto* timer = window->findChild<QTimer*>("refreshTimer");
+            timerRunningWhenHidden = timer && timer->isActive();
+        }
+        return false;
+    }
+};
+
+/// What the progress window shows at one moment.
+struct WindowState {
+    std::string status, sizeLine, bar;
+    bool timerRunning = false;
+    bool staysOnTop = false;
+};
+
+WindowState Look(QDialog* window) {
+    WindowState state;
+    if (!window)
+        return state;
+    state.status = window->findChild<QLabel*>("mainStatusTextField")->text().toStdString();
+    state.sizeLine = window->findChild<QLabel*>("minorStatusTextField")->text().toStdString();
+    auto* progress = window->findChild<QProgressBar*>("progressIndicator");
+    state.bar = std::to_string(progress->value()) + "/" + std::to_string(progress->maximum());
+    auto* timer = window->findChild<QTimer*>("refreshTimer");
+    state.timerRunning = timer && timer->isActive();
+    state.staysOnTop = window->windowFlags().testFlag(Qt::WindowStaysOnTopHint);
+    return state;
+}
+
+void ClickButton(QMessageBox* alert, const char* key) {
+    QAbstractButton* button = ButtonWithText(alert, QZLocalizedString(key));
+    ASSERT_NE(button, nullptr) << key;
+    button->click();
+}
+
+/// A step that answers the download confirmation with Download.
+UiScript::Step AgreeToDownload() {
+    return {[] { return ButtonWithText(AlertOnScreen(), QZLocalizedString("Download")); },
+            [] { ClickButton(AlertOnScreen(), "Download"); }};
+}
+
+class DownloadRoadTest : public ::testing::Test {
+protected:
+    void SetUp() override {
+        ASSERT_TRUE(root_.isValid());
+        ASSERT_TRUE(server_.IsListening());
+        fonts_ = root_.path() + "/data/fonts";
+        QDir().mkpath(fonts_);
+        QDir().mkpath(root_.path() + "/system");
+        QFile config(root_.path() + "/fonts.conf");
+        ASSERT_TRUE(config.open(QIODevice::WriteOnly));
+        config.write(("<?xml version=\"1.0\"?>\n<!DOCTYPE fontconfig SYSTEM \"fonts.dtd\">\n"
+                      "<fontconfig>\n  <dir>" +
+                      fonts_ + "</dir>\n  <cachedir>" + root_.path() +
+                      "/cache/fontconfig</cachedir>\n</fontconfig>\n")
+                         .toUtf8());
+        config.close();
+        qputenv("XDG_DATA_HOME", (root_.path() + "/data").toUtf8());
+        qputenv("XDG_DATA_DIRS", (root_.path() + "/system").toUtf8());
+        qputenv("XDG_CACHE_HOME", (root_.path() + "/cache").toUtf8());
+        qputenv("FONTCONFIG_FILE", (root_.path() + "/fonts.conf").toUtf8());
+        ASSERT_TRUE(QZReloadFontConfiguration());
+        ASSERT_FALSE(QZIsFontInstalled("DejaVuSansMono"));
+
+        QZNetworkCheck::SetFlagsSourceForTesting(&Online);
+        QZFontDownloadConfirmation::SetPreferredLanguageForTesting("en-US");
+        Controller::SetProgressTapForTesting(callbacks_.Tap());
+        QCoreApplication::instance()->installEventFilter(&watch_);
+    }
+    void TearDown() override {
+        QCoreApplication::instance()->removeEventFilter(&watch_);
+        // A matching whose window has gone ends at its next callback; wait for its thread.
+        callbacks_.Release();
+        EXPECT_TRUE(SpinUntil([] { return Controller::MatchingRunsInProgress() == 0; }));
+        Controller::SetProgressTapForTesting({});
+        QZNetworkCheck::SetFlagsSourceForTesting(nullptr);
+        QZFontDownloadConfirmation::SetPreferredLanguageForTesting(QString());
+        for (const char* name :
+             {"XDG_DATA_HOME", "XDG_DATA_DIRS", "XDG_CACHE_HOME", "FONTCONFIG_FILE"})
+            qunsetenv(name);
+        QZReloadFontConfiguration();
+    }
+
+    /// Serves the DejaVu file `file` at "/<file>" with `resource`'s delivery settings and
+    /// returns its catalog entry holding `postScriptName`; `sha256` replaces the file's own.
+    std::string ServeFont(const QString& file, const std::string& localID,
+                          const std::string& postScriptName,
+                          LoopbackHTTPServer::Resource resource = {}, std::string sha256 = {}) {
+        resource.body = ReadFile(kDejaVu + file);
+        EXPECT_FALSE(resource.body.empty()) << file.toStdString();
+        if (sha256.empty())
+            sha256 = SHA256Of(resource.body);
+        const std::string path = "/" + file.toStdString();
+        server_.Serve(path, resource);
+        return "{\"LocalID\": \"" + localID + "\", \"url\": \"" + server_.URL(path) +
+               "\", \"size\": " + std::to_string(resource.body.size()) + ", \"sha256\": \"" +
+               sha256 + "\", \"fonts\": [{\"postScriptName\": \"" + postScriptName + "\"}]}";
+    }
+    void WriteCatalog(const std::vector<std::string>& assets) {
+        std::string text = "{\"assets\": [";
+        for (size_t i = 0; i < assets.size(); ++i)
+            text += (i ? ", " : "") + assets[i];
+        text += "]}";
+        QDir().mkpath(root_.path() + "/data/glyphwell");
+        WriteFile(root_.path() + "/data/glyphwell/downloadable-fonts.json",
+                  QByteArray(text.data(), qsizetype(text.size())));
+    }
+    /// Every entry of the download folder, hidden ones included.
+    QStringList DownloadFolder() const {
+        return QDir(fonts_ + "/glyphwell")
+            .entryList(QDir::Files | QDir::Hidden | QDir::NoDotAndDotDot, QDir::Name);
+    }
+    /// Waits until the matching's thread is done.
+    static bool WaitForTheMatchingToEnd() {
+        return SpinUntil([] { return Controller::MatchingRunsInProgress() == 0; });
+    }
+
+    EnglishTexts english_;
+    QTemporaryDir root_;
+    QString fonts_;
+    LoopbackHTTPServer server_;
+    Callbacks callbacks_;
+    WindowWatch watch_;
+};
+
+TEST_F(DownloadRoadTest, AnAgreedDownloadIsInstalledMatchedAndAnsweredYes) {
+    WriteCatalog({ServeFont("DejaVuSansMono.ttf", "org.test.Mono", "DejaVuSansMono")});
+    Ref mono = RequestedFont("DejaVuSansMono", "DejaVu Sans Mono");
+    callbacks_.HoldAt(kCTFontDescriptorMatchingDownloading);
+    WindowState whileDownloading;
+    UiScript script({AgreeToDownload(),
+                     {[this] { return callbacks_.Holding(); },
+                      [&] {
+                          whileDownloading = Look(ProgressWindowOnScreen());
+                          callbacks_.Release();
+                      }}},
+                    EndEveryModalRun);
+
+    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({mono.get()}).get()),
+              DownloadReply(true, false));
+
+    EXPECT_TRUE(script.done());
+    EXPECT_EQ(callbacks_.States(), (std::vector<uint32_t>{0, 2, 4, 5, 6, 7, 1}));
+    // Once the total is known: the bar in bytes and the first size line at once.
+    EXPECT_EQ(whileDownloading.status, "Downloading “DejaVu Sans Mono”…");
+    EXPECT_EQ(whileDownloading.sizeLine, "0 bytes of 343 kB");
+    EXPECT_EQ(whileDownloading.bar, "0/343140");
+    EXPECT_TRUE(whileDownloading.timerRunning);
+    EXPECT_TRUE(whileDownloading.staysOnTop);
+    // The bar then follows the bytes up to the whole file.
+    ASSERT_FALSE(watch_.bar.empty());
+    EXPECT_EQ(watch_.bar.back(), "343140/343140");
+    for (const std::string& value : watch_.bar)
+        EXPECT_TRUE(value.size() > 7 && value.compare(value.size() - 7, 7, "/343140") == 0)
+            << value;
+    EXPECT_TRUE(watch_.hidden);
+    EXPECT_FALSE(watch_.timerRunningWhenHidden);
+    EXPECT_EQ(watch_.progressWindowsShown, 1);
+
+    EXPECT_EQ(DownloadFolder(), QStringList{"org.test.Mono.ttf"});
+    EXPECT_TRUE(ReadFile(fonts_ + "/glyphwell/org.test.Mono.ttf") ==
+                ReadFile(kDejaVu + "DejaVuSansMono.ttf"));
+    EXPECT_TRUE(QZIsFontInstalled("DejaVuSansMono"));
+}
+
+TEST_F(DownloadRoadTest, AnInstalledFontIsMatchedWithoutDownloading) {
+    ASSERT_TRUE(QFile::copy(kDejaVu + "DejaVuSansMono.ttf", fonts_ + "/DejaVuSansMono.ttf"));
+    ASSERT_TRUE(QZReloadFontConfiguration());
+    WriteCatalog({ServeFont("DejaVuSansMono.ttf", "org.test.Mono", "DejaVuSansMono")});
+    Ref mono = RequestedFont("DejaVuSansMono");
+
+    // Nothing to download means nothing to confirm: only a request that says not to ask gets
+    // this far.
+    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({mono.get()}, 0, true).get()),
+              DownloadReply(true, true));
+    EXPECT_EQ(callbacks_.States(), (std::vector<uint32_t>{0, 2, 7, 1}));
+    EXPECT_EQ(server_.RequestCount("/DejaVuSansMono.ttf"), 0);
+    EXPECT_TRUE(DownloadFolder().isEmpty());
+}
+
+TEST_F(DownloadRoadTest, CancelDuringTheTransferStopsTheTimerLeavesNoFileAndAnswersNo) {
+    WriteCatalog({ServeFont("DejaVuSansMono.ttf", "org.test.Mono", "DejaVuSansMono")});
+    Ref mono = RequestedFont("DejaVuSansMono", "DejaVu Sans Mono");
+    callbacks_.HoldAt(kCTFontDescriptorMatchingDownloading);
+    bool timerRunningAfterCancel = true;
+    UiScript script({AgreeToDownload(),
+                     {[this] { return callbacks_.Holding(); },
+                      [&] {
+                          QDialog* window = ProgressWindowOnScreen();
+                          ASSERT_NE(window, nullptr);
+                          window->findChild<QPushButton*>("cancelButton")->click();
+                          timerRunningAfterCancel = Look(window).timerRunning;
+                          callbacks_.Release();
+                      }}},
+                    EndEveryModalRun);
+
+    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({mono.get()}).get()),
+              DownloadReply(false, false));
+
+    EXPECT_TRUE(script.done());
+    EXPECT_FALSE(timerRunningAfterCancel);
+    EXPECT_FALSE(watch_.timerRunningWhenHidden);
+    ASSERT_TRUE(WaitForTheMatchingToEnd());
+    // The callback held at the first bytes answered stop: nothing came after it.
+    EXPECT_EQ(callbacks_.States(), (std::vector<uint32_t>{0, 2, 4, 5}));
+    EXPECT_EQ(server_.RequestCount("/DejaVuSansMono.ttf"), 1);
+    EXPECT_TRUE(DownloadFolder().isEmpty()) << DownloadFolder().join(", ").toStdString();
+    EXPECT_FALSE(QZIsFontInstalled("DejaVuSansMono"));
+}
+
+TEST_F(DownloadRoadTest, AFailureAnsweredContinueDownloadGoesOnToTheNextFont) {
+    WriteCatalog({ServeFont("DejaVuSansMono-Bold.ttf", "org.test.MonoBold", "DejaVuSansMono-Bold",
+                            {}, std::string(64, '0')),
+                  ServeFont("DejaVuSansMono.ttf", "org.test.Mono", "DejaVuSansMono")});
+    Ref bold = RequestedFont("DejaVuSansMono-Bold");
+    Ref mono = RequestedFont("DejaVuSansMono");
+    std::string informative, defaultButton, escapeButton;
+    UiScript script(
+        {{[] { return AlertWithText("The font “DejaVuSansMono-Bold” cannot be downloaded."); },
+          [&] {
+              QMessageBox* alert = AlertOnScreen();
+              informative = alert->informativeText().toStdString();
+              defaultButton = alert->defaultButton()->text().toStdString();
+              escapeButton = alert->escapeButton()->text().toStdString();
+              ClickButton(alert, "Continue Download");
+          }}},
+        EndEveryModalRun);
+
+    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({bold.get(), mono.get()}, 0, true).get()),
+              DownloadReply(true, true));
+
+    EXPECT_TRUE(script.done());
+    EXPECT_EQ(informative,
+              "The downloaded file is damaged: its SHA-256 checksum is not the expected one.");
+    EXPECT_EQ(defaultButton, "Continue Download");
+    EXPECT_EQ(escapeButton, "Cancel");
+    EXPECT_EQ(callbacks_.States(), (std::vector<uint32_t>{0, 2, 4, 5, 8, 2, 4, 5, 6, 7, 1}));
+    EXPECT_EQ(DownloadFolder(), QStringList{"org.test.Mono.ttf"});
+    EXPECT_FALSE(QZIsFontInstalled("DejaVuSansMono-Bold"));
+}
+
+TEST_F(DownloadRoadTest, AFailureAnsweredCancelEndsTheDownloadWithNo) {
+    LoopbackHTTPServer::Resource dropped;
+    dropped.dropAfter = 100000;
+    WriteCatalog(
+        {ServeFont("DejaVuSansMono-Bold.ttf", "org.test.MonoBold", "DejaVuSansMono-Bold", dropped),
+         ServeFont("DejaVuSansMono.ttf", "org.test.Mono", "DejaVuSansMono")});
+    Ref bold = RequestedFont("DejaVuSansMono-Bold");
+    Ref mono = RequestedFont("DejaVuSansMono");
+    std::string informative;
+    UiScript script(
+        {{[] { return AlertWithText("The font “DejaVuSansMono-Bold” cannot be downloaded."); },
+          [&] {
+              informative = AlertOnScreen()->informativeText().toStdString();
+              ClickButton(AlertOnScreen(), "Cancel");
+          }}},
+        EndEveryModalRun);
+
+    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({bold.get(), mono.get()}, 0, true).get()),
+              DownloadReply(false, true));
+
+    EXPECT_TRUE(script.done());
+    EXPECT_EQ(informative, "The connection ended after 100000 of 334268 bytes.");
+    ASSERT_TRUE(WaitForTheMatchingToEnd());
+    EXPECT_EQ(callbacks_.States(), (std::vector<uint32_t>{0, 2, 4, 5, 8}));
+    EXPECT_EQ(server_.RequestCount("/DejaVuSansMono.ttf"), 0);
+    EXPECT_TRUE(DownloadFolder().isEmpty()) << DownloadFolder().join(", ").toStdString();
+    EXPECT_FALSE(watch_.timerRunningWhenHidden);
+}
+
+TEST_F(DownloadRoadTest, RegressionTheRequestingProcessExitEndsTheWindowsOwnRunNotTheInnermost) {
+    WriteCatalog({ServeFont("DejaVuSansMono.ttf", "org.test.Mono", "DejaVuSansMono")});
+    Ref mono = RequestedFont("DejaVuSansMono", "DejaVu Sans Mono");
+    PausedChild requester;
+    callbacks_.HoldAt(kCTFontDescriptorMatchingDownloading);
+
+    // Another question comes up above the progress window while the download runs.
+    QPointer<QMessageBox> other;
+    QZModalSession* otherSession = nullptr;
+    bool otherUpWhenWindowWent = false;
+    UiScript script({AgreeToDownload(),
+                     {[this] { return callbacks_.Holding() && ProgressWindowOnScreen(); },
+                      [&] {
+                          QTimer::singleShot(0, [&] {
+                              QMessageBox box;
+                              box.setText(QStringLiteral("Another question"));
+                              QZModalSession session(&box);
+                              other = &box;
+                              otherSession = &session;
+                              session.Run();
+                              otherSession = nullptr;
+                          });
+                      }},
+                     {[&] { return other && other->isVisible(); }, [&] { requester.Kill(); }},
+                     {[&] { return !ProgressWindowOnScreen(); },
+                      [&] {
+                          otherUpWhenWindowWent = other && other->isVisible();
+                          otherSession->End(kQZModalResponseStop);
+                          callbacks_.Release();
+                      }}},
+                    EndEveryModalRun);
+
+    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({mono.get()}, requester.pid()).get()),
+              DownloadReply(false, false));
+
+    EXPECT_TRUE(script.done());
+    EXPECT_TRUE(otherUpWhenWindowWent);
+    EXPECT_FALSE(watch_.timerRunningWhenHidden);
+    ASSERT_TRUE(WaitForTheMatchingToEnd());
+    EXPECT_EQ(callbacks_.States(), (std::vector<uint32_t>{0, 2, 4, 5}));
+    EXPECT_TRUE(DownloadFolder().isEmpty()) << DownloadFolder().join(", ").toStdString();
+}
+
+TEST_F(DownloadRoadTest, RegressionARequestWithoutFontNamesOpensNoWindowAndAsksNothing) {
+    // Offline: a network question would show an alert.
+    QZNetworkCheck::SetFlagsSourceForTesting(&Offline);
+    Ref nameless = Dict({{NSFontFamilyAttribute, Str("DejaVu Sans Mono").get()}});
+    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({nameless.get()}, 0, true).get()),
+              DownloadReply(false, true));
+    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({}, 0, true).get()),
+              DownloadReply(false, true));
+    EXPECT_EQ(watch_.windowsShown, 0);
+    EXPECT_TRUE(callbacks_.States().empty());
+}
+
+TEST(DownloadWindow, ByteCountsUseDecimalUnitsWithPrecisionGrowingWithTheUnit) {
+    EnglishTexts english;
+    EXPECT_EQ(Controller::FormattedByteCount(0).toStdString(), "0 bytes");
+    EXPECT_EQ(Controller::FormattedByteCount(999).toStdString(), "999 bytes");
+    EXPECT_EQ(Controller::FormattedByteCount(343140).toStdString(), "343 kB");
+    EXPECT_EQ(Controller::FormattedByteCount(1500000).toStdString(), "1.5 MB");
+    EXPECT_EQ(Controller::FormattedByteCount(50000000).toStdString(), "50.0 MB");
+    EXPECT_EQ(Controller::FormattedByteCount(2250000000).toStdString(), "2.25 GB");
+    EXPECT_EQ(Controller::FormattedByteCount(-5).toStdString(), "0 bytes");
+}
+
+} // namespace
