@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <cstring>
+#include <vector>
 
 #include "bitmap/QZBitmapRepresentation.h"
 #include "cfutil/TCFError.h"
@@ -14,29 +15,59 @@
 
 namespace {
 
-using ElementTable = TStackBuffer<void const*, 30>;
+/// The element references of one container being read: 30 inline, on the heap beyond. The
+/// table grows by doubling with the elements actually read, so its size follows them rather than
+/// the count the stream claims. The inline storage is not cleared (clearing it cost more than
+/// reading a small dictionary's pairs): every element is stored before it is read.
+class ElementTable {
+public:
+    ElementTable() = default;
+    ElementTable(const ElementTable&) = delete;
+    ElementTable& operator=(const ElementTable&) = delete;
 
-/// Makes room for element `index` of a container of `count` elements, doubling the table so
-/// that its size follows the elements actually read rather than the count the stream claims.
-void ReserveElement(ElementTable& table, unsigned long index, long count) {
-    if (index < table.GetCount())
-        return;
-    const unsigned long doubled = std::max<unsigned long>(2 * table.GetCount(), 30);
-    table.SetCount(std::min<unsigned long>(doubled, static_cast<unsigned long>(count)));
+    /// Makes room for element `index` of a container of `count` elements (`index` < `count`).
+    void Reserve(unsigned long index, long count) {
+        if (index >= capacity_)
+            Grow(count);
+    }
+    void const*& operator[](unsigned long index) { return elements_[index]; }
+    void const** Data() { return elements_; }
+
+private:
+    void Grow(long count);
+
+    static constexpr unsigned long kInlineCount = 30;
+    void const* inline_[kInlineCount];
+    std::vector<void const*> heap_;
+    void const** elements_ = inline_;
+    unsigned long capacity_ = kInlineCount;
+};
+
+/// Doubles the table, up to `count` elements. Only the elements below the old capacity, all
+/// stored already, are moved.
+void ElementTable::Grow(long count) {
+    const unsigned long grown =
+        std::min<unsigned long>(2 * capacity_, static_cast<unsigned long>(count));
+    if (heap_.empty())
+        heap_.assign(inline_, inline_ + capacity_);
+    heap_.resize(grown);
+    elements_ = heap_.data();
+    capacity_ = grown;
 }
 
 void ReleaseElements(ElementTable& table, long count) {
     for (long i = count - 1; i >= 0; --i)
-        TCFSafeRelease(table[i]);
+        TCFSafeRelease(table[static_cast<unsigned long>(i)]);
 }
 
 /// Reads the `count` elements of an array or set into `table`. One missing element loses them
 /// all: false, with the elements read so far released.
 bool ResurrectElements(TCFResurrectContext& context, long count, ElementTable& table) {
     for (long i = 0; i < count; ++i) {
-        ReserveElement(table, static_cast<unsigned long>(i), count);
-        table[i] = context.Resurrect(kTCFTypeAny);
-        if (!table[i]) {
+        table.Reserve(static_cast<unsigned long>(i), count);
+        void const*& element = table[static_cast<unsigned long>(i)];
+        element = context.Resurrect(kTCFTypeAny);
+        if (!element) {
             ReleaseElements(table, i);
             return false;
         }
@@ -327,45 +358,48 @@ long TCFResurrectContext::ContainerCount(const char* label) {
 
 __CFArray const* TCFResurrectContext::ResurrectCFArray() {
     const long count = ContainerCount("cfarray");
-    ElementTable table(0);
+    ElementTable table;
     if (!ResurrectElements(*this, count, table))
         return nullptr;
     CFArrayRef array =
-        CFArrayCreate(kCFAllocatorDefault, table.GetBuffer(), count, &kCFTypeArrayCallBacks);
+        CFArrayCreate(kCFAllocatorDefault, table.Data(), count, &kCFTypeArrayCallBacks);
     ReleaseElements(table, count);
     return array;
 }
 
 __CFSet const* TCFResurrectContext::ResurrectCFSet() {
     const long count = ContainerCount("cfarray");
-    ElementTable table(0);
+    ElementTable table;
     if (!ResurrectElements(*this, count, table))
         return nullptr;
-    CFSetRef set = CFSetCreate(kCFAllocatorDefault, table.GetBuffer(), count, &kCFTypeSetCallBacks);
+    CFSetRef set = CFSetCreate(kCFAllocatorDefault, table.Data(), count, &kCFTypeSetCallBacks);
     ReleaseElements(table, count);
     return set;
 }
 
 __CFDictionary const* TCFResurrectContext::ResurrectCFDictionary() {
     long count = ContainerCount("cfdict");
-    ElementTable keys(0), values(0);
+    ElementTable keys, values;
     for (long i = 0; i < count; ++i) {
-        ReserveElement(keys, static_cast<unsigned long>(i), count);
-        ReserveElement(values, static_cast<unsigned long>(i), count);
-        keys[i] = Resurrect(kTCFTypeAny);
-        values[i] = Resurrect(kTCFTypeAny);
-        if (!keys[i] || !values[i]) {
+        const unsigned long index = static_cast<unsigned long>(i);
+        keys.Reserve(index, count);
+        values.Reserve(index, count);
+        void const*& key = keys[index];
+        void const*& value = values[index];
+        key = Resurrect(kTCFTypeAny);
+        value = Resurrect(kTCFTypeAny);
+        if (!key || !value) {
             CFLog(
                 kCFLogLevelError,
                 "*** ResurrectCFDictionary missing either a key or a value, truncating dictionary");
-            TCFSafeRelease(keys[i]);
-            TCFSafeRelease(values[i]);
+            TCFSafeRelease(key);
+            TCFSafeRelease(value);
             count = i;
             break;
         }
     }
     CFDictionaryRef dictionary =
-        CFDictionaryCreate(kCFAllocatorDefault, keys.GetBuffer(), values.GetBuffer(), count,
+        CFDictionaryCreate(kCFAllocatorDefault, keys.Data(), values.Data(), count,
                            &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks);
     ReleaseElements(keys, count);
     ReleaseElements(values, count);

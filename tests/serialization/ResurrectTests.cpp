@@ -261,6 +261,31 @@ TEST(ResurrectContainers, DictionaryIsTruncatedAtTheFirstMissingPair) {
               (Lines{Corrupt("cftype"), "*** don't how to resurrect type 99999", kTruncating}));
 }
 
+TEST(ResurrectContainers, DictionaryBeyondThirtyPairsKeepsEveryPairBeforeTheCut) {
+    // 40 pairs of 20 bytes each ("kNN" and a boolean), cut after the 35th: the element tables
+    // have grown past their 30 inline entries by then.
+    std::vector<Ref> keys;
+    std::vector<const void*> keyRefs, valueRefs;
+    for (int i = 0; i < 40; ++i) {
+        keys.push_back(Str((i < 10 ? "k0" : "k") + std::to_string(i)));
+        keyRefs.push_back(keys.back().get());
+        valueRefs.push_back(i % 2 ? kCFBooleanTrue : kCFBooleanFalse);
+    }
+    Ref whole(CFDictionaryCreate(nullptr, keyRefs.data(), valueRefs.data(), 40,
+                                 &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks));
+    auto bytes = Flatten(whole.get());
+    ASSERT_EQ(bytes.size(), 8u + 40 * 20);
+    EXPECT_TRUE(CFEqual(Dictionary(bytes).value.get(), whole.get()));
+
+    bytes.resize(8 + 35 * 20);
+    const Read cut = Dictionary(bytes);
+    ASSERT_TRUE(cut.value);
+    EXPECT_EQ(CFDictionaryGetCount(cut.value.as<CFDictionaryRef>()), 35);
+    EXPECT_EQ(CFDictionaryGetValue(cut.value.as<CFDictionaryRef>(), keyRefs[34]), kCFBooleanFalse);
+    EXPECT_EQ(cut.log,
+              (Lines{Corrupt("cftype"), "*** don't how to resurrect type 99999", kTruncating}));
+}
+
 TEST(ResurrectContainers, UnsupportedValueTruncatesADictionaryAndLeavesTheRestUnread) {
     Read read = Dictionary(Hex("00 00 00 10 00 00 00 02 00 00 00 07 00 00 00 01 61 00 00 00 63 "
                                "00 00 00 07 00 00 00 01 62 00 00 01 03 00 00 00 01 01"));
