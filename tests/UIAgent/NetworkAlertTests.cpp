@@ -1,0 +1,195 @@
+// The network check before a download: which reachability flags let the download go on without
+// a word, the offline alert's texts and buttons, its answers, and what the dispatcher makes of
+// them. The flags are injected; reading them from the routing table is tested with the desktop
+// services.
+#include <QDir>
+#include <QPushButton>
+#include <QTemporaryDir>
+
+#include "UIAgent/FontDownloadWindowController.h"
+#include "UIAgent/QZFontDownloadConfirmation.h"
+#include "UIAgent/QZLocalizedString.h"
+#include "UIAgent/QZNetworkCheck.h"
+#include "tests/UIAgent/AlertTestSupport.h"
+#include "tests/UIAgent/DownloadTestSupport.h"
+#include "tests/UIAgent/QtTestEnvironment.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+using namespace glyphwell::testing;
+
+const QString kOfflineHeadline = QStringLiteral("Network is not connected.");
+
+QZNetworkReachabilityFlags gFlags = 0;
+bool gFlagsReadable = true;
+
+bool InjectedFlags(QZNetworkReachabilityFlags* flags) {
+    *flags = gFlagsReadable ? gFlags : 0;
+    return gFlagsReadable;
+}
+
+/// Counts the windows shown while it lives, and the progress windows among them.
+class ShownWindows : public QObject {
+public:
+    ShownWindows() { QCoreApplication::instance()->installEventFilter(this); }
+    ~ShownWindows() override { QCoreApplication::instance()->removeEventFilter(this); }
+    int count = 0;
+    int progressWindows = 0;
+
+protected:
+    bool eventFilter(QObject* watched, QEvent* event) override {
+        if (event->type() == QEvent::Show && watched->isWidgetType() &&
+            static_cast<QWidget*>(watched)->isWindow()) {
+            ++count;
+            if (watched->objectName() == QLatin1String("FontDownloadWindow"))
+                ++progressWindows;
+        }
+        return false;
+    }
+};
+
+/// A step that presses the offline alert's button `key`.
+UiScript::Step AnswerOfflineAlert(const char* key) {
+    return {[] { return AlertWithText(kOfflineHeadline); },
+            [key] {
+                QAbstractButton* button = ButtonWithText(AlertOnScreen(), QZLocalizedString(key));
+                ASSERT_NE(button, nullptr) << key;
+                button->click();
+            }};
+}
+
+class NetworkCheckTest : public ::testing::Test {
+protected:
+    void SetUp() override {
+        gFlags = 0;
+        gFlagsReadable = true;
+        QZNetworkCheck::SetFlagsSourceForTesting(&InjectedFlags);
+    }
+    void TearDown() override {
+        EXPECT_TRUE(
+            SpinUntil([] { return FontDownloadWindowController::MatchingRunsInProgress() == 0; }));
+        QZNetworkCheck::SetFlagsSourceForTesting(nullptr);
+    }
+
+    EnglishTexts english_;
+};
+
+TEST_F(NetworkCheckTest, OnlyReachableWithoutConnectionRequiredGoesOnWithoutAnAlert) {
+    struct Case {
+        QZNetworkReachabilityFlags flags;
+        bool readable;
+        bool alert;
+    };
+    const Case cases[] = {
+        {kQZNetworkReachabilityFlagsReachable, true, false},
+        {kQZNetworkReachabilityFlagsReachable | 0xFFF0'0001u, true, false}, // other bits ignored
+        {kQZNetworkReachabilityFlagsReachable | kQZNetworkReachabilityFlagsConnectionRequired, true,
+         true},
+        {kQZNetworkReachabilityFlagsConnectionRequired, true, true},
+        {0, true, true},
+        {kQZNetworkReachabilityFlagsReachable, false, true}, // flags that cannot be read
+    };
+    for (const Case& c : cases) {
+        gFlags = c.flags;
+        gFlagsReadable = c.readable;
+        ShownWindows shown;
+        UiScript script({AnswerOfflineAlert("Continue Download")}, EndEveryModalRun, 10s);
+        EXPECT_TRUE(QZNetworkCheck().continueDownload());
+        EXPECT_EQ(shown.count, c.alert ? 1 : 0)
+            << "flags " << c.flags << " readable " << c.readable;
+    }
+}
+
+TEST_F(NetworkCheckTest, TheOfflineAlertIsCriticalAndItsDefaultCancelStopsTheDownload) {
+    QString informative, defaultButton, escapeButton;
+    QMessageBox::Icon icon = QMessageBox::NoIcon;
+    QZNetworkCheck check;
+    UiScript script({{[] { return AlertWithText(kOfflineHeadline); },
+                      [&] {
+                          QMessageBox* alert = check.alert();
+                          ASSERT_EQ(alert, AlertOnScreen());
+                          informative = alert->informativeText();
+                          icon = alert->icon();
+                          defaultButton = alert->defaultButton()->text();
+                          escapeButton = alert->escapeButton()->text();
+                          alert->defaultButton()->click();
+                      }}},
+                    EndEveryModalRun);
+    EXPECT_FALSE(check.continueDownload());
+    EXPECT_TRUE(script.done());
+    EXPECT_EQ(informative,
+              "You are not connected to the Internet. Do you want to cancel downloading?");
+    EXPECT_EQ(icon, QMessageBox::Critical);
+    EXPECT_EQ(defaultButton, "Cancel");
+    EXPECT_EQ(escapeButton, "Cancel");
+    // The class operation of the download window asks the same question.
+    UiScript again({AnswerOfflineAlert("Cancel")}, EndEveryModalRun);
+    EXPECT_FALSE(FontDownloadWindowController::continueDownloadWithNetworkReachabilityCheck());
+}
+
+TEST_F(NetworkCheckTest, ContinueDownloadAndAWithdrawnAlertGoOn) {
+    UiScript proceed({AnswerOfflineAlert("Continue Download")}, EndEveryModalRun);
+    EXPECT_TRUE(QZNetworkCheck().continueDownload());
+    EXPECT_TRUE(proceed.done());
+
+    QZNetworkCheck check;
+    UiScript withdraw({{[] { return AlertWithText(kOfflineHeadline); }, [&] { check.withdraw(); }}},
+                      EndEveryModalRun);
+    EXPECT_TRUE(check.continueDownload());
+    EXPECT_TRUE(withdraw.done());
+    EXPECT_FALSE(check.alert()->isVisible());
+}
+
+TEST_F(NetworkCheckTest, OfflineCancelAnswersNoWithoutAProgressWindow) {
+    ShownWindows shown;
+    // DejaVu Sans is installed: a download that went on would match it.
+    Ref font = RequestedFont("DejaVuSans");
+    UiScript script({AnswerOfflineAlert("Cancel")}, EndEveryModalRun);
+    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({font.get()}, 0, true).get()),
+              DownloadReply(false, true));
+    EXPECT_TRUE(script.done());
+    EXPECT_EQ(shown.count, 1);
+    EXPECT_EQ(shown.progressWindows, 0);
+}
+
+TEST_F(NetworkCheckTest, OfflineContinueRunsTheDownloadWindow) {
+    ShownWindows shown;
+    Ref font = RequestedFont("DejaVuSans");
+    UiScript script({AnswerOfflineAlert("Continue Download")}, EndEveryModalRun);
+    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({font.get()}, 0, true).get()),
+              DownloadReply(true, true));
+    EXPECT_TRUE(script.done());
+    EXPECT_EQ(shown.progressWindows, 1);
+}
+
+TEST_F(NetworkCheckTest, TheRequestingApplicationQuittingEndsTheOfflineAlertAndNoWindowOpens) {
+    // A font that can be downloaded, so that the confirmation asks.
+    QTemporaryDir data;
+    ASSERT_TRUE(data.isValid());
+    qputenv("XDG_DATA_HOME", data.path().toUtf8());
+    qputenv("XDG_DATA_DIRS", data.filePath("none").toUtf8());
+    QDir().mkpath(data.filePath("glyphwell"));
+    WriteFile(data.filePath("glyphwell/downloadable-fonts.json"),
+              R"({"assets": [{"LocalID": "A", "url": "https://fonts.example/A", "size": 5000,
+                  "sha256": "0000000000000000000000000000000000000000000000000000000000000000",
+                  "fonts": [{"postScriptName": "Example-Regular"}]}]})");
+    PausedChild requester;
+    ShownWindows shown;
+    Ref font = RequestedFont("Example-Regular");
+    UiScript script(
+        {{[] { return ButtonWithText(AlertOnScreen(), QZLocalizedString("Download")); },
+          [] { ButtonWithText(AlertOnScreen(), QZLocalizedString("Download"))->click(); }},
+         {[] { return AlertWithText(kOfflineHeadline); }, [&] { requester.Kill(); }}},
+        EndEveryModalRun);
+
+    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({font.get()}, requester.pid()).get()),
+              DownloadReply(false, false));
+
+    EXPECT_TRUE(script.done());
+    EXPECT_EQ(shown.progressWindows, 0);
+    qunsetenv("XDG_DATA_HOME");
+    qunsetenv("XDG_DATA_DIRS");
+}
+
+} // namespace
