@@ -1,7 +1,10 @@
 #include "platform/CFCollectionStorage.h"
 
 #include <algorithm>
+#include <cstdint>
 #include <cstdlib>
+#include <cstring>
+#include <new>
 
 #include "platform/Log.h"
 
@@ -94,6 +97,40 @@ void ElementReleaser::ReleaseCounted(CFReleaseCallBack release, const void* valu
 }
 
 // ---------------------------------------------------------------------------------------------
+// EntryVector
+
+EntryVector::EntryVector(EntryVector&& other) noexcept : size_(other.size_) {
+    if (other.data_ == other.inline_) {
+        std::copy_n(other.inline_, other.size_, inline_);
+    } else {
+        data_ = other.data_;
+        capacity_ = other.capacity_;
+        other.data_ = other.inline_;
+        other.capacity_ = kInlineCount;
+    }
+    other.size_ = 0;
+}
+
+EntryVector::~EntryVector() {
+    if (data_ != inline_)
+        std::free(data_);
+}
+
+void EntryVector::Grow(size_t count) {
+    const size_t capacity = std::max(count, 2 * capacity_);
+    if (capacity > SIZE_MAX / sizeof(HashedEntry))
+        throw std::bad_alloc();
+    void* block = data_ == inline_ ? std::malloc(capacity * sizeof(HashedEntry))
+                                   : std::realloc(data_, capacity * sizeof(HashedEntry));
+    if (!block)
+        throw std::bad_alloc();
+    if (data_ == inline_)
+        std::memcpy(block, inline_, size_ * sizeof(HashedEntry));
+    data_ = static_cast<HashedEntry*>(block);
+    capacity_ = capacity;
+}
+
+// ---------------------------------------------------------------------------------------------
 // HashedTable
 
 const void* HashedTable::RemovedKey() noexcept {
@@ -166,10 +203,9 @@ HashedEntry HashedTable::Remove(CFIndex position) {
     return removed;
 }
 
-std::vector<HashedEntry> HashedTable::TakeAll() noexcept {
-    std::vector<HashedEntry> taken;
-    taken.swap(entries_);
-    std::erase_if(taken, [](const HashedEntry& entry) { return entry.key == RemovedKey(); });
+EntryVector HashedTable::TakeAll() noexcept {
+    EntryVector taken(std::move(entries_));
+    taken.erase_if([](const HashedEntry& entry) { return entry.key == RemovedKey(); });
     slots_.clear();
     slotShift_ = 64;
     liveCount_ = 0;
@@ -188,7 +224,7 @@ void HashedTable::Reserve(CFIndex count) {
 
 void HashedTable::Rebuild(size_t count) {
     if (removedCount_ > 0) {
-        std::erase_if(entries_, [](const HashedEntry& entry) { return entry.key == RemovedKey(); });
+        entries_.erase_if([](const HashedEntry& entry) { return entry.key == RemovedKey(); });
         removedCount_ = 0;
     }
     count = std::max(count, entries_.size());

@@ -98,6 +98,54 @@ struct HashedEntry {
     CFHashCode hash; ///< the key's hash, kept so that growing never calls the callback again
 };
 
+/// The entries of a hashed table, in order: up to kInlineCount inside the object itself (the
+/// dictionaries of a request have three or four pairs, which then need no allocation of their
+/// own), on the heap beyond. Like a std::vector of trivially copyable entries otherwise.
+class EntryVector {
+public:
+    static constexpr size_t kInlineCount = 4;
+
+    EntryVector() noexcept = default;
+    EntryVector(EntryVector&& other) noexcept;
+    EntryVector& operator=(EntryVector&&) = delete;
+    EntryVector(const EntryVector&) = delete;
+    ~EntryVector();
+
+    size_t size() const noexcept { return size_; }
+    HashedEntry& operator[](size_t index) noexcept { return data_[index]; }
+    const HashedEntry& operator[](size_t index) const noexcept { return data_[index]; }
+    const HashedEntry* begin() const noexcept { return data_; }
+    const HashedEntry* end() const noexcept { return data_ + size_; }
+
+    void push_back(const HashedEntry& entry) {
+        if (size_ == capacity_)
+            Grow(size_ + 1);
+        data_[size_++] = entry;
+    }
+    /// Makes room for `count` entries.
+    void reserve(size_t count) {
+        if (count > capacity_)
+            Grow(count);
+    }
+    /// Removes the entries for which `test` is true, keeping the order of the others.
+    template <class Test> void erase_if(Test&& test) {
+        size_t kept = 0;
+        for (size_t i = 0; i < size_; ++i)
+            if (!test(data_[i]))
+                data_[kept++] = data_[i];
+        size_ = kept;
+    }
+
+private:
+    /// Moves the entries to a heap block of at least `count` (and twice the old capacity).
+    void Grow(size_t count);
+
+    HashedEntry* data_ = inline_;
+    size_t size_ = 0;
+    size_t capacity_ = kInlineCount;
+    HashedEntry inline_[kInlineCount];
+};
+
 class HashedTable {
 public:
     /// Keys are hashed with `hash` and compared with `equal`; null means pointer identity.
@@ -122,7 +170,7 @@ public:
     /// release. Later positions may move.
     HashedEntry Remove(CFIndex position);
     /// Takes out every entry, in insertion order, for the caller to release.
-    std::vector<HashedEntry> TakeAll() noexcept;
+    EntryVector TakeAll() noexcept;
     /// Makes room for `count` live entries without regrowing the index.
     void Reserve(CFIndex count);
 
@@ -160,10 +208,10 @@ private:
 
     CFHashCallBack hashCallBack_;
     CFEqualCallBack equalCallBack_;
-    std::vector<HashedEntry> entries_; ///< insertion order, removed entries included
-    std::vector<size_t> slots_;        ///< entry position + 1, 0 for an empty slot; power of two;
-                                       ///< empty while the table is small
-    unsigned slotShift_ = 64;          ///< 64 - log2(slots_.size())
+    EntryVector entries_;       ///< insertion order, removed entries included
+    std::vector<size_t> slots_; ///< entry position + 1, 0 for an empty slot; power of two;
+                                ///< empty while the table is small
+    unsigned slotShift_ = 64;   ///< 64 - log2(slots_.size())
     CFIndex liveCount_ = 0;
     size_t removedCount_ = 0;
 };

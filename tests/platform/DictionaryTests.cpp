@@ -219,8 +219,9 @@ TEST(CFDictionary, LargeDictionaryFindsEveryKey) {
 }
 
 TEST(CFDictionary, LookupsHoldWhileGrowingAndShrinkingAcrossEightPairs) {
-    // Small dictionaries are searched without an index and get one past eight pairs (removed
-    // pairs count until compacted); every lookup must agree with a plain model throughout.
+    // Small dictionaries keep four pairs inline, are searched without an index and get one
+    // past eight pairs (removed pairs count until compacted); every lookup must agree with a
+    // plain model throughout.
     const int keyCount = 20;
     std::vector<Owned<CFNumberRef>> keys;
     for (int i = 0; i < keyCount; ++i)
@@ -249,6 +250,11 @@ TEST(CFDictionary, LookupsHoldWhileGrowingAndShrinkingAcrossEightPairs) {
         }
         ASSERT_EQ(CFDictionaryGetCount(dictionary.get()), expected);
     }
+    // Emptying gives every key its count back, whether the pairs were inline or on the heap.
+    CFDictionaryRemoveAllValues(dictionary.get());
+    EXPECT_EQ(CFDictionaryGetCount(dictionary.get()), 0);
+    for (const auto& key : keys)
+        EXPECT_EQ(CFGetRetainCount(key.get()), 1);
 }
 
 TEST(CFDictionary, ChangingImmutableDictionaryIsReportedAndIgnored) {
