@@ -276,6 +276,8 @@ void FontDownloadWindowController::windowDidLoad() {
     window.setWindowFlags(Qt::Dialog | Qt::CustomizeWindowHint | Qt::WindowTitleHint |
                           Qt::WindowCloseButtonHint | Qt::WindowStaysOnTopHint);
     window.setWindowTitle(QZLocalizedString("QZ_DOWNLOAD_WINDOW_TITLE"));
+    // Scripts and window rules find the window by its role, whatever the language.
+    window.setWindowRole(QStringLiteral("FontDownloadWindow"));
     ui_->cancelButton->setText(QZLocalizedString("Cancel"));
     connect(ui_->cancelButton, &QPushButton::clicked, this,
             &FontDownloadWindowController::cancelButtonPressed);
