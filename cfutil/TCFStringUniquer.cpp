@@ -95,6 +95,22 @@ uint32_t TableHash(const unsigned char* text, size_t length) {
     return folded != 0 ? folded : 0x80000000u;
 }
 
+/// Whether the `length` bytes at `a` and `b` are equal. Up to 16 bytes are compared with two
+/// loads from each side (overlapping when shorter), without a call to memcmp. Reads only the
+/// `length` bytes of each.
+inline bool SameBytes(const unsigned char* a, const unsigned char* b, size_t length) {
+    if (length > 16)
+        return std::memcmp(a, b, length) == 0;
+    if (length >= 8)
+        return ((Load64(a) ^ Load64(b)) | (Load64(a + length - 8) ^ Load64(b + length - 8))) == 0;
+    if (length >= 4)
+        return ((Load32(a) ^ Load32(b)) | (Load32(a + length - 4) ^ Load32(b + length - 4))) == 0;
+    for (size_t i = 0; i < length; ++i)
+        if (a[i] != b[i])
+            return false;
+    return true;
+}
+
 /// One table entry, allocated in one block with its private, zero-terminated key copy right
 /// after it. Written once before it is published, never changed or freed afterwards.
 struct Entry {
@@ -139,6 +155,7 @@ public:
 
 private:
     static CFStringRef Find(const Table& table, const char* key, size_t length, uint32_t hash);
+    CFStringRef Enter(const char* bytes, CFIndex length, size_t keyLength, uint32_t hash);
     CFStringRef Insert(Entry* entry);
 
     std::atomic<const Table*> table_; ///< the current slot array; replaced under mutex_
@@ -149,15 +166,17 @@ private:
 };
 
 /// The string of the entry whose key is the `length` bytes at `key`, or null when `table` has
-/// none. Safe without the lock.
-CFStringRef TCFStringUniquerImp::Find(const Table& table, const char* key, size_t length,
-                                      uint32_t hash) {
+/// none. Safe without the lock. Inlined into the hit path, which then makes no call but the
+/// key comparison.
+inline __attribute__((always_inline)) CFStringRef
+TCFStringUniquerImp::Find(const Table& table, const char* key, size_t length, uint32_t hash) {
     for (size_t index = table.Home(hash);; index = (index + 1) & table.mask) {
         const Entry* entry = table.slots[index].load(std::memory_order_acquire);
         if (!entry)
             return nullptr;
         if (entry->hash == hash && entry->length == length &&
-            std::memcmp(entry->Key(), key, length) == 0)
+            SameBytes(reinterpret_cast<const unsigned char*>(entry->Key()),
+                      reinterpret_cast<const unsigned char*>(key), length))
             return entry->string;
     }
 }
@@ -209,8 +228,14 @@ CFStringRef TCFStringUniquerImp::GetUniqueString(const char* bytes, CFIndex leng
     const uint32_t hash = TableHash(reinterpret_cast<const unsigned char*>(bytes), keyLength);
     if (CFStringRef found = Find(*table_.load(std::memory_order_acquire), bytes, keyLength, hash))
         return found;
+    return Enter(bytes, length, keyLength, hash);
+}
 
-    // A miss: make the entry outside the lock, so that the lock is held only to insert.
+/// A miss: makes the entry for the text (whose key is its first `keyLength` bytes, hashed to
+/// `hash`) outside the lock, so that the lock is held only to insert it. Kept out of the hit
+/// path, whose every call would otherwise save and restore the registers this needs.
+__attribute__((noinline)) CFStringRef TCFStringUniquerImp::Enter(const char* bytes, CFIndex length,
+                                                                 size_t keyLength, uint32_t hash) {
     auto* entry = static_cast<Entry*>(std::malloc(sizeof(Entry) + keyLength + 1));
     if (!entry)
         return nullptr;
