@@ -125,6 +125,22 @@ TEST(StringUniquer, ReadsNoFurtherThanTheLengthWithoutATerminator) {
     ASSERT_NE(unique, nullptr);
     EXPECT_EQ(Units(unique), u"xyz");
     EXPECT_EQ(Unique("xyz"), unique);
+
+    // Every key length the lookup compares in its own way, entered and then found again, each
+    // time from a heap block of exactly its size.
+    for (size_t length = 1; length <= 24; ++length) {
+        std::string key(length, 'q');
+        key[0] = '#';
+        std::unique_ptr<char[]> first(new char[length]);
+        std::unique_ptr<char[]> again(new char[length]);
+        std::memcpy(first.get(), key.data(), length);
+        std::memcpy(again.get(), key.data(), length);
+        CFStringRef entered = TCFStringUniquer().GetUniqueString(first.get(), CFIndex(length));
+        ASSERT_NE(entered, nullptr) << length;
+        EXPECT_EQ(TCFStringUniquer().GetUniqueString(again.get(), CFIndex(length)), entered)
+            << length;
+        EXPECT_EQ(CFStringGetLength(entered), CFIndex(length));
+    }
 }
 
 TEST(StringUniquer, HandsOutSharedConstantsThatReleaseDoesNotDestroy) {
