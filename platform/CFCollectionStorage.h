@@ -7,7 +7,8 @@
 // compared through the container's callbacks. An open-addressing index maps hashes to entry
 // positions; removal marks the entry and compacts once marked entries outnumber live ones. A
 // small table (up to 8 entries, the common case for the values of a request) has no index and
-// is searched by comparing the stored hashes, which saves the index's allocation and upkeep.
+// is searched by comparing the stored hashes, which saves the index's allocation and upkeep; up
+// to 4 entries live inside the table itself.
 #pragma once
 
 #include <cstddef>
