@@ -94,7 +94,7 @@ TEST(StackBuffer, CountBeyondCapacityAllocatesExactlyThatManyZeroElements) {
         EXPECT_EQ(constBuffer[i], nullptr) << i;
 }
 
-TEST(StackBuffer, ShrinkingFromHeapMovesPrefixInlineAndFreesHeap) {
+TEST(StackBuffer, ShrinkingFromHeapMovesPrefixInlineOrToZeroAndFreesHeap) {
     TStackBuffer<char, 30> buffer(40);
     FillWithIndexPlusOne(buffer);
 
@@ -108,29 +108,26 @@ TEST(StackBuffer, ShrinkingFromHeapMovesPrefixInlineAndFreesHeap) {
     EXPECT_TRUE(IsInline(buffer));
     EXPECT_EQ(std::vector<char>(buffer.GetBuffer(), buffer.GetBuffer() + 10),
               (std::vector<char>{1, 2, 3, 4, 5, 6, 7, 8, 9, 10}));
+
+    TStackBuffer<char, 30> emptied(31);
+    AllocationRecorder toZero;
+    emptied.SetCount(0);
+    toZero.Stop();
+    EXPECT_EQ(toZero.Frees(), 1u);
+    EXPECT_EQ(emptied.GetCount(), 0u);
+    EXPECT_TRUE(IsInline(emptied));
 }
 
-TEST(StackBuffer, ShrinkingFromHeapToZeroFreesHeap) {
-    TStackBuffer<char, 30> buffer(31);
-    AllocationRecorder recorder;
-    buffer.SetCount(0);
-    recorder.Stop();
-
-    EXPECT_EQ(recorder.Frees(), 1u);
-    EXPECT_EQ(buffer.GetCount(), 0u);
-    EXPECT_TRUE(IsInline(buffer));
-}
-
-TEST(StackBuffer, SpillingToHeapKeepsPrefixAndAddsZeros) {
-    TStackBuffer<char, 30> buffer(10);
-    FillWithIndexPlusOne(buffer);
-
-    buffer.SetCount(40);
-
-    EXPECT_EQ(buffer.GetCount(), 40u);
-    EXPECT_FALSE(IsInline(buffer));
-    for (uint64_t i = 0; i < 40; ++i)
-        EXPECT_EQ(buffer[i], i < 10 ? static_cast<char>(i + 1) : 0) << i;
+TEST(StackBuffer, GrowingKeepsElementsAndAddsZerosWhetherSpillingOrOnHeap) {
+    for (auto [from, to] : {std::pair<uint64_t, uint64_t>{10, 40}, {40, 100}}) {
+        TStackBuffer<char, 30> buffer(from);
+        FillWithIndexPlusOne(buffer);
+        buffer.SetCount(to);
+        EXPECT_EQ(buffer.GetCount(), to);
+        EXPECT_FALSE(IsInline(buffer));
+        for (uint64_t i = 0; i < to; ++i)
+            EXPECT_EQ(buffer[i], i < from ? static_cast<char>(i + 1) : 0) << from << " " << i;
+    }
 }
 
 TEST(StackBuffer, SpillingCopiesOldCountThenGrowsToTwiceItOrNewCount) {
@@ -158,17 +155,6 @@ TEST(StackBuffer, SpillingCopiesOldCountThenGrowsToTwiceItOrNewCount) {
         recorder.Stop();
         EXPECT_EQ(recorder.Sizes(), std::vector<std::size_t>{31});
     }
-}
-
-TEST(StackBuffer, GrowingOnHeapKeepsElementsAndAddsZeros) {
-    TStackBuffer<char, 30> buffer(40);
-    FillWithIndexPlusOne(buffer);
-
-    buffer.SetCount(100);
-
-    EXPECT_EQ(buffer.GetCount(), 100u);
-    for (uint64_t i = 0; i < 100; ++i)
-        EXPECT_EQ(buffer[i], i < 40 ? static_cast<char>(i + 1) : 0) << i;
 }
 
 TEST(StackBuffer, ResizingWithinInlineStorageNeitherMovesNorZeroes) {
