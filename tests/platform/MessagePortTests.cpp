@@ -28,12 +28,18 @@ struct Reply {
     std::string bytes;
 };
 
-/// One request through a new remote port for `name`.
-Reply Send(const std::string& name, SInt32 msgid, const std::string& body,
-           CFTimeInterval receiveTimeout = 10) {
+/// A remote port for `name`, or null when nothing listens there.
+CFMessagePortRef CreateRemote(const std::string& name) {
     CFStringRef portName = CreateCFString(name);
     CFMessagePortRef remote = CFMessagePortCreateRemote(kCFAllocatorDefault, portName);
     CFRelease(portName);
+    return remote;
+}
+
+/// One request through a new remote port for `name`.
+Reply Send(const std::string& name, SInt32 msgid, const std::string& body,
+           CFTimeInterval receiveTimeout = 10) {
+    CFMessagePortRef remote = CreateRemote(name);
     if (!remote)
         return {-100, {}};
     CFDataRef data = CreateCFData(body);
@@ -173,9 +179,7 @@ protected:
 TEST_F(MessagePortTest, RoundTripsManyRequestsOverOneRemotePort) {
     PortServer server(kName, EchoWithMsgid);
     ASSERT_TRUE(server.Started());
-    CFStringRef portName = CreateCFString(kName);
-    CFMessagePortRef remote = CFMessagePortCreateRemote(kCFAllocatorDefault, portName);
-    CFRelease(portName);
+    CFMessagePortRef remote = CreateRemote(kName);
     ASSERT_NE(remote, nullptr);
     for (int i = 0; i < 100; ++i) {
         CFDataRef data = CreateCFData("request " + std::to_string(i));
@@ -500,9 +504,7 @@ TEST_F(MessagePortTest, ReceiveTimeoutLeavesThePortUsableForTheNextRequest) {
         return EchoWithMsgid(msgid, data);
     });
     ASSERT_TRUE(server.Started());
-    CFStringRef name = CreateCFString(kName);
-    CFMessagePortRef remote = CFMessagePortCreateRemote(kCFAllocatorDefault, name);
-    CFRelease(name);
+    CFMessagePortRef remote = CreateRemote(kName);
     ASSERT_NE(remote, nullptr);
     CFDataRef slow = CreateCFData("slow");
     CFDataRef marker = CreateCFData("not cleared");
@@ -528,9 +530,7 @@ TEST_F(MessagePortTest, ReceiveTimeoutLeavesThePortUsableForTheNextRequest) {
 TEST_F(MessagePortTest, ReportsEachWayAServerCanFail) {
     const int listener = RawListen(SocketPath());
     ASSERT_GE(listener, 0);
-    CFStringRef name = CreateCFString(kName);
-    CFMessagePortRef remote = CFMessagePortCreateRemote(kCFAllocatorDefault, name);
-    CFRelease(name);
+    CFMessagePortRef remote = CreateRemote(kName);
     ASSERT_NE(remote, nullptr);
     CFDataRef data = CreateCFData("x");
     CFDataRef reply = nullptr;
@@ -566,9 +566,7 @@ TEST_F(MessagePortTest, ReportsEachWayAServerCanFail) {
     CFRelease(data);
     CFRelease(remote);
 
-    name = CreateCFString("org.glyphwell.Test.Nobody");
-    EXPECT_EQ(CFMessagePortCreateRemote(kCFAllocatorDefault, name), nullptr);
-    CFRelease(name);
+    EXPECT_EQ(CreateRemote("org.glyphwell.Test.Nobody"), nullptr);
 }
 
 TEST_F(MessagePortTest, InvalidatingARemotePortEndsTheRequestWaitingOnIt) {
@@ -586,9 +584,7 @@ TEST_F(MessagePortTest, InvalidatingARemotePortEndsTheRequestWaitingOnIt) {
     ASSERT_TRUE(server.Started());
     // Once with a blocking wait, once with a poll-based one.
     for (CFTimeInterval timeout : {kCFMessagePortWaitForever, 60.0}) {
-        CFStringRef name = CreateCFString(kName);
-        CFMessagePortRef remote = CFMessagePortCreateRemote(kCFAllocatorDefault, name);
-        CFRelease(name);
+        CFMessagePortRef remote = CreateRemote(kName);
         ASSERT_NE(remote, nullptr);
         const int before = entered;
         std::future<SInt32> waiting = std::async(std::launch::async, [remote, timeout] {
@@ -716,9 +712,7 @@ TEST_F(MessagePortTest, AnswersEveryRequestOfManyConcurrentClients) {
     std::vector<std::thread> clients;
     for (int c = 0; c < kClients; ++c) {
         clients.emplace_back([&, c] {
-            CFStringRef name = CreateCFString(kName);
-            CFMessagePortRef remote = CFMessagePortCreateRemote(kCFAllocatorDefault, name);
-            CFRelease(name);
+            CFMessagePortRef remote = CreateRemote(kName);
             if (!remote)
                 return;
             for (int r = 0; r < kRequestsEach; ++r) {

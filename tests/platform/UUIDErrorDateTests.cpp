@@ -11,6 +11,10 @@
 #include "platform/CFString.h"
 #include "platform/CFUUID.h"
 #include "platform/Log.h"
+#include "tests/platform/ContainerTestSupport.h"
+
+using glyphwell::testing::Own;
+using glyphwell::testing::Owned;
 
 namespace {
 
@@ -72,77 +76,61 @@ TEST(UUID, CreateMakesDistinctVersion4Values) {
     CFRelease(b);
 }
 
-// A one-entry dictionary with property-value callbacks.
-CFMutableDictionaryRef Info(CFStringRef key, CFTypeRef value) {
-    CFMutableDictionaryRef info = CFDictionaryCreateMutable(
-        nullptr, 0, &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks);
-    CFDictionarySetValue(info, key, value);
+// A one-entry dictionary with property-value callbacks (empty without a key).
+Owned<CFMutableDictionaryRef> Info(CFStringRef key = nullptr, CFTypeRef value = nullptr) {
+    auto info = Own(CFDictionaryCreateMutable(nullptr, 0, &kCFTypeDictionaryKeyCallBacks,
+                                              &kCFTypeDictionaryValueCallBacks));
+    if (key)
+        CFDictionarySetValue(info.get(), key, value);
     return info;
 }
 
 TEST(Error, KeepsDomainCodeAndACopyOfTheUserInfo) {
-    CFMutableDictionaryRef info = Info(kCFErrorLocalizedFailureReasonKey, CFSTR("disk full"));
-    CFErrorRef error = CFErrorCreate(nullptr, kCFErrorDomainPOSIX, 28, info);
-    CFDictionarySetValue(info, kCFErrorLocalizedDescriptionKey, CFSTR("later"));
+    auto info = Info(kCFErrorLocalizedFailureReasonKey, CFSTR("disk full"));
+    auto error = Own(CFErrorCreate(nullptr, kCFErrorDomainPOSIX, 28, info.get()));
+    CFDictionarySetValue(info.get(), kCFErrorLocalizedDescriptionKey, CFSTR("later"));
 
-    EXPECT_EQ(CFGetTypeID(error), CFErrorGetTypeID());
-    EXPECT_TRUE(CFEqual(CFErrorGetDomain(error), kCFErrorDomainPOSIX));
-    EXPECT_EQ(CFErrorGetCode(error), 28);
-    CFDictionaryRef copied = CFErrorCopyUserInfo(error);
-    EXPECT_EQ(CFDictionaryGetCount(copied), 1);
-    EXPECT_TRUE(CFEqual(CFDictionaryGetValue(copied, kCFErrorLocalizedFailureReasonKey),
+    EXPECT_EQ(CFGetTypeID(error.get()), CFErrorGetTypeID());
+    EXPECT_TRUE(CFEqual(CFErrorGetDomain(error.get()), kCFErrorDomainPOSIX));
+    EXPECT_EQ(CFErrorGetCode(error.get()), 28);
+    auto copied = Own(CFErrorCopyUserInfo(error.get()));
+    EXPECT_EQ(CFDictionaryGetCount(copied.get()), 1);
+    EXPECT_TRUE(CFEqual(CFDictionaryGetValue(copied.get(), kCFErrorLocalizedFailureReasonKey),
                         CFSTR("disk full")));
-    CFRelease(copied);
-    CFRelease(error);
-    CFRelease(info);
-}
 
-TEST(Error, WithoutUserInfoCopiesAnEmptyDictionary) {
-    CFErrorRef error = CFErrorCreate(nullptr, CFSTR("Domain"), -1, nullptr);
-    CFDictionaryRef info = CFErrorCopyUserInfo(error);
-    ASSERT_NE(info, nullptr);
-    EXPECT_EQ(CFDictionaryGetCount(info), 0);
-    CFRelease(info);
-    CFRelease(error);
+    // Without user info the copy is an empty dictionary; without a domain there is no error.
+    auto bare = Own(CFErrorCreate(nullptr, CFSTR("Domain"), -1, nullptr));
+    auto empty = Own(CFErrorCopyUserInfo(bare.get()));
+    ASSERT_NE(empty, nullptr);
+    EXPECT_EQ(CFDictionaryGetCount(empty.get()), 0);
     EXPECT_EQ(CFErrorCreate(nullptr, nullptr, 1, nullptr), nullptr);
 }
 
 TEST(Error, EqualityComparesDomainCodeAndUserInfo) {
-    CFMutableDictionaryRef reason = Info(kCFErrorLocalizedFailureReasonKey, CFSTR("why"));
-    CFMutableDictionaryRef empty = CFDictionaryCreateMutable(
-        nullptr, 0, &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks);
-    CFStringRef domain = CFStringCreateWithCString(nullptr, "Domain", kCFStringEncodingUTF8);
-    CFErrorRef plain = CFErrorCreate(nullptr, CFSTR("Domain"), 1, nullptr);
-    CFErrorRef sameDomainCopy = CFErrorCreate(nullptr, domain, 1, empty);
-    CFErrorRef otherCode = CFErrorCreate(nullptr, domain, 2, nullptr);
-    CFErrorRef withReason = CFErrorCreate(nullptr, domain, 1, reason);
-    CFErrorRef withReasonAgain = CFErrorCreate(nullptr, CFSTR("Domain"), 1, reason);
+    auto reason = Info(kCFErrorLocalizedFailureReasonKey, CFSTR("why"));
+    auto empty = Info();
+    auto domain = Own(CFStringCreateWithCString(nullptr, "Domain", kCFStringEncodingUTF8));
+    auto plain = Own(CFErrorCreate(nullptr, CFSTR("Domain"), 1, nullptr));
+    auto sameDomainCopy = Own(CFErrorCreate(nullptr, domain.get(), 1, empty.get()));
+    auto withReason = Own(CFErrorCreate(nullptr, domain.get(), 1, reason.get()));
+    auto withReasonAgain = Own(CFErrorCreate(nullptr, CFSTR("Domain"), 1, reason.get()));
 
-    EXPECT_TRUE(CFEqual(plain, sameDomainCopy)); // no user info and an empty one are the same
-    EXPECT_EQ(CFHash(plain), CFHash(sameDomainCopy));
-    EXPECT_FALSE(CFEqual(plain, otherCode));
-    EXPECT_FALSE(CFEqual(plain, withReason));
-    EXPECT_TRUE(CFEqual(withReason, withReasonAgain));
-    EXPECT_EQ(CFHash(withReason), CFHash(withReasonAgain));
-
-    for (CFTypeRef value :
-         {(CFTypeRef)plain, (CFTypeRef)sameDomainCopy, (CFTypeRef)otherCode, (CFTypeRef)withReason,
-          (CFTypeRef)withReasonAgain, (CFTypeRef)domain, (CFTypeRef)reason, (CFTypeRef)empty})
-        CFRelease(value);
+    // No user info and an empty one are the same.
+    EXPECT_TRUE(CFEqual(plain.get(), sameDomainCopy.get()));
+    EXPECT_EQ(CFHash(plain.get()), CFHash(sameDomainCopy.get()));
+    EXPECT_FALSE(CFEqual(plain.get(), Own(CFErrorCreate(nullptr, domain.get(), 2, nullptr)).get()));
+    EXPECT_FALSE(CFEqual(plain.get(), withReason.get()));
+    EXPECT_TRUE(CFEqual(withReason.get(), withReasonAgain.get()));
+    EXPECT_EQ(CFHash(withReason.get()), CFHash(withReasonAgain.get()));
 }
 
 TEST(Date, ComparesByAbsoluteTime) {
-    CFDateRef a = CFDateCreate(nullptr, 12.5);
-    CFDateRef b = CFDateCreate(nullptr, 12.5);
-    CFDateRef c = CFDateCreate(nullptr, 13.0);
-    EXPECT_EQ(CFGetTypeID(a), CFDateGetTypeID());
-    EXPECT_EQ(CFDateGetAbsoluteTime(a), 12.5);
-    EXPECT_TRUE(CFEqual(a, b));
-    EXPECT_EQ(CFHash(a), CFHash(b));
-    EXPECT_FALSE(CFEqual(a, c));
-    CFRelease(a);
-    CFRelease(b);
-    CFRelease(c);
+    auto a = Own(CFDateCreate(nullptr, 12.5)), b = Own(CFDateCreate(nullptr, 12.5));
+    EXPECT_EQ(CFGetTypeID(a.get()), CFDateGetTypeID());
+    EXPECT_EQ(CFDateGetAbsoluteTime(a.get()), 12.5);
+    EXPECT_TRUE(CFEqual(a.get(), b.get()));
+    EXPECT_EQ(CFHash(a.get()), CFHash(b.get()));
+    EXPECT_FALSE(CFEqual(a.get(), Own(CFDateCreate(nullptr, 13.0)).get()));
 }
 
 TEST(Date, DescriptionAndCurrentTime) {
