@@ -59,7 +59,8 @@ for _ in $(seq 100); do
     sleep 0.1
 done
 [ -s "$work/display" ] || fail "Xvfb did not start: $(cat "$work/xvfb.log")"
-export DISPLAY=":$(head -n 1 "$work/display" | tr -d '[:space:]')"
+display=$(head -n 1 "$work/display" | tr -d '[:space:]')
+export DISPLAY=":$display"
 unset WAYLAND_DISPLAY
 
 # A private runtime directory (the socket), data home (the catalog) and font setup: one
@@ -136,8 +137,10 @@ ask() {
     grep -qF "$expected" "$work/$name.reply" || fail "the $name reply lacks $expected"
 }
 
+# shellcheck disable=SC2016 # the dollars are the tagged JSON's own
 ask activation Return '"QZUIPropertyResult":{"$number":1,"$type":7}' \
     ask-activation --candidate "$font_file" --app Demo
+# shellcheck disable=SC2016
 ask download Return '"QZUIPropertyResult":{"$number":0,"$type":7}' \
     ask-download --font "GlyphwellTestSans-Regular:Glyphwell Test Sans" --app Demo
 
