@@ -19,9 +19,14 @@
 #include "platform/CFNumber.h"
 #include "tests/desktop/DesktopTestEnvironment.h"
 #include "tests/support/LoopbackHTTPServer.h"
+#include "tests/support/PrivateFonts.h"
 #include "tests/support/Values.h"
 
 namespace {
+
+using glyphwell::testing::kDejaVu;
+using glyphwell::testing::ReadFile;
+using glyphwell::testing::SHA256Of;
 
 using glyphwell::testing::Dict;
 using glyphwell::testing::LoopbackHTTPServer;
@@ -29,30 +34,7 @@ using glyphwell::testing::Ref;
 using glyphwell::testing::Str;
 using std::chrono::milliseconds;
 
-const QString kDejaVu = QStringLiteral("/usr/share/fonts/truetype/dejavu/");
 constexpr auto kRunTimeout = std::chrono::seconds(20);
-
-std::string ReadFile(const QString& path) {
-    QFile file(path);
-    if (!file.open(QIODevice::ReadOnly))
-        return {};
-    const QByteArray bytes = file.readAll();
-    return std::string(bytes.constData(), size_t(bytes.size()));
-}
-
-/// SHA-256 in hexadecimal, computed here with OpenSSL rather than by the code under test.
-std::string SHA256Of(const std::string& bytes) {
-    unsigned char digest[EVP_MAX_MD_SIZE];
-    unsigned int length = 0;
-    EVP_Digest(bytes.data(), bytes.size(), digest, &length, EVP_sha256(), nullptr);
-    std::string hex;
-    for (unsigned int i = 0; i < length; ++i) {
-        char pair[3];
-        std::snprintf(pair, sizeof pair, "%02x", digest[i]);
-        hex += pair;
-    }
-    return hex;
-}
 
 std::string Utf8(CFTypeRef value) {
     if (!value || CFGetTypeID(value) != CFStringGetTypeID())
@@ -191,29 +173,12 @@ protected:
     void SetUp() override {
         ASSERT_TRUE(root_.isValid());
         ASSERT_TRUE(server_.IsListening());
-        fonts_ = root_.path() + "/data/fonts";
-        QDir().mkpath(fonts_);
-        QDir().mkpath(root_.path() + "/system");
-        QFile config(root_.path() + "/fonts.conf");
-        ASSERT_TRUE(config.open(QIODevice::WriteOnly));
-        config.write(("<?xml version=\"1.0\"?>\n<!DOCTYPE fontconfig SYSTEM \"fonts.dtd\">\n"
-                      "<fontconfig>\n  <dir>" +
-                      fonts_ + "</dir>\n  <cachedir>" + root_.path() +
-                      "/cache/fontconfig</cachedir>\n</fontconfig>\n")
-                         .toUtf8());
-        config.close();
-        qputenv("XDG_DATA_HOME", (root_.path() + "/data").toUtf8());
-        qputenv("XDG_DATA_DIRS", (root_.path() + "/system").toUtf8());
-        qputenv("XDG_CACHE_HOME", (root_.path() + "/cache").toUtf8());
-        qputenv("FONTCONFIG_FILE", (root_.path() + "/fonts.conf").toUtf8());
-        ASSERT_TRUE(QZReloadFontConfiguration());
+        fonts_ = glyphwell::testing::UsePrivateFonts(root_.path());
+        ASSERT_FALSE(fonts_.isEmpty());
         ASSERT_FALSE(QZIsFontInstalled("DejaVuSans-Bold"));
     }
     void TearDown() override {
-        for (const char* name :
-             {"XDG_DATA_HOME", "XDG_DATA_DIRS", "XDG_CACHE_HOME", "FONTCONFIG_FILE"})
-            qunsetenv(name);
-        QZReloadFontConfiguration();
+        glyphwell::testing::StopUsingPrivateFonts();
     }
 
     /// Serves the DejaVu file `file` at "/<file>" with `resource`'s delivery settings and

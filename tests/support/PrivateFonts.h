@@ -1,0 +1,71 @@
+// Test helper for the font download tests: the installed DejaVu files as download material, and a
+// private font setup (XDG directories and a fontconfig configuration under a temporary root) so
+// that no font the tests download is installed before they run.
+#pragma once
+
+#include <QDir>
+#include <QFile>
+#include <QString>
+#include <cstdio>
+#include <openssl/evp.h>
+#include <string>
+
+#include "desktop/QZFontMatching.h"
+
+namespace glyphwell::testing {
+
+inline const QString kDejaVu = QStringLiteral("/usr/share/fonts/truetype/dejavu/");
+
+inline std::string ReadFile(const QString& path) {
+    QFile file(path);
+    if (!file.open(QIODevice::ReadOnly))
+        return {};
+    const QByteArray bytes = file.readAll();
+    return std::string(bytes.constData(), size_t(bytes.size()));
+}
+
+/// SHA-256 in hexadecimal, computed here with OpenSSL rather than by the code under test.
+inline std::string SHA256Of(const std::string& bytes) {
+    unsigned char digest[EVP_MAX_MD_SIZE];
+    unsigned int length = 0;
+    EVP_Digest(bytes.data(), bytes.size(), digest, &length, EVP_sha256(), nullptr);
+    std::string hex;
+    for (unsigned int i = 0; i < length; ++i) {
+        char pair[3];
+        std::snprintf(pair, sizeof pair, "%02x", digest[i]);
+        hex += pair;
+    }
+    return hex;
+}
+
+/// Points the XDG directories and fontconfig at `root`: the user font directory is
+/// `root`/data/fonts (returned), the system data directory `root`/system, the caches under
+/// `root`/cache. Returns an empty string when the configuration cannot be written or loaded.
+inline QString UsePrivateFonts(const QString& root) {
+    const QString fonts = root + "/data/fonts";
+    QDir().mkpath(fonts);
+    QDir().mkpath(root + "/system");
+    QFile config(root + "/fonts.conf");
+    if (!config.open(QIODevice::WriteOnly))
+        return {};
+    config.write(("<?xml version=\"1.0\"?>\n<!DOCTYPE fontconfig SYSTEM \"fonts.dtd\">\n"
+                  "<fontconfig>\n  <dir>" +
+                  fonts + "</dir>\n  <cachedir>" + root +
+                  "/cache/fontconfig</cachedir>\n</fontconfig>\n")
+                     .toUtf8());
+    config.close();
+    qputenv("XDG_DATA_HOME", (root + "/data").toUtf8());
+    qputenv("XDG_DATA_DIRS", (root + "/system").toUtf8());
+    qputenv("XDG_CACHE_HOME", (root + "/cache").toUtf8());
+    qputenv("FONTCONFIG_FILE", (root + "/fonts.conf").toUtf8());
+    return QZReloadFontConfiguration() ? fonts : QString();
+}
+
+/// Undoes UsePrivateFonts: the process's own environment and font configuration again.
+inline void StopUsingPrivateFonts() {
+    for (const char* name : {"XDG_DATA_HOME", "XDG_DATA_DIRS", "XDG_CACHE_HOME", "FONTCONFIG_FILE"})
+        qunsetenv(name);
+    QZReloadFontConfiguration();
+}
+
+} // namespace glyphwell::testing
