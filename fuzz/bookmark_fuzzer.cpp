@@ -17,7 +17,8 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
         CFRelease(properties);
     Boolean stale = false;
     CFErrorRef error = nullptr;
-    if (CFURLRef url = TCFBookmark::CreateURLByResolvingBookmarkData(bookmark, &stale, nullptr, nullptr, 0, &error))
+    if (CFURLRef url = TCFBookmark::CreateURLByResolvingBookmarkData(bookmark, &stale, nullptr,
+                                                                     nullptr, 0, &error))
         CFRelease(url);
     if (error)
         CFRelease(error);

@@ -35,7 +35,9 @@ struct CFRange {
     CFIndex location;
     CFIndex length;
 };
-inline CFRange CFRangeMake(CFIndex location, CFIndex length) { return CFRange{location, length}; }
+inline CFRange CFRangeMake(CFIndex location, CFIndex length) {
+    return CFRange{location, length};
+}
 
 enum : CFIndex { kCFNotFound = -1 };
 
@@ -75,10 +77,10 @@ typedef const struct __CFNull* CFNullRef;
 // that calling code reads as usual. kCFAllocatorMalloc and kCFAllocatorNull matter only as the
 // deallocator of CFDataCreateWithBytesNoCopy: free() the bytes, or leave them alone.
 
-extern const CFAllocatorRef kCFAllocatorDefault;     ///< null: the default allocator
+extern const CFAllocatorRef kCFAllocatorDefault; ///< null: the default allocator
 extern const CFAllocatorRef kCFAllocatorSystemDefault;
-extern const CFAllocatorRef kCFAllocatorMalloc;      ///< bytes came from malloc(); free() them
-extern const CFAllocatorRef kCFAllocatorNull;        ///< bytes are not ours; never free them
+extern const CFAllocatorRef kCFAllocatorMalloc; ///< bytes came from malloc(); free() them
+extern const CFAllocatorRef kCFAllocatorNull;   ///< bytes are not ours; never free them
 
 // ---------------------------------------------------------------------------------------------
 // Operations on every value. Passing null to CFRetain, CFRelease, CFGetTypeID, CFHash or

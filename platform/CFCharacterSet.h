@@ -19,7 +19,8 @@ CFCharacterSetRef CFCharacterSetCreateWithBitmapRepresentation(CFAllocatorRef al
 /// planes only when they have members).
 CFDataRef CFCharacterSetCreateBitmapRepresentation(CFAllocatorRef allocator, CFCharacterSetRef set);
 /// A new set of the code points in `range` (clipped to 0 ... 0x10FFFF).
-CFCharacterSetRef CFCharacterSetCreateWithCharactersInRange(CFAllocatorRef allocator, CFRange range);
+CFCharacterSetRef CFCharacterSetCreateWithCharactersInRange(CFAllocatorRef allocator,
+                                                            CFRange range);
 /// A new set of the characters of `string` (surrogate pairs count as one code point).
 CFCharacterSetRef CFCharacterSetCreateWithCharactersInString(CFAllocatorRef allocator,
                                                              CFStringRef string);

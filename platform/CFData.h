@@ -19,7 +19,8 @@ CFDataRef CFDataCreateWithBytesNoCopy(CFAllocatorRef allocator, const UInt8* byt
 CFDataRef CFDataCreateCopy(CFAllocatorRef allocator, CFDataRef data);
 /// A new empty mutable data object; `capacity` 0 means unlimited (a limit is not enforced).
 CFMutableDataRef CFDataCreateMutable(CFAllocatorRef allocator, CFIndex capacity);
-CFMutableDataRef CFDataCreateMutableCopy(CFAllocatorRef allocator, CFIndex capacity, CFDataRef data);
+CFMutableDataRef CFDataCreateMutableCopy(CFAllocatorRef allocator, CFIndex capacity,
+                                         CFDataRef data);
 
 CFIndex CFDataGetLength(CFDataRef data);
 /// Null for an empty data object is allowed; never dereference past the length.

@@ -127,9 +127,10 @@ CFStringRef CFCopyDescription(CFTypeRef value) {
 CFStringRef CFCopyTypeIDDescription(CFTypeID typeID) {
     using namespace glyphwell::runtime;
     static const char* const names[kKindCount] = {
-        "",      "CFNull", "CFBoolean",   "CFNumber",    "CFString", "CFData",  "CFCharacterSet",
-        "CFArray", "CFSet", "CFDictionary", "CFURL",     "CFUUID",   "CFError", "CFDate",
-        "CFMessagePort", "CFRunLoopSource"};
+        "",         "CFNull",       "CFBoolean",      "CFNumber",
+        "CFString", "CFData",       "CFCharacterSet", "CFArray",
+        "CFSet",    "CFDictionary", "CFURL",          "CFUUID",
+        "CFError",  "CFDate",       "CFMessagePort",  "CFRunLoopSource"};
     if (typeID == 0 || typeID >= kKindCount)
         return nullptr;
     return CFStringCreateWithCString(kCFAllocatorDefault, names[typeID], kCFStringEncodingUTF8);
@@ -140,18 +141,22 @@ void CFShow(CFTypeRef value) {
     std::fprintf(stderr, "%s\n", text.c_str());
 }
 
-static const void* retainValue(CFAllocatorRef, const void* value) { return CFRetain(value); }
-static void releaseValue(CFAllocatorRef, const void* value) { CFRelease(value); }
+static const void* retainValue(CFAllocatorRef, const void* value) {
+    return CFRetain(value);
+}
+static void releaseValue(CFAllocatorRef, const void* value) {
+    CFRelease(value);
+}
 
 const CFArrayCallBacks kCFTypeArrayCallBacks = {0, retainValue, releaseValue, CFCopyDescription,
                                                 CFEqual};
-const CFSetCallBacks kCFTypeSetCallBacks = {0,         retainValue, releaseValue, CFCopyDescription,
-                                            CFEqual,   CFHash};
+const CFSetCallBacks kCFTypeSetCallBacks = {0,       retainValue, releaseValue, CFCopyDescription,
+                                            CFEqual, CFHash};
 const CFDictionaryKeyCallBacks kCFTypeDictionaryKeyCallBacks = {
     0, retainValue, releaseValue, CFCopyDescription, CFEqual, CFHash};
-const CFDictionaryValueCallBacks kCFTypeDictionaryValueCallBacks = {
-    0, retainValue, releaseValue, CFCopyDescription, CFEqual};
+const CFDictionaryValueCallBacks kCFTypeDictionaryValueCallBacks = {0, retainValue, releaseValue,
+                                                                    CFCopyDescription, CFEqual};
 const CFDictionaryKeyCallBacks kCFCopyStringDictionaryKeyCallBacks = {
     0, retainValue, releaseValue, CFCopyDescription, CFEqual, CFHash};
-const CFSetCallBacks kCFCopyStringSetCallBacks = {0,       retainValue, releaseValue,
-                                                  CFCopyDescription, CFEqual, CFHash};
+const CFSetCallBacks kCFCopyStringSetCallBacks = {
+    0, retainValue, releaseValue, CFCopyDescription, CFEqual, CFHash};

@@ -62,7 +62,9 @@ private:
     mutable std::atomic<CFIndex> refCount_{1};
 };
 
-inline const CFObject* AsObject(CFTypeRef value) { return static_cast<const CFObject*>(value); }
+inline const CFObject* AsObject(CFTypeRef value) {
+    return static_cast<const CFObject*>(value);
+}
 
 /// The object behind `value` as kind T, or null when `value` is null or of another kind.
 template <class T> const T* As(CFTypeRef value, CFTypeID kind) {

@@ -11,7 +11,7 @@ enum : CFStringEncoding {
     kCFStringEncodingISOLatin1 = 0x0201,
     kCFStringEncodingASCII = 0x0600,
     kCFStringEncodingUTF8 = 0x08000100,
-    kCFStringEncodingUTF16 = 0x0100,     ///< host order; a byte-order mark is honoured on input
+    kCFStringEncodingUTF16 = 0x0100, ///< host order; a byte-order mark is honoured on input
     kCFStringEncodingUTF16BE = 0x10000100,
     kCFStringEncodingUTF16LE = 0x14000100,
     kCFStringEncodingUTF32BE = 0x18000100,
@@ -21,10 +21,10 @@ enum : CFStringEncoding {
 
 typedef CFOptionFlags CFStringCompareFlags;
 enum : CFStringCompareFlags {
-    kCFCompareCaseInsensitive = 1,  ///< ASCII letters only
-    kCFCompareBackwards = 4,        ///< search from the end
-    kCFCompareAnchored = 8,         ///< match only at the start (or end, with kCFCompareBackwards)
-    kCFCompareNonliteral = 16,      ///< accepted, no effect: text is compared literally
+    kCFCompareCaseInsensitive = 1, ///< ASCII letters only
+    kCFCompareBackwards = 4,       ///< search from the end
+    kCFCompareAnchored = 8,        ///< match only at the start (or end, with kCFCompareBackwards)
+    kCFCompareNonliteral = 16,     ///< accepted, no effect: text is compared literally
 };
 
 CFTypeID CFStringGetTypeID();
@@ -47,10 +47,12 @@ CFStringRef CFStringCreateWithCString(CFAllocatorRef allocator, const char* cStr
 CFStringRef CFStringCreateWithCharacters(CFAllocatorRef allocator, const UniChar* chars,
                                          CFIndex numChars);
 /// Text from a path in the file-system representation (UTF-8 on Linux).
-CFStringRef CFStringCreateWithFileSystemRepresentation(CFAllocatorRef allocator, const char* buffer);
+CFStringRef CFStringCreateWithFileSystemRepresentation(CFAllocatorRef allocator,
+                                                       const char* buffer);
 CFStringRef CFStringCreateCopy(CFAllocatorRef allocator, CFStringRef string);
 /// The units of `range`; the caller keeps the range inside the string.
-CFStringRef CFStringCreateWithSubstring(CFAllocatorRef allocator, CFStringRef string, CFRange range);
+CFStringRef CFStringCreateWithSubstring(CFAllocatorRef allocator, CFStringRef string,
+                                        CFRange range);
 /// printf-style formatting; "%@" inserts a value's description.
 CFStringRef CFStringCreateWithFormat(CFAllocatorRef allocator, CFDictionaryRef formatOptions,
                                      CFStringRef format, ...);
@@ -60,7 +62,8 @@ CFMutableStringRef CFStringCreateMutable(CFAllocatorRef allocator, CFIndex maxLe
 CFMutableStringRef CFStringCreateMutableCopy(CFAllocatorRef allocator, CFIndex maxLength,
                                              CFStringRef string);
 void CFStringAppend(CFMutableStringRef string, CFStringRef appended);
-void CFStringAppendCString(CFMutableStringRef string, const char* cString, CFStringEncoding encoding);
+void CFStringAppendCString(CFMutableStringRef string, const char* cString,
+                           CFStringEncoding encoding);
 void CFStringAppendCharacters(CFMutableStringRef string, const UniChar* chars, CFIndex numChars);
 /// Replaces the units of `range` with `replacement`.
 void CFStringReplace(CFMutableStringRef string, CFRange range, CFStringRef replacement);
@@ -82,9 +85,9 @@ const UniChar* CFStringGetCharactersPtr(CFStringRef string);
 /// would not fit. Returns the number of UTF-16 units converted and stores the bytes used (or
 /// needed) in `*usedBufLen`. A surrogate pair converts whole or not at all. No byte-order mark
 /// is written for UTF-8, even with `isExternalRepresentation`.
-CFIndex CFStringGetBytes(CFStringRef string, CFRange range, CFStringEncoding encoding, UInt8 lossByte,
-                         Boolean isExternalRepresentation, UInt8* buffer, CFIndex maxBufLen,
-                         CFIndex* usedBufLen);
+CFIndex CFStringGetBytes(CFStringRef string, CFRange range, CFStringEncoding encoding,
+                         UInt8 lossByte, Boolean isExternalRepresentation, UInt8* buffer,
+                         CFIndex maxBufLen, CFIndex* usedBufLen);
 /// Zero-terminated conversion of the whole string; false when it does not fit or cannot convert.
 Boolean CFStringGetCString(CFStringRef string, char* buffer, CFIndex bufferSize,
                            CFStringEncoding encoding);

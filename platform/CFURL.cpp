@@ -1,8 +1,8 @@
 // URLs: the reference text exactly as given (UTF-8) and an optional base URL. uriparser checks
 // that the text is an RFC 3986 reference and resolves it against its base; the parts of a
 // reference are found with the RFC's own split (appendix B), which is exact for valid text.
-#include <algorithm>
 #include "platform/CFURL.h"
+#include <algorithm>
 
 #include <uriparser/Uri.h>
 

@@ -69,6 +69,6 @@ void AssertionFailure(const char* condition, const char* function, const char* f
 } // namespace glyphwell
 
 /// Checks an internal invariant; on failure reports it through the assertion handler and goes on.
-#define GW_ASSERT(condition)                                                                      \
-    ((condition) ? (void)0                                                                        \
+#define GW_ASSERT(condition)                                                                       \
+    ((condition) ? (void)0                                                                         \
                  : ::glyphwell::AssertionFailure(#condition, __func__, __FILE__, __LINE__))

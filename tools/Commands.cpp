@@ -111,7 +111,8 @@ int RunEncode(const std::vector<std::string>& arguments, std::istream& in, std::
     try {
         json = nlohmann::ordered_json::parse(text);
     } catch (const nlohmann::json::parse_error& failure) {
-        err << "glyphwell encode: " << name << ":" << Position(text, failure.byte ? failure.byte - 1 : 0)
+        err << "glyphwell encode: " << name << ":"
+            << Position(text, failure.byte ? failure.byte - 1 : 0)
             << ": malformed JSON: " << failure.what() << "\n";
         return 1;
     }
@@ -165,11 +166,12 @@ int RunEncode(const std::vector<std::string>& arguments, std::istream& in, std::
 int RunDecode(const std::vector<std::string>& arguments, std::istream& in, std::ostream& out,
               std::ostream& err) {
     static const std::pair<const char*, TCFType> kKinds[] = {
-        {"any", kTCFTypeAny},           {"string", kTCFTypeString}, {"number", kTCFTypeNumber},
-        {"boolean", kTCFTypeBoolean},   {"data", kTCFTypeData},     {"charset", kTCFTypeCharacterSet},
-        {"array", kTCFTypeArray},       {"dictionary", kTCFTypeDictionary},
-        {"set", kTCFTypeSet},           {"url", kTCFTypeURL},       {"uuid", kTCFTypeUUID},
-        {"error", kTCFTypeError}};
+        {"any", kTCFTypeAny},       {"string", kTCFTypeString},
+        {"number", kTCFTypeNumber}, {"boolean", kTCFTypeBoolean},
+        {"data", kTCFTypeData},     {"charset", kTCFTypeCharacterSet},
+        {"array", kTCFTypeArray},   {"dictionary", kTCFTypeDictionary},
+        {"set", kTCFTypeSet},       {"url", kTCFTypeURL},
+        {"uuid", kTCFTypeUUID},     {"error", kTCFTypeError}};
     std::string inputPath;
     TCFType expected = kTCFTypeAny;
     bool compact = false, haveInput = false;
@@ -213,19 +215,31 @@ int RunDecode(const std::vector<std::string>& arguments, std::istream& in, std::
     // Every line the reader and the uniquer log goes to `err` as its bare text.
     LogSink previous = SetLogSink([&](const LogRecord& record) { err << record.text << "\n"; });
     TCFResurrectContext context(reinterpret_cast<const unsigned char*>(bytes.data()), bytes.size());
-    CFTypeRef value = expected == kTCFTypeAny ? context.Resurrect(kTCFTypeAny) : [&]() -> CFTypeRef {
+    CFTypeRef value =
+        expected == kTCFTypeAny ? context.Resurrect(kTCFTypeAny) : [&]() -> CFTypeRef {
         switch (expected) {
-        case kTCFTypeString: return context.RetrieveCFString();
-        case kTCFTypeNumber: return context.RetrieveCFNumber();
-        case kTCFTypeBoolean: return context.RetrieveCFBoolean();
-        case kTCFTypeData: return context.RetrieveCFData();
-        case kTCFTypeCharacterSet: return context.RetrieveCFCharacterSet();
-        case kTCFTypeArray: return context.RetrieveCFArray();
-        case kTCFTypeDictionary: return context.RetrieveCFDictionary();
-        case kTCFTypeSet: return context.RetrieveCFSet();
-        case kTCFTypeURL: return context.RetrieveCFURL();
-        case kTCFTypeUUID: return context.RetrieveCFUUID();
-        default: return context.RetrieveCFError();
+        case kTCFTypeString:
+            return context.RetrieveCFString();
+        case kTCFTypeNumber:
+            return context.RetrieveCFNumber();
+        case kTCFTypeBoolean:
+            return context.RetrieveCFBoolean();
+        case kTCFTypeData:
+            return context.RetrieveCFData();
+        case kTCFTypeCharacterSet:
+            return context.RetrieveCFCharacterSet();
+        case kTCFTypeArray:
+            return context.RetrieveCFArray();
+        case kTCFTypeDictionary:
+            return context.RetrieveCFDictionary();
+        case kTCFTypeSet:
+            return context.RetrieveCFSet();
+        case kTCFTypeURL:
+            return context.RetrieveCFURL();
+        case kTCFTypeUUID:
+            return context.RetrieveCFUUID();
+        default:
+            return context.RetrieveCFError();
         }
     }();
     SetLogSink(previous);

@@ -116,8 +116,8 @@ CFTypeRef CreateNumber(const Json& tagged, const std::string& where) {
     const int64_t v = value.get<int64_t>();
     const int bits = int(CFNumberTypeByteSize(type)) * 8;
     if (bits < 64 && (v < -(int64_t(1) << (bits - 1)) || v >= (int64_t(1) << (bits - 1))))
-        throw InputError{Child(where, "$number"), "value out of range for type " +
-                                                      std::to_string(type)};
+        throw InputError{Child(where, "$number"),
+                         "value out of range for type " + std::to_string(type)};
     // Every integer code reads a little-endian value of its width, so the low bytes of v serve.
     return CFNumberCreate(kCFAllocatorDefault, type, &v);
 }
@@ -166,7 +166,8 @@ CFTypeRef CreateCharacterSet(const Json& ranges, const std::string& where) {
 
 CFTypeRef CreateArrayOrSet(const Json& items, const std::string& where, bool isSet) {
     if (!items.is_array())
-        throw InputError{where, isSet ? "\"$set\" must be an array" : "\"$array\" must be an array"};
+        throw InputError{where,
+                         isSet ? "\"$set\" must be an array" : "\"$array\" must be an array"};
     Held elements;
     for (size_t i = 0; i < items.size(); ++i)
         elements.Add(Create(items[i], Child(where, i)));
@@ -231,9 +232,9 @@ CFTypeRef CreateTagged(const Json& object, const std::string& where) {
         const std::string text = body.get<std::string>();
         if (text.size() > kMaxStreamedLength)
             throw InputError{at, "URL longer than 1048576 bytes cannot be written"};
-        CFURLRef url = CFURLCreateWithBytes(kCFAllocatorDefault,
-                                            reinterpret_cast<const UInt8*>(text.data()),
-                                            CFIndex(text.size()), kCFStringEncodingUTF8, nullptr);
+        CFURLRef url =
+            CFURLCreateWithBytes(kCFAllocatorDefault, reinterpret_cast<const UInt8*>(text.data()),
+                                 CFIndex(text.size()), kCFStringEncodingUTF8, nullptr);
         if (!url)
             throw InputError{at, "not a URL: " + text};
         return url;

@@ -177,9 +177,7 @@ protected:
         ASSERT_FALSE(fonts_.isEmpty());
         ASSERT_FALSE(QZIsFontInstalled("DejaVuSans-Bold"));
     }
-    void TearDown() override {
-        glyphwell::testing::StopUsingPrivateFonts();
-    }
+    void TearDown() override { glyphwell::testing::StopUsingPrivateFonts(); }
 
     /// Serves the DejaVu file `file` at "/<file>" with `resource`'s delivery settings and
     /// returns its catalog entry holding `postScriptName`. `sha256` and `size` replace the

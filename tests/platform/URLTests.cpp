@@ -136,12 +136,14 @@ TEST(URL, RejectsBytesThatAreNotAReference) {
 }
 
 TEST(URL, InternationalTextIsKeptPercentEncoded) {
-    auto url = URL("file:///Schriften/Gr\xC3\xBC\xC3\x9F" "e.ttf");
+    auto url = URL("file:///Schriften/Gr\xC3\xBC\xC3\x9F"
+                   "e.ttf");
     ASSERT_TRUE(url);
     EXPECT_EQ(Bytes(url.get()), "file:///Schriften/Gr%C3%BC%C3%9Fe.ttf");
     UInt8 path[64] = {};
     ASSERT_TRUE(CFURLGetFileSystemRepresentation(url.get(), true, path, sizeof path));
-    EXPECT_EQ(std::string(reinterpret_cast<char*>(path)), "/Schriften/Gr\xC3\xBC\xC3\x9F" "e.ttf");
+    EXPECT_EQ(std::string(reinterpret_cast<char*>(path)), "/Schriften/Gr\xC3\xBC\xC3\x9F"
+                                                          "e.ttf");
 }
 
 TEST(URL, EmptyBytesGiveAnEmptyRelativeURL) {

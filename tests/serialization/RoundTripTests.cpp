@@ -21,27 +21,48 @@ public:
     Ref Any(int depth) {
         const int kinds = depth > 0 ? 14 : 11;
         switch (Below(kinds)) {
-        case 0: return Text();
-        case 1: return Number();
-        case 2: return Ref(CFRetain(Below(2) ? kCFBooleanTrue : kCFBooleanFalse));
-        case 3: return Data();
-        case 4: return CharacterSet();
-        case 5: return URL();
-        case 6: return UUID();
-        case 7: return Error();
-        case 8: return Text();
-        case 9: return Number();
-        case 10: return Data();
-        case 11: return Array(depth - 1);
-        case 12: return SetOf(depth - 1);
-        default: return Dictionary(depth - 1);
+        case 0:
+            return Text();
+        case 1:
+            return Number();
+        case 2:
+            return Ref(CFRetain(Below(2) ? kCFBooleanTrue : kCFBooleanFalse));
+        case 3:
+            return Data();
+        case 4:
+            return CharacterSet();
+        case 5:
+            return URL();
+        case 6:
+            return UUID();
+        case 7:
+            return Error();
+        case 8:
+            return Text();
+        case 9:
+            return Number();
+        case 10:
+            return Data();
+        case 11:
+            return Array(depth - 1);
+        case 12:
+            return SetOf(depth - 1);
+        default:
+            return Dictionary(depth - 1);
         }
     }
 
     Ref Text() {
-        static const char* const pieces[] = {"a", "Zz", " ", "\xC3\xA9", "\xE6\x97\xA5",
-                                             "\xF0\x9F\x98\x80", "\xF4\x8F\xBF\xBF", "\xEF\xBF\xBD",
-                                             "~", "\x7F"};
+        static const char* const pieces[] = {"a",
+                                             "Zz",
+                                             " ",
+                                             "\xC3\xA9",
+                                             "\xE6\x97\xA5",
+                                             "\xF0\x9F\x98\x80",
+                                             "\xF4\x8F\xBF\xBF",
+                                             "\xEF\xBF\xBD",
+                                             "~",
+                                             "\x7F"};
         std::string text;
         for (int i = Below(12); i > 0; --i)
             text += pieces[Below(10)];
@@ -53,12 +74,18 @@ public:
         const int64_t integer = int64_t(random_()) << 32 ^ int64_t(random_());
         const double real = std::ldexp(double(int64_t(random_())) - 2147483648.0, Below(80) - 40);
         switch (CFNumberTypeByteSize(type) * 10 + (IsFloat(type) ? 1 : 0)) {
-        case 10: return Num<int8_t>(type, int8_t(integer));
-        case 20: return Num<int16_t>(type, int16_t(integer));
-        case 40: return Num<int32_t>(type, int32_t(integer));
-        case 41: return Num<float>(type, float(real));
-        case 81: return Num<double>(type, real);
-        default: return Num<int64_t>(type, integer);
+        case 10:
+            return Num<int8_t>(type, int8_t(integer));
+        case 20:
+            return Num<int16_t>(type, int16_t(integer));
+        case 40:
+            return Num<int32_t>(type, int32_t(integer));
+        case 41:
+            return Num<float>(type, float(real));
+        case 81:
+            return Num<double>(type, real);
+        default:
+            return Num<int64_t>(type, integer);
         }
     }
 
@@ -105,8 +132,8 @@ public:
         std::vector<const void*> values;
         for (const Ref& item : items)
             values.push_back(item.get());
-        return Ref(CFArrayCreate(nullptr, values.data(), CFIndex(values.size()),
-                                 &kCFTypeArrayCallBacks));
+        return Ref(
+            CFArrayCreate(nullptr, values.data(), CFIndex(values.size()), &kCFTypeArrayCallBacks));
     }
 
     Ref SetOf(int depth) {
@@ -114,7 +141,8 @@ public:
         std::vector<const void*> values;
         for (const Ref& item : items)
             values.push_back(item.get());
-        return Ref(CFSetCreate(nullptr, values.data(), CFIndex(values.size()), &kCFTypeSetCallBacks));
+        return Ref(
+            CFSetCreate(nullptr, values.data(), CFIndex(values.size()), &kCFTypeSetCallBacks));
     }
 
     Ref Dictionary(int depth) {
@@ -226,11 +254,13 @@ TEST(RoundTrip, WideContainersAndTextsAtTheLimits) {
 TEST(RoundTrip, CharacterSetsWithEveryPlane) {
     Ref set(CFCharacterSetCreateMutable(nullptr));
     for (CFIndex plane = 0; plane <= 16; ++plane)
-        CFCharacterSetAddCharactersInRange(const_cast<__CFCharacterSet*>(set.as<CFCharacterSetRef>()),
-                                           CFRangeMake(plane * 0x10000 + plane * 97, 1 + plane));
+        CFCharacterSetAddCharactersInRange(
+            const_cast<__CFCharacterSet*>(set.as<CFCharacterSetRef>()),
+            CFRangeMake(plane * 0x10000 + plane * 97, 1 + plane));
     Ref back = ReadBack(Flatten(set.get()));
     EXPECT_TRUE(CFEqual(back.get(), set.get()));
-    EXPECT_TRUE(CFCharacterSetIsLongCharacterMember(back.as<CFCharacterSetRef>(), 0x10000 * 16 + 16 * 97));
+    EXPECT_TRUE(
+        CFCharacterSetIsLongCharacterMember(back.as<CFCharacterSetRef>(), 0x10000 * 16 + 16 * 97));
 }
 
 TEST(RoundTrip, DeepestAcceptedNestingReadsAndReleases) {

@@ -57,7 +57,8 @@ inline Ref Dict(std::initializer_list<std::pair<CFTypeRef, CFTypeRef>> pairs) {
 
 inline Ref Array(std::initializer_list<CFTypeRef> items) {
     std::vector<const void*> values(items);
-    return Ref(CFArrayCreate(nullptr, values.data(), CFIndex(values.size()), &kCFTypeArrayCallBacks));
+    return Ref(
+        CFArrayCreate(nullptr, values.data(), CFIndex(values.size()), &kCFTypeArrayCallBacks));
 }
 
 inline Ref Set(std::initializer_list<CFTypeRef> items) {

@@ -60,8 +60,8 @@ TEST(DecodeCommand, GivesBackTheEncodedJSONForEveryKind) {
 TEST(DecodeCommand, PrintsTheReadersLinesAndFailsOnCorruption) {
     // A dictionary claiming three pairs that holds two.
     const std::string bytes =
-        Bytes({0, 0, 0, 0x10, 0, 0, 0, 3, 0, 0, 0, 7, 0, 0, 0, 1, 'a', 0, 0, 1, 3, 0, 0, 0, 1, 1,
-               0, 0, 0, 7, 0, 0, 0, 1, 'b', 0, 0, 1, 3, 0, 0, 0, 1, 0});
+        Bytes({0, 0, 0, 0x10, 0, 0, 0, 3, 0, 0, 0, 7, 0,   0, 0, 1, 'a', 0, 0, 1, 3, 0,
+               0, 0, 1, 1,    0, 0, 0, 7, 0, 0, 0, 1, 'b', 0, 0, 1, 3,   0, 0, 0, 1, 0});
     const Result result = Invoke({"decode", "--compact", "--expect", "dictionary"}, bytes);
     EXPECT_EQ(result.status, 1);
     EXPECT_EQ(result.out, "{\"a\":true,\"b\":false}\n");

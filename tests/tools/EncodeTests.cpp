@@ -43,7 +43,8 @@ TEST(EncodeCommand, MapsPlainAndTaggedJSONToTheirKinds) {
     EXPECT_EQ(Encode("0.5").out, "00 00 00 16 00 00 00 0D 00 00 00 08 3F E0 00 00 00 00 00 00\n");
     EXPECT_EQ(Encode("[false]").out, "00 00 00 11 00 00 00 01 00 00 01 03 00 00 00 01 00\n");
     EXPECT_EQ(Encode(R"({"$array": []})").out, "00 00 00 11 00 00 00 00\n");
-    EXPECT_EQ(Encode(R"({"$set": [true]})").out, "00 00 01 00 00 00 00 01 00 00 01 03 00 00 00 01 01\n");
+    EXPECT_EQ(Encode(R"({"$set": [true]})").out,
+              "00 00 01 00 00 00 00 01 00 00 01 03 00 00 00 01 01\n");
     EXPECT_EQ(Encode(R"({"$data": "3q0="})").out, "00 00 00 12 00 00 00 02 DE AD\n");
     EXPECT_EQ(Encode(R"({"$url": "file:///a"})").out,
               "00 00 01 01 00 00 00 09 66 69 6C 65 3A 2F 2F 2F 61\n");
@@ -54,7 +55,8 @@ TEST(EncodeCommand, MapsPlainAndTaggedJSONToTheirKinds) {
     EXPECT_EQ(Encode(R"({"$dict": [[1, "x"]]})").out,
               "00 00 00 10 00 00 00 01 00 00 00 16 00 00 00 0A 00 00 00 08 00 00 00 00 00 00 00 "
               "01 00 00 00 07 00 00 00 01 78\n");
-    EXPECT_EQ(Encode(R"({"$number": -1, "$type": 7})").out, "00 00 00 16 00 00 00 07 00 00 00 01 FF\n");
+    EXPECT_EQ(Encode(R"({"$number": -1, "$type": 7})").out,
+              "00 00 00 16 00 00 00 07 00 00 00 01 FF\n");
     // A set of just U+0000 is a BMP bitmap whose first word is 0x0001: literal 1, fill 4095.
     EXPECT_EQ(Encode(R"({"$charset": [[0, 0]]})").out,
               "00 00 00 1B 00 00 00 0E 00 00 00 00 00 20 00 00 01 00 01 00 FF 0F\n");
@@ -67,8 +69,11 @@ TEST(EncodeCommand, WritesRawBytesToAFile) {
     EXPECT_EQ(result.status, 0);
     EXPECT_EQ(result.out, "");
     std::ifstream file(path, std::ios::binary);
-    const std::string bytes((std::istreambuf_iterator<char>(file)), std::istreambuf_iterator<char>());
-    EXPECT_EQ(bytes, std::string("\0\0\0\x07\0\0\0\x03" "abc", 11));
+    const std::string bytes((std::istreambuf_iterator<char>(file)),
+                            std::istreambuf_iterator<char>());
+    EXPECT_EQ(bytes, std::string("\0\0\0\x07\0\0\0\x03"
+                                 "abc",
+                                 11));
     std::filesystem::remove(path);
 }
 
@@ -80,7 +85,8 @@ TEST(EncodeCommand, RejectsBadInputWithThePlaceAndNoOutput) {
         {"{\"a\": [1,\n  2,,]}", "<stdin>:2:5: malformed JSON"},
         {"", "<stdin>:1:1: malformed JSON"},
         {R"({"a": [1, {"$bogus": 1}]})", "at /a/1: unknown tag \"$bogus\""},
-        {R"({"$number": 1, "$type": 17})", "at /$type: number type code must be an integer from 1 to 16"},
+        {R"({"$number": 1, "$type": 17})",
+         "at /$type: number type code must be an integer from 1 to 16"},
         {R"({"$number": 1, "$type": 0})", "at /$type: number type code"},
         {R"({"$number": 300, "$type": 1})", "at /$number: value out of range for type 1"},
         {R"({"$number": 1.5, "$type": 3})", "at /$number: type 3 needs an integer value"},
@@ -130,7 +136,7 @@ TEST(Base64, RoundTripsAndRejectsNonCanonicalText) {
     }
     EXPECT_EQ(EncodeBase64(reinterpret_cast<const uint8_t*>("foobar"), 6), "Zm9vYmFy");
     EXPECT_FALSE(DecodeBase64("Zg="));
-    EXPECT_FALSE(DecodeBase64("Zh=="));  // stray bits under the padding
+    EXPECT_FALSE(DecodeBase64("Zh==")); // stray bits under the padding
     EXPECT_FALSE(DecodeBase64("Z=g="));
     EXPECT_FALSE(DecodeBase64("Zm9v YmFy"));
 }
