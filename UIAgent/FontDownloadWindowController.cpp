@@ -19,11 +19,11 @@
 #include "UIAgent/QZLocalizedString.h"
 #include "UIAgent/QZModalSession.h"
 #include "UIAgent/QZNetworkCheck.h"
-#include "UIAgent/QZUIProperties.h"
 #include "desktop/QZCancelDownloadHandler.h"
 #include "desktop/QZQtStrings.h"
 #include "platform/CFError.h"
 #include "platform/CFNumber.h"
+#include "protocol/QZUIProtocol.h"
 #include "ui_FontDownloadWindow.h"
 
 namespace {

@@ -18,13 +18,13 @@
 
 #include "UIAgent/QZLocalizedString.h"
 #include "UIAgent/QZModalSession.h"
-#include "UIAgent/QZUIProperties.h"
 #include "cfutil/TStackBuffer.h"
 #include "desktop/QZDesktopEntry.h"
 #include "desktop/QZFileManager.h"
 #include "desktop/QZQtStrings.h"
 #include "desktop/QZVolumes.h"
 #include "platform/CFNumber.h"
+#include "protocol/QZUIProtocol.h"
 
 // The help page is compiled into the agent's library, whose resources register only when
 // something refers to them.

@@ -8,7 +8,6 @@
 
 #include "UIAgent/QZLocalizedString.h"
 #include "UIAgent/QZModalSession.h"
-#include "UIAgent/QZUIProperties.h"
 #include "desktop/QZDesktopEntry.h"
 #include "desktop/QZDownloadableFontCatalog.h"
 #include "desktop/QZProcessWatch.h"
@@ -16,6 +15,7 @@
 #include "platform/CFArray.h"
 #include "platform/CFNumber.h"
 #include "platform/CFSet.h"
+#include "protocol/QZUIProtocol.h"
 
 namespace {
 

@@ -6,7 +6,6 @@
 #include "UIAgent/QZFontDownloadConfirmation.h"
 #include "UIAgent/QZRunFontDownload.h"
 #include "UIAgent/QZUIController.h"
-#include "UIAgent/QZUIProperties.h"
 #include "cfutil/TCFArray.h"
 #include "cfutil/TCFData.h"
 #include "cfutil/TCFDictionary.h"
@@ -14,6 +13,7 @@
 #include "cfutil/TCFRetained.h"
 #include "cfutil/TCFTypeRef.h"
 #include "platform/Log.h"
+#include "protocol/QZUIProtocol.h"
 #include "serialization/TCFFlattenContext.h"
 #include "serialization/TCFResurrectContext.h"
 
@@ -150,10 +150,10 @@ CFDataRef QZUIAgentHandleMessage(CFMessagePortRef, SInt32 msgid, CFDataRef data,
         controller->setAlertCount(controller->alertCount() + 1);
 
     switch (msgid) {
-    case 1:
+    case kQZUIMessageAutoActivation:
         HandleAutoActivation(request, reply);
         break;
-    case 2:
+    case kQZUIMessageFontDownload:
         HandleFontDownload(request, reply);
         break;
     default:

@@ -1,10 +1,10 @@
 #include "UIAgent/QZUIController.h"
 
 #include "UIAgent/QZUIAgentHandleMessage.h"
-#include "UIAgent/QZUIProperties.h"
 #include "platform/CFRunLoop.h"
 #include "platform/CFString.h"
 #include "platform/Log.h"
+#include "protocol/QZUIProtocol.h"
 
 namespace {
 
@@ -54,7 +54,7 @@ void QZUIController::applicationWillFinishLaunching() {
 
     // The port does not own the controller: no retain or release callbacks.
     CFMessagePortContext context = {0, this, nullptr, nullptr, nullptr};
-    messagePort_ = CFMessagePortCreateLocal(kCFAllocatorDefault, CFSTR(kQZUIAgentPortName),
+    messagePort_ = CFMessagePortCreateLocal(kCFAllocatorDefault, kQZUIAgentPortName,
                                             QZUIAgentHandleMessage, &context, nullptr);
     if (!messagePort_) {
         glyphwell::AppLog("CFMessagePortCreateLocal returned nil");

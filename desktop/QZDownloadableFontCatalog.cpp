@@ -14,6 +14,7 @@
 #include "platform/CFDictionary.h"
 #include "platform/CFNumber.h"
 #include "platform/Log.h"
+#include "protocol/QZUIProtocol.h"
 
 namespace {
 
@@ -190,9 +191,9 @@ CFDictionaryRef CreateAssetDictionary(const QZDownloadableFontAsset& asset,
     CFDictionarySetValue(dictionary, CFSTR("_DownloadSize"), number);
     setString(CFSTR("_DownloadURL"), asset.url);
     setString(CFSTR("_DownloadSHA256"), asset.sha256);
-    setString(CFSTR("NSFontNameAttribute"), font.postScriptName);
+    setString(NSFontNameAttribute, font.postScriptName);
     if (!font.family.empty())
-        setString(CFSTR("NSFontFamilyAttribute"), font.family);
+        setString(NSFontFamilyAttribute, font.family);
     if (!font.localizedFamilyNames.empty()) {
         TCFRetained<CFMutableDictionaryRef> names(
             CFDictionaryCreateMutable(kCFAllocatorDefault, 0, &kCFTypeDictionaryKeyCallBacks,
@@ -204,7 +205,7 @@ CFDictionaryRef CreateAssetDictionary(const QZDownloadableFontAsset& asset,
             if (key && value)
                 CFDictionarySetValue(names, key, value);
         }
-        CFDictionarySetValue(dictionary, CFSTR("NSCTFontLocalizedFamilyNameAttribute"), names);
+        CFDictionarySetValue(dictionary, NSCTFontLocalizedFamilyNameAttribute, names);
     }
     return dictionary;
 }
@@ -292,8 +293,8 @@ QZCopyDownloadableFontAttributesForRequests(CFArrayRef requestedFontAttributeDic
         const void* element = CFArrayGetValueAtIndex(requestedFontAttributeDictionaries, i);
         if (!element || CFGetTypeID(element) != CFDictionaryGetTypeID())
             continue;
-        const QString name = QZQStringIfString(CFDictionaryGetValue(
-            static_cast<CFDictionaryRef>(element), CFSTR("NSFontNameAttribute")));
+        const QString name = QZQStringIfString(
+            CFDictionaryGetValue(static_cast<CFDictionaryRef>(element), NSFontNameAttribute));
         if (name.isEmpty())
             continue;
         const std::string postScriptName = name.toStdString();

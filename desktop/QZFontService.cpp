@@ -19,6 +19,7 @@
 #include "platform/CFError.h"
 #include "platform/CFNumber.h"
 #include "platform/Log.h"
+#include "protocol/QZUIProtocol.h"
 
 const CFStringRef kCTFontDescriptorMatchingCancelDownloadHandler =
     CFSTR("CTFontDescriptorMatchingCancelDownloadHandler");
@@ -38,9 +39,6 @@ namespace {
 /// between at most this often: each report may cost the receiver a trip to its main thread.
 constexpr std::chrono::milliseconds kDownloadingReportInterval{100};
 
-const CFStringRef kFontNameAttribute = CFSTR("NSFontNameAttribute");
-const CFStringRef kFontFamilyAttribute = CFSTR("NSFontFamilyAttribute");
-
 QString Text(const char* sourceText) {
     return QCoreApplication::translate("QZFontService", sourceText);
 }
@@ -54,7 +52,7 @@ std::string PostScriptName(const void* descriptor) {
     if (!descriptor || CFGetTypeID(descriptor) != CFDictionaryGetTypeID())
         return {};
     return QZQStringIfString(
-               CFDictionaryGetValue(static_cast<CFDictionaryRef>(descriptor), kFontNameAttribute))
+               CFDictionaryGetValue(static_cast<CFDictionaryRef>(descriptor), NSFontNameAttribute))
         .toStdString();
 }
 
@@ -63,10 +61,10 @@ CFDictionaryRef CreateMatchedDescriptor(const QZInstalledFont& font) {
     CFMutableDictionaryRef descriptor = CFDictionaryCreateMutable(
         kCFAllocatorDefault, 0, &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks);
     TCFRetained<CFStringRef> name(CreateString(font.postScriptName), kAdopted);
-    CFDictionarySetValue(descriptor, kFontNameAttribute, name);
+    CFDictionarySetValue(descriptor, NSFontNameAttribute, name);
     if (!font.family.empty()) {
         TCFRetained<CFStringRef> family(CreateString(font.family), kAdopted);
-        CFDictionarySetValue(descriptor, kFontFamilyAttribute, family);
+        CFDictionarySetValue(descriptor, NSFontFamilyAttribute, family);
     }
     return descriptor;
 }

@@ -10,8 +10,8 @@
 #include <iostream>
 #include <iterator>
 
-#include "UIAgent/QZUIProperties.h"
 #include "platform/CFMessagePort.h"
+#include "protocol/QZUIProtocol.h"
 #include "serialization/TCFFlattenContext.h"
 #include "serialization/TCFResurrectContext.h"
 #include "tools/TaggedJSON.h"
@@ -34,7 +34,7 @@ namespace {
 using Json = nlohmann::ordered_json;
 
 struct PortOptions {
-    std::string name = kQZUIAgentPortName;
+    std::string name = kQZUIAgentPortNameText;
     CFTimeInterval receiveTimeout = kCFMessagePortWaitForever;
     CFTimeInterval sendTimeout = 10;
     bool compact = false;

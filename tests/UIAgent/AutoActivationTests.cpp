@@ -9,7 +9,7 @@
 #include <sys/stat.h>
 
 #include "UIAgent/QZAutoActivationConfirmation.h"
-#include "UIAgent/QZUIProperties.h"
+#include "protocol/QZUIProtocol.h"
 #include "tests/UIAgent/AlertTestSupport.h"
 #include "tests/UIAgent/QtTestEnvironment.h"
 #include "tests/support/PrivateSessionBus.h"

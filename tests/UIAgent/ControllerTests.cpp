@@ -11,7 +11,7 @@
 #include "UIAgent/QZTerminationRequests.h"
 #include "UIAgent/QZUIAgentHandleMessage.h"
 #include "UIAgent/QZUIController.h"
-#include "UIAgent/QZUIProperties.h"
+#include "protocol/QZUIProtocol.h"
 #include "tests/UIAgent/AgentTestSupport.h"
 #include "tests/UIAgent/QtTestEnvironment.h"
 #include "tests/support/LogCapture.h"
@@ -64,7 +64,7 @@ TEST_F(ControllerTest, LaunchingCreatesAndServesThePortAndSetsTheSharedControlle
     SInt32 status = 1;
     CFDataRef reply = nullptr;
     std::thread client([&] {
-        CFMessagePortRef remote = CFMessagePortCreateRemote(nullptr, CFSTR(kQZUIAgentPortName));
+        CFMessagePortRef remote = CFMessagePortCreateRemote(nullptr, kQZUIAgentPortName);
         if (!remote)
             return;
         status = CFMessagePortSendRequest(remote, 3, nullptr, 5, 5, kCFRunLoopDefaultMode, &reply);
@@ -99,7 +99,7 @@ TEST_F(ControllerTest, ASecondLaunchReportsTheFailedCheckAndKeepsThePort) {
 
 TEST_F(ControllerTest, ATakenNameIsLoggedAndTheAgentRunsOnWithoutAPort) {
     CFMessagePortContext context = {0, nullptr, nullptr, nullptr, nullptr};
-    CFMessagePortRef other = CFMessagePortCreateLocal(nullptr, CFSTR(kQZUIAgentPortName),
+    CFMessagePortRef other = CFMessagePortCreateLocal(nullptr, kQZUIAgentPortName,
                                                       QZUIAgentHandleMessage, &context, nullptr);
     ASSERT_NE(other, nullptr);
     LogCapture log;
@@ -127,7 +127,7 @@ TEST_F(ControllerTest, DestroyingTheControllerClearsTheSharedPointerAndInvalidat
     // Also when the port could not be made: no dangling shared pointer.
     auto second = std::make_unique<QZUIController>();
     CFMessagePortContext context = {0, nullptr, nullptr, nullptr, nullptr};
-    CFMessagePortRef other = CFMessagePortCreateLocal(nullptr, CFSTR(kQZUIAgentPortName),
+    CFMessagePortRef other = CFMessagePortCreateLocal(nullptr, kQZUIAgentPortName,
                                                       QZUIAgentHandleMessage, &context, nullptr);
     second->applicationWillFinishLaunching();
     second.reset();

@@ -15,7 +15,7 @@
 #include "UIAgent/QZLocalizedString.h"
 #include "UIAgent/QZUIAgentHandleMessage.h"
 #include "UIAgent/QZUIController.h"
-#include "UIAgent/QZUIProperties.h"
+#include "protocol/QZUIProtocol.h"
 #include "tests/UIAgent/AgentTestSupport.h"
 #include "tests/UIAgent/QtTestEnvironment.h"
 #include "tests/support/LogCapture.h"
@@ -273,7 +273,7 @@ public:
     Client(SInt32 msgid, CFTypeRef request, CFTimeInterval receiveTimeout)
         : bytes_(Flattened(request)) {
         thread_ = std::thread([this, msgid, receiveTimeout] {
-            CFMessagePortRef remote = CFMessagePortCreateRemote(nullptr, CFSTR(kQZUIAgentPortName));
+            CFMessagePortRef remote = CFMessagePortCreateRemote(nullptr, kQZUIAgentPortName);
             if (remote) {
                 status_ = CFMessagePortSendRequest(remote, msgid, bytes_.as<CFDataRef>(), 5,
                                                    receiveTimeout, kCFRunLoopDefaultMode, &reply_);

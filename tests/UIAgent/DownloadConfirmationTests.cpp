@@ -11,7 +11,7 @@
 #include <unistd.h>
 
 #include "UIAgent/QZFontDownloadConfirmation.h"
-#include "UIAgent/QZUIProperties.h"
+#include "protocol/QZUIProtocol.h"
 #include "tests/UIAgent/AlertTestSupport.h"
 #include "tests/UIAgent/QtTestEnvironment.h"
 

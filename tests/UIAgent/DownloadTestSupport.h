@@ -15,7 +15,7 @@
 
 #include "UIAgent/QZModalSession.h"
 #include "UIAgent/QZUIAgentHandleMessage.h"
-#include "UIAgent/QZUIProperties.h"
+#include "protocol/QZUIProtocol.h"
 #include "tests/UIAgent/AgentTestSupport.h"
 #include "tests/support/Values.h"
 
