@@ -1,0 +1,147 @@
+#!/usr/bin/python3
+"""End-to-end: the agent driven through the real accessibility bus, as a screen reader user
+would, under a private X server and a private session bus (the bus launcher activated through
+it). The alert of each question is found by its role and read; its checkbox is toggled and a
+button pressed through the bus, each once it is enabled (the alerts ignore presses for a moment
+after showing). Allow with "don't ask again" replies Result 1, Suppress 1; Download opens the
+progress window, whose Cancel, pressed through the bus while the transfer is held, replies
+Result 0. Skipped (77) without Xvfb, dbus-run-session, at-spi2-core or pyatspi.
+
+usage: accessibility.py AGENT GLYPHWELL"""
+import os
+import shutil
+import sys
+
+sys.path.insert(0, os.path.dirname(os.path.abspath(__file__)))
+from e2e_support import (CANDIDATE_FONT, DOWNLOAD_NAME, Failure, Run, main, skip,  # noqa: E402
+                         wait_for)
+
+PRIVATE_BUS = "GLYPHWELL_E2E_PRIVATE_BUS"
+
+
+def accessible(pyatspi, pid):
+    """Finders over the accessible tree of the application with process id `pid`."""
+
+    def application():
+        desktop = pyatspi.Registry.getDesktop(0)
+        for app in desktop:
+            if app is not None and app.get_process_id() == pid:
+                return app
+        return None
+
+    def showing(node):
+        return node.getState().contains(pyatspi.STATE_SHOWING)
+
+    def find(role, name=None, within=None):
+        """The first showing descendant with `role` (and `name`), else None."""
+        root = within or application()
+        if root is None:
+            return None
+        return pyatspi.findDescendant(
+            root, lambda n: n is not None and n.getRole() == role and showing(n)
+            and (name is None or n.name == name))
+
+    def texts(node):
+        """The names of the labels under `node`."""
+        return [label.name for label in pyatspi.findAllDescendants(
+            node, lambda n: n is not None and n.getRole() == pyatspi.ROLE_LABEL)]
+
+    def act(node, action):
+        """Waits until `node` is enabled and sensitive, then does its action named `action`."""
+        wait_for(f"{node.name!r} to be enabled", lambda: all(
+            node.getState().contains(state)
+            for state in (pyatspi.STATE_ENABLED, pyatspi.STATE_SENSITIVE)), timeout=10)
+        actions = node.queryAction()
+        names = [actions.getName(i) for i in range(actions.nActions)]
+        if action not in names:
+            raise Failure(f"{node.name!r} offers {names}, not {action}")
+        actions.doAction(names.index(action))
+
+    return find, texts, act
+
+
+def test(agent, tool):
+    import pyatspi
+
+    with Run("accessibility") as run:
+        display_read, display_write = os.pipe()
+        run.start("xvfb", ["Xvfb", "-displayfd", str(display_write), "-screen", "0",
+                           "1024x768x24", "-nolisten", "tcp"], pass_fds=(display_write,))
+        os.close(display_write)
+        with os.fdopen(display_read) as display:
+            number = display.readline().strip()
+        if not number:
+            raise Failure("Xvfb did not start")
+
+        # Asking for the desktop starts the accessibility bus before the agent looks for it.
+        pyatspi.Registry.getDesktop(0)
+        env = dict(run.env, DISPLAY=f":{number}", QT_QPA_PLATFORM="xcb",
+                   QT_LINUX_ACCESSIBILITY_ALWAYS_ON="1")
+        env.pop("WAYLAND_DISPLAY", None)
+        process = run.start_agent(agent, env)
+        server = run.serve_download_font()
+        find, texts, act = accessible(pyatspi, process.pid)
+
+        # Message id 1: read, "don't ask again" toggled, Allow pressed.
+        client = run.ask(tool, "activation", "ask-activation", "--candidate", CANDIDATE_FONT,
+                         "--font", "DejaVu Serif", "--app", "Demo Editor")
+        alert = wait_for("the activation alert", lambda: find(pyatspi.ROLE_ALERT))
+        words = texts(alert)
+        print(f"activation alert says: {words}")
+        if not any("Demo Editor" in text and "DejaVu Serif" in text for text in words):
+            raise Failure("no text of the alert names the application and the font")
+        allow = find(pyatspi.ROLE_PUSH_BUTTON, "Allow", alert)
+        check_box = find(pyatspi.ROLE_CHECK_BOX, within=alert)
+        if not allow or not check_box:
+            raise Failure("the alert has no Allow button or no checkbox")
+        act(check_box, "Toggle")
+        wait_for("the checkbox to be checked",
+                 lambda: check_box.getState().contains(pyatspi.STATE_CHECKED), timeout=10)
+        act(allow, "Press")
+        if run.reply(client, "activation") != (1, 1):
+            raise Failure("Allow with \"don't ask again\" did not reply Result 1, Suppress 1")
+
+        # Message id 2: Download pressed; then Cancel in the progress window, the transfer held.
+        client = run.ask(tool, "download", "ask-download", "--font",
+                         f"{DOWNLOAD_NAME}:DejaVu Serif", "--app", "Demo Editor")
+        alert = wait_for("the download alert", lambda: find(pyatspi.ROLE_ALERT))
+        print(f"download alert says: {texts(alert)}")
+        act(find(pyatspi.ROLE_PUSH_BUTTON, "Download", alert), "Press")
+        wait_for("the font request", server.started.is_set)
+        cancel = wait_for("the progress window's Cancel",
+                          lambda: find(pyatspi.ROLE_PUSH_BUTTON, "Cancel"))
+        bar = wait_for("the progress bar", lambda: find(pyatspi.ROLE_PROGRESS_BAR))
+        if not bar.name:
+            raise Failure("the progress bar has no accessible name")
+        act(cancel, "Press")
+        if run.reply(client, "download")[0] != 0:
+            raise Failure("Cancel in the progress window did not reply Result 0")
+        left = [name for _, _, files in os.walk(run.path("home")) for name in files]
+        if left:
+            raise Failure(f"the cancelled download left {left} behind")
+
+
+def requirements():
+    """Skips unless everything the test needs is here."""
+    for program in ("Xvfb", "dbus-run-session"):
+        if not shutil.which(program):
+            skip(f"{program} is not installed")
+    if not any(os.path.exists(os.path.join(folder, "at-spi-bus-launcher"))
+               for folder in ("/usr/libexec", "/usr/lib/at-spi2-core")):
+        skip("at-spi2-core is not installed")
+    try:
+        import pyatspi  # noqa: F401  (imported here without a bus: it connects lazily)
+    except ImportError:
+        skip("python3-pyatspi is not installed")
+
+
+if __name__ == "__main__":
+    if len(sys.argv) != 3:
+        sys.exit(__doc__.splitlines()[-1])
+    if os.environ.get(PRIVATE_BUS) != "1":
+        requirements()
+        # A private session bus (and so a private accessibility bus) for this run alone.
+        os.environ[PRIVATE_BUS] = "1"
+        os.execvp("dbus-run-session", ["dbus-run-session", "--", sys.executable,
+                                       os.path.abspath(__file__), *sys.argv[1:]])
+    main(lambda: test(*sys.argv[1:]))
