@@ -13,8 +13,8 @@ import shutil
 import sys
 
 sys.path.insert(0, os.path.dirname(os.path.abspath(__file__)))
-from e2e_support import (CANDIDATE_FONT, DOWNLOAD_NAME, Failure, Run, main, skip,  # noqa: E402
-                         wait_for)
+from e2e_support import (CANDIDATE_FONT, DOWNLOAD_NAME, Failure, Run, check_running,  # noqa: E402
+                         main, skip, wait_for)
 
 PRIVATE_BUS = "GLYPHWELL_E2E_PRIVATE_BUS"
 
@@ -78,9 +78,9 @@ def test(agent, tool):
         env = dict(run.env, DISPLAY=f":{number}", QT_QPA_PLATFORM="xcb",
                    QT_LINUX_ACCESSIBILITY_ALWAYS_ON="1")
         env.pop("WAYLAND_DISPLAY", None)
-        process = run.start_agent(agent, env)
+        agent_process = run.start_agent(agent, env)
         server = run.serve_download_font()
-        find, texts, act = accessible(pyatspi, process.pid)
+        find, texts, act = accessible(pyatspi, agent_process.pid)
 
         # Message id 1: read, "don't ask again" toggled, Allow pressed.
         client = run.ask(tool, "activation", "ask-activation", "--candidate", CANDIDATE_FONT,
@@ -119,6 +119,7 @@ def test(agent, tool):
         left = [name for _, _, files in os.walk(run.path("home")) for name in files]
         if left:
             raise Failure(f"the cancelled download left {left} behind")
+        check_running(agent_process)
 
 
 def requirements():

@@ -122,7 +122,8 @@ class Run:
             f.write(
                 '<?xml version="1.0"?>\n<!DOCTYPE fontconfig SYSTEM "fonts.dtd">\n<fontconfig>\n'
                 '  <include ignore_missing="yes">/etc/fonts/fonts.conf</include>\n'
-                f"  <selectfont><rejectfont><glob>{DOWNLOAD_FONT}</glob></rejectfont></selectfont>\n"
+                f"  <selectfont><rejectfont><glob>{DOWNLOAD_FONT}</glob></rejectfont>"
+                "</selectfont>\n"
                 "</fontconfig>\n"
             )
 
@@ -187,8 +188,10 @@ class Run:
         return process
 
     def ask(self, tool, name, *arguments):
-        """Sends a request with the glyphwell tool in the background; its reply goes to NAME.reply."""
-        with open(self.path(name + ".reply"), "wb") as out, open(self.path(name + ".err"), "wb") as err:
+        """Sends a request with the glyphwell tool in the background: its reply goes to
+        NAME.reply, its errors to NAME.err."""
+        with open(self.path(name + ".reply"), "wb") as out, \
+                open(self.path(name + ".err"), "wb") as err:
             process = subprocess.Popen(
                 [tool, *arguments, "--compact", "--timeout", "60"],
                 env=self.env, stdout=out, stderr=err,
@@ -209,6 +212,12 @@ class Run:
         value = json.loads(text)
         return tuple(value.get(key, {}).get("$number") for key in
                      ("QZUIPropertyResult", "QZUIPropertySuppress"))
+
+
+def check_running(process):
+    """Fails when the agent ended (it must outlive its replies by 10 s)."""
+    if process.poll() is not None:
+        raise Failure(f"the agent ended with status {process.returncode} after its replies")
 
 
 def stop(process, grace=3.0):

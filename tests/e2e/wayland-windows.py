@@ -14,8 +14,8 @@ import shutil
 import sys
 
 sys.path.insert(0, os.path.dirname(os.path.abspath(__file__)))
-from e2e_support import (CANDIDATE_FONT, DOWNLOAD_NAME, Failure, Run, main, skip,  # noqa: E402
-                         stop, wait_for)
+from e2e_support import (CANDIDATE_FONT, DOWNLOAD_NAME, Failure, Run, check_running,  # noqa: E402
+                         main, skip, stop, wait_for)
 
 REQUEST = re.compile(r"-> (\w+)@(\d+)\.(\w+)\((.*)\)\s*$")
 NEW_ID = re.compile(r"new id (\w+)@(\d+)")
@@ -89,7 +89,7 @@ def test(agent, tool):
         env = dict(run.env, QT_QPA_PLATFORM="wayland", WAYLAND_DISPLAY=socket_name,
                    WAYLAND_DEBUG="client")
         env.pop("DISPLAY", None)
-        run.start_agent(agent, env)
+        agent_process = run.start_agent(agent, env)
         server = run.serve_download_font()
 
         def next_toplevel(seen, done=lambda record: record["mapped"]):
@@ -123,6 +123,7 @@ def test(agent, tool):
         result, _ = run.reply(client, "progress")
         if result != 1:
             raise Failure(f"the download's Result is {result}, not 1")
+        check_running(agent_process)
 
 
 if __name__ == "__main__":
