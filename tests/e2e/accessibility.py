@@ -9,6 +9,7 @@ Result 0. Skipped (77) without Xvfb, dbus-run-session, at-spi2-core or pyatspi.
 
 usage: accessibility.py AGENT GLYPHWELL"""
 import os
+import re
 import shutil
 import sys
 
@@ -42,7 +43,11 @@ def accessible(pyatspi, pid):
             and (name is None or n.name == name))
 
     def texts(node):
-        """The names of the labels under `node`."""
+        """The names of the labels under `node`; fails when any name under it is a bare
+        translation key (a text that no table covers)."""
+        for child in pyatspi.findAllDescendants(node, lambda n: n is not None):
+            if child.name.startswith("QZ_"):
+                raise Failure(f"a {child.getRoleName()} is named with the key {child.name}")
         return [label.name for label in pyatspi.findAllDescendants(
             node, lambda n: n is not None and n.getRole() == pyatspi.ROLE_LABEL)]
 
@@ -58,6 +63,22 @@ def accessible(pyatspi, pid):
         actions.doAction(names.index(action))
 
     return find, texts, act
+
+
+def seconds_left(countdown):
+    """The seconds that the countdown's accessible description (else its name) says are left."""
+    for text in (countdown.description, countdown.name):
+        match = re.search(r"(\d+):(\d\d)", text or "")
+        if match:
+            return int(match[1]) * 60 + int(match[2])
+    raise Failure(f"the countdown says no time: {countdown.name!r}, {countdown.description!r}")
+
+
+def find_document(find):
+    """The help page, exposed as a document of any kind."""
+    import pyatspi
+    return any(find(role) for role in (pyatspi.ROLE_DOCUMENT_FRAME, pyatspi.ROLE_DOCUMENT_TEXT,
+                                       pyatspi.ROLE_DOCUMENT_WEB))
 
 
 def test(agent, tool):
@@ -82,7 +103,8 @@ def test(agent, tool):
         server = run.serve_download_font()
         find, texts, act = accessible(pyatspi, agent_process.pid)
 
-        # Message id 1: read, "don't ask again" toggled, Allow pressed.
+        # Message id 1: read; the countdown must be a status region, and toggling "don't ask
+        # again" through the bus must restart it; the help opens as a document; Allow pressed.
         client = run.ask(tool, "activation", "ask-activation", "--candidate", CANDIDATE_FONT,
                          "--font", "DejaVu Serif", "--app", "Demo Editor")
         alert = wait_for("the activation alert", lambda: find(pyatspi.ROLE_ALERT))
@@ -94,9 +116,17 @@ def test(agent, tool):
         check_box = find(pyatspi.ROLE_CHECK_BOX, within=alert)
         if not allow or not check_box:
             raise Failure("the alert has no Allow button or no checkbox")
+        countdown = find(pyatspi.ROLE_STATUS_BAR, within=alert)
+        if not countdown:
+            raise Failure("the alert's countdown is not exposed as a status region")
+        wait_for("the countdown to run", lambda: seconds_left(countdown) <= 118, timeout=10)
         act(check_box, "Toggle")
         wait_for("the checkbox to be checked",
                  lambda: check_box.getState().contains(pyatspi.STATE_CHECKED), timeout=10)
+        wait_for("the toggle to restart the countdown", lambda: seconds_left(countdown) >= 119,
+                 timeout=5)
+        act(find(pyatspi.ROLE_PUSH_BUTTON, "Help", alert), "Press")
+        wait_for("the help document", lambda: find_document(find))
         act(allow, "Press")
         if run.reply(client, "activation") != (1, 1):
             raise Failure("Allow with \"don't ask again\" did not reply Result 1, Suppress 1")
