@@ -1,9 +1,10 @@
 #!/usr/bin/python3
 """End-to-end: the agent driven through the real accessibility bus, as a screen reader user
 would, under a private X server and a private session bus (the bus launcher activated through
-it). The alert of each question is found by its role and read; its checkbox is toggled and a
-button pressed through the bus, each once it is enabled (the alerts ignore presses for a moment
-after showing). Allow with "don't ask again" replies Result 1, Suppress 1; Download opens the
+it). The alert of each question is found by its role and read (no text a bare translation key);
+its checkbox is toggled and a button pressed through the bus, each once it is enabled (the alerts
+ignore presses for a moment after showing). The countdown must be a status region that the
+toggle restarts, and the help a document. Allow with "don't ask again" replies Result 1, Suppress 1; Download opens the
 progress window, whose Cancel, pressed through the bus while the transfer is held, replies
 Result 0. Skipped (77) without Xvfb, dbus-run-session, at-spi2-core or pyatspi.
 

@@ -2,10 +2,9 @@
 """End-to-end: the agent on a headless Wayland compositor started here (weston's headless
 backend, a socket of its own, no X display). The client side of the protocol (WAYLAND_DEBUG)
 must show each window mapped as an xdg toplevel with a title of its own (not the program's name
-nor an untranslated key),
-the agent's application id and a fixed size (minimum == maximum), a buffer attached. Both
-questions are answered by withdrawal: their client is killed, the alert goes away, and the next
-request is served. A download that asks nothing shows the progress window, and its reply says
+nor an untranslated key), the agent's application id and a fixed size (minimum == maximum), a
+buffer attached. Both questions are answered by withdrawal: their client is killed, the alert
+goes away, and the next request is served. A download that asks nothing shows the progress window, and its reply says
 Result 1 once the held transfer is released. Skipped (77) without weston.
 
 usage: wayland-windows.py AGENT GLYPHWELL"""
