@@ -76,6 +76,11 @@ def check_window(record, kind, title=None):
                       f"maximum {record['max']}")
 
 
+def has_default_route():
+    with open("/proc/net/route") as routes:
+        return any(line.split()[1] == "00000000" for line in list(routes)[1:])
+
+
 def test(agent, tool):
     weston = shutil.which("weston")
     if not weston:
@@ -115,6 +120,10 @@ def test(agent, tool):
             seen += 1
 
         # Nothing asked: the progress window follows the transfer, held until it is seen.
+        # Offline, an alert would come first, which nothing here can answer.
+        if not has_default_route():
+            print("no default route: the progress window is not checked")
+            return
         client = run.ask(tool, "progress", "ask-download", "--font", DOWNLOAD_NAME, "--suppress",
                          "--app", "Demo")
         wait_for("the font request", server.started.is_set)
