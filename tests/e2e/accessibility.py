@@ -36,12 +36,14 @@ def accessible(pyatspi, pid):
 
     def find(role, name=None, within=None):
         """The first showing descendant with `role` (and `name`), else None."""
-        root = within or application()
-        if root is None:
-            return None
-        return pyatspi.findDescendant(
-            root, lambda n: n is not None and n.getRole() == role and showing(n)
-            and (name is None or n.name == name))
+        from gi.repository import GLib
+        try:
+            root = within or application()
+            return root and pyatspi.findDescendant(
+                root, lambda n: n is not None and n.getRole() == role and showing(n)
+                and (name is None or n.name == name))
+        except GLib.Error:
+            return None  # a window went away while it was walked: the caller asks again
 
     def texts(node):
         """The names of the labels under `node`; fails when any name under it is a bare
