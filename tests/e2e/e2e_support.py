@@ -20,6 +20,8 @@ PORT_NAME = "org.glyphwell.Glyphwell.GlyphwellUIAgent"
 CANDIDATE_FONT = "/usr/share/fonts/truetype/dejavu/DejaVuSerif.ttf"
 DOWNLOAD_FONT = "/usr/share/fonts/truetype/dejavu/DejaVuSerif-Bold.ttf"
 DOWNLOAD_NAME = "DejaVuSerif-Bold"
+# A font that the catalog offers from a file that the server does not have: its download fails.
+MISSING_NAME = "GlyphwellMissing-Regular"
 
 
 class Failure(Exception):
@@ -159,7 +161,7 @@ class Run:
         return process
 
     def serve_download_font(self):
-        """Starts the font server and lists its font in a one-font catalog."""
+        """Starts the font server and lists its font in the catalog, with a font it lacks."""
         self.server = FontServer(DOWNLOAD_FONT)
         with open(DOWNLOAD_FONT, "rb") as f:
             data = f.read()
@@ -170,8 +172,15 @@ class Run:
             "sha256": hashlib.sha256(data).hexdigest(),
             "fonts": [{"postScriptName": DOWNLOAD_NAME, "family": "DejaVu Serif"}],
         }
+        missing = {
+            "LocalID": "org.glyphwell.e2e.Missing",
+            "url": self.server.url.replace(self.server.name, "missing.ttf"),
+            "size": 1000,
+            "sha256": "0" * 64,
+            "fonts": [{"postScriptName": MISSING_NAME, "family": "Glyphwell Missing"}],
+        }
         with open(self.path("data/glyphwell/downloadable-fonts.json"), "w") as f:
-            json.dump({"assets": [asset]}, f)
+            json.dump({"assets": [asset, missing]}, f)
         return self.server
 
     def start_agent(self, agent, env):

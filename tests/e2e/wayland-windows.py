@@ -5,7 +5,8 @@ must show each window mapped as an xdg toplevel with a title of its own (not the
 nor an untranslated key), the agent's application id and a fixed size (minimum == maximum), a
 buffer attached. Both questions are answered by withdrawal: their client is killed, the alert
 goes away, and the next request is served. A download that asks nothing shows the progress window, and its reply says
-Result 1 once the held transfer is released. Skipped (77) without weston.
+Result 1 once the held transfer is released; a font whose file is missing brings the download
+error alert, withdrawn in turn. Skipped (77) without weston.
 
 usage: wayland-windows.py AGENT GLYPHWELL"""
 import os
@@ -14,8 +15,8 @@ import shutil
 import sys
 
 sys.path.insert(0, os.path.dirname(os.path.abspath(__file__)))
-from e2e_support import (CANDIDATE_FONT, DOWNLOAD_NAME, Failure, Run, check_running,  # noqa: E402
-                         main, skip, stop, wait_for)
+from e2e_support import (CANDIDATE_FONT, DOWNLOAD_NAME, MISSING_NAME, Failure, Run,  # noqa: E402
+                         check_running, main, skip, stop, wait_for)
 
 REQUEST = re.compile(r"-> (\w+)@(\d+)\.(\w+)\((.*)\)\s*$")
 NEW_ID = re.compile(r"new id (\w+)@(\d+)")
@@ -134,6 +135,14 @@ def test(agent, tool):
         result, _ = run.reply(client, "progress")
         if result != 1:
             raise Failure(f"the download's Result is {result}, not 1")
+
+        # A font that fails: after its progress window, the error alert, withdrawn.
+        client = run.ask(tool, "failure", "ask-download", "--font", MISSING_NAME, "--suppress",
+                         "--app", "Demo")
+        found = next_toplevel(len(found) + 1)
+        check_window(found[-1], "download error alert")
+        stop(client)
+        next_toplevel(len(found) - 1, lambda record: record["destroyed"])
         check_running(agent_process)
 
 
