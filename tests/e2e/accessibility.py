@@ -50,7 +50,7 @@ def accessible(pyatspi, pid):
         translation key (a text that no table covers)."""
         for child in [node, *pyatspi.findAllDescendants(node, lambda n: n is not None)]:
             if child.name.startswith("QZ_"):
-                raise Failure(f"a text that no table covers: the {child.getRoleName()} {child.name}")
+                raise Failure(f"no table covers the {child.getRoleName()} {child.name}")
         return [label.name for label in pyatspi.findAllDescendants(
             node, lambda n: n is not None and n.getRole() == pyatspi.ROLE_LABEL)]
 

@@ -4,9 +4,9 @@ backend, a socket of its own, no X display). The client side of the protocol (WA
 must show each window mapped as an xdg toplevel with a title of its own (not the program's name
 nor an untranslated key), the agent's application id and a fixed size (minimum == maximum), a
 buffer attached. Both questions are answered by withdrawal: their client is killed, the alert
-goes away, and the next request is served. A download that asks nothing shows the progress window, and its reply says
-Result 1 once the held transfer is released; a font whose file is missing brings the download
-error alert, withdrawn in turn. Skipped (77) without weston.
+goes away, and the next request is served. A download that asks nothing shows the progress
+window, and its reply says Result 1 once the held transfer is released; a font whose file is
+missing brings the download error alert, withdrawn in turn. Skipped (77) without weston.
 
 usage: wayland-windows.py AGENT GLYPHWELL"""
 import os
