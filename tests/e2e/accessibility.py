@@ -14,6 +14,7 @@ import re
 import shutil
 import sys
 
+sys.dont_write_bytecode = True  # no cache files in the source tree
 sys.path.insert(0, os.path.dirname(os.path.abspath(__file__)))
 from e2e_support import (CANDIDATE_FONT, DOWNLOAD_NAME, Failure, Run, check_running,  # noqa: E402
                          main, skip, wait_for)

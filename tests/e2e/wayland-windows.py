@@ -14,6 +14,7 @@ import re
 import shutil
 import sys
 
+sys.dont_write_bytecode = True  # no cache files in the source tree
 sys.path.insert(0, os.path.dirname(os.path.abspath(__file__)))
 from e2e_support import (CANDIDATE_FONT, DOWNLOAD_NAME, MISSING_NAME, Failure, Run,  # noqa: E402
                          check_running, main, skip, stop, wait_for)
