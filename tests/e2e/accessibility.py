@@ -9,6 +9,7 @@ the time left, and the help a document. Allow with "don't ask again" replies Res
 is held, replies Result 0. Skipped (77) without Xvfb, dbus-run-session, at-spi2-core or pyatspi.
 
 usage: accessibility.py AGENT GLYPHWELL"""
+import importlib.util
 import os
 import re
 import shutil
@@ -170,9 +171,7 @@ def requirements():
     if not any(os.path.exists(os.path.join(folder, "at-spi-bus-launcher"))
                for folder in ("/usr/libexec", "/usr/lib/at-spi2-core")):
         skip("at-spi2-core is not installed")
-    try:
-        import pyatspi  # noqa: F401  (imported here without a bus: it connects lazily)
-    except ImportError:
+    if importlib.util.find_spec("pyatspi") is None:
         skip("python3-pyatspi is not installed")
 
 
