@@ -23,42 +23,56 @@ REQUEST = re.compile(r"-> (\w+)@(\d+)\.(\w+)\((.*)\)\s*$")
 NEW_ID = re.compile(r"new id (\w+)@(\d+)")
 
 
-def toplevels(log):
-    """The xdg toplevels that a WAYLAND_DEBUG=client log shows the client creating, in order:
-    title, application id, minimum and maximum size, whether a buffer was attached to its surface
-    while it lived, and whether it was destroyed."""
-    shell_surfaces = {}  # xdg_surface id -> wl_surface id
-    live = {}  # xdg_toplevel id -> its record
-    on_surface = {}  # wl_surface id -> the record of the toplevel living on it
-    found = []
-    for line in log.splitlines():
-        match = REQUEST.search(line)
-        if not match:
-            continue
-        interface, object_id, request, arguments = match.groups()
+class ProtocolLog:
+    """The xdg toplevels that a WAYLAND_DEBUG=client log shows the client creating, in order,
+    read as the log grows: title, application id, minimum and maximum size, whether a buffer was
+    attached to its surface while it lived, and whether it was destroyed."""
+
+    def __init__(self, path):
+        self.path, self.offset, self.partial = path, 0, b""
+        self.shell_surfaces = {}  # xdg_surface id -> wl_surface id
+        self.live = {}  # xdg_toplevel id -> its record
+        self.on_surface = {}  # wl_surface id -> the record of the toplevel living on it
+        self.toplevels = []
+
+    def update(self):
+        """Reads the lines added since the last call; returns every toplevel so far."""
+        with open(self.path, "rb") as log:
+            log.seek(self.offset)
+            data = log.read()
+        self.offset += len(data)
+        lines = (self.partial + data).split(b"\n")
+        self.partial = lines.pop()
+        for line in lines:
+            match = REQUEST.search(line.decode("utf-8", "replace"))
+            if match:
+                self.request(*match.groups())
+        return self.toplevels
+
+    def request(self, interface, object_id, request, arguments):
         new = NEW_ID.search(arguments)
         if interface == "xdg_wm_base" and request == "get_xdg_surface" and new:
-            shell_surfaces[new.group(2)] = re.search(r"wl_surface@(\d+)", arguments).group(1)
+            surface = re.search(r"wl_surface@(\d+)", arguments).group(1)
+            self.shell_surfaces[new.group(2)] = surface
         elif interface == "xdg_surface" and request == "get_toplevel" and new:
             record = dict(title=None, app_id=None, min=None, max=None, mapped=False,
-                          destroyed=False, surface=shell_surfaces.get(object_id))
-            live[new.group(2)] = record
-            on_surface[record["surface"]] = record
-            found.append(record)
-        elif interface == "xdg_toplevel" and object_id in live:
-            record = live[object_id]
+                          destroyed=False, surface=self.shell_surfaces.get(object_id))
+            self.live[new.group(2)] = record
+            self.on_surface[record["surface"]] = record
+            self.toplevels.append(record)
+        elif interface == "xdg_toplevel" and object_id in self.live:
+            record = self.live[object_id]
             if request in ("set_title", "set_app_id"):
                 record[request[4:]] = arguments[1:-1]  # the quoted string
             elif request in ("set_min_size", "set_max_size"):
                 record[request[4:7]] = tuple(int(n) for n in arguments.split(","))
             elif request == "destroy":
                 record["destroyed"] = True
-                del live[object_id]
-                on_surface.pop(record["surface"], None)
-        elif interface == "wl_surface" and request == "attach" and object_id in on_surface:
+                del self.live[object_id]
+                self.on_surface.pop(record["surface"], None)
+        elif interface == "wl_surface" and request == "attach" and object_id in self.on_surface:
             if not arguments.startswith("nil"):
-                on_surface[object_id]["mapped"] = True
-    return found
+                self.on_surface[object_id]["mapped"] = True
 
 
 def check_window(record, kind, title=None):
@@ -101,10 +115,12 @@ def test(agent, tool):
         agent_process = run.start_agent(agent, env)
         server = run.serve_download_font()
 
+        log = ProtocolLog(run.path("agent.log"))
+
         def next_toplevel(seen, done=lambda record: record["mapped"]):
             """Waits for a toplevel beyond the first `seen` ones to satisfy `done`."""
             def ready():
-                found = toplevels(run.read("agent.log"))
+                found = log.update()
                 return len(found) > seen and done(found[seen]) and found
             return wait_for(f"window {seen + 1} to map", ready)
 
