@@ -42,9 +42,9 @@ set(CPACK_DEBIAN_FILE_NAME DEB-DEFAULT)
 set(CPACK_DEBIAN_PACKAGE_SECTION utils)
 set(CPACK_DEBIAN_PACKAGE_PRIORITY optional)
 set(CPACK_PACKAGE_DESCRIPTION_SUMMARY "font consent agent for desktop applications")
+# The summary is the Description's first line; this is the text below it.
 set(CPACK_DEBIAN_PACKAGE_DESCRIPTION
-    "font consent agent for desktop applications
-Glyphwell is the user-interface agent of a font registry: when an application
+    "Glyphwell is the user-interface agent of a font registry: when an application
 asks for a font that is not installed but was found in a file on disk, or for
 fonts that can be downloaded, the agent asks the user, shows the progress of
 the download, and answers. It is started on demand through a systemd user
@@ -61,8 +61,7 @@ if(GLYPHWELL_AGENT)
     set(CPACK_DEBIAN_PACKAGE_DEPENDS "qt6-qpa-plugins, qt6-wayland")
 endif()
 
-set(glyphwell_control_extra
-    ${glyphwell_debian_dir}/postinst ${glyphwell_debian_dir}/prerm ${glyphwell_debian_dir}/postrm)
+set(glyphwell_control_extra ${glyphwell_debian_dir}/postinst ${glyphwell_debian_dir}/postrm)
 # A shared library of ours (the client library) needs a shlibs file, so that packages built
 # against it depend on this one, and the ldconfig trigger, so that its links are made.
 if(TARGET glyphwell_client)
