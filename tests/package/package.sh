@@ -49,7 +49,7 @@ deb="$build/glyphwell_${version}_$(dpkg --print-architecture).deb"
 echo "built $(basename "$deb")"
 
 # --- lintian: errors fail; everything else is shown.
-lintian --fail-on error --display-info --no-tag-display-limit "$deb" >"$tmp/lintian.log" 2>&1
+lintian --fail-on error --display-info --tag-display-limit 0 "$deb" >"$tmp/lintian.log" 2>&1
 lintian_status=$?
 sed 's/^/lintian: /' "$tmp/lintian.log"
 [ "$lintian_status" = 0 ] || fail "lintian reports errors"
