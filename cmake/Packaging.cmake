@@ -61,7 +61,12 @@ if(GLYPHWELL_AGENT)
     set(CPACK_DEBIAN_PACKAGE_DEPENDS "qt6-qpa-plugins, qt6-wayland")
 endif()
 
-set(glyphwell_control_extra ${glyphwell_debian_dir}/postinst ${glyphwell_debian_dir}/postrm)
+# The maintainer scripts enable the agent's user socket: only a package with the agent has them.
+set(glyphwell_control_extra)
+if(GLYPHWELL_AGENT)
+    list(APPEND glyphwell_control_extra
+         ${glyphwell_debian_dir}/postinst ${glyphwell_debian_dir}/postrm)
+endif()
 # A shared library of ours (the client library) needs a shlibs file, so that packages built
 # against it depend on this one, and the ldconfig trigger, so that its links are made.
 if(TARGET glyphwell_client)

@@ -68,6 +68,17 @@ for file in usr/lib/systemd/user/$unit usr/lib/systemd/user/glyphwell-ui-agent.s
     usr/share/doc/glyphwell/changelog.Debian.gz usr/share/doc/glyphwell/help/index.html; do
     [ -s "$root/$file" ] || fail "/$file is missing"
 done
+# The client library, once built, is in the package with its development files, a shlibs file
+# for packages built against it, and the ldconfig trigger.
+multiarch=$(dpkg-architecture -qDEB_HOST_MULTIARCH)
+if compgen -G "$build/client/libglyphwell-client.so.*" >/dev/null; then
+    for file in usr/lib/$multiarch/libglyphwell-client.so.0 usr/include/glyphwell/client.h \
+        usr/lib/$multiarch/pkgconfig/glyphwell-client.pc; do
+        [ -e "$root/$file" ] || fail "/$file is missing"
+    done
+    grep -q '^libglyphwell-client 0 glyphwell ' "$tmp/control/shlibs" || fail "no shlibs entry"
+    grep -qx 'activate-noawait ldconfig' "$tmp/control/triggers" || fail "no ldconfig trigger"
+fi
 depends=$(sed -n 's/^Depends: //p' "$tmp/control/control")
 echo "Depends: $depends"
 for package in libc6 libqt6widgets6 libcurl4 libfontconfig1 qt6-qpa-plugins qt6-wayland; do
@@ -75,7 +86,7 @@ for package in libc6 libqt6widgets6 libcurl4 libfontconfig1 qt6-qpa-plugins qt6-
 done
 
 # The extracted tool finds a shared library of the package (the client library) in the root.
-export LD_LIBRARY_PATH="$root/usr/lib/$(dpkg-architecture -qDEB_HOST_MULTIARCH 2>/dev/null):$root/usr/lib"
+export LD_LIBRARY_PATH="$root/usr/lib/$multiarch"
 agent_path=$(sed -n 's/^ExecStart=//p' "$root/usr/lib/systemd/user/glyphwell-ui-agent.service")
 [ "$agent_path" = /usr/libexec/GlyphwellUIAgent ] || fail "ExecStart is $agent_path"
 desktop="$root/usr/share/applications/$app_id.desktop"
