@@ -7,6 +7,7 @@
 #include <sys/stat.h>
 #include <sys/wait.h>
 
+#include <algorithm>
 #include <chrono>
 #include <filesystem>
 #include <fstream>
@@ -16,6 +17,7 @@
 
 #include "platform/CFMessagePort.h"
 #include "platform/CFRunLoop.h"
+#include "platform/MessagePortWire.h"
 #include "support/LogCapture.h"
 #include "support/PortTestSupport.h"
 
@@ -763,4 +765,190 @@ TEST_F(MessagePortTest, AnswersEveryRequestOfManyConcurrentClients) {
         client.join();
     EXPECT_EQ(answered, kClients * kRequestsEach);
     EXPECT_EQ(handled, kClients * kRequestsEach);
+}
+
+TEST_F(MessagePortTest, ServesConnectionsInTurnAndDropsTheQueueOfAClientThatHungUp) {
+    std::vector<SInt32> handled;
+    LocalPort local(kName, [&](SInt32 msgid, CFDataRef data) {
+        handled.push_back(msgid);
+        return EchoWithMsgid(msgid, data);
+    });
+    ASSERT_NE(local.Port(), nullptr);
+    const int flood = RawConnect(SocketPath());
+    const int other = RawConnect(SocketPath());
+    ASSERT_GE(flood, 0);
+    ASSERT_GE(other, 0);
+    std::string frames;
+    for (int i = 0; i < 500; ++i)
+        frames += RequestFrame(1, "");
+    ASSERT_TRUE(RawWrite(flood, frames));
+    ASSERT_TRUE(RawWrite(other, RequestFrame(2, "")));
+    // The other client is served within the first round, not after the 500.
+    const auto answered = [](int descriptor) {
+        pollfd entry{descriptor, POLLIN, 0};
+        return poll(&entry, 1, 0) > 0;
+    };
+    ASSERT_TRUE(local.RunUntil([&] { return answered(other); }));
+    EXPECT_EQ(RawRead(other, 6), std::string("\x00\x00\x00\x02@2", 6));
+    const auto otherAt = std::find(handled.begin(), handled.end(), 2) - handled.begin();
+    EXPECT_LE(otherAt, 2);
+
+    // The flooding client hangs up: what it queued is dropped, not worked through.
+    close(flood);
+    ASSERT_TRUE(local.RunUntil([&] { return !glyphwell::port::IsReceivingRequest(local.Port()); }));
+    EXPECT_LT(std::count(handled.begin(), handled.end(), 1), 10);
+    ASSERT_TRUE(RawWrite(other, RequestFrame(3, "")));
+    ASSERT_TRUE(local.RunUntil([&] { return answered(other); }));
+    EXPECT_EQ(RawRead(other, 6), std::string("\x00\x00\x00\x02@3", 6));
+    close(other);
+}
+
+TEST_F(MessagePortTest, AClientThatShutsItsWritingSideDownStillGetsItsReplies) {
+    LogCapture log;
+    PortServer server(kName, EchoWithMsgid);
+    ASSERT_TRUE(server.Started());
+    const std::string midRequest =
+        "message port org.glyphwell.Test.Port: a client disconnected in the middle of a request";
+    struct Case {
+        std::string sent;    ///< before the shutdown
+        std::string replies; ///< then the end of the stream
+        std::vector<std::string> lines;
+    } cases[] = {
+        {RequestFrame(1, "q"), std::string("\x00\x00\x00\x03q@1", 7), {}},
+        {RequestFrame(1, "") + RequestFrame(2, "x") + std::string("\x00\x00\x00\x03\x00", 5),
+         std::string("\x00\x00\x00\x02@1\x00\x00\x00\x03x@2", 13),
+         {midRequest}},
+    };
+    for (const Case& test : cases) {
+        log.Clear();
+        const int client = RawConnect(SocketPath());
+        ASSERT_GE(client, 0);
+        ASSERT_TRUE(RawWrite(client, test.sent));
+        ASSERT_EQ(shutdown(client, SHUT_WR), 0);
+        EXPECT_EQ(RawRead(client, test.replies.size()), test.replies);
+        EXPECT_TRUE(RawSeesClose(client)) << "closed once everything is answered";
+        close(client);
+        EXPECT_EQ(log.Texts(), test.lines);
+    }
+}
+
+TEST_F(MessagePortTest, ClosesARequestThatStalledButNotOneThatKeepsComing) {
+    LogCapture log;
+    LocalPort local(kName, EchoWithMsgid);
+    ASSERT_NE(local.Port(), nullptr);
+    glyphwell::port::SetStallTimeout(local.Port(), std::chrono::milliseconds(300));
+    const int stalled = RawConnect(SocketPath());
+    const int slow = RawConnect(SocketPath());
+    ASSERT_GE(stalled, 0);
+    ASSERT_GE(slow, 0);
+    ASSERT_TRUE(RawWrite(stalled, std::string("\x00\x00\x00\x01\x00", 5)));
+    ASSERT_TRUE(local.RunUntil([&] { return glyphwell::port::IsReceivingRequest(local.Port()); }));
+
+    // The slow client sends a byte every 60 ms, 0.72 s in all: more than the timeout.
+    const std::string frame = RequestFrame(2, "abcd");
+    for (char byte : frame) {
+        ASSERT_TRUE(RawWrite(slow, std::string(1, byte)));
+        const auto next = std::chrono::steady_clock::now() + std::chrono::milliseconds(60);
+        local.RunUntil([&] { return std::chrono::steady_clock::now() >= next; });
+    }
+    ASSERT_TRUE(local.RunUntil([&] { return !glyphwell::port::IsReceivingRequest(local.Port()); }));
+    EXPECT_EQ(RawRead(slow, 10), std::string("\x00\x00\x00\x06"
+                                             "abcd@2",
+                                             10));
+    EXPECT_TRUE(RawSeesClose(stalled));
+    EXPECT_EQ(log.Texts(), (std::vector<std::string>{
+                               "message port org.glyphwell.Test.Port: closed a connection whose "
+                               "request made no progress for 0.3 s"}));
+    close(stalled);
+    close(slow);
+}
+
+TEST_F(MessagePortTest, BoundsTheBytesHeldByUnfinishedRequests) {
+    LogCapture log;
+    LocalPort local(kName, EchoWithMsgid);
+    ASSERT_NE(local.Port(), nullptr);
+    glyphwell::port::SetUnfinishedRequestLimit(local.Port(), 56320);
+    // Three unfinished requests of 20, 30 and 10 KiB: any two fit, all three do not, and the
+    // one holding the most goes.
+    struct Client {
+        size_t sent, announced;
+        int descriptor = -1;
+    } clients[] = {{20480, 30720}, {30720, 30720 + 1}, {10240, 10240 + 1}};
+    for (Client& client : clients) {
+        client.descriptor = RawConnect(SocketPath());
+        ASSERT_GE(client.descriptor, 0);
+        std::string frame = RequestFrame(1, std::string(client.announced, 'x'));
+        ASSERT_TRUE(RawWrite(client.descriptor, frame.substr(0, 8 + client.sent)));
+    }
+    ASSERT_TRUE(local.RunUntil([&] { return !log.Texts().empty(); }));
+    EXPECT_TRUE(RawSeesClose(clients[1].descriptor));
+    EXPECT_EQ(log.Texts(), (std::vector<std::string>{
+                               "message port org.glyphwell.Test.Port: unfinished requests held "
+                               "61464 bytes (the limit is 56320); closed the connection holding "
+                               "30728 of them"}));
+    // The others go on: the first finishes its request and is answered.
+    ASSERT_TRUE(RawWrite(clients[0].descriptor, std::string(10240, 'x')));
+    std::string reply;
+    ASSERT_TRUE(local.RunUntil([&] {
+        pollfd entry{clients[0].descriptor, POLLIN, 0};
+        return poll(&entry, 1, 0) > 0;
+    }));
+    EXPECT_EQ(RawRead(clients[0].descriptor, 4), std::string("\x00\x00\x78\x02", 4));
+    for (const Client& client : clients)
+        close(client.descriptor);
+}
+
+namespace {
+
+std::atomic<int> failingSendCalls{0};
+
+/// Sends the first 3 bytes of a reply for real, then fails as a broken device would.
+ssize_t SendThenFail(int descriptor, const msghdr* message, int flags) {
+    if (failingSendCalls++ > 0) {
+        errno = EIO;
+        return -1;
+    }
+    return send(descriptor, message->msg_iov[0].iov_base, 3, flags);
+}
+
+} // namespace
+
+TEST_F(MessagePortTest, AReplyWriteThatFailsClosesOnlyThatConnection) {
+    LogCapture log;
+    const std::string large(8u << 20, 'r');
+    PortServer server(kName, [&](SInt32 msgid, CFDataRef data) {
+        return msgid == 9 ? CreateCFData(large) : EchoWithMsgid(msgid, data);
+    });
+    ASSERT_TRUE(server.Started());
+    struct Case {
+        const char* what;
+        glyphwell::port::ReplySendFunction send;
+        size_t readBeforeClosing; ///< 0: reads until the server closes
+        std::string line;
+    } cases[] = {
+        {"the write fails", SendThenFail, 0,
+         "message port org.glyphwell.Test.Port: cannot send a reply: Input/output error; closed "
+         "its connection"},
+        {"the client closes with the reply unread", nullptr, 4,
+         "message port org.glyphwell.Test.Port: a client went away in the middle of its reply"},
+    };
+    for (const Case& test : cases) {
+        SCOPED_TRACE(test.what);
+        log.Clear();
+        failingSendCalls = 0;
+        glyphwell::port::SetReplySendFunctionForTesting(test.send);
+        const int client = RawConnect(SocketPath());
+        ASSERT_GE(client, 0);
+        ASSERT_TRUE(RawWrite(client, RequestFrame(9, "")));
+        if (test.readBeforeClosing == 0) {
+            EXPECT_EQ(RawRead(client, 4), std::string("\x00\x80\x00", 3));
+        } else {
+            EXPECT_EQ(RawRead(client, test.readBeforeClosing).size(), test.readBeforeClosing);
+        }
+        close(client);
+        ASSERT_TRUE(WaitForLines(log, 1));
+        glyphwell::port::SetReplySendFunctionForTesting(nullptr);
+        EXPECT_EQ(Send(kName, 1, "others").bytes, "others@1");
+        EXPECT_EQ(log.Texts(), (std::vector<std::string>{test.line}));
+    }
 }
