@@ -5,9 +5,11 @@
 // process's resident memory and open descriptors, sampled over the run.
 //
 //   port_load [--clients N] [--seconds S] [--body BYTES] [--sample SECONDS] [--idle N]
+//             [--flooders N]
 //
-// --idle opens N more connections that stay silent for the whole run (the server must keep
-// serving the others). A soak is a long run: --seconds 600 --sample 60.
+// --idle opens N more connections that stay silent for the whole run; --flooders runs N more
+// clients that each queue 5,000 requests and hang up, over and over. Neither may hold up the
+// measured clients. A soak is a long run: --seconds 600 --sample 60.
 #include <signal.h>
 #include <stdlib.h>
 #include <sys/socket.h>
@@ -42,6 +44,7 @@ struct Options {
     size_t body = 256;
     double sample = 1;
     int idle = 0;
+    int flooders = 0;
 };
 
 bool ParseOptions(int argc, char** argv, Options* options) {
@@ -58,11 +61,13 @@ bool ParseOptions(int argc, char** argv, Options* options) {
             options->sample = std::atof(value);
         else if (flag == "--idle")
             options->idle = std::atoi(value);
+        else if (flag == "--flooders")
+            options->flooders = std::atoi(value);
         else
             return false;
     }
     return argc % 2 == 1 && options->clients > 0 && options->seconds > 0 && options->sample > 0 &&
-           options->idle >= 0;
+           options->idle >= 0 && options->flooders >= 0;
 }
 
 CFStringRef PortName() {
@@ -160,6 +165,41 @@ void RunClient(const Options& options, const std::atomic<bool>& stop, ClientResu
     CFRelease(remote);
 }
 
+/// A raw connection to `path`, or -1.
+int Connect(const std::string& path) {
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    std::memcpy(address.sun_path, path.data(), std::min(path.size(), sizeof address.sun_path - 1));
+    const int descriptor = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    if (descriptor >= 0 &&
+        connect(descriptor, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
+        close(descriptor);
+        return -1;
+    }
+    return descriptor;
+}
+
+/// Queues 5,000 empty requests on a new connection and hangs up, until `stop`.
+void RunFlooder(const std::string& path, const std::atomic<bool>& stop) {
+    std::string frames;
+    for (int i = 0; i < 5000; ++i)
+        frames.append("\x00\x00\x03\xE8\x00\x00\x00\x00", 8);
+    while (!stop.load(std::memory_order_relaxed)) {
+        const int descriptor = Connect(path);
+        if (descriptor < 0)
+            continue;
+        size_t done = 0;
+        while (done < frames.size()) {
+            const ssize_t sent =
+                send(descriptor, frames.data() + done, frames.size() - done, MSG_NOSIGNAL);
+            if (sent <= 0)
+                break;
+            done += size_t(sent);
+        }
+        close(descriptor);
+    }
+}
+
 /// The server's resident memory in KiB (VmRSS) and its open descriptors.
 std::pair<long, long> SampleProcess(pid_t server) {
     long residentKiB = -1;
@@ -211,22 +251,15 @@ int main(int argc, char** argv) {
     std::vector<int> idle;
     const std::string path = glyphwell::port::SocketPathForName("org.glyphwell.Bench.Load");
     // Silent connections that stay open: raw sockets, never written to.
-    for (int i = 0; i < options.idle; ++i) {
-        sockaddr_un address{};
-        address.sun_family = AF_UNIX;
-        std::memcpy(address.sun_path, path.data(),
-                    std::min(path.size(), sizeof address.sun_path - 1));
-        const int descriptor = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-        if (descriptor >= 0 &&
-            connect(descriptor, reinterpret_cast<const sockaddr*>(&address), sizeof address) == 0)
+    for (int i = 0; i < options.idle; ++i)
+        if (const int descriptor = Connect(path); descriptor >= 0)
             idle.push_back(descriptor);
-    }
 
     const auto [startKiB, startDescriptors] = SampleProcess(server);
     std::printf("server pid %d: %ld KiB resident, %ld descriptors before the run "
-                "(%d clients, %zu-byte requests, %zu silent connections)\n",
-                int(server), startKiB, startDescriptors, options.clients, options.body,
-                idle.size());
+                "(%d clients, %zu-byte requests, %zu silent connections, %d flooders)\n",
+                int(server), startKiB, startDescriptors, options.clients, options.body, idle.size(),
+                options.flooders);
     std::printf("%8s %12s %10s %12s %8s\n", "time s", "requests", "req/s", "RSS KiB", "fds");
 
     std::atomic<bool> stop{false};
@@ -235,6 +268,8 @@ int main(int argc, char** argv) {
     const Clock::time_point begin = Clock::now();
     for (int i = 0; i < options.clients; ++i)
         clients.emplace_back(RunClient, std::cref(options), std::cref(stop), &results[size_t(i)]);
+    for (int i = 0; i < options.flooders; ++i)
+        clients.emplace_back(RunFlooder, std::cref(path), std::cref(stop));
 
     long maxKiB = startKiB, maxDescriptors = startDescriptors;
     const auto end = begin + std::chrono::duration_cast<Clock::duration>(
