@@ -8,7 +8,7 @@
 //             [--flooders N]
 //
 // --idle opens N more connections that stay silent for the whole run; --flooders runs N more
-// clients that each queue 5,000 requests and hang up, over and over. Neither may hold up the
+// clients that each queue 5,000 requests and hang up, once a second. Neither may hold up the
 // measured clients. A soak is a long run: --seconds 600 --sample 60.
 #include <signal.h>
 #include <stdlib.h>
@@ -179,7 +179,7 @@ int Connect(const std::string& path) {
     return descriptor;
 }
 
-/// Queues 5,000 empty requests on a new connection and hangs up, until `stop`.
+/// Queues 5,000 empty requests on a new connection and hangs up, once a second until `stop`.
 void RunFlooder(const std::string& path, const std::atomic<bool>& stop) {
     std::string frames;
     for (int i = 0; i < 5000; ++i)
@@ -197,6 +197,8 @@ void RunFlooder(const std::string& path, const std::atomic<bool>& stop) {
             done += size_t(sent);
         }
         close(descriptor);
+        for (int tick = 0; tick < 10 && !stop.load(std::memory_order_relaxed); ++tick)
+            std::this_thread::sleep_for(std::chrono::milliseconds(100));
     }
 }
 

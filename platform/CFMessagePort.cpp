@@ -545,6 +545,7 @@ struct __CFMessagePort final : CFObject {
     size_t unfinishedLimit = kDefaultUnfinishedLimit;
     Clock::duration stallTimeout = kDefaultStallTimeout;
     bool stallTimerArmed = false;
+    bool serveSignalPending = false; ///< `serveSignal` has been written and not yet read
 
     // Remote ports.
     std::mutex requestMutex;    ///< one request at a time
@@ -578,6 +579,7 @@ private:
     void ArmStallTimer(Clock::time_point when);
     void OnHangUps();
     void Enqueue(const ConnectionPtr& connection);
+    void SignalServe();
     void OnServeSignal();
     void ServeOne(const ConnectionPtr& connection);
     void ResumeReading(const ConnectionPtr& connection);
@@ -838,7 +840,13 @@ void __CFMessagePort::EndOfStream(const ConnectionPtr& connection) {
 void __CFMessagePort::AfterInput(const ConnectionPtr& connection) {
     CountUnfinished(connection);
     EnforceUnfinishedLimit();
-    if (connection->descriptor >= 0)
+    if (connection->descriptor < 0)
+        return;
+    // Nobody waits for a turn: one request is served at once, saving a round of the loop; the
+    // rest of the connection's requests wait for their turns like everyone's.
+    if (serveQueue.empty())
+        ServeOne(connection);
+    else
         Enqueue(connection);
 }
 
@@ -920,6 +928,13 @@ void __CFMessagePort::Enqueue(const ConnectionPtr& connection) {
         return;
     connection->queued = true;
     serveQueue.push_back(connection);
+    SignalServe();
+}
+
+void __CFMessagePort::SignalServe() {
+    if (serveSignalPending)
+        return;
+    serveSignalPending = true;
     const uint64_t one = 1;
     while (write(serveSignal, &one, sizeof one) < 0 && errno == EINTR) {
     }
@@ -928,6 +943,7 @@ void __CFMessagePort::Enqueue(const ConnectionPtr& connection) {
 void __CFMessagePort::OnServeSignal() {
     PortHold hold(this);
     DrainCounter(serveSignal);
+    serveSignalPending = false;
     // One request of each connection waiting now; a connection with more goes to the back, and
     // the loop looks at every other descriptor before the next round.
     for (size_t turns = serveQueue.size(); turns > 0 && !serveQueue.empty() && valid; --turns) {
@@ -938,11 +954,8 @@ void __CFMessagePort::OnServeSignal() {
         connection->queued = false;
         ServeOne(connection);
     }
-    if (!serveQueue.empty() && valid) {
-        const uint64_t one = 1;
-        while (write(serveSignal, &one, sizeof one) < 0 && errno == EINTR) {
-        }
-    }
+    if (!serveQueue.empty() && valid)
+        SignalServe();
 }
 
 void __CFMessagePort::ServeOne(const ConnectionPtr& connection) {
