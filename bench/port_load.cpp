@@ -5,11 +5,12 @@
 // process's resident memory and open descriptors, sampled over the run.
 //
 //   port_load [--clients N] [--seconds S] [--body BYTES] [--sample SECONDS] [--idle N]
-//             [--flooders N]
+//             [--flooders N] [--work MICROSECONDS]
 //
 // --idle opens N more connections that stay silent for the whole run; --flooders runs N more
-// clients that each queue 5,000 requests and hang up, once a second. Neither may hold up the
-// measured clients. A soak is a long run: --seconds 600 --sample 60.
+// clients that each queue 5,000 requests and hang up, once a second. --work makes the server's
+// callback take that long per request (busy), as the agent's reading and answering does. Neither
+// may hold up the measured clients. A soak is a long run: --seconds 600 --sample 60.
 #include <signal.h>
 #include <stdlib.h>
 #include <sys/socket.h>
@@ -45,7 +46,11 @@ struct Options {
     double sample = 1;
     int idle = 0;
     int flooders = 0;
+    double work = 0;
 };
+
+/// The server callback's busy time per request, in microseconds.
+double serverWork = 0;
 
 bool ParseOptions(int argc, char** argv, Options* options) {
     for (int i = 1; i + 1 < argc; i += 2) {
@@ -63,11 +68,13 @@ bool ParseOptions(int argc, char** argv, Options* options) {
             options->idle = std::atoi(value);
         else if (flag == "--flooders")
             options->flooders = std::atoi(value);
+        else if (flag == "--work")
+            options->work = std::atof(value);
         else
             return false;
     }
     return argc % 2 == 1 && options->clients > 0 && options->seconds > 0 && options->sample > 0 &&
-           options->idle >= 0 && options->flooders >= 0;
+           options->idle >= 0 && options->flooders >= 0 && options->work >= 0;
 }
 
 CFStringRef PortName() {
@@ -75,6 +82,10 @@ CFStringRef PortName() {
 }
 
 CFDataRef EmptyReply(CFMessagePortRef, SInt32, CFDataRef, void*) {
+    const auto until = Clock::now() + std::chrono::duration_cast<Clock::duration>(
+                                          std::chrono::duration<double, std::micro>(serverWork));
+    while (Clock::now() < until) {
+    }
     return nullptr;
 }
 
@@ -224,7 +235,7 @@ int main(int argc, char** argv) {
     Options options;
     if (!ParseOptions(argc, argv, &options)) {
         std::fprintf(stderr, "usage: port_load [--clients N] [--seconds S] [--body BYTES] "
-                             "[--sample SECONDS] [--idle N]\n");
+                             "[--sample SECONDS] [--idle N] [--flooders N] [--work US]\n");
         return 2;
     }
     char pattern[] = "/tmp/glyphwell-load-XXXXXX";
@@ -237,6 +248,7 @@ int main(int argc, char** argv) {
     int ready[2];
     if (pipe(ready) != 0)
         return 1;
+    serverWork = options.work;
     const pid_t server = fork();
     if (server == 0) {
         close(ready[0]);
@@ -258,10 +270,12 @@ int main(int argc, char** argv) {
             idle.push_back(descriptor);
 
     const auto [startKiB, startDescriptors] = SampleProcess(server);
-    std::printf("server pid %d: %ld KiB resident, %ld descriptors before the run "
-                "(%d clients, %zu-byte requests, %zu silent connections, %d flooders)\n",
-                int(server), startKiB, startDescriptors, options.clients, options.body, idle.size(),
-                options.flooders);
+    std::printf(
+        "server pid %d: %ld KiB resident, %ld descriptors before the run "
+        "(%d clients, %zu-byte requests, %zu silent connections, %d flooders, %g us of work "
+        "per request)\n",
+        int(server), startKiB, startDescriptors, options.clients, options.body, idle.size(),
+        options.flooders, options.work);
     std::printf("%8s %12s %10s %12s %8s\n", "time s", "requests", "req/s", "RSS KiB", "fds");
 
     std::atomic<bool> stop{false};
