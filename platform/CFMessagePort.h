@@ -17,7 +17,8 @@
 // for the user is answered at once, and first.
 //
 // Every client may be faulty or hostile, and none can stall the others:
-// - Connections are served in turn, one request each, before the loop looks at anything else.
+// - Connections with requests waiting are served in turn, one request each per round of the
+//   loop, so a client that queues many requests delays the others by one request at most.
 // - A foreign peer, a frame over the limit, an unfinished request that has received nothing for
 //   the stall timeout (30 s), or a write of a reply that fails closes that connection with one
 //   line on the application log.
@@ -101,9 +102,9 @@ CFRunLoopSourceRef CFMessagePortCreateRunLoopSource(CFAllocatorRef allocator,
 /// wait for each other) and stays valid after every error but IsInvalid: a connection that
 /// failed, timed out or that the server dropped while idle is replaced by a new one on the next
 /// request. Without `returnData` the reply is not awaited and the connection is given up after
-/// the request has been written (the server sees its client go away). Timeouts of zero, below
-/// zero or NaN do not wait at all. Invalidating the port from another thread ends a waiting
-/// request with IsInvalid.
+/// the request has been written (the server sees its client go away, and may drop the request
+/// unhandled). Timeouts of zero, below zero or NaN do not wait at all. Invalidating the port from
+/// another thread ends a waiting request with IsInvalid.
 SInt32 CFMessagePortSendRequest(CFMessagePortRef remote, SInt32 msgid, CFDataRef data,
                                 CFTimeInterval sendTimeout, CFTimeInterval receiveTimeout,
                                 CFStringRef replyMode, CFDataRef* returnData);
