@@ -122,6 +122,12 @@ CFDataRef EchoWithMsgid(SInt32 msgid, CFDataRef data) {
     return CreateCFData(BytesOf(data) + "@" + std::to_string(msgid));
 }
 
+/// True when `descriptor` has bytes to read (or its end) now.
+bool HasBytes(int descriptor) {
+    pollfd entry{descriptor, POLLIN, 0};
+    return poll(&entry, 1, 0) > 0;
+}
+
 /// Waits up to 10 s for `count` log lines.
 bool WaitForLines(const LogCapture& log, size_t count) {
     const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(10);
@@ -211,6 +217,7 @@ TEST_F(MessagePortTest, AnswersPipelinedFramesInOrderWithExactBytes) {
 TEST_F(MessagePortTest, PortsAndSourcesArePropertyValues) {
     LocalPort local(kName, EchoWithMsgid);
     ASSERT_NE(local.Port(), nullptr);
+    EXPECT_NE(access((SocketPath() + ".lock").c_str(), F_OK), 0) << "the lock file is gone";
     EXPECT_EQ(CFGetTypeID(local.Port()), CFMessagePortGetTypeID());
     CFStringRef kind = CFCopyTypeIDDescription(CFMessagePortGetTypeID());
     CFStringRef expected = CFSTR("CFMessagePort");
@@ -779,11 +786,7 @@ TEST_F(MessagePortTest, ServesConnectionsInTurnAndDropsTheQueueOfAClientThatHung
     ASSERT_TRUE(RawWrite(flood, frames));
     ASSERT_TRUE(RawWrite(other, RequestFrame(2, "")));
     // The other client is served within the first round, not after the 500.
-    const auto answered = [](int descriptor) {
-        pollfd entry{descriptor, POLLIN, 0};
-        return poll(&entry, 1, 0) > 0;
-    };
-    ASSERT_TRUE(local.RunUntil([&] { return answered(other); }));
+    ASSERT_TRUE(local.RunUntil([&] { return HasBytes(other); }));
     EXPECT_EQ(RawRead(other, 6), std::string("\x00\x00\x00\x02@2", 6));
     const auto otherAt = std::find(handled.begin(), handled.end(), 2) - handled.begin();
     EXPECT_LE(otherAt, 2);
@@ -793,7 +796,7 @@ TEST_F(MessagePortTest, ServesConnectionsInTurnAndDropsTheQueueOfAClientThatHung
     ASSERT_TRUE(local.RunUntil([&] { return !glyphwell::port::IsReceivingRequest(local.Port()); }));
     EXPECT_LT(std::count(handled.begin(), handled.end(), 1), 10);
     ASSERT_TRUE(RawWrite(other, RequestFrame(3, "")));
-    ASSERT_TRUE(local.RunUntil([&] { return answered(other); }));
+    ASSERT_TRUE(local.RunUntil([&] { return HasBytes(other); }));
     EXPECT_EQ(RawRead(other, 6), std::string("\x00\x00\x00\x02@3", 6));
     close(other);
 }
@@ -883,11 +886,7 @@ TEST_F(MessagePortTest, BoundsTheBytesHeldByUnfinishedRequests) {
                                "30728 of them"}));
     // The others go on: the first finishes its request and is answered.
     ASSERT_TRUE(RawWrite(clients[0].descriptor, std::string(10240, 'x')));
-    std::string reply;
-    ASSERT_TRUE(local.RunUntil([&] {
-        pollfd entry{clients[0].descriptor, POLLIN, 0};
-        return poll(&entry, 1, 0) > 0;
-    }));
+    ASSERT_TRUE(local.RunUntil([&] { return HasBytes(clients[0].descriptor); }));
     EXPECT_EQ(RawRead(clients[0].descriptor, 4), std::string("\x00\x00\x78\x02", 4));
     for (const Client& client : clients)
         close(client.descriptor);
