@@ -114,6 +114,13 @@ void QZUIController::setTerminateTimer(QTimer* timer) {
 }
 
 void QZUIController::terminateTimerFired() {
+    // A request still being received is work too: wait another idle delay rather than cut its
+    // client off. A client that stops sending is closed by the port after its stall timeout.
+    if (messagePort_ && glyphwell::port::IsReceivingRequest(messagePort_)) {
+        if (terminateTimer_)
+            terminateTimer_->start();
+        return;
+    }
     terminate();
 }
 

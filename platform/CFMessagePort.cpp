@@ -2,9 +2,14 @@
 
 #include <fcntl.h>
 #include <poll.h>
+#include <pwd.h>
+#include <sys/epoll.h>
+#include <sys/eventfd.h>
 #include <sys/file.h>
+#include <sys/ioctl.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
+#include <sys/timerfd.h>
 #include <sys/uio.h>
 #include <sys/un.h>
 #include <unistd.h>
@@ -17,6 +22,7 @@
 #include <cmath>
 #include <cstdlib>
 #include <cstring>
+#include <deque>
 #include <map>
 #include <mutex>
 #include <vector>
@@ -42,9 +48,15 @@ constexpr size_t kReadChunk = 64 * 1024;
 constexpr int kReadsPerEvent = 16;
 /// Connections accepted per readiness event of the listening socket.
 constexpr int kAcceptsPerEvent = 64;
-/// While a connection's request is being handled or answered, at most this many bytes of its
-/// later frames are held; beyond it the connection is not read until the reply has gone out.
+/// While a connection has a request waiting, being handled or answered, at most this many bytes
+/// of its later frames are held; beyond it the connection is not read until they are served.
 constexpr size_t kReadAheadLimit = 1u << 20;
+/// How long an unfinished request may go without a new byte before its connection is closed.
+constexpr std::chrono::milliseconds kDefaultStallTimeout{30000};
+/// The most bytes that unfinished requests may hold across all connections of a port.
+constexpr size_t kDefaultUnfinishedLimit = size_t(128) << 20;
+
+using Clock = std::chrono::steady_clock;
 
 std::string UTF8(CFStringRef string) {
     if (!string)
@@ -101,6 +113,23 @@ ssize_t ReceiveInto(int descriptor, FrameAssembler& assembler, std::vector<uint8
 std::string ErrorText(int error) {
     char buffer[128];
     return strerror_r(error, buffer, sizeof buffer);
+}
+
+/// `text` with control characters, backslashes and bytes above 0x7E written as \xNN, so that a
+/// path from the environment cannot forge or garble a log line.
+std::string EscapeForLog(const std::string& text) {
+    static const char kHex[] = "0123456789abcdef";
+    std::string escaped;
+    for (const unsigned char byte : text) {
+        if (byte < 0x20 || byte > 0x7E || byte == '\\') {
+            escaped += "\\x";
+            escaped += kHex[byte >> 4];
+            escaped += kHex[byte & 15];
+        } else {
+            escaped += char(byte);
+        }
+    }
+    return escaped;
 }
 
 bool MakeAddress(const std::string& path, sockaddr_un* address) {
@@ -259,16 +288,22 @@ struct Connection {
             CFRelease(reply);
     }
 
-    int descriptor = -1;
+    /// Nothing of it is waiting: no whole frame held, none being handled or answered.
+    bool IsIdle() const { return !busy && !writing && !input.HasFrame(); }
+
+    int descriptor = -1; ///< -1 once closed
     int processID = 0;
     FrameAssembler input{FrameAssembler::Kind::Request, kMessagePortMaxFrame};
-    /// The client went away: the descriptor is closed, whole frames still held are served
-    /// withdrawn and their replies dropped.
-    bool peerGone = false;
-    bool busy = false; ///< one of its requests is in the callback
-    bool readPaused = false;
+    bool busy = false;         ///< one of its requests is in the callback
+    bool queued = false;       ///< in the port's queue of connections with a frame to serve
+    bool readPaused = false;   ///< enough of its later frames are held: not read for now
+    bool readClosed = false;   ///< the client shut its writing side down; it still gets replies
     bool writeBlocked = false; ///< waiting for room in the socket buffer
     std::shared_ptr<RequestState> current;
+
+    /// Bytes of its unfinished frame counted in the port's total, and when the last came.
+    size_t unfinishedCounted = 0;
+    Clock::time_point lastProgress;
 
     // The reply being written: a 4-byte header, then the body of `reply` (owned; may be null).
     bool writing = false;
@@ -335,87 +370,133 @@ int TakeActivationSocket(const std::string& portName) {
     return kFirstPassedDescriptor;
 }
 
+/// An exclusive lock on the file `lockPath` (created when missing), or -1. Whoever holds the lock
+/// removes the file before letting go (UnlockName), so a lock won on a file that was removed
+/// meanwhile guards nothing: it is taken again on the file now at the path.
+int LockName(const std::string& lockPath) {
+    for (int attempt = 0; attempt < 100; ++attempt) {
+        const int lock = open(lockPath.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600);
+        if (lock < 0)
+            return -1;
+        while (flock(lock, LOCK_EX) != 0 && errno == EINTR) {
+        }
+        struct stat held, current;
+        if (fstat(lock, &held) == 0 && lstat(lockPath.c_str(), &current) == 0 &&
+            held.st_dev == current.st_dev && held.st_ino == current.st_ino)
+            return lock;
+        CloseDescriptor(lock);
+    }
+    return -1;
+}
+
+/// Removes the lock file of LockName and lets the lock go; nothing for -1.
+void UnlockName(int lock, const std::string& lockPath) {
+    if (lock < 0)
+        return;
+    unlink(lockPath.c_str());
+    CloseDescriptor(lock);
+}
+
+/// True when the name's socket file can be bound: there is none, or nothing listens on it (a
+/// stale file left by a server that ended without removing it, removed here). False when a live
+/// server answers (no log line: the caller says what it means) or, after one log line, when the
+/// file is not a socket or cannot be checked or removed.
+bool ClearStaleSocket(const std::string& portName, const std::string& path,
+                      const sockaddr_un& address) {
+    struct stat status;
+    if (lstat(path.c_str(), &status) != 0) {
+        if (errno == ENOENT)
+            return true;
+        AppLog("message port %s: cannot check %s: %s", portName.c_str(), path.c_str(),
+               ErrorText(errno).c_str());
+        return false;
+    }
+    if (!S_ISSOCK(status.st_mode)) {
+        AppLog("message port %s: %s exists and is not a socket", portName.c_str(), path.c_str());
+        return false;
+    }
+    const int probe = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
+    if (probe < 0) {
+        AppLog("message port %s: socket: %s", portName.c_str(), ErrorText(errno).c_str());
+        return false;
+    }
+    const int result = connect(probe, reinterpret_cast<const sockaddr*>(&address), sizeof address);
+    const int error = errno;
+    CloseDescriptor(probe);
+    if (result == 0 || error == EAGAIN || error == EINPROGRESS)
+        return false; // the name is taken by a running server
+    if (error != ECONNREFUSED) {
+        AppLog("message port %s: cannot check %s: %s", portName.c_str(), path.c_str(),
+               ErrorText(error).c_str());
+        return false;
+    }
+    if (unlink(path.c_str()) != 0 && errno != ENOENT) {
+        AppLog("message port %s: cannot remove the stale socket %s: %s", portName.c_str(),
+               path.c_str(), ErrorText(errno).c_str());
+        return false;
+    }
+    return true;
+}
+
+/// A socket bound to `address` (mode 0600) and listening, and its file's identity; -1 after one
+/// log line (none when a server bound the name first).
+int BindAndListen(const std::string& portName, const std::string& path, const sockaddr_un& address,
+                  dev_t* device, ino_t* inode) {
+    const int descriptor = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
+    if (descriptor < 0) {
+        AppLog("message port %s: socket: %s", portName.c_str(), ErrorText(errno).c_str());
+        return -1;
+    }
+    if (bind(descriptor, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
+        if (errno != EADDRINUSE)
+            AppLog("message port %s: cannot bind %s: %s", portName.c_str(), path.c_str(),
+                   ErrorText(errno).c_str());
+        CloseDescriptor(descriptor);
+        return -1;
+    }
+    chmod(path.c_str(), 0600);
+    struct stat status;
+    if (listen(descriptor, SOMAXCONN) != 0 || stat(path.c_str(), &status) != 0) {
+        AppLog("message port %s: cannot listen on %s: %s", portName.c_str(), path.c_str(),
+               ErrorText(errno).c_str());
+        unlink(path.c_str());
+        CloseDescriptor(descriptor);
+        return -1;
+    }
+    *device = status.st_dev;
+    *inode = status.st_ino;
+    return descriptor;
+}
+
 /// Binds and listens on `path`, taking over a stale socket file. Returns the listening socket
-/// and the file's identity, or -1 after one log line.
+/// and the file's identity, or -1 (after one log line unless a live server has the name).
 int BindListeningSocket(const std::string& portName, const std::string& path, dev_t* device,
                         ino_t* inode) {
     sockaddr_un address;
     if (!MakeAddress(path, &address))
         return -1;
     // Two servers starting at once must not both take over the same stale file: the check,
-    // unlink and bind run under a lock on a file beside the socket.
+    // unlink and bind run under a lock on a file beside the socket, removed once bound.
     const std::string lockPath = path + ".lock";
-    const int lock = open(lockPath.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600);
-    if (lock >= 0)
-        while (flock(lock, LOCK_EX) != 0 && errno == EINTR) {
-        }
-    auto fail = [&](int descriptor) {
-        CloseDescriptor(descriptor);
-        CloseDescriptor(lock);
-        return -1;
-    };
+    const int lock = LockName(lockPath);
+    int listening = -1;
+    if (ClearStaleSocket(portName, path, address))
+        listening = BindAndListen(portName, path, address, device, inode);
+    UnlockName(lock, lockPath);
+    return listening;
+}
 
-    struct stat status;
-    if (lstat(path.c_str(), &status) == 0) {
-        if (!S_ISSOCK(status.st_mode)) {
-            AppLog("message port %s: %s exists and is not a socket", portName.c_str(),
-                   path.c_str());
-            return fail(-1);
-        }
-        const int probe = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
-        if (probe < 0) {
-            AppLog("message port %s: socket: %s", portName.c_str(), ErrorText(errno).c_str());
-            return fail(-1);
-        }
-        const int result =
-            connect(probe, reinterpret_cast<const sockaddr*>(&address), sizeof address);
-        const int error = errno;
-        CloseDescriptor(probe);
-        if (result == 0 || error == EAGAIN || error == EINPROGRESS) {
-            AppLog("message port %s: the name is taken by a running server", portName.c_str());
-            return fail(-1);
-        }
-        if (error != ECONNREFUSED) {
-            AppLog("message port %s: cannot check %s: %s", portName.c_str(), path.c_str(),
-                   ErrorText(error).c_str());
-            return fail(-1);
-        }
-        // Nothing listens: a stale file left by a server that ended without removing it.
-        if (unlink(path.c_str()) != 0 && errno != ENOENT) {
-            AppLog("message port %s: cannot remove the stale socket %s: %s", portName.c_str(),
-                   path.c_str(), ErrorText(errno).c_str());
-            return fail(-1);
-        }
-    } else if (errno != ENOENT) {
-        AppLog("message port %s: cannot check %s: %s", portName.c_str(), path.c_str(),
-               ErrorText(errno).c_str());
-        return fail(-1);
-    }
+/// Whether the peer of `descriptor` has hung up altogether (not merely shut its writing side).
+bool PeerHungUp(int descriptor) {
+    pollfd entry{descriptor, 0, 0};
+    return poll(&entry, 1, 0) > 0 && (entry.revents & (POLLHUP | POLLERR));
+}
 
-    const int descriptor = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
-    if (descriptor < 0) {
-        AppLog("message port %s: socket: %s", portName.c_str(), ErrorText(errno).c_str());
-        return fail(-1);
+/// Reads and discards an eventfd's or timerfd's counter.
+void DrainCounter(int descriptor) {
+    uint64_t counter;
+    while (read(descriptor, &counter, sizeof counter) < 0 && errno == EINTR) {
     }
-    if (bind(descriptor, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
-        if (errno == EADDRINUSE)
-            AppLog("message port %s: the name is taken by a running server", portName.c_str());
-        else
-            AppLog("message port %s: cannot bind %s: %s", portName.c_str(), path.c_str(),
-                   ErrorText(errno).c_str());
-        return fail(descriptor);
-    }
-    chmod(path.c_str(), 0600);
-    if (listen(descriptor, SOMAXCONN) != 0 || stat(path.c_str(), &status) != 0) {
-        AppLog("message port %s: cannot listen on %s: %s", portName.c_str(), path.c_str(),
-               ErrorText(errno).c_str());
-        unlink(path.c_str());
-        return fail(descriptor);
-    }
-    *device = status.st_dev;
-    *inode = status.st_ino;
-    CloseDescriptor(lock);
-    return descriptor;
 }
 
 } // namespace
@@ -445,6 +526,9 @@ struct __CFMessagePort final : CFObject {
     // Local ports: used on the run loop's thread only.
     int listenDescriptor = -1;
     int spareDescriptor = -1; ///< given up to accept and refuse a client when out of descriptors
+    int serveSignal = -1;     ///< eventfd: readable while connections wait for their turn
+    int stallTimer = -1;      ///< timerfd: the next check for stalled unfinished requests
+    int hangUps = -1;         ///< epoll set of every connection: readable when a client hangs up
     int lastAcceptError = 0;  ///< the accept failure already logged, until an accept succeeds
     bool ownsSocketFile = false;
     std::string socketPath;
@@ -455,7 +539,13 @@ struct __CFMessagePort final : CFObject {
     RunLoopDriver* driver = nullptr;
     __CFRunLoopSource* source = nullptr; ///< not retained: the source retains the port
     std::map<int, ConnectionPtr> connections;
+    std::deque<std::weak_ptr<Connection>> serveQueue; ///< connections with a frame, in turn
     std::vector<uint8_t> readBuffer;
+    size_t unfinishedBytes = 0; ///< bytes of unfinished frames over all connections
+    size_t unfinishedLimit = kDefaultUnfinishedLimit;
+    Clock::duration stallTimeout = kDefaultStallTimeout;
+    bool stallTimerArmed = false;
+    bool serveSignalPending = false; ///< `serveSignal` has been written and not yet read
 
     // Remote ports.
     std::mutex requestMutex;    ///< one request at a time
@@ -463,11 +553,13 @@ struct __CFMessagePort final : CFObject {
     int descriptor = -1;
     std::vector<uint8_t> receiveBuffer;
 
+    bool OpenLocalDescriptors();
     void Schedule(RunLoopDriver* newDriver);
     void Cancel(RunLoopDriver* oldDriver);
     void InvalidateLocal();
     void InvalidateRemote();
     void CloseRemoteDescriptor();
+    bool IsReceiving() const;
     SInt32 Exchange(SInt32 msgid, CFDataRef data, CFTimeInterval sendTimeout,
                     CFTimeInterval receiveTimeout, CFDataRef* returnData);
 
@@ -476,20 +568,37 @@ private:
     void RemoveSocketFile();
     void UpdateWatch(const ConnectionPtr& connection);
     void OnListenEvent();
+    void Accept(int client, const ucred& credentials);
     void OnConnectionEvent(const std::weak_ptr<Connection>& weak, bool readable, bool writable);
     void ReadAvailable(const ConnectionPtr& connection);
-    void ServeQueued(const ConnectionPtr& connection);
+    void EndOfStream(const ConnectionPtr& connection);
+    void AfterInput(const ConnectionPtr& connection);
+    void CountUnfinished(const ConnectionPtr& connection);
+    void EnforceUnfinishedLimit();
+    void OnStallTimer();
+    void ArmStallTimer(Clock::time_point when);
+    void OnHangUps();
+    void Enqueue(const ConnectionPtr& connection);
+    void SignalServe();
+    void OnServeSignal();
+    void ServeOne(const ConnectionPtr& connection);
+    void ResumeReading(const ConnectionPtr& connection);
     CFDataRef Dispatch(const ConnectionPtr& connection, glyphwell::port::Frame& frame);
     void StartReply(const ConnectionPtr& connection, CFDataRef reply);
     void FlushReply(const ConnectionPtr& connection);
+    void ReplyFailed(const ConnectionPtr& connection, int error);
+    void FinishIfDone(const ConnectionPtr& connection);
     void PeerGone(const ConnectionPtr& connection);
     void Drop(const ConnectionPtr& connection);
     void CloseConnection(ConnectionPtr connection);
 
+    // Remote ports.
     int RemoteDescriptor();
     int Reconnect();
+    bool SendRequestFrame(const uint8_t* header, const UInt8* body, size_t bodyLength,
+                          CFTimeInterval sendTimeout, int* connection, SInt32* status);
+    SInt32 ReceiveReply(int connection, CFTimeInterval receiveTimeout, CFDataRef* returnData);
 };
-
 namespace {
 
 /// Keeps a port alive while a method of it runs code that may release it.
@@ -549,19 +658,31 @@ __CFMessagePort::~__CFMessagePort() {
 
 // --- local ports: scheduling ----------------------------------------------------------------
 
+bool __CFMessagePort::OpenLocalDescriptors() {
+    spareDescriptor = open("/dev/null", O_RDONLY | O_CLOEXEC);
+    serveSignal = eventfd(0, EFD_NONBLOCK | EFD_CLOEXEC);
+    stallTimer = timerfd_create(CLOCK_MONOTONIC, TFD_NONBLOCK | TFD_CLOEXEC);
+    hangUps = epoll_create1(EPOLL_CLOEXEC);
+    return serveSignal >= 0 && stallTimer >= 0 && hangUps >= 0;
+}
+
 void __CFMessagePort::Schedule(RunLoopDriver* newDriver) {
     if (!valid || remote || !newDriver)
         return;
     driver = newDriver;
     driver->Watch(listenDescriptor, true, false, [this](bool, bool) { OnListenEvent(); });
+    driver->Watch(serveSignal, true, false, [this](bool, bool) { OnServeSignal(); });
+    driver->Watch(stallTimer, true, false, [this](bool, bool) { OnStallTimer(); });
+    driver->Watch(hangUps, true, false, [this](bool, bool) { OnHangUps(); });
     for (const auto& [connectionDescriptor, connection] : connections)
         UpdateWatch(connection);
 }
 
 void __CFMessagePort::Cancel(RunLoopDriver* oldDriver) {
     if (oldDriver && oldDriver == driver) {
-        if (listenDescriptor >= 0)
-            driver->Unwatch(listenDescriptor);
+        for (int own : {listenDescriptor, serveSignal, stallTimer, hangUps})
+            if (own >= 0)
+                driver->Unwatch(own);
         for (const auto& [connectionDescriptor, connection] : connections)
             driver->Unwatch(connectionDescriptor);
     }
@@ -571,7 +692,8 @@ void __CFMessagePort::Cancel(RunLoopDriver* oldDriver) {
 void __CFMessagePort::UpdateWatch(const ConnectionPtr& connection) {
     if (!driver || connection->descriptor < 0)
         return;
-    const bool read = !connection->readPaused;
+    // A hang-up is seen through `hangUps` whether or not the connection is read.
+    const bool read = !connection->readPaused && !connection->readClosed;
     const bool write = connection->writeBlocked;
     std::weak_ptr<Connection> weak = connection;
     driver->Watch(connection->descriptor, read, write, [this, weak](bool readable, bool writable) {
@@ -624,12 +746,25 @@ void __CFMessagePort::OnListenEvent() {
             CloseDescriptor(client);
             continue;
         }
-        auto connection = std::make_shared<Connection>();
-        connection->descriptor = client;
-        connection->processID = credentials.pid;
-        connections[client] = connection;
-        UpdateWatch(connection);
+        Accept(client, credentials);
     }
+}
+
+void __CFMessagePort::Accept(int client, const ucred& credentials) {
+    // Events 0: the set reports only hang-ups and errors, which epoll always watches.
+    epoll_event event{};
+    event.data.fd = client;
+    if (epoll_ctl(hangUps, EPOLL_CTL_ADD, client, &event) != 0) {
+        AppLog("message port %s: cannot watch a connection: %s", nameText.c_str(),
+               ErrorText(errno).c_str());
+        CloseDescriptor(client);
+        return;
+    }
+    auto connection = std::make_shared<Connection>();
+    connection->descriptor = client;
+    connection->processID = credentials.pid;
+    connections[client] = connection;
+    UpdateWatch(connection);
 }
 
 void __CFMessagePort::OnConnectionEvent(const std::weak_ptr<Connection>& weak, bool readable,
@@ -640,15 +775,16 @@ void __CFMessagePort::OnConnectionEvent(const std::weak_ptr<Connection>& weak, b
     PortHold hold(this);
     if (writable && connection->writing)
         FlushReply(connection);
-    if (readable && connection->descriptor >= 0 && !connection->readPaused)
+    if (readable && connection->descriptor >= 0 && !connection->readPaused &&
+        !connection->readClosed)
         ReadAvailable(connection);
-    ServeQueued(connection);
+    if (connection->descriptor >= 0)
+        AfterInput(connection);
 }
 
 void __CFMessagePort::ReadAvailable(const ConnectionPtr& connection) {
     for (int reads = 0; reads < kReadsPerEvent; ++reads) {
-        if ((connection->busy || connection->writing) &&
-            connection->input.BufferedBytes() >= kReadAheadLimit) {
+        if (!connection->IsIdle() && connection->input.BufferedBytes() >= kReadAheadLimit) {
             connection->readPaused = true;
             UpdateWatch(connection);
             return;
@@ -665,6 +801,7 @@ void __CFMessagePort::ReadAvailable(const ConnectionPtr& connection) {
                 Drop(connection);
                 return;
             }
+            connection->lastProgress = Clock::now();
             if (drained)
                 return; // the next readiness event brings the rest, or the end of the stream
             continue;
@@ -673,34 +810,186 @@ void __CFMessagePort::ReadAvailable(const ConnectionPtr& connection) {
             continue;
         if (got < 0 && (errno == EAGAIN || errno == EWOULDBLOCK))
             return;
-        // End of stream, a reset, or a failed read: the client is gone.
-        PeerGone(connection);
+        if (got == 0)
+            EndOfStream(connection);
+        else
+            PeerGone(connection); // a reset or a failed read
         return;
     }
 }
 
-void __CFMessagePort::ServeQueued(const ConnectionPtr& connection) {
-    while (valid && !connection->busy && !connection->writing && connection->input.HasFrame()) {
-        glyphwell::port::Frame frame = connection->input.TakeFrame();
-        CFDataRef reply = Dispatch(connection, frame);
-        if (connection->descriptor < 0 || !valid) {
-            // Withdrawn meanwhile: nobody reads this reply.
-            if (reply)
-                CFRelease(reply);
+void __CFMessagePort::EndOfStream(const ConnectionPtr& connection) {
+    if (PeerHungUp(connection->descriptor)) {
+        PeerGone(connection);
+        return;
+    }
+    // Half-closed: the client will send nothing more but waits for its replies. A frame it left
+    // unfinished can never be completed.
+    if (connection->input.IsMidFrame()) {
+        AppLog("message port %s: a client disconnected in the middle of a request",
+               nameText.c_str());
+        connection->input.DropPartial();
+    }
+    connection->readClosed = true;
+    UpdateWatch(connection);
+    FinishIfDone(connection);
+}
+
+/// After bytes came in or went out: the unfinished bytes are counted, and a connection with a
+/// whole frame waits for its turn.
+void __CFMessagePort::AfterInput(const ConnectionPtr& connection) {
+    CountUnfinished(connection);
+    EnforceUnfinishedLimit();
+    if (connection->descriptor < 0)
+        return;
+    // Nobody waits for a turn: one request is served at once, saving a round of the loop; the
+    // rest of the connection's requests wait for their turns like everyone's.
+    if (serveQueue.empty())
+        ServeOne(connection);
+    else
+        Enqueue(connection);
+}
+
+void __CFMessagePort::CountUnfinished(const ConnectionPtr& connection) {
+    const size_t now = connection->descriptor >= 0 ? connection->input.PartialBytes() : 0;
+    unfinishedBytes = unfinishedBytes - connection->unfinishedCounted + now;
+    connection->unfinishedCounted = now;
+    if (now > 0 && !stallTimerArmed)
+        ArmStallTimer(connection->lastProgress + stallTimeout);
+}
+
+void __CFMessagePort::EnforceUnfinishedLimit() {
+    while (unfinishedBytes > unfinishedLimit) {
+        ConnectionPtr largest;
+        for (const auto& [connectionDescriptor, connection] : connections)
+            if (!largest || connection->unfinishedCounted > largest->unfinishedCounted)
+                largest = connection;
+        if (!largest || largest->unfinishedCounted == 0)
+            return;
+        AppLog("message port %s: unfinished requests held %zu bytes (the limit is %zu); closed "
+               "the connection holding %zu of them",
+               nameText.c_str(), unfinishedBytes, unfinishedLimit, largest->unfinishedCounted);
+        Drop(largest);
+    }
+}
+
+void __CFMessagePort::ArmStallTimer(Clock::time_point when) {
+    const auto left = std::max(when - Clock::now(), Clock::duration(std::chrono::microseconds(1)));
+    const auto seconds = std::chrono::duration_cast<std::chrono::seconds>(left);
+    itimerspec spec{};
+    spec.it_value.tv_sec = time_t(seconds.count());
+    spec.it_value.tv_nsec = long(std::chrono::nanoseconds(left - seconds).count());
+    stallTimerArmed = timerfd_settime(stallTimer, 0, &spec, nullptr) == 0;
+}
+
+void __CFMessagePort::OnStallTimer() {
+    PortHold hold(this);
+    DrainCounter(stallTimer);
+    stallTimerArmed = false;
+    const Clock::time_point now = Clock::now();
+    std::vector<ConnectionPtr> stalled;
+    Clock::time_point next = Clock::time_point::max();
+    for (const auto& [connectionDescriptor, connection] : connections) {
+        // A connection not read for now (its earlier requests are being served) is not stalled.
+        if (connection->unfinishedCounted == 0 || connection->readPaused)
             continue;
-        }
-        StartReply(connection, reply);
+        const Clock::time_point due = connection->lastProgress + stallTimeout;
+        if (due <= now)
+            stalled.push_back(connection);
+        else
+            next = std::min(next, due);
     }
-    if (connection->readPaused && !connection->busy && !connection->writing &&
-        connection->descriptor >= 0) {
-        connection->readPaused = false;
-        UpdateWatch(connection);
+    const double seconds = std::chrono::duration<double>(stallTimeout).count();
+    for (const ConnectionPtr& connection : stalled) {
+        AppLog("message port %s: closed a connection whose request made no progress for %g s",
+               nameText.c_str(), seconds);
+        Drop(connection);
     }
+    if (next != Clock::time_point::max() && valid)
+        ArmStallTimer(next);
+}
+
+void __CFMessagePort::OnHangUps() {
+    PortHold hold(this);
+    epoll_event events[64];
+    const int count = epoll_wait(hangUps, events, 64, 0);
+    for (int i = 0; i < count && valid; ++i) {
+        const auto found = connections.find(events[i].data.fd);
+        if (found != connections.end())
+            PeerGone(ConnectionPtr(found->second));
+    }
+}
+
+// --- local ports: serving in turn -------------------------------------------------------------
+
+void __CFMessagePort::Enqueue(const ConnectionPtr& connection) {
+    if (connection->queued || connection->busy || connection->writing ||
+        !connection->input.HasFrame())
+        return;
+    connection->queued = true;
+    serveQueue.push_back(connection);
+    SignalServe();
+}
+
+void __CFMessagePort::SignalServe() {
+    if (serveSignalPending)
+        return;
+    serveSignalPending = true;
+    const uint64_t one = 1;
+    while (write(serveSignal, &one, sizeof one) < 0 && errno == EINTR) {
+    }
+}
+
+void __CFMessagePort::OnServeSignal() {
+    PortHold hold(this);
+    DrainCounter(serveSignal);
+    serveSignalPending = false;
+    // One request of each connection waiting now; a connection with more goes to the back, and
+    // the loop looks at every other descriptor before the next round.
+    for (size_t turns = serveQueue.size(); turns > 0 && !serveQueue.empty() && valid; --turns) {
+        ConnectionPtr connection = serveQueue.front().lock();
+        serveQueue.pop_front();
+        if (!connection)
+            continue;
+        connection->queued = false;
+        ServeOne(connection);
+    }
+    if (!serveQueue.empty() && valid)
+        SignalServe();
+}
+
+void __CFMessagePort::ServeOne(const ConnectionPtr& connection) {
+    if (connection->descriptor < 0 || connection->busy || connection->writing ||
+        !connection->input.HasFrame())
+        return;
+    glyphwell::port::Frame frame = connection->input.TakeFrame();
+    CFDataRef reply = Dispatch(connection, frame);
+    if (connection->descriptor < 0 || !valid) {
+        // Withdrawn meanwhile: nobody reads this reply.
+        if (reply)
+            CFRelease(reply);
+        return;
+    }
+    StartReply(connection, reply);
+    if (connection->descriptor < 0)
+        return;
+    ResumeReading(connection);
+    Enqueue(connection);
+    FinishIfDone(connection);
+}
+
+void __CFMessagePort::ResumeReading(const ConnectionPtr& connection) {
+    if (!connection->readPaused ||
+        (!connection->IsIdle() && connection->input.BufferedBytes() >= kReadAheadLimit))
+        return;
+    connection->readPaused = false;
+    connection->lastProgress = Clock::now(); // not read meanwhile: the clock starts again
+    UpdateWatch(connection);
 }
 
 CFDataRef __CFMessagePort::Dispatch(const ConnectionPtr& connection,
                                     glyphwell::port::Frame& frame) {
-    auto request = std::make_shared<RequestState>(connection->processID, connection->peerGone);
+    auto request = std::make_shared<RequestState>(connection->processID, false);
     connection->busy = true;
     connection->current = request;
     CFDataRef data = CreateDataAdopting(frame.body);
@@ -732,6 +1021,7 @@ void __CFMessagePort::StartReply(const ConnectionPtr& connection, CFDataRef repl
 
 void __CFMessagePort::FlushReply(const ConnectionPtr& connection) {
     constexpr size_t headerSize = glyphwell::port::kReplyHeaderSize;
+    const glyphwell::port::ReplySendFunction send = glyphwell::port::ReplySend();
     while (connection->replyWritten < connection->replyTotal) {
         iovec pieces[2];
         int count = 0;
@@ -747,7 +1037,7 @@ void __CFMessagePort::FlushReply(const ConnectionPtr& connection) {
         msghdr message{};
         message.msg_iov = pieces;
         message.msg_iovlen = size_t(count);
-        const ssize_t sent = sendmsg(connection->descriptor, &message, MSG_NOSIGNAL | MSG_DONTWAIT);
+        const ssize_t sent = send(connection->descriptor, &message, MSG_NOSIGNAL | MSG_DONTWAIT);
         if (sent > 0) {
             connection->replyWritten += size_t(sent);
             continue;
@@ -761,13 +1051,7 @@ void __CFMessagePort::FlushReply(const ConnectionPtr& connection) {
             }
             return;
         }
-        if (errno == EPIPE || errno == ECONNRESET) {
-            PeerGone(connection);
-        } else {
-            AppLog("message port %s: cannot send a reply: %s", nameText.c_str(),
-                   ErrorText(errno).c_str());
-            Drop(connection);
-        }
+        ReplyFailed(connection, errno);
         return;
     }
     if (connection->reply)
@@ -778,22 +1062,48 @@ void __CFMessagePort::FlushReply(const ConnectionPtr& connection) {
         connection->writeBlocked = false;
         UpdateWatch(connection);
     }
+    ResumeReading(connection);
+    Enqueue(connection);
+    FinishIfDone(connection);
+}
+
+void __CFMessagePort::ReplyFailed(const ConnectionPtr& connection, int error) {
+    if (error == EPIPE || error == ECONNRESET)
+        AppLog("message port %s: a client went away in the middle of its reply", nameText.c_str());
+    else
+        AppLog("message port %s: cannot send a reply: %s; closed its connection", nameText.c_str(),
+               ErrorText(error).c_str());
+    Drop(connection);
+}
+
+void __CFMessagePort::FinishIfDone(const ConnectionPtr& connection) {
+    // A half-closed client whose every request has been answered: nothing more can come.
+    if (connection->readClosed && connection->descriptor >= 0 && connection->IsIdle())
+        CloseConnection(connection);
 }
 
 void __CFMessagePort::PeerGone(const ConnectionPtr& connection) {
-    if (connection->input.IsMidFrame())
+    if (connection->descriptor < 0)
+        return;
+    // What the client sent before it went is read, only to tell whether it left a request
+    // unfinished: its requests are dropped unanswered. The socket holds at most its buffer's size.
+    for (int reads = 0; reads < 64 && !connection->input.Failed(); ++reads) {
+        bool drained = false;
+        if (ReceiveInto(connection->descriptor, connection->input, readBuffer, &drained) <= 0 ||
+            drained)
+            break;
+    }
+    if (connection->writing)
+        AppLog("message port %s: a client went away in the middle of its reply", nameText.c_str());
+    else if (connection->input.IsMidFrame())
         AppLog("message port %s: a client disconnected in the middle of a request",
                nameText.c_str());
-    CloseConnection(connection);
-    connection->peerGone = true;
-    if (connection->current)
-        connection->current->Withdraw();
+    Drop(connection);
 }
 
 void __CFMessagePort::Drop(const ConnectionPtr& connection) {
     connection->input.Clear();
     CloseConnection(connection);
-    connection->peerGone = true;
     if (connection->current)
         connection->current->Withdraw();
 }
@@ -804,14 +1114,23 @@ void __CFMessagePort::CloseConnection(ConnectionPtr connection) {
         return;
     if (driver)
         driver->Unwatch(connection->descriptor);
+    epoll_ctl(hangUps, EPOLL_CTL_DEL, connection->descriptor, nullptr);
     connections.erase(connection->descriptor);
     CloseDescriptor(connection->descriptor);
     connection->descriptor = -1;
+    CountUnfinished(connection);
     if (connection->reply)
         CFRelease(connection->reply);
     connection->reply = nullptr;
     connection->writing = false;
     connection->writeBlocked = false;
+}
+
+bool __CFMessagePort::IsReceiving() const {
+    for (const auto& [connectionDescriptor, connection] : connections)
+        if (connection->input.BufferedBytes() > 0)
+            return true;
+    return false;
 }
 
 // --- local ports: invalidation --------------------------------------------------------------
@@ -828,8 +1147,10 @@ void __CFMessagePort::RemoveSocketFile() {
 }
 
 void __CFMessagePort::ShutDownLocal() {
-    if (driver && listenDescriptor >= 0)
-        driver->Unwatch(listenDescriptor);
+    for (int* own : {&listenDescriptor, &serveSignal, &stallTimer, &hangUps}) {
+        if (driver && *own >= 0)
+            driver->Unwatch(*own);
+    }
     CloseDescriptor(listenDescriptor);
     listenDescriptor = -1;
     RemoveSocketFile();
@@ -842,7 +1163,11 @@ void __CFMessagePort::ShutDownLocal() {
             pending.push_back(connection->current);
         connection->input.Clear();
         CloseConnection(connection);
-        connection->peerGone = true;
+    }
+    serveQueue.clear();
+    for (int* own : {&serveSignal, &stallTimer, &hangUps}) {
+        CloseDescriptor(*own);
+        *own = -1;
     }
     // Handlers last: they may call back into the port.
     for (const auto& request : pending)
@@ -946,54 +1271,48 @@ SendOutcome SendFrame(int descriptor, const uint8_t* header, const UInt8* body, 
 
 } // namespace
 
-SInt32 __CFMessagePort::Exchange(SInt32 msgid, CFDataRef data, CFTimeInterval sendTimeout,
-                                 CFTimeInterval receiveTimeout, CFDataRef* returnData) {
-    const size_t bodyLength = data ? size_t(CFDataGetLength(data)) : 0;
-    const UInt8* body = data && bodyLength ? CFDataGetBytePtr(data) : nullptr;
-    uint8_t header[glyphwell::port::kRequestHeaderSize];
-    glyphwell::port::StoreBigEndian32(uint32_t(msgid), header);
-    glyphwell::port::StoreBigEndian32(uint32_t(bodyLength), header + 4);
-
+/// Writes the request frame, on the kept connection or a new one. True when it went out, with
+/// the connection in `*connection`; otherwise false with the status in `*status`.
+bool __CFMessagePort::SendRequestFrame(const uint8_t* header, const UInt8* body, size_t bodyLength,
+                                       CFTimeInterval sendTimeout, int* connection,
+                                       SInt32* status) {
     const Deadline sendDeadline(sendTimeout);
     // A kept connection that the server has dropped since (it ended while idle) fails the
     // send with EPIPE before any byte goes out; a new connection is then tried once.
-    int connection = RemoteDescriptor();
+    *connection = RemoteDescriptor();
     for (int attempt = 0;; ++attempt) {
         bool fresh = false;
-        if (connection < 0) {
-            connection = Reconnect();
-            if (connection < 0)
-                return valid ? kCFMessagePortTransportError : kCFMessagePortIsInvalid;
+        if (*connection < 0) {
+            *connection = Reconnect();
+            if (*connection < 0) {
+                *status = valid ? kCFMessagePortTransportError : kCFMessagePortIsInvalid;
+                return false;
+            }
             fresh = true;
         }
         bool sentAny = false;
         const SendOutcome outcome =
-            SendFrame(connection, header, body, bodyLength, sendDeadline, &sentAny);
+            SendFrame(*connection, header, body, bodyLength, sendDeadline, &sentAny);
         if (outcome == SendOutcome::Sent)
-            break;
+            return true;
         CloseRemoteDescriptor();
-        connection = -1;
-        if (!valid)
-            return kCFMessagePortIsInvalid;
+        *connection = -1;
+        if (!valid) {
+            *status = kCFMessagePortIsInvalid;
+            return false;
+        }
         if (outcome == SendOutcome::PeerClosed && !sentAny && !fresh && attempt == 0)
             continue;
-        switch (outcome) {
-        case SendOutcome::Timeout:
-            return kCFMessagePortSendTimeout;
-        case SendOutcome::PeerClosed:
-            return kCFMessagePortBecameInvalidError;
-        default:
-            return kCFMessagePortTransportError;
-        }
+        *status = outcome == SendOutcome::Timeout      ? kCFMessagePortSendTimeout
+                  : outcome == SendOutcome::PeerClosed ? kCFMessagePortBecameInvalidError
+                                                       : kCFMessagePortTransportError;
+        return false;
     }
+}
 
-    if (!returnData) {
-        // No one will read the reply: give the connection up so that it is never taken for
-        // the reply of a later request.
-        CloseRemoteDescriptor();
-        return kCFMessagePortSuccess;
-    }
-
+/// Waits for the one reply frame on `connection` and hands its body out in `*returnData`.
+SInt32 __CFMessagePort::ReceiveReply(int connection, CFTimeInterval receiveTimeout,
+                                     CFDataRef* returnData) {
     const Deadline receiveDeadline(receiveTimeout);
     FrameAssembler reply(FrameAssembler::Kind::Reply, kMessagePortMaxFrame);
     if (receiveBuffer.empty())
@@ -1001,16 +1320,12 @@ SInt32 __CFMessagePort::Exchange(SInt32 msgid, CFDataRef data, CFTimeInterval se
     // Without a limit the receive simply blocks (an Invalidate on another thread ends it by
     // shutting the socket down); with one, poll keeps the deadline.
     const bool blocking = receiveDeadline.IsForever();
-    for (;;) {
+    while (!reply.HasFrame()) {
         if (!blocking) {
             const int ready = WaitFor(connection, POLLIN, receiveDeadline);
-            if (ready == 0 && valid) {
+            if (ready <= 0 && valid) {
                 CloseRemoteDescriptor();
-                return kCFMessagePortReceiveTimeout;
-            }
-            if (ready < 0 && valid) {
-                CloseRemoteDescriptor();
-                return kCFMessagePortTransportError;
+                return ready == 0 ? kCFMessagePortReceiveTimeout : kCFMessagePortTransportError;
             }
         }
         if (!valid) {
@@ -1019,16 +1334,11 @@ SInt32 __CFMessagePort::Exchange(SInt32 msgid, CFDataRef data, CFTimeInterval se
         }
         bool drained = false;
         const ssize_t got = ReceiveInto(connection, reply, receiveBuffer, &drained, blocking);
-        if (got > 0) {
-            if (reply.Failed()) {
-                CloseRemoteDescriptor();
-                return kCFMessagePortTransportError;
-            }
-            if (reply.HasFrame())
-                break;
-            continue;
+        if (got > 0 && reply.Failed()) {
+            CloseRemoteDescriptor();
+            return kCFMessagePortTransportError;
         }
-        if (got < 0 && (errno == EINTR || errno == EAGAIN || errno == EWOULDBLOCK))
+        if (got > 0 || (got < 0 && (errno == EINTR || errno == EAGAIN || errno == EWOULDBLOCK)))
             continue;
         const bool closedByServer = got == 0 || errno == ECONNRESET;
         CloseRemoteDescriptor();
@@ -1041,6 +1351,27 @@ SInt32 __CFMessagePort::Exchange(SInt32 msgid, CFDataRef data, CFTimeInterval se
         CloseRemoteDescriptor(); // more than one reply: the connection is out of step
     *returnData = CreateDataAdopting(frame.body);
     return kCFMessagePortSuccess;
+}
+
+SInt32 __CFMessagePort::Exchange(SInt32 msgid, CFDataRef data, CFTimeInterval sendTimeout,
+                                 CFTimeInterval receiveTimeout, CFDataRef* returnData) {
+    const size_t bodyLength = data ? size_t(CFDataGetLength(data)) : 0;
+    const UInt8* body = data && bodyLength ? CFDataGetBytePtr(data) : nullptr;
+    uint8_t header[glyphwell::port::kRequestHeaderSize];
+    glyphwell::port::StoreBigEndian32(uint32_t(msgid), header);
+    glyphwell::port::StoreBigEndian32(uint32_t(bodyLength), header + 4);
+
+    int connection = -1;
+    SInt32 status = kCFMessagePortSuccess;
+    if (!SendRequestFrame(header, body, bodyLength, sendTimeout, &connection, &status))
+        return status;
+    if (!returnData) {
+        // No one will read the reply: give the connection up so that it is never taken for
+        // the reply of a later request.
+        CloseRemoteDescriptor();
+        return kCFMessagePortSuccess;
+    }
+    return ReceiveReply(connection, receiveTimeout, returnData);
 }
 
 // ---------------------------------------------------------------------------------------------
@@ -1078,11 +1409,16 @@ CFMessagePortRef CFMessagePortCreateLocal(CFAllocatorRef, CFStringRef name,
 
     auto* port = new __CFMessagePort(name, text, false);
     port->listenDescriptor = listening;
-    port->spareDescriptor = open("/dev/null", O_RDONLY | O_CLOEXEC);
     port->ownsSocketFile = ownsFile;
     port->socketPath = path;
     port->socketDevice = device;
     port->socketInode = inode;
+    if (!port->OpenLocalDescriptors()) {
+        AppLog("message port %s: cannot set up its event descriptors: %s", text.c_str(),
+               ErrorText(errno).c_str());
+        CFRelease(port); // stops listening and removes the socket file
+        return nullptr;
+    }
     port->callout = callout;
     if (context) {
         port->context = *context;
@@ -1172,26 +1508,72 @@ CFStringRef CFMessagePortGetName(CFMessagePortRef port) {
 
 namespace glyphwell::port {
 
-std::string SocketPathForName(const std::string& name) {
-    if (name.empty() || name == "." || name == ".." || name.find('/') != std::string::npos ||
-        name.find('\0') != std::string::npos)
-        return {};
+std::string HomeDirectory() {
+    const char* home = getenv("HOME");
+    if (home && home[0] == '/')
+        return home;
+    passwd entry{};
+    passwd* found = nullptr;
+    std::vector<char> buffer(16384);
+    while (getpwuid_r(geteuid(), &entry, buffer.data(), buffer.size(), &found) == ERANGE &&
+           buffer.size() < (1u << 20))
+        buffer.resize(buffer.size() * 2);
+    if (found && found->pw_dir && found->pw_dir[0] == '/')
+        return found->pw_dir;
+    return {};
+}
+
+std::string SocketDirectory() {
     std::string directory;
     const char* runtimeDirectory = getenv("XDG_RUNTIME_DIR");
     if (runtimeDirectory && runtimeDirectory[0] == '/') {
         directory = runtimeDirectory;
+    } else {
+        directory = HomeDirectory();
+        if (directory.empty()) {
+            AppLog("message port: no socket directory: neither XDG_RUNTIME_DIR nor a home "
+                   "directory is known");
+            return {};
+        }
         while (directory.size() > 1 && directory.back() == '/')
             directory.pop_back();
-    } else {
+        directory += directory == "/" ? ".glyphwell" : "/.glyphwell";
+        // In the user's home no other user can take the name first; it is still checked, since
+        // a home may be shared or its permissions loose.
         const uid_t user = geteuid();
-        directory = "/tmp/glyphwell-" + std::to_string(user);
-        if (mkdir(directory.c_str(), 0700) != 0 && errno != EEXIST)
-            return {};
+        std::string refusal;
         struct stat status;
-        if (lstat(directory.c_str(), &status) != 0 || !S_ISDIR(status.st_mode) ||
-            status.st_uid != user || (status.st_mode & 077) != 0)
+        if (mkdir(directory.c_str(), 0700) != 0 && errno != EEXIST)
+            refusal = "cannot create it: " + ErrorText(errno);
+        else if (lstat(directory.c_str(), &status) != 0)
+            refusal = "cannot check it: " + ErrorText(errno);
+        else if (S_ISLNK(status.st_mode))
+            refusal = "it is a symbolic link";
+        else if (!S_ISDIR(status.st_mode))
+            refusal = "it is not a directory";
+        else if (status.st_uid != user)
+            refusal =
+                Format("it is owned by uid %u, not %u", unsigned(status.st_uid), unsigned(user));
+        else if ((status.st_mode & 077) != 0)
+            refusal = Format("its mode %04o lets other users in", unsigned(status.st_mode & 07777));
+        if (!refusal.empty()) {
+            AppLog("message port: refused the socket directory %s: %s",
+                   EscapeForLog(directory).c_str(), refusal.c_str());
             return {};
+        }
     }
+    while (directory.size() > 1 && directory.back() == '/')
+        directory.pop_back();
+    return directory;
+}
+
+std::string SocketPathForName(const std::string& name) {
+    if (name.empty() || name == "." || name == ".." || name.find('/') != std::string::npos ||
+        name.find('\0') != std::string::npos)
+        return {};
+    const std::string directory = SocketDirectory();
+    if (directory.empty())
+        return {};
     std::string path = directory == "/" ? "/" + name : directory + "/" + name;
     if (path.size() >= sizeof(sockaddr_un::sun_path))
         return {};
@@ -1200,6 +1582,28 @@ std::string SocketPathForName(const std::string& name) {
 
 std::shared_ptr<PendingRequest> CurrentRequest() {
     return currentRequests.empty() ? nullptr : currentRequests.back();
+}
+
+/// The local port behind `port`, or null (after an assertion report) for anything else.
+static __CFMessagePort* AsLocalPort(CFMessagePortRef port) {
+    __CFMessagePort* object = AsPort(port);
+    GW_ASSERT(object != nullptr && !object->remote);
+    return object && !object->remote ? object : nullptr;
+}
+
+void SetStallTimeout(CFMessagePortRef local, std::chrono::milliseconds timeout) {
+    if (__CFMessagePort* port = AsLocalPort(local))
+        port->stallTimeout = std::max(timeout, std::chrono::milliseconds(1));
+}
+
+void SetUnfinishedRequestLimit(CFMessagePortRef local, size_t bytes) {
+    if (__CFMessagePort* port = AsLocalPort(local))
+        port->unfinishedLimit = bytes;
+}
+
+bool IsReceivingRequest(CFMessagePortRef local) {
+    __CFMessagePort* port = AsLocalPort(local);
+    return port && port->valid && port->IsReceiving();
 }
 
 } // namespace glyphwell::port

@@ -1,32 +1,40 @@
 // Message ports: request/reply messaging between processes of one user over a Unix-domain stream
 // socket named after the port.
 //
-// Socket: $XDG_RUNTIME_DIR/<name>; without XDG_RUNTIME_DIR, /tmp/glyphwell-<uid>/<name> in a
-// directory created with mode 0700 and checked to be the user's own (owner, mode, not a symlink).
-// Frames, integers big-endian: request = int32 msgid, uint32 length, length bytes;
-// reply = uint32 length, length bytes. One connection carries any number of requests, one at a
-// time. Frames longer than kMessagePortMaxFrame close the connection.
+// Socket: <directory>/<name>, the directory being $XDG_RUNTIME_DIR, or without it ~/.glyphwell
+// (see SocketDirectory). Frames, integers big-endian: request = int32 msgid, uint32 length,
+// length bytes; reply = uint32 length, length bytes. One connection carries any number of
+// requests, one at a time. Frames longer than kMessagePortMaxFrame close the connection.
 //
 // Local ports accept connections only from peers of the same user id (SO_PEERCRED). Creating a
-// local port whose name a live server answers on fails (null); a stale socket file (nothing
-// listening) is removed and the name taken over. When systemd passes a listening socket
-// (LISTEN_PID/LISTEN_FDS), the first local port created in the process serves it instead of
-// binding its own. A local port is served by adding its run-loop source to a run loop (see
-// CFRunLoop.h); its callback then runs on that loop's thread, nested inside any callback that
-// spins a nested loop, so a request arriving while another one waits for the user is answered
-// at once, and first.
+// local port whose name a live server answers on fails (null, nothing logged: the caller says
+// what it means); a stale socket file (nothing listening) is removed and the name taken over.
+// The lock file beside the socket that guards this takeover is removed once the port is bound.
+// When systemd passes a listening socket (LISTEN_PID/LISTEN_FDS), the first local port created in
+// the process serves it instead of binding its own. A local port is served by adding its run-loop
+// source to a run loop (see CFRunLoop.h); its callback then runs on that loop's thread, nested
+// inside any callback that spins a nested loop, so a request arriving while another one waits
+// for the user is answered at once, and first.
 //
-// Each connection is served on its own: a foreign peer, a frame over the limit or a client that
-// disconnects in the middle of a frame closes that connection with one line on the application
-// log, and every other client goes on being served. While a connection's request is in the
-// callback, the port keeps reading that connection (holding up to 1 MiB of any later frames,
-// which are handled one at a time after the reply), so that the client's going away is seen at
-// once: the request is then withdrawn (see PendingRequest) and its reply discarded. Whole
-// frames that arrived before the client went away are still handled (withdrawn from the start
-// when the end of the stream was seen before them); an incomplete one is dropped.
+// Every client may be faulty or hostile, and none can stall the others:
+// - Connections with requests waiting are served in turn, one request each per round of the
+//   loop, so a client that queues many requests delays the others by one request at most.
+// - A foreign peer, a frame over the limit, an unfinished request that has received nothing for
+//   the stall timeout (30 s), or a write of a reply that fails closes that connection with one
+//   line on the application log.
+// - Unfinished requests hold at most 128 MiB over all connections; beyond it the connection
+//   holding the most is closed, with one log line.
+// - While a connection has a request waiting, in the callback or being answered, at most 1 MiB
+//   of its later frames is held; it is not read beyond that until they are served.
+// - A client that hangs up (or whose reply cannot be written) is gone: its request in the
+//   callback is withdrawn (see PendingRequest), its reply discarded, and the requests it had
+//   queued are dropped unhandled. A client that only shuts its writing side down after sending
+//   still gets its replies; the connection is closed once they are written.
 // Replies are written without blocking; a large reply goes out as the client reads it.
 #pragma once
 
+#include <chrono>
+#include <cstddef>
 #include <functional>
 #include <memory>
 #include <string>
@@ -66,11 +74,11 @@ typedef CFDataRef (*CFMessagePortCallBack)(CFMessagePortRef local, SInt32 msgid,
 
 CFTypeID CFMessagePortGetTypeID();
 
-/// A new local port listening under `name`, or null (one log line on the application log) when
-/// the name is taken by a live server or the socket cannot be made. `context->info` is passed to
-/// every callback; its retain/release callbacks are honoured when given. `*shouldFreeInfo`
-/// (when given) is set to false when the port keeps the info, true when no port was made.
-/// The request data given to the callback is never null (empty for an empty request).
+/// A new local port listening under `name`, or null when the name is taken by a live server
+/// (nothing logged) or the socket cannot be made (one line on the application log). `context->info`
+/// is passed to every callback; its retain/release callbacks are honoured when given.
+/// `*shouldFreeInfo` (when given) is set to false when the port keeps the info, true when no port
+/// was made. The request data given to the callback is never null (empty for an empty request).
 CFMessagePortRef CFMessagePortCreateLocal(CFAllocatorRef allocator, CFStringRef name,
                                           CFMessagePortCallBack callout,
                                           CFMessagePortContext* context, Boolean* shouldFreeInfo);
@@ -94,9 +102,9 @@ CFRunLoopSourceRef CFMessagePortCreateRunLoopSource(CFAllocatorRef allocator,
 /// wait for each other) and stays valid after every error but IsInvalid: a connection that
 /// failed, timed out or that the server dropped while idle is replaced by a new one on the next
 /// request. Without `returnData` the reply is not awaited and the connection is given up after
-/// the request has been written (the server sees its client go away). Timeouts of zero, below
-/// zero or NaN do not wait at all. Invalidating the port from another thread ends a waiting
-/// request with IsInvalid.
+/// the request has been written (the server sees its client go away, and may drop the request
+/// unhandled). Timeouts of zero, below zero or NaN do not wait at all. Invalidating the port from
+/// another thread ends a waiting request with IsInvalid.
 SInt32 CFMessagePortSendRequest(CFMessagePortRef remote, SInt32 msgid, CFDataRef data,
                                 CFTimeInterval sendTimeout, CFTimeInterval receiveTimeout,
                                 CFStringRef replyMode, CFDataRef* returnData);
@@ -113,10 +121,30 @@ CFStringRef CFMessagePortGetName(CFMessagePortRef port);
 
 namespace glyphwell::port {
 
-/// The socket path for a port name (see above). Empty when it cannot be made safely: a name that
-/// is empty, ".", ".." or holds "/", a fallback directory that is not the user's own, or a path
-/// too long for a socket address. A relative XDG_RUNTIME_DIR counts as unset.
+/// The user's home directory: $HOME when set and absolute, else the password database's entry
+/// for the effective user; empty when neither is known.
+std::string HomeDirectory();
+
+/// The directory of the sockets, shared by servers and clients: $XDG_RUNTIME_DIR when set and
+/// absolute; otherwise <home>/.glyphwell, created with mode 0700 when missing. That directory is
+/// refused (empty result, one log line naming the path and the reason) when it is a symbolic
+/// link, not a directory, owned by another user, or open to others.
+std::string SocketDirectory();
+
+/// The socket path for a port name: SocketDirectory()/<name>. Empty when it cannot be made
+/// safely: a name that is empty, ".", ".." or holds "/", no usable directory, or a path too long
+/// for a socket address.
 std::string SocketPathForName(const std::string& name);
+
+/// How long an unfinished request of a local port may receive nothing before its connection is
+/// closed (30 s unless set; at least 1 ms). Run-loop thread only.
+void SetStallTimeout(CFMessagePortRef local, std::chrono::milliseconds timeout);
+/// The most bytes that unfinished requests of a local port may hold over all its connections
+/// (128 MiB unless set). Run-loop thread only.
+void SetUnfinishedRequestLimit(CFMessagePortRef local, size_t bytes);
+/// True while a local port is receiving work: a connection holds part of a request, or whole
+/// requests not yet handled. False for an invalidated port. Run-loop thread only.
+bool IsReceivingRequest(CFMessagePortRef local);
 
 /// One request being handled by a local port's callback. A callback that waits for the user
 /// keeps it and learns through it when its client went away (disconnected or died) or the port

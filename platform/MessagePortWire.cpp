@@ -1,6 +1,7 @@
 #include "platform/MessagePortWire.h"
 
 #include <algorithm>
+#include <atomic>
 #include <cstdlib>
 #include <cstring>
 #include <utility>
@@ -158,12 +159,34 @@ Frame FrameAssembler::TakeFrame() {
     return frame;
 }
 
+void FrameAssembler::DropPartial() {
+    buffered_ -= PartialBytes();
+    current_ = Frame();
+    headerFill_ = 0;
+    bodyLength_ = 0;
+}
+
 void FrameAssembler::Clear() {
     frames_.clear();
     current_ = Frame();
     headerFill_ = 0;
     bodyLength_ = 0;
     buffered_ = 0;
+}
+
+namespace {
+
+std::atomic<ReplySendFunction> replySendFunction{nullptr};
+
+} // namespace
+
+void SetReplySendFunctionForTesting(ReplySendFunction function) {
+    replySendFunction = function;
+}
+
+ReplySendFunction ReplySend() {
+    ReplySendFunction function = replySendFunction;
+    return function ? function : &sendmsg;
 }
 
 } // namespace glyphwell::port

@@ -8,6 +8,9 @@
 // without a copy, and large bodies can be received straight into place (BodyRoom).
 #pragma once
 
+#include <sys/socket.h>
+#include <sys/types.h>
+
 #include <cstddef>
 #include <cstdint>
 #include <deque>
@@ -88,6 +91,12 @@ public:
     bool IsMidFrame() const { return headerFill_ != 0; }
     /// Bytes held: whole frames not yet taken plus the frame in progress.
     size_t BufferedBytes() const { return buffered_; }
+    /// Bytes received of the frame in progress (header included); 0 between frames.
+    size_t PartialBytes() const {
+        return headerFill_ == 0 ? 0 : headerFill_ + current_.body.Size();
+    }
+    /// Drops the frame in progress and keeps the whole frames.
+    void DropPartial();
     bool Failed() const { return failed_; }
     /// The body length the refused frame announced (valid once Failed()).
     uint32_t RefusedLength() const { return refusedLength_; }
@@ -115,5 +124,11 @@ private:
     bool failed_ = false;
     uint32_t refusedLength_ = 0;
 };
+
+/// How local ports write replies: sendmsg(2) unless a test installs a hook (null restores it).
+/// The hook is process-wide and must be installed while no port writes.
+using ReplySendFunction = ssize_t (*)(int descriptor, const msghdr* message, int flags);
+void SetReplySendFunctionForTesting(ReplySendFunction function);
+ReplySendFunction ReplySend();
 
 } // namespace glyphwell::port
