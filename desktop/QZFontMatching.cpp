@@ -97,6 +97,26 @@ bool QZIsFontInstalled(const std::string& postScriptName) {
     return QZFindInstalledFont(postScriptName).has_value();
 }
 
+std::optional<std::vector<std::string>> QZFontFilePostScriptNames(const std::string& path) {
+    std::lock_guard<std::mutex> lock(FontconfigMutex());
+    CurrentConfig();
+    FcFontSet* faces = FcFontSetCreate();
+    if (!faces)
+        return std::nullopt;
+    int count = 0;
+    // Face index -1 (all bits set) asks for every face of the file.
+    const unsigned read = FcFreeTypeQueryAll(reinterpret_cast<const FcChar8*>(path.c_str()),
+                                             unsigned(-1), nullptr, &count, faces);
+    std::optional<std::vector<std::string>> names;
+    if (read > 0 && faces->nfont > 0) {
+        names.emplace();
+        for (int i = 0; i < faces->nfont; ++i)
+            names->push_back(PatternString(faces->fonts[i], FC_POSTSCRIPT_NAME));
+    }
+    FcFontSetDestroy(faces);
+    return names;
+}
+
 bool QZRegisterInstalledFontFile(const std::string& path, const std::string& directory) {
     std::lock_guard<std::mutex> lock(FontconfigMutex());
     FcConfig* config = CurrentConfig();

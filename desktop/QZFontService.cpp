@@ -19,6 +19,7 @@
 #include "platform/CFError.h"
 #include "platform/CFNumber.h"
 #include "platform/Log.h"
+#include "platform/LogEscape.h"
 #include "protocol/QZUIProtocol.h"
 
 const CFStringRef kCTFontDescriptorMatchingCancelDownloadHandler =
@@ -176,7 +177,9 @@ bool MatchingRun::ReportFailure(CFTypeRef concerned, const std::string& postScri
     const void* one[] = {concerned};
     TCFRetained<CFArrayRef> concernedArray(
         CFArrayCreate(kCFAllocatorDefault, one, 1, &kCFTypeArrayCallBacks), kAdopted);
-    glyphwell::AppLog("Cannot download the font %s: %s", postScriptName.c_str(), reason.c_str());
+    glyphwell::AppLog("Cannot download the font %s: %s",
+                      glyphwell::LogEscape(postScriptName).c_str(),
+                      glyphwell::LogEscape(reason).c_str());
     return Report(kCTFontDescriptorMatchingDidFailWithError,
                   {{kCTFontDescriptorMatchingDescriptors, concernedArray},
                    {kCTFontDescriptorMatchingError, error}});
@@ -203,7 +206,8 @@ bool MatchingRun::Download(CFTypeRef descriptor, const std::string& postScriptNa
         return ReportDownloading(kCTFontDescriptorMatchingDownloading, descriptor,
                                  startBytes + received);
     };
-    const QZFontAssetDownload download{asset.localID, asset.url, asset.size, asset.sha256};
+    const QZFontAssetDownload download{
+        asset.localID, asset.url, asset.size, asset.sha256, {postScriptName}};
     const QZFontDownloadResult result =
         QZDownloadFontAsset(download, QZFontInstallDirectory(), progress, cancellation_.get());
 
