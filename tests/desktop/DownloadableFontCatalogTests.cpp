@@ -151,7 +151,7 @@ TEST(CatalogParse, TheDocumentedSampleIsAValidCatalog) {
     const auto catalog = QZDownloadableFontCatalog::Parse(sample.readAll().toStdString(), "sample");
     EXPECT_TRUE(log.Texts().empty());
     ASSERT_EQ(catalog.assets.size(), 2u);
-    EXPECT_EQ(catalog.assets[0].fonts[1].localizedFamilyNames.at("de"), "Beispiel Sans");
+    EXPECT_EQ(catalog.assets[0].fonts[1].LocalizedFamilyName("de"), "Beispiel Sans");
 }
 
 } // namespace
