@@ -172,8 +172,8 @@ public:
     QZDownloadableFontCatalog Finish(bool parsed);
 
     // Scalars.
-    bool null() override { return Scalar(Seen::Invalid, {}); }
-    bool boolean(bool) override { return Scalar(Seen::Invalid, {}); }
+    bool null() override { return Scalar(false, {}); }
+    bool boolean(bool) override { return Scalar(false, {}); }
     bool number_integer(number_integer_t value) override {
         return Size(value >= 0, uint64_t(value));
     }
@@ -181,8 +181,8 @@ public:
         return Size(value <= uint64_t(std::numeric_limits<int64_t>::max()), value);
     }
     bool number_float(number_float_t, const string_t&) override { return Size(false, 0); }
-    bool string(string_t& value) override { return Scalar(Seen::Valid, value); }
-    bool binary(binary_t&) override { return Scalar(Seen::Invalid, {}); }
+    bool string(string_t& value) override { return Scalar(true, value); }
+    bool binary(binary_t&) override { return Scalar(false, {}); }
 
     // Containers.
     bool start_object(std::size_t) override;
@@ -214,11 +214,13 @@ private:
         Name
     };
 
-    bool Scalar(Seen seen, std::string_view text);
+    bool Scalar(bool isString, std::string_view text);
     bool Size(bool valid, uint64_t value);
-    /// A value (scalar or container start) arrives in the current context; `container` is the
-    /// context it opens (Skip for scalars and containers of no interest).
-    Context Place(Seen seen, std::string_view text, Context container);
+    /// A value arrives in the current context: a string (`isString`, with `text`), another
+    /// scalar, or the start of a container that opens `container` (Skip: of no interest).
+    void Place(bool isString, std::string_view text, Context container);
+    void PlaceAssetMember(bool isString, std::string_view text, Context container);
+    void PlaceFontMember(bool isString, std::string_view text, Context container);
     void StartAsset();
     void EndAsset();
     void EndFont();
@@ -267,7 +269,7 @@ bool CatalogReader::start_object(std::size_t) {
         opened = Context::Font;
     else if (top == Context::Font && member_ == Member::Names)
         opened = Context::Names;
-    Place(Seen::Valid, {}, opened);
+    Place(false, {}, opened);
     if (opened == Context::Skip) {
         skipDepth_ = 1;
         return true;
@@ -306,7 +308,7 @@ bool CatalogReader::start_array(std::size_t) {
         opened = Context::Assets;
     else if (top == Context::Asset && member_ == Member::Fonts)
         opened = Context::Fonts;
-    Place(Seen::Valid, {}, opened);
+    Place(false, {}, opened);
     if (opened == Context::Skip) {
         skipDepth_ = 1;
         return true;
@@ -387,9 +389,9 @@ bool CatalogReader::key(string_t& name) {
     return true;
 }
 
-bool CatalogReader::Scalar(Seen seen, std::string_view text) {
+bool CatalogReader::Scalar(bool isString, std::string_view text) {
     if (skipDepth_ == 0)
-        Place(seen, text, Context::Skip);
+        Place(isString, text, Context::Skip);
     return true;
 }
 
@@ -401,14 +403,11 @@ bool CatalogReader::Size(bool valid, uint64_t value) {
         asset_.size = value;
         return true;
     }
-    Place(Seen::Invalid, {}, Context::Skip);
+    Place(false, {}, Context::Skip);
     return true;
 }
 
-CatalogReader::Context CatalogReader::Place(Seen seen, std::string_view text, Context container) {
-    const bool isString = seen == Seen::Valid && container == Context::Skip && text.data();
-    const Seen asString = isString ? Seen::Valid : Seen::Invalid;
-    StringArena& strings = storage_->strings;
+void CatalogReader::Place(bool isString, std::string_view text, Context container) {
     switch (stack_.back()) {
     case Context::Root:
         if (member_ == Member::Assets)
@@ -419,27 +418,11 @@ CatalogReader::Context CatalogReader::Place(Seen seen, std::string_view text, Co
             // An element that is not an object is an asset of its own, left out.
             StartAsset();
             AddProblem(QZCatalogProblem::Kind::Asset, "not an object", assetLine_, assetColumn_);
-            storage_->strings.Rewind(assetMark_);
             ++assetIndex_;
         }
         break;
     case Context::Asset:
-        if (member_ == Member::LocalID)
-            localID_ = isString && !text.empty() ? Seen::Valid : Seen::Invalid;
-        else if (member_ == Member::URL)
-            url_ = isString && !text.empty() ? Seen::Valid : Seen::Invalid;
-        else if (member_ == Member::SHA256)
-            sha256_ = isString && IsSHA256(text) ? Seen::Valid : Seen::Invalid;
-        else if (member_ == Member::Size)
-            size_ = Seen::Invalid;
-        else if (member_ == Member::Fonts)
-            fontsMember_ = container == Context::Fonts ? Seen::Valid : Seen::Invalid;
-        if (member_ == Member::LocalID && localID_ == Seen::Valid)
-            asset_.localID = strings.Store(text);
-        else if (member_ == Member::URL && url_ == Seen::Valid)
-            asset_.url = strings.Store(text);
-        else if (member_ == Member::SHA256 && sha256_ == Seen::Valid)
-            asset_.sha256 = strings.Store(text);
+        PlaceAssetMember(isString, text, container);
         break;
     case Context::Fonts:
         if (container != Context::Font) {
@@ -449,31 +432,50 @@ CatalogReader::Context CatalogReader::Place(Seen seen, std::string_view text, Co
             EndFont();
         }
         break;
-    case Context::Font: {
-        FontRecord& font = fonts_.back();
-        if (member_ == Member::PostScriptName) {
-            font.postScriptName = isString && !text.empty() ? Seen::Valid : Seen::Invalid;
-            if (font.postScriptName == Seen::Valid)
-                font.postScriptNameText = strings.Store(text);
-        } else if (member_ == Member::Family) {
-            font.family = asString;
-            if (isString)
-                font.familyText = strings.Store(text);
-        } else if (member_ == Member::Names) {
-            font.names = container == Context::Names ? Seen::Valid : Seen::Invalid;
-        }
+    case Context::Font:
+        PlaceFontMember(isString, text, container);
         break;
-    }
-    case Context::Names: {
-        FontRecord& font = fonts_.back();
-        storage_->names.push_back({language_, isString ? strings.Store(text) : std::string_view{}});
-        font.nameValid.push_back(isString);
+    case Context::Names:
+        storage_->names.push_back(
+            {language_, isString ? storage_->strings.Store(text) : std::string_view{}});
+        fonts_.back().nameValid.push_back(isString);
         break;
-    }
     default:
         break;
     }
-    return container;
+}
+
+void CatalogReader::PlaceAssetMember(bool isString, std::string_view text, Context container) {
+    const auto check = [&](Seen& seen, std::string_view& stored, bool valid) {
+        seen = valid ? Seen::Valid : Seen::Invalid;
+        if (valid)
+            stored = storage_->strings.Store(text);
+    };
+    if (member_ == Member::LocalID)
+        check(localID_, asset_.localID, isString && !text.empty());
+    else if (member_ == Member::URL)
+        check(url_, asset_.url, isString && !text.empty());
+    else if (member_ == Member::SHA256)
+        check(sha256_, asset_.sha256, isString && IsSHA256(text));
+    else if (member_ == Member::Size)
+        size_ = Seen::Invalid; // numbers arrive through Size()
+    else if (member_ == Member::Fonts)
+        fontsMember_ = container == Context::Fonts ? Seen::Valid : Seen::Invalid;
+}
+
+void CatalogReader::PlaceFontMember(bool isString, std::string_view text, Context container) {
+    FontRecord& font = fonts_.back();
+    if (member_ == Member::PostScriptName) {
+        font.postScriptName = isString && !text.empty() ? Seen::Valid : Seen::Invalid;
+        if (font.postScriptName == Seen::Valid)
+            font.postScriptNameText = storage_->strings.Store(text);
+    } else if (member_ == Member::Family) {
+        font.family = isString ? Seen::Valid : Seen::Invalid;
+        if (isString)
+            font.familyText = storage_->strings.Store(text);
+    } else if (member_ == Member::Names) {
+        font.names = container == Context::Names ? Seen::Valid : Seen::Invalid;
+    }
 }
 
 void CatalogReader::StartAsset() {

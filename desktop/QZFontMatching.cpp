@@ -4,6 +4,7 @@
 #include <mutex>
 
 #include "platform/Log.h"
+#include "platform/LogEscape.h"
 
 namespace {
 
@@ -53,7 +54,8 @@ void RescanDirectoryCache(FcConfig* config, const std::string& directory) {
     if (cache)
         FcDirCacheUnload(cache);
     else
-        glyphwell::AppLog("Cannot update the font cache of %s", directory.c_str());
+        glyphwell::AppLog("Cannot update the font cache of %s",
+                          glyphwell::LogEscape(directory).c_str());
 }
 
 } // namespace
