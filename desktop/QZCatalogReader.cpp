@@ -501,8 +501,19 @@ void CatalogReader::EndFont() {
         fontProblem_ = reason;
     if (!reason.empty() || font.names != Seen::Valid)
         return;
-    // Sorted by language, the last of equal languages kept, as a JSON object reads.
     std::vector<QZLocalizedName>& names = storage_->names;
+    const auto first = names.begin() + std::ptrdiff_t(font.namesBegin);
+    const auto valid =
+        std::find(font.nameValid.begin(), font.nameValid.end(), false) == font.nameValid.end();
+    if (valid && std::adjacent_find(first, names.end(), [](const auto& a, const auto& b) {
+                     return a.language >= b.language;
+                 }) == names.end()) {
+        // The usual case: languages already in order, each once.
+        font.namesCount = size_t(names.end() - first);
+        font.nameValid.clear();
+        return;
+    }
+    // Sorted by language, the last of equal languages kept, as a JSON object reads.
     std::vector<size_t> order(names.size() - font.namesBegin);
     for (size_t i = 0; i < order.size(); ++i)
         order[i] = i;
