@@ -150,7 +150,9 @@ int main(int argc, char** argv) {
     gPeak.store(heapBefore);
 
     const auto start = std::chrono::steady_clock::now();
+    const double cpuStart = CPUMilliseconds();
     const auto catalog = QZCurrentDownloadableFontCatalog();
+    const double cpu = CPUMilliseconds() - cpuStart;
     const double milliseconds =
         std::chrono::duration<double, std::milli>(std::chrono::steady_clock::now() - start).count();
 
