@@ -71,8 +71,10 @@ struct QZCatalogProblem {
         Asset       ///< one asset is left out
     };
     Kind kind = Kind::Malformed;
-    size_t line = 0;     ///< 1-based place of the problem (an asset's opening brace); 0 when none
-    size_t column = 0;   ///< 1-based, in bytes
+    /// For Kind::Asset, the 1-based line and byte column of the asset's opening brace (of the
+    /// end of an element that is not an object); 0 for the other kinds.
+    size_t line = 0;
+    size_t column = 0;
     size_t asset = 0;    ///< the asset's index in "assets", for Kind::Asset
     std::string message; ///< e.g. "no \"url\"" or the JSON parser's message
 };
