@@ -1,120 +1,21 @@
 #include "desktop/QZDownloadableFontCatalog.h"
 
 #include <QDateTime>
-#include <QFile>
 #include <QFileInfo>
 #include <QStandardPaths>
-#include <limits>
 #include <mutex>
-#include <nlohmann/json.hpp>
-#include <set>
 
 #include "cfutil/TCFRetained.h"
 #include "desktop/QZQtStrings.h"
 #include "platform/CFDictionary.h"
 #include "platform/CFNumber.h"
 #include "platform/Log.h"
+#include "platform/LogEscape.h"
 #include "protocol/QZUIProtocol.h"
 
 namespace {
 
 constexpr char kCatalogRelativePath[] = "glyphwell/downloadable-fonts.json";
-/// A catalog beyond this size is not read: it cannot be a list of font files.
-constexpr qint64 kMaximumCatalogSize = 64 << 20;
-
-using nlohmann::json;
-
-bool IsSHA256(const std::string& text) {
-    if (text.size() != 64)
-        return false;
-    for (char c : text)
-        if (!((c >= '0' && c <= '9') || (c >= 'a' && c <= 'f')))
-            return false;
-    return true;
-}
-
-bool NonEmptyString(const json& object, const char* key) {
-    const auto found = object.find(key);
-    return found != object.end() && found->is_string() &&
-           !found->get_ref<const std::string&>().empty();
-}
-
-/// Reads one font of an asset; false with `reason` set when it is malformed.
-bool ReadFont(const json& value, QZDownloadableFont& font, std::string& reason) {
-    if (!value.is_object() || !NonEmptyString(value, "postScriptName")) {
-        reason = "a font without a \"postScriptName\"";
-        return false;
-    }
-    font.postScriptName = value["postScriptName"].get<std::string>();
-    if (const auto family = value.find("family"); family != value.end()) {
-        if (!family->is_string()) {
-            reason = "a \"family\" that is not a string";
-            return false;
-        }
-        font.family = family->get<std::string>();
-    }
-    if (const auto names = value.find("localizedFamilyNames"); names != value.end()) {
-        if (!names->is_object()) {
-            reason = "\"localizedFamilyNames\" that is not an object";
-            return false;
-        }
-        for (const auto& [language, name] : names->items()) {
-            if (!name.is_string()) {
-                reason = "a localized family name that is not a string";
-                return false;
-            }
-            font.localizedFamilyNames[language] = name.get<std::string>();
-        }
-    }
-    return true;
-}
-
-/// Reads one asset; false with `reason` set when it is malformed.
-bool ReadAsset(const json& value, QZDownloadableFontAsset& asset, std::string& reason) {
-    if (!value.is_object()) {
-        reason = "not an object";
-        return false;
-    }
-    if (!NonEmptyString(value, "LocalID")) {
-        reason = "no \"LocalID\"";
-        return false;
-    }
-    asset.localID = value["LocalID"].get<std::string>();
-    if (!NonEmptyString(value, "url")) {
-        reason = "no \"url\"";
-        return false;
-    }
-    asset.url = value["url"].get<std::string>();
-    const auto size = value.find("size");
-    if (size == value.end() || !size->is_number_integer() ||
-        (size->is_number_unsigned()
-             ? size->get<uint64_t>() > uint64_t(std::numeric_limits<int64_t>::max())
-             : size->get<int64_t>() < 0)) {
-        reason = "no \"size\" in bytes";
-        return false;
-    }
-    asset.size =
-        size->is_number_unsigned() ? size->get<uint64_t>() : uint64_t(size->get<int64_t>());
-    const auto sha256 = value.find("sha256");
-    if (sha256 == value.end() || !sha256->is_string() || !IsSHA256(sha256->get<std::string>())) {
-        reason = "no \"sha256\" of 64 lower-case hexadecimal digits";
-        return false;
-    }
-    asset.sha256 = sha256->get<std::string>();
-    const auto fonts = value.find("fonts");
-    if (fonts == value.end() || !fonts->is_array() || fonts->empty()) {
-        reason = "no \"fonts\"";
-        return false;
-    }
-    for (const json& font : *fonts) {
-        QZDownloadableFont read;
-        if (!ReadFont(font, read, reason))
-            return false;
-        asset.fonts.push_back(std::move(read));
-    }
-    return true;
-}
-
 /// The state of the catalog file that the cached catalog was read from.
 struct FileState {
     QString path; ///< empty: no catalog file
@@ -146,30 +47,42 @@ FileState CurrentFileState() {
     return {};
 }
 
+/// Logs the problems of the catalog `origin` as the agent reports them: an unreadable or
+/// malformed catalog in one line, otherwise one line per asset left out.
+void LogProblems(const std::vector<QZCatalogProblem>& problems, const std::string& origin) {
+    const std::string place = glyphwell::LogEscape(origin);
+    for (const QZCatalogProblem& problem : problems) {
+        if (problem.kind == QZCatalogProblem::Kind::Asset)
+            continue;
+        glyphwell::AppLog(problem.kind == QZCatalogProblem::Kind::Unreadable
+                              ? "Cannot read the downloadable font catalog %s: %s"
+                              : "Cannot parse the downloadable font catalog %s: %s",
+                          place.c_str(), glyphwell::LogEscape(problem.message).c_str());
+        return;
+    }
+    for (const QZCatalogProblem& problem : problems)
+        glyphwell::AppLog("Skipping asset %zu of the downloadable font catalog %s: %s",
+                          problem.asset, place.c_str(),
+                          glyphwell::LogEscape(problem.message).c_str());
+}
+
 QZDownloadableFontCatalog LoadCatalog(const FileState& state) {
     if (state.path.isEmpty()) {
         glyphwell::AppLog(
             "No downloadable font catalog: none of %s exists",
-            qUtf8Printable(QZDownloadableFontCatalogPaths().join(QStringLiteral(", "))));
+            glyphwell::LogEscape(
+                QZDownloadableFontCatalogPaths().join(QStringLiteral(", ")).toStdString())
+                .c_str());
         return {};
     }
-    QFile file(state.path);
-    if (!file.open(QIODevice::ReadOnly)) {
-        glyphwell::AppLog("Cannot read the downloadable font catalog %s: %s",
-                          qUtf8Printable(state.path), qUtf8Printable(file.errorString()));
-        return {};
-    }
-    const QByteArray bytes = file.read(kMaximumCatalogSize + 1);
-    if (bytes.size() > kMaximumCatalogSize) {
-        glyphwell::AppLog("Cannot read the downloadable font catalog %s: larger than %lld bytes",
-                          qUtf8Printable(state.path), (long long)kMaximumCatalogSize);
-        return {};
-    }
-    return QZDownloadableFontCatalog::Parse(
-        std::string_view(bytes.constData(), size_t(bytes.size())), state.path.toStdString());
+    std::vector<QZCatalogProblem> problems;
+    const std::string path = state.path.toStdString();
+    QZDownloadableFontCatalog catalog = QZReadDownloadableFontCatalogFile(path, problems);
+    LogProblems(problems, path);
+    return catalog;
 }
 
-CFStringRef CreateString(const std::string& utf8) {
+CFStringRef CreateString(std::string_view utf8) {
     return CFStringCreateWithBytes(kCFAllocatorDefault, reinterpret_cast<const UInt8*>(utf8.data()),
                                    CFIndex(utf8.size()), kCFStringEncodingUTF8, false);
 }
@@ -179,7 +92,7 @@ CFDictionaryRef CreateAssetDictionary(const QZDownloadableFontAsset& asset,
                                       const QZDownloadableFont& font) {
     CFMutableDictionaryRef dictionary = CFDictionaryCreateMutable(
         kCFAllocatorDefault, 0, &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks);
-    auto setString = [dictionary](CFStringRef key, const std::string& utf8) {
+    auto setString = [dictionary](CFStringRef key, std::string_view utf8) {
         TCFRetained<CFStringRef> value(CreateString(utf8), kAdopted);
         if (value)
             CFDictionarySetValue(dictionary, key, value);
@@ -214,38 +127,9 @@ CFDictionaryRef CreateAssetDictionary(const QZDownloadableFontAsset& asset,
 
 QZDownloadableFontCatalog QZDownloadableFontCatalog::Parse(std::string_view bytes,
                                                            const std::string& origin) {
-    QZDownloadableFontCatalog catalog;
-    json document;
-    try {
-        document = json::parse(bytes.begin(), bytes.end());
-    } catch (const json::exception& error) {
-        glyphwell::AppLog("Cannot parse the downloadable font catalog %s: %s", origin.c_str(),
-                          error.what());
-        return catalog;
-    }
-    const auto assets = document.is_object() ? document.find("assets") : document.end();
-    if (!document.is_object() || assets == document.end() || !assets->is_array()) {
-        glyphwell::AppLog("Cannot parse the downloadable font catalog %s: no \"assets\" array",
-                          origin.c_str());
-        return catalog;
-    }
-    std::set<std::string> identifiers;
-    size_t index = 0;
-    for (const json& value : *assets) {
-        QZDownloadableFontAsset asset;
-        std::string reason;
-        if (!ReadAsset(value, asset, reason)) {
-            glyphwell::AppLog("Skipping asset %zu of the downloadable font catalog %s: %s", index,
-                              origin.c_str(), reason.c_str());
-        } else if (!identifiers.insert(asset.localID).second) {
-            glyphwell::AppLog("Skipping asset %zu of the downloadable font catalog %s: "
-                              "duplicate \"LocalID\" %s",
-                              index, origin.c_str(), asset.localID.c_str());
-        } else {
-            catalog.assets.push_back(std::move(asset));
-        }
-        ++index;
-    }
+    std::vector<QZCatalogProblem> problems;
+    QZDownloadableFontCatalog catalog = QZReadDownloadableFontCatalog(bytes, problems);
+    LogProblems(problems, origin);
     return catalog;
 }
 

@@ -13,39 +13,81 @@
 #include <QStringList>
 #include <cstdint>
 #include <functional>
-#include <map>
 #include <memory>
+#include <span>
 #include <string>
 #include <string_view>
 #include <vector>
 
 #include "platform/CFArray.h"
 
-/// One font held by an asset.
+/// A family name in one language.
+struct QZLocalizedName {
+    std::string_view language;
+    std::string_view name;
+};
+
+/// One font held by an asset. The views point into the catalog's storage.
 struct QZDownloadableFont {
-    std::string postScriptName;
-    std::string family; ///< may be empty
-    /// Language identifier to family name in that language.
-    std::map<std::string, std::string> localizedFamilyNames;
+    std::string_view postScriptName;
+    std::string_view family; ///< may be empty
+    /// Language identifier to family name in that language: sorted by language, each once.
+    std::span<const QZLocalizedName> localizedFamilyNames;
+
+    /// The family name in `language`; empty when the catalog gives none.
+    std::string_view LocalizedFamilyName(std::string_view language) const;
 };
 
-/// One downloadable asset: a file holding one or more fonts.
+/// One downloadable asset: a file holding one or more fonts. The views point into the catalog's
+/// storage.
 struct QZDownloadableFontAsset {
-    std::string localID; ///< the asset's identifier, unique in the catalog
-    std::string url;
-    uint64_t size = 0;  ///< bytes to download, at most INT64_MAX
-    std::string sha256; ///< 64 lower-case hexadecimal digits
-    std::vector<QZDownloadableFont> fonts;
+    std::string_view localID; ///< the asset's identifier, unique in the catalog
+    std::string_view url;
+    uint64_t size = 0;       ///< bytes to download, at most INT64_MAX
+    std::string_view sha256; ///< 64 lower-case hexadecimal digits
+    std::span<const QZDownloadableFont> fonts;
 };
 
+/// The catalog in compact form: every string stored once in a few large blocks, assets and fonts
+/// as views into them, no JSON document kept.
+///
+/// NOTE: the views of `assets` stay valid as long as a catalog sharing `storage` exists (copies
+/// and moves share it); they do not outlive the last one.
 struct QZDownloadableFontCatalog {
     std::vector<QZDownloadableFontAsset> assets;
+    std::shared_ptr<const void> storage; ///< what the views point into
 
     /// Reads a catalog from `bytes`; `origin` names it in log lines. Text that is not a JSON
     /// object with an "assets" array gives an empty catalog and one log line; each malformed
     /// asset is left out with one log line.
     static QZDownloadableFontCatalog Parse(std::string_view bytes, const std::string& origin);
 };
+
+/// One problem found while reading a catalog.
+struct QZCatalogProblem {
+    enum class Kind {
+        Unreadable, ///< the file cannot be read or is too large: the catalog is empty
+        Malformed,  ///< not JSON, or no "assets" array: the catalog is empty
+        Asset       ///< one asset is left out
+    };
+    Kind kind = Kind::Malformed;
+    /// For Kind::Asset, the 1-based line and byte column of the asset's opening brace (of the
+    /// end of an element that is not an object); 0 for the other kinds.
+    size_t line = 0;
+    size_t column = 0;
+    size_t asset = 0;    ///< the asset's index in "assets", for Kind::Asset
+    std::string message; ///< e.g. "no \"url\"" or the JSON parser's message
+};
+
+/// Reads the catalog file `path` as the agent does (streaming, at most 64 MiB) and appends every
+/// problem found to `problems`, in file order, without logging. Asset problems are found even
+/// when the text turns out not to be JSON further on; the catalog returned is then empty.
+QZDownloadableFontCatalog
+QZReadDownloadableFontCatalogFile(const std::string& path, std::vector<QZCatalogProblem>& problems);
+
+/// Reads a catalog from `bytes` like QZReadDownloadableFontCatalogFile, without logging.
+QZDownloadableFontCatalog QZReadDownloadableFontCatalog(std::string_view bytes,
+                                                        std::vector<QZCatalogProblem>& problems);
 
 /// The places searched for the catalog, in order.
 QStringList QZDownloadableFontCatalogPaths();

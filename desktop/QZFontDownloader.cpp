@@ -3,28 +3,34 @@
 #include <QCoreApplication>
 #include <QStandardPaths>
 #include <QString>
+#include <algorithm>
 #include <cerrno>
+#include <condition_variable>
 #include <cstring>
 #include <curl/curl.h>
-#include <fcntl.h>
+#include <deque>
 #include <filesystem>
+#include <map>
+#include <memory>
 #include <openssl/evp.h>
+#include <optional>
 #include <strings.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include "desktop/QZFontFileWriter.h"
 #include "desktop/QZFontMatching.h"
 #include "platform/Log.h"
+#include "platform/LogEscape.h"
 
 namespace {
 
 constexpr size_t kMaximumBaseNameLength = 80;
-/// How long a transfer may wait for its first byte of connection, and how long it may go
-/// without receiving anything, before it counts as failed.
-constexpr long kConnectTimeoutSeconds = 30;
-constexpr long kStallTimeoutSeconds = 60;
 /// The longest wait in the transfer loop; Cancel() wakes it sooner.
 constexpr int kPollTimeoutMilliseconds = 1000;
+/// The longest wait for another thread's transfer of the same asset before the cancellation is
+/// looked at again.
+constexpr std::chrono::milliseconds kShareWaitInterval{50};
 /// libcurl's receive buffer: its largest size, so that a large asset costs fewer callbacks and
 /// system calls.
 constexpr long kReceiveBufferSize = 512 * 1024;
@@ -97,65 +103,21 @@ std::string SHA256Hex(const std::string& bytes) {
     return digest.FinishHex();
 }
 
-/// The hidden temporary file a download is written to; removed unless it was renamed into place.
-class TemporaryFile {
-public:
-    TemporaryFile() = default;
-    TemporaryFile(const TemporaryFile&) = delete;
-    TemporaryFile& operator=(const TemporaryFile&) = delete;
-    ~TemporaryFile() {
-        Close();
-        if (!path_.empty())
-            unlink(path_.c_str());
-    }
-
-    /// Creates "<directory>/.<baseName>.XXXXXX"; the leading dot keeps fontconfig from scanning
-    /// a file that is still being written.
-    bool Create(const std::string& directory, const std::string& baseName) {
-        std::string pattern = directory + "/." + baseName + ".XXXXXX";
-        fd_ = mkostemp(pattern.data(), O_CLOEXEC);
-        if (fd_ < 0)
-            return false;
-        path_ = pattern;
-        fchmod(fd_, 0644);
-        return true;
-    }
-    int Descriptor() const { return fd_; }
-    const std::string& Path() const { return path_; }
-    /// Flushes the bytes to the disk and closes; false with errno set on failure.
-    bool SyncAndClose() {
-        const bool synced = fsync(fd_) == 0;
-        const int syncError = errno;
-        const bool closed = Close();
-        if (!synced)
-            errno = syncError;
-        return synced && closed;
-    }
-    /// Renames the file to `path`, which replaces any file there; false with errno set.
-    bool RenameTo(const std::string& path) {
-        if (rename(path_.c_str(), path.c_str()) != 0)
-            return false;
-        path_.clear();
-        return true;
-    }
-
-private:
-    bool Close() {
-        if (fd_ < 0)
-            return true;
-        const bool closed = close(fd_) == 0;
-        fd_ = -1;
-        return closed;
-    }
-
-    int fd_ = -1;
-    std::string path_;
+/// The libcurl easy handle of one transfer, cleaned up with it.
+struct EasyHandleCleanup {
+    void operator()(CURL* easy) const { curl_easy_cleanup(easy); }
 };
+using EasyHandle = std::unique_ptr<CURL, EasyHandleCleanup>;
+
+using Clock = std::chrono::steady_clock;
+
+std::mutex gLimitsMutex;
+QZDownloadLimits gLimits;
 
 /// State shared with libcurl's callbacks during one transfer.
 struct Transfer {
     CURL* easy = nullptr;
-    int fd = -1;
+    QZFontFileWriter* file = nullptr;
     SHA256Digest digest;
     uint64_t expectedSize = 0;
     uint64_t written = 0;
@@ -164,16 +126,30 @@ struct Transfer {
     const QZDownloadProgressFunction* progress = nullptr;
     QZDownloadCancellation* cancellation = nullptr;
 
+    QZDownloadLimits limits;
+    Clock::time_point start = Clock::now();
+    bool answered = false; ///< a header line or body byte arrived
+    /// Byte counts at most one low-speed window apart, oldest first, taken every eighth of it.
+    std::deque<std::pair<Clock::time_point, uint64_t>> samples;
+
     // Why the transfer was ended from our side, if it was.
     bool cancelled = false;
     bool stopped = false;
     bool tooLarge = false;
+    bool noAnswer = false;
+    bool tooSlow = false;
     int64_t announcedSize = -1; ///< a Content-Length that differs from the expected size
     int writeError = 0;
 };
 
+size_t ReceiveHeader(char*, size_t, size_t count, void* context) {
+    static_cast<Transfer*>(context)->answered = true;
+    return count;
+}
+
 size_t WriteBody(char* bytes, size_t, size_t count, void* context) {
     auto* transfer = static_cast<Transfer*>(context);
+    transfer->answered = true;
     if (transfer->written == 0) {
         curl_off_t announced = -1;
         if (curl_easy_getinfo(transfer->easy, CURLINFO_CONTENT_LENGTH_DOWNLOAD_T, &announced) ==
@@ -190,19 +166,33 @@ size_t WriteBody(char* bytes, size_t, size_t count, void* context) {
     for (size_t i = 0; i < count && transfer->written + i < sizeof transfer->head; ++i)
         transfer->head[transfer->written + i] = static_cast<unsigned char>(bytes[i]);
     transfer->digest.Update(bytes, count);
-    size_t done = 0;
-    while (done < count) {
-        const ssize_t n = write(transfer->fd, bytes + done, count - done);
-        if (n < 0 && errno == EINTR)
-            continue;
-        if (n <= 0) {
-            transfer->writeError = n < 0 ? errno : EIO;
-            return CURL_WRITEFUNC_ERROR;
-        }
-        done += size_t(n);
+    if (!transfer->file->Write(bytes, count)) {
+        transfer->writeError = errno;
+        return CURL_WRITEFUNC_ERROR;
     }
     transfer->written += count;
     return count;
+}
+
+/// Whether the transfer is too slow to go on: no answer within the connect timeout, or less than
+/// the low-speed limit on average over the last window.
+bool IsTooSlow(Transfer& transfer) {
+    const Clock::time_point now = Clock::now();
+    if (!transfer.answered) {
+        transfer.noAnswer = now - transfer.start >= transfer.limits.connectTimeout;
+        return transfer.noAnswer;
+    }
+    const auto window = transfer.limits.lowSpeedWindow;
+    if (transfer.samples.empty() || now - transfer.samples.back().first >= window / 8)
+        transfer.samples.emplace_back(now, transfer.written);
+    while (transfer.samples.size() > 2 && now - transfer.samples[1].first >= window)
+        transfer.samples.pop_front();
+    const auto& [oldest, bytes] = transfer.samples.front();
+    const double seconds = std::chrono::duration<double>(now - oldest).count();
+    transfer.tooSlow =
+        now - oldest >= window &&
+        double(transfer.written - bytes) < seconds * double(transfer.limits.lowSpeedBytesPerSecond);
+    return transfer.tooSlow;
 }
 
 int TransferProgress(void* context, curl_off_t, curl_off_t, curl_off_t, curl_off_t) {
@@ -211,6 +201,8 @@ int TransferProgress(void* context, curl_off_t, curl_off_t, curl_off_t, curl_off
         transfer->cancelled = true;
         return 1;
     }
+    if (IsTooSlow(*transfer))
+        return 1;
     if (transfer->written != transfer->reported) {
         transfer->reported = transfer->written;
         if (*transfer->progress && !(*transfer->progress)(transfer->written)) {
@@ -239,6 +231,10 @@ CURLcode RunTransfer(CURL* easy, Transfer& transfer, QZDownloadCancellation* can
     }
     if (cancellation)
         cancellation->Attach(multi);
+    // The speed checks run at least eight times per window.
+    const auto window =
+        std::chrono::duration_cast<std::chrono::milliseconds>(transfer.limits.lowSpeedWindow / 8);
+    const int pollTimeout = int(std::clamp<int64_t>(window.count(), 10, kPollTimeoutMilliseconds));
     bool done = false;
     while (!done) {
         int running = 0;
@@ -260,7 +256,7 @@ CURLcode RunTransfer(CURL* easy, Transfer& transfer, QZDownloadCancellation* can
             result = CURLE_ABORTED_BY_CALLBACK;
             break;
         }
-        if (curl_multi_poll(multi, nullptr, 0, kPollTimeoutMilliseconds, nullptr) != CURLM_OK) {
+        if (curl_multi_poll(multi, nullptr, 0, pollTimeout, nullptr) != CURLM_OK) {
             result = CURLE_RECV_ERROR;
             break;
         }
@@ -276,7 +272,16 @@ QZFontDownloadResult Failure(std::string reason) {
     return {QZFontDownloadOutcome::Failed, {}, std::move(reason)};
 }
 
-/// The reason for a transfer that libcurl ended with `code`.
+QZFontDownloadResult WriteFailure(int error) {
+    return Failure(
+        Text("The font file cannot be written: %1", QString::fromLocal8Bit(std::strerror(error))));
+}
+
+QString Seconds(std::chrono::milliseconds duration) {
+    return QString::number(double(duration.count()) / 1000.0);
+}
+
+/// The reason for a transfer that our side or libcurl ended with `code`.
 std::string TransferFailureReason(const Transfer& transfer, CURL* easy, CURLcode code,
                                   const char* detail) {
     if (transfer.announcedSize >= 0)
@@ -286,8 +291,17 @@ std::string TransferFailureReason(const Transfer& transfer, CURL* easy, CURLcode
         return Text("The server sent more than the %1 bytes of the font.",
                     QString::number(qulonglong(transfer.expectedSize)));
     if (transfer.writeError)
-        return Text("The font file cannot be written: %1",
-                    QString::fromLocal8Bit(std::strerror(transfer.writeError)));
+        return WriteFailure(transfer.writeError).failureReason;
+    if (transfer.noAnswer || (code == CURLE_OPERATION_TIMEDOUT && !transfer.answered))
+        return Text("The server did not answer within %1 seconds.",
+                    Seconds(transfer.limits.connectTimeout));
+    if (transfer.tooSlow)
+        return QCoreApplication::translate("QZFontDownloader",
+                                           "The download was given up: the server sent less "
+                                           "than %1 bytes per second over %2 seconds.")
+            .arg(qulonglong(transfer.limits.lowSpeedBytesPerSecond))
+            .arg(Seconds(transfer.limits.lowSpeedWindow))
+            .toStdString();
     if (code == CURLE_HTTP_RETURNED_ERROR) {
         long status = 0;
         curl_easy_getinfo(easy, CURLINFO_RESPONSE_CODE, &status);
@@ -308,7 +322,230 @@ bool IsNameByte(unsigned char c) {
            c == '_' || c == '.';
 }
 
+/// Reads the completed temporary as a font; the failure reason when it is not one or lacks a
+/// requested font, empty when it passes.
+std::string CheckFontFile(const QZFontFileWriter& file, const QZFontAssetDownload& asset) {
+    const std::optional<std::vector<std::string>> names =
+        QZFontFilePostScriptNames(file.ReadablePath());
+    if (!names)
+        return Text("The downloaded file is not a font.");
+    for (const std::string& wanted : asset.postScriptNames)
+        if (std::find(names->begin(), names->end(), wanted) == names->end())
+            return Text("The downloaded file does not hold the font “%1”.",
+                        QString::fromStdString(wanted));
+    return {};
+}
+
+/// Sets up `easy` for `asset`, its callbacks working on `transfer`.
+void ConfigureTransfer(CURL* easy, const QZFontAssetDownload& asset, Transfer& transfer,
+                       char* detail) {
+    curl_easy_setopt(easy, CURLOPT_URL, asset.url.c_str());
+    curl_easy_setopt(easy, CURLOPT_PROTOCOLS_STR, "http,https,file");
+    // A redirect never leads to a local file.
+    curl_easy_setopt(easy, CURLOPT_REDIR_PROTOCOLS_STR, "http,https");
+    curl_easy_setopt(easy, CURLOPT_FOLLOWLOCATION, 1L);
+    curl_easy_setopt(easy, CURLOPT_MAXREDIRS, 10L);
+    curl_easy_setopt(easy, CURLOPT_FAILONERROR, 1L);
+    curl_easy_setopt(easy, CURLOPT_NOSIGNAL, 1L);
+    curl_easy_setopt(easy, CURLOPT_CONNECTTIMEOUT_MS, long(transfer.limits.connectTimeout.count()));
+    curl_easy_setopt(easy, CURLOPT_MAXFILESIZE_LARGE, curl_off_t(asset.size));
+    curl_easy_setopt(easy, CURLOPT_BUFFERSIZE, kReceiveBufferSize);
+    curl_easy_setopt(easy, CURLOPT_USERAGENT, "Glyphwell font downloader");
+    curl_easy_setopt(easy, CURLOPT_ERRORBUFFER, detail);
+    curl_easy_setopt(easy, CURLOPT_HEADERFUNCTION, ReceiveHeader);
+    curl_easy_setopt(easy, CURLOPT_HEADERDATA, &transfer);
+    curl_easy_setopt(easy, CURLOPT_WRITEFUNCTION, WriteBody);
+    curl_easy_setopt(easy, CURLOPT_WRITEDATA, &transfer);
+    curl_easy_setopt(easy, CURLOPT_NOPROGRESS, 0L);
+    curl_easy_setopt(easy, CURLOPT_XFERINFOFUNCTION, TransferProgress);
+    curl_easy_setopt(easy, CURLOPT_XFERINFODATA, &transfer);
+}
+
+/// Fetches `asset` into `file` and checks its size and SHA-256. Installed (without a path) when
+/// every byte arrived as expected; otherwise the outcome that ends the download.
+QZFontDownloadResult Fetch(const QZFontAssetDownload& asset, QZFontFileWriter& file,
+                           const QZDownloadProgressFunction& progress,
+                           QZDownloadCancellation* cancellation, unsigned char (&head)[4]) {
+    InitializeCurlOnce();
+    const EasyHandle easy(curl_easy_init());
+    Transfer transfer;
+    if (!easy || !transfer.digest.IsValid())
+        return Failure(Text("The download failed: %1", QStringLiteral("out of memory")));
+    transfer.easy = easy.get();
+    transfer.file = &file;
+    transfer.expectedSize = asset.size;
+    transfer.progress = &progress;
+    transfer.cancellation = cancellation;
+    transfer.limits = QZCurrentDownloadLimits();
+    char detail[CURL_ERROR_SIZE] = {};
+    ConfigureTransfer(easy.get(), asset, transfer, detail);
+
+    const CURLcode code = RunTransfer(easy.get(), transfer, cancellation);
+    if (transfer.cancelled)
+        return {QZFontDownloadOutcome::Cancelled, {}, {}};
+    if (transfer.stopped)
+        return {QZFontDownloadOutcome::Stopped, {}, {}};
+    if (code != CURLE_OK)
+        return Failure(TransferFailureReason(transfer, easy.get(), code, detail));
+    long status = 0;
+    curl_easy_getinfo(easy.get(), CURLINFO_RESPONSE_CODE, &status);
+    if (IsHTTPScheme(easy.get()) && status != 200)
+        return Failure(
+            Text("The server answered with the HTTP status %1.", QString::number(status)));
+    if (transfer.written != asset.size)
+        return Failure(Text("The download holds %1 bytes, but the font should have %2 bytes.",
+                            transfer.written, asset.size));
+    const std::string digest = transfer.digest.FinishHex();
+    if (digest.empty() || strcasecmp(digest.c_str(), asset.sha256.c_str()) != 0)
+        return Failure(Text("The downloaded file is damaged: its SHA-256 checksum is not the "
+                            "expected one."));
+    std::memcpy(head, transfer.head, sizeof head);
+    return {QZFontDownloadOutcome::Installed, {}, {}};
+}
+
+/// The files that an installed copy of the asset `baseName` may have, one per extension.
+std::vector<std::string> InstalledCopies(const std::string& directory,
+                                         const std::string& baseName) {
+    std::vector<std::string> copies;
+    for (const char* extension : {".ttf", ".otf", ".ttc", ".woff", ".woff2", ".font"}) {
+        std::string path = directory + "/" + baseName + extension;
+        struct stat status {};
+        if (lstat(path.c_str(), &status) == 0)
+            copies.push_back(std::move(path));
+    }
+    return copies;
+}
+
+/// Puts the checked `file` in place as `path`, replacing the installed copies of the asset, and
+/// registers it; logs one line per file replaced.
+QZFontDownloadResult Install(QZFontFileWriter& file, const std::string& directory,
+                             const std::string& baseName, const std::string& path) {
+    const std::vector<std::string> replaced = InstalledCopies(directory, baseName);
+    if (!file.Publish(path))
+        return WriteFailure(errno);
+    for (const std::string& old : replaced) {
+        // A copy under another extension is left over from an earlier version of the asset.
+        if (old != path && unlink(old.c_str()) != 0)
+            continue;
+        glyphwell::AppLog("Replaced the installed font file %s with a new download",
+                          glyphwell::LogEscape(old).c_str());
+    }
+    if (!QZRegisterInstalledFontFile(path, directory))
+        glyphwell::AppLog("Cannot register the downloaded font file %s with fontconfig",
+                          glyphwell::LogEscape(path).c_str());
+    return {QZFontDownloadOutcome::Installed, path, {}};
+}
+
+/// Downloads, checks and installs `asset`: the download itself, without sharing.
+QZFontDownloadResult DownloadAndInstall(const QZFontAssetDownload& asset,
+                                        const std::string& directory,
+                                        const QZDownloadProgressFunction& progress,
+                                        QZDownloadCancellation* cancellation) {
+    std::error_code error;
+    std::filesystem::create_directories(directory, error);
+    if (error)
+        return Failure(Text("The font folder cannot be created: %1",
+                            QString::fromStdString(directory + ": " + error.message())));
+    QZRemoveStaleFontTemporaries(directory);
+    const std::string baseName = QZFontFileBaseName(asset.localID);
+    QZFontFileWriter file;
+    if (!file.Open(directory, baseName))
+        return WriteFailure(errno);
+    unsigned char head[4] = {};
+    QZFontDownloadResult result = Fetch(asset, file, progress, cancellation, head);
+    if (result.outcome != QZFontDownloadOutcome::Installed)
+        return result;
+    if (!file.Sync())
+        return WriteFailure(errno);
+    if (std::string reason = CheckFontFile(file, asset); !reason.empty())
+        return Failure(std::move(reason));
+    const std::string path = directory + "/" + baseName +
+                             QZFontFileExtension(head, size_t(std::min<uint64_t>(asset.size, 4)));
+    return Install(file, directory, baseName, path);
+}
+
+/// A download in progress that later requests for the same asset wait for.
+struct SharedDownload {
+    uint64_t size = 0;
+    std::string sha256;
+    std::mutex mutex;
+    std::condition_variable changed;
+    uint64_t received = 0;
+    bool done = false;
+    QZFontDownloadResult result;
+};
+
+std::mutex gSharedDownloadsMutex;
+std::map<std::string, std::shared_ptr<SharedDownload>> gSharedDownloads; ///< by target base path
+
+/// Downloads for every request of the asset that comes while it runs.
+QZFontDownloadResult DownloadAsOwner(const QZFontAssetDownload& asset, const std::string& directory,
+                                     const QZDownloadProgressFunction& progress,
+                                     QZDownloadCancellation* cancellation, const std::string& key,
+                                     SharedDownload& shared) {
+    const QZDownloadProgressFunction reporting = [&](uint64_t received) {
+        {
+            std::lock_guard<std::mutex> lock(shared.mutex);
+            shared.received = received;
+        }
+        shared.changed.notify_all();
+        return !progress || progress(received);
+    };
+    QZFontDownloadResult result = DownloadAndInstall(asset, directory, reporting, cancellation);
+    {
+        std::lock_guard<std::mutex> lock(gSharedDownloadsMutex);
+        gSharedDownloads.erase(key);
+    }
+    {
+        std::lock_guard<std::mutex> lock(shared.mutex);
+        shared.done = true;
+        shared.result = result;
+    }
+    shared.changed.notify_all();
+    return result;
+}
+
+/// Waits for another thread's download of the asset, reporting its progress; its outcome when it
+/// applies to this request, nothing when this request must download on its own.
+std::optional<QZFontDownloadResult> WaitForShared(SharedDownload& shared,
+                                                  const QZDownloadProgressFunction& progress,
+                                                  QZDownloadCancellation* cancellation) {
+    uint64_t reported = 0;
+    std::unique_lock<std::mutex> lock(shared.mutex);
+    for (;;) {
+        if (cancellation && cancellation->IsCancelled())
+            return QZFontDownloadResult{QZFontDownloadOutcome::Cancelled, {}, {}};
+        if (shared.done)
+            break;
+        if (shared.received != reported) {
+            reported = shared.received;
+            lock.unlock();
+            const bool goOn = !progress || progress(reported);
+            lock.lock();
+            if (!goOn)
+                return QZFontDownloadResult{QZFontDownloadOutcome::Stopped, {}, {}};
+            continue;
+        }
+        // Cancel() does not know this wait: it is seen within one interval.
+        shared.changed.wait_for(lock, kShareWaitInterval);
+    }
+    const QZFontDownloadResult& result = shared.result;
+    if (result.outcome == QZFontDownloadOutcome::Cancelled ||
+        result.outcome == QZFontDownloadOutcome::Stopped)
+        return std::nullopt;
+    return result;
+}
 } // namespace
+
+void QZSetDownloadLimits(const QZDownloadLimits& limits) {
+    std::lock_guard<std::mutex> lock(gLimitsMutex);
+    gLimits = limits;
+}
+
+QZDownloadLimits QZCurrentDownloadLimits() {
+    std::lock_guard<std::mutex> lock(gLimitsMutex);
+    return gLimits;
+}
 
 void QZDownloadCancellation::Cancel() {
     cancelled_.store(true, std::memory_order_release);
@@ -373,99 +610,28 @@ QZFontDownloadResult QZDownloadFontAsset(const QZFontAssetDownload& asset,
                                          const std::string& directory,
                                          const QZDownloadProgressFunction& progress,
                                          QZDownloadCancellation* cancellation) {
-    if (cancellation && cancellation->IsCancelled())
-        return {QZFontDownloadOutcome::Cancelled, {}, {}};
-    std::error_code error;
-    std::filesystem::create_directories(directory, error);
-    if (error)
-        return Failure(Text("The font folder cannot be created: %1",
-                            QString::fromStdString(directory + ": " + error.message())));
-    const std::string baseName = QZFontFileBaseName(asset.localID);
-    TemporaryFile file;
-    if (!file.Create(directory, baseName))
-        return Failure(Text("The font file cannot be written: %1",
-                            QString::fromLocal8Bit(std::strerror(errno))));
-
-    InitializeCurlOnce();
-    CURL* easy = curl_easy_init();
-    if (!easy)
-        return Failure(Text("The download failed: %1", QStringLiteral("out of memory")));
-    Transfer transfer;
-    transfer.easy = easy;
-    transfer.fd = file.Descriptor();
-    transfer.expectedSize = asset.size;
-    transfer.progress = &progress;
-    transfer.cancellation = cancellation;
-    if (!transfer.digest.IsValid()) {
-        curl_easy_cleanup(easy);
-        return Failure(Text("The download failed: %1", QStringLiteral("no SHA-256 digest")));
+    const std::string key = directory + "/" + QZFontFileBaseName(asset.localID);
+    for (;;) {
+        if (cancellation && cancellation->IsCancelled())
+            return {QZFontDownloadOutcome::Cancelled, {}, {}};
+        std::shared_ptr<SharedDownload> shared;
+        bool owner = false;
+        {
+            std::lock_guard<std::mutex> lock(gSharedDownloadsMutex);
+            std::shared_ptr<SharedDownload>& entry = gSharedDownloads[key];
+            if (!entry) {
+                entry = std::make_shared<SharedDownload>();
+                entry->size = asset.size;
+                entry->sha256 = asset.sha256;
+                owner = true;
+            }
+            shared = entry;
+        }
+        if (owner)
+            return DownloadAsOwner(asset, directory, progress, cancellation, key, *shared);
+        std::optional<QZFontDownloadResult> result = WaitForShared(*shared, progress, cancellation);
+        if (result)
+            return *result;
+        // The other transfer was cancelled or stopped by its owner, or fetched another version.
     }
-
-    char detail[CURL_ERROR_SIZE] = {};
-    curl_easy_setopt(easy, CURLOPT_URL, asset.url.c_str());
-    curl_easy_setopt(easy, CURLOPT_PROTOCOLS_STR, "http,https,file");
-    // A redirect never leads to a local file.
-    curl_easy_setopt(easy, CURLOPT_REDIR_PROTOCOLS_STR, "http,https");
-    curl_easy_setopt(easy, CURLOPT_FOLLOWLOCATION, 1L);
-    curl_easy_setopt(easy, CURLOPT_MAXREDIRS, 10L);
-    curl_easy_setopt(easy, CURLOPT_FAILONERROR, 1L);
-    curl_easy_setopt(easy, CURLOPT_NOSIGNAL, 1L);
-    curl_easy_setopt(easy, CURLOPT_CONNECTTIMEOUT, kConnectTimeoutSeconds);
-    curl_easy_setopt(easy, CURLOPT_LOW_SPEED_LIMIT, 1L);
-    curl_easy_setopt(easy, CURLOPT_LOW_SPEED_TIME, kStallTimeoutSeconds);
-    curl_easy_setopt(easy, CURLOPT_MAXFILESIZE_LARGE, curl_off_t(asset.size));
-    curl_easy_setopt(easy, CURLOPT_BUFFERSIZE, kReceiveBufferSize);
-    curl_easy_setopt(easy, CURLOPT_USERAGENT, "Glyphwell font downloader");
-    curl_easy_setopt(easy, CURLOPT_ERRORBUFFER, detail);
-    curl_easy_setopt(easy, CURLOPT_WRITEFUNCTION, WriteBody);
-    curl_easy_setopt(easy, CURLOPT_WRITEDATA, &transfer);
-    curl_easy_setopt(easy, CURLOPT_NOPROGRESS, 0L);
-    curl_easy_setopt(easy, CURLOPT_XFERINFOFUNCTION, TransferProgress);
-    curl_easy_setopt(easy, CURLOPT_XFERINFODATA, &transfer);
-
-    const CURLcode code = RunTransfer(easy, transfer, cancellation);
-    long status = 0;
-    curl_easy_getinfo(easy, CURLINFO_RESPONSE_CODE, &status);
-    const bool http = IsHTTPScheme(easy);
-    std::string reason;
-    if (!transfer.cancelled && !transfer.stopped && code != CURLE_OK)
-        reason = TransferFailureReason(transfer, easy, code, detail);
-    curl_easy_cleanup(easy);
-
-    if (transfer.cancelled)
-        return {QZFontDownloadOutcome::Cancelled, {}, {}};
-    if (transfer.stopped)
-        return {QZFontDownloadOutcome::Stopped, {}, {}};
-    if (!reason.empty())
-        return Failure(std::move(reason));
-    if (http && status != 200)
-        return Failure(
-            Text("The server answered with the HTTP status %1.", QString::number(status)));
-    if (transfer.written != asset.size)
-        return Failure(Text("The download holds %1 bytes, but the font should have %2 bytes.",
-                            transfer.written, asset.size));
-    const std::string digest = transfer.digest.FinishHex();
-    if (digest.empty() || strcasecmp(digest.c_str(), asset.sha256.c_str()) != 0)
-        return Failure(Text("The downloaded file is damaged: its SHA-256 checksum is not the "
-                            "expected one."));
-    if (!file.SyncAndClose())
-        return Failure(Text("The font file cannot be written: %1",
-                            QString::fromLocal8Bit(std::strerror(errno))));
-
-    const std::string path =
-        directory + "/" + baseName +
-        QZFontFileExtension(transfer.head, size_t(std::min<uint64_t>(transfer.written, 4)));
-    if (!file.RenameTo(path))
-        return Failure(Text("The font file cannot be written: %1",
-                            QString::fromLocal8Bit(std::strerror(errno))));
-    if (const int directoryFd = open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
-        directoryFd >= 0) {
-        fsync(directoryFd);
-        close(directoryFd);
-    }
-    if (!QZRegisterInstalledFontFile(path, directory)) {
-        unlink(path.c_str());
-        return Failure(Text("The downloaded file is not a font."));
-    }
-    return {QZFontDownloadOutcome::Installed, path, {}};
 }

@@ -1,18 +1,25 @@
 // Downloading one font asset and installing it for the user.
 //
 // The asset is fetched with libcurl (https, http or file URLs; redirects only to http or https)
-// into a hidden temporary file in the destination directory, its size and SHA-256 checked as the
-// bytes arrive, then renamed into place under a name made from its LocalID (never from the URL)
-// and registered with fontconfig, so that this process and other applications find it. A
-// download that is cancelled, stopped, fails or does not match its catalog entry leaves no file
-// behind. Downloads run on the calling thread; several may run at once on different threads.
+// into a temporary file in the destination directory (QZFontFileWriter: unnamed where the file
+// system allows, so that a crash leaves nothing), its size and SHA-256 checked as the bytes
+// arrive. Once complete, the temporary is read as a font and must hold the requested fonts; only
+// then does it replace, in one rename, the file installed under a name made from its LocalID
+// (never from the URL), and it is registered with fontconfig, so that this process and other
+// applications find it. A download that is cancelled, stopped, fails or is rejected leaves the
+// directory as it was. A transfer that does not start within the connect timeout, or that
+// averages under the low-speed limit over the low-speed window, is given up. Two downloads of
+// the same asset into the same directory at the same time share one transfer. Downloads run on
+// the calling thread; several may run at once on different threads.
 #pragma once
 
 #include <atomic>
+#include <chrono>
 #include <cstdint>
 #include <functional>
 #include <mutex>
 #include <string>
+#include <vector>
 
 /// Cancels a download from another thread. Cancel() wakes the transfer at once, wherever it
 /// waits, and the download then ends as Cancelled. Thread-safe; a cancellation is final and
@@ -43,7 +50,23 @@ struct QZFontAssetDownload {
     std::string url;
     uint64_t size = 0;  ///< exact number of bytes expected
     std::string sha256; ///< 64 hexadecimal digits (either case)
+    /// PostScript names the file must hold; empty: any font will do.
+    std::vector<std::string> postScriptNames;
 };
+
+/// When a transfer is given up.
+struct QZDownloadLimits {
+    /// The longest wait for the connection and the first bytes of the answer.
+    std::chrono::milliseconds connectTimeout{30000};
+    /// A transfer that receives less than `lowSpeedBytesPerSecond` on average over any window
+    /// this long is given up.
+    std::chrono::milliseconds lowSpeedWindow{30000};
+    uint64_t lowSpeedBytesPerSecond = 1024;
+};
+
+/// The limits of the downloads that start from now on; process-wide (tests shorten them).
+void QZSetDownloadLimits(const QZDownloadLimits& limits);
+QZDownloadLimits QZCurrentDownloadLimits();
 
 enum class QZFontDownloadOutcome {
     Installed, ///< the file is in place and fontconfig knows it
@@ -64,7 +87,11 @@ using QZDownloadProgressFunction = std::function<bool(uint64_t downloadedBytes)>
 
 /// Downloads `asset` into `directory` (created with its parents when missing) and installs it.
 /// `progress` may be empty; `cancellation` may be null. A file already installed under the same
-/// name is replaced only once the new one has been checked.
+/// name is replaced only once the new one has been checked, with one log line naming it. Stale
+/// temporaries of earlier downloads in `directory` are removed first. While another thread
+/// downloads the same asset (same name, size and SHA-256) into `directory`, this call waits for
+/// that transfer, reports its progress and returns its outcome; when that one was cancelled or
+/// stopped, this call downloads on its own.
 QZFontDownloadResult QZDownloadFontAsset(const QZFontAssetDownload& asset,
                                          const std::string& directory,
                                          const QZDownloadProgressFunction& progress,

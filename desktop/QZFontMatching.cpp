@@ -4,6 +4,7 @@
 #include <mutex>
 
 #include "platform/Log.h"
+#include "platform/LogEscape.h"
 
 namespace {
 
@@ -53,7 +54,8 @@ void RescanDirectoryCache(FcConfig* config, const std::string& directory) {
     if (cache)
         FcDirCacheUnload(cache);
     else
-        glyphwell::AppLog("Cannot update the font cache of %s", directory.c_str());
+        glyphwell::AppLog("Cannot update the font cache of %s",
+                          glyphwell::LogEscape(directory).c_str());
 }
 
 } // namespace
@@ -95,6 +97,26 @@ std::optional<QZInstalledFont> QZFindInstalledFont(const std::string& postScript
 
 bool QZIsFontInstalled(const std::string& postScriptName) {
     return QZFindInstalledFont(postScriptName).has_value();
+}
+
+std::optional<std::vector<std::string>> QZFontFilePostScriptNames(const std::string& path) {
+    std::lock_guard<std::mutex> lock(FontconfigMutex());
+    CurrentConfig();
+    FcFontSet* faces = FcFontSetCreate();
+    if (!faces)
+        return std::nullopt;
+    int count = 0;
+    // Face index -1 (all bits set) asks for every face of the file.
+    const unsigned read = FcFreeTypeQueryAll(reinterpret_cast<const FcChar8*>(path.c_str()),
+                                             unsigned(-1), nullptr, &count, faces);
+    std::optional<std::vector<std::string>> names;
+    if (read > 0 && faces->nfont > 0) {
+        names.emplace();
+        for (int i = 0; i < faces->nfont; ++i)
+            names->push_back(PatternString(faces->fonts[i], FC_POSTSCRIPT_NAME));
+    }
+    FcFontSetDestroy(faces);
+    return names;
 }
 
 bool QZRegisterInstalledFontFile(const std::string& path, const std::string& directory) {

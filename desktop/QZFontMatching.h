@@ -8,6 +8,7 @@
 
 #include <optional>
 #include <string>
+#include <vector>
 
 /// One installed font that fontconfig lists.
 struct QZInstalledFont {
@@ -23,6 +24,10 @@ std::optional<QZInstalledFont> QZFindInstalledFont(const std::string& postScript
 
 /// Whether QZFindInstalledFont finds `postScriptName`; suits QZSetInstalledFontCheck.
 bool QZIsFontInstalled(const std::string& postScriptName);
+
+/// The PostScript names of the faces in the font file `path` (every face of a collection), in
+/// file order; nothing when fontconfig cannot read the file as a font. Registers nothing.
+std::optional<std::vector<std::string>> QZFontFilePostScriptNames(const std::string& path);
 
 /// Makes the font file `path`, just written into `directory`, known at once to this process's
 /// fontconfig configuration, and brings the user's fontconfig cache of `directory` (and of its

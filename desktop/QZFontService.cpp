@@ -19,6 +19,7 @@
 #include "platform/CFError.h"
 #include "platform/CFNumber.h"
 #include "platform/Log.h"
+#include "platform/LogEscape.h"
 #include "protocol/QZUIProtocol.h"
 
 const CFStringRef kCTFontDescriptorMatchingCancelDownloadHandler =
@@ -123,8 +124,8 @@ private:
     TCFRetained<QZCancelDownloadHandlerRef> cancelHandler_;
     TCFRetained<CFMutableArrayRef> matches_;
     std::shared_ptr<const QZDownloadableFontCatalog> catalog_;
-    std::map<std::string, AssetOutcome> assetOutcomes_; ///< by LocalID
-    std::set<std::string> plannedAssets_;               ///< LocalIDs counted in totalBytes_
+    std::map<std::string, AssetOutcome, std::less<>> assetOutcomes_; ///< by LocalID
+    std::set<std::string, std::less<>> plannedAssets_; ///< LocalIDs counted in totalBytes_
     uint64_t totalBytes_ = 0;
     uint64_t finishedBytes_ = 0; ///< bytes of the assets that ended, whatever their outcome
 };
@@ -176,7 +177,9 @@ bool MatchingRun::ReportFailure(CFTypeRef concerned, const std::string& postScri
     const void* one[] = {concerned};
     TCFRetained<CFArrayRef> concernedArray(
         CFArrayCreate(kCFAllocatorDefault, one, 1, &kCFTypeArrayCallBacks), kAdopted);
-    glyphwell::AppLog("Cannot download the font %s: %s", postScriptName.c_str(), reason.c_str());
+    glyphwell::AppLog("Cannot download the font %s: %s",
+                      glyphwell::LogEscape(postScriptName).c_str(),
+                      glyphwell::LogEscape(reason).c_str());
     return Report(kCTFontDescriptorMatchingDidFailWithError,
                   {{kCTFontDescriptorMatchingDescriptors, concernedArray},
                    {kCTFontDescriptorMatchingError, error}});
@@ -185,7 +188,7 @@ bool MatchingRun::ReportFailure(CFTypeRef concerned, const std::string& postScri
 bool MatchingRun::Download(CFTypeRef descriptor, const std::string& postScriptName,
                            const QZDownloadableFontAsset& asset) {
     // An asset that was not foreseen when the run began (its font was installed then).
-    if (plannedAssets_.insert(asset.localID).second)
+    if (plannedAssets_.emplace(asset.localID).second)
         totalBytes_ += asset.size;
     const uint64_t startBytes = finishedBytes_;
     if (!ReportDownloading(kCTFontDescriptorMatchingWillBeginDownloading, descriptor, startBytes))
@@ -203,7 +206,11 @@ bool MatchingRun::Download(CFTypeRef descriptor, const std::string& postScriptNa
         return ReportDownloading(kCTFontDescriptorMatchingDownloading, descriptor,
                                  startBytes + received);
     };
-    const QZFontAssetDownload download{asset.localID, asset.url, asset.size, asset.sha256};
+    const QZFontAssetDownload download{std::string(asset.localID),
+                                       std::string(asset.url),
+                                       asset.size,
+                                       std::string(asset.sha256),
+                                       {postScriptName}};
     const QZFontDownloadResult result =
         QZDownloadFontAsset(download, QZFontInstallDirectory(), progress, cancellation_.get());
 
@@ -214,14 +221,14 @@ bool MatchingRun::Download(CFTypeRef descriptor, const std::string& postScriptNa
         return true; // Run() sees the cancellation and finishes
     case QZFontDownloadOutcome::Failed:
         finishedBytes_ = startBytes + asset.size;
-        assetOutcomes_[asset.localID] = {false, result.failureReason};
+        assetOutcomes_[std::string(asset.localID)] = {false, result.failureReason};
         return ReportFailure(descriptor, postScriptName, kQZFontDownloadErrorDownloadFailed,
                              result.failureReason);
     case QZFontDownloadOutcome::Installed:
         break;
     }
     finishedBytes_ = startBytes + asset.size;
-    assetOutcomes_[asset.localID] = {true, {}};
+    assetOutcomes_[std::string(asset.localID)] = {true, {}};
     if (!ReportDownloading(kCTFontDescriptorMatchingDidFinishDownloading, descriptor,
                            finishedBytes_))
         return false;
@@ -265,7 +272,7 @@ void MatchingRun::Run() {
             continue;
         if (!QZIsFontInstalled(name))
             if (const QZDownloadableFontAsset* asset = FindAsset(*catalog_, name))
-                if (plannedAssets_.insert(asset->localID).second)
+                if (plannedAssets_.emplace(asset->localID).second)
                     totalBytes_ += asset->size;
         fonts.emplace_back(descriptor, std::move(name));
     }

@@ -3,8 +3,10 @@
 #include <QDir>
 #include <QFile>
 #include <QTemporaryDir>
+#include <unistd.h>
 
 #include "desktop/QZDownloadableFontCatalog.h"
+#include "platform/LogEscape.h"
 #include "tests/desktop/DesktopTestEnvironment.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/Values.h"
@@ -127,10 +129,12 @@ TEST(CatalogParse, SkipsEachMalformedAssetWithOneLine) {
     const QByteArray text = "{\"assets\": [42, " + Asset("A", "-1", "{\"postScriptName\": \"F\"}") +
                             ", " + Asset("B", "1", "{\"family\": \"F\"}") + ", " +
                             Asset("C", "5", "{\"postScriptName\": \"F\"}") + ", " +
-                            Asset("C", "6", "{\"postScriptName\": \"F\"}") + "]}";
+                            Asset("C", "6", "{\"postScriptName\": \"F\"}") + ", " +
+                            Asset("E\\n\\u001b", "1", "{\"postScriptName\": \"F\"}") + ", " +
+                            Asset("E\\n\\u001b", "1", "{\"postScriptName\": \"F\"}") + "]}";
     LogCapture log;
     const auto catalog = QZDownloadableFontCatalog::Parse(text.toStdString(), "test");
-    ASSERT_EQ(catalog.assets.size(), 1u);
+    ASSERT_EQ(catalog.assets.size(), 2u);
     EXPECT_EQ(catalog.assets[0].size, 5u);
     EXPECT_EQ(log.Texts(),
               (std::vector<std::string>{
@@ -139,6 +143,9 @@ TEST(CatalogParse, SkipsEachMalformedAssetWithOneLine) {
                   "Skipping asset 2 of the downloadable font catalog test: a font without a "
                   "\"postScriptName\"",
                   "Skipping asset 4 of the downloadable font catalog test: duplicate \"LocalID\" C",
+                  // A value from the catalog cannot start a line of its own.
+                  "Skipping asset 6 of the downloadable font catalog test: duplicate \"LocalID\" "
+                  "E\\n\\x1b",
               }));
 }
 
@@ -151,7 +158,109 @@ TEST(CatalogParse, TheDocumentedSampleIsAValidCatalog) {
     const auto catalog = QZDownloadableFontCatalog::Parse(sample.readAll().toStdString(), "sample");
     EXPECT_TRUE(log.Texts().empty());
     ASSERT_EQ(catalog.assets.size(), 2u);
-    EXPECT_EQ(catalog.assets[0].fonts[1].localizedFamilyNames.at("de"), "Beispiel Sans");
+    EXPECT_EQ(catalog.assets[0].fonts[1].LocalizedFamilyName("de"), "Beispiel Sans");
+}
+
+TEST(LogEscape, EscapesControlsBackslashesAndMalformedUTF8) {
+    const std::vector<std::pair<std::string, std::string>> cases = {
+        {"plain ünïcode ✓ 😀", "plain ünïcode ✓ 😀"},
+        {"a\nb\r\tc", "a\\nb\\r\\tc"},
+        {"\x1b[31mred", "\\x1b[31mred"},
+        {std::string("nul\0x", 5), "nul\\x00x"},
+        {"back\\slash", "back\\\\slash"},
+        {"\x7f \xc2\x85", "\\x7f \\xc2\\x85"},                   // DEL and a C1 control
+        {"\xff\xfe", "\\xff\\xfe"},                              // never valid
+        {"\xc3", "\\xc3"},                                       // truncated
+        {"\xc0\xaf \xe0\x80\xaf", "\\xc0\\xaf \\xe0\\x80\\xaf"}, // overlong
+        {"\xed\xa0\x80", "\\xed\\xa0\\x80"},                     // surrogate
+        {"\xf4\x90\x80\x80", "\\xf4\\x90\\x80\\x80"},            // beyond U+10FFFF
+    };
+    for (const auto& [value, escaped] : cases)
+        EXPECT_EQ(glyphwell::LogEscape(value), escaped);
+}
+
+/// Each problem as "line:column asset: message" (asset problems) or "kind: message".
+std::vector<std::string> Problems(const std::vector<QZCatalogProblem>& problems) {
+    std::vector<std::string> texts;
+    for (const QZCatalogProblem& problem : problems)
+        texts.push_back(problem.kind == QZCatalogProblem::Kind::Asset
+                            ? std::to_string(problem.line) + ":" + std::to_string(problem.column) +
+                                  " " + std::to_string(problem.asset) + ": " + problem.message
+                            : (problem.kind == QZCatalogProblem::Kind::Unreadable ? "unreadable: "
+                                                                                  : "malformed: ") +
+                                  problem.message.substr(0, 32));
+    return texts;
+}
+
+TEST(CatalogRead, ReportsEachProblemWithItsPlaceAndReadsMembersAsAJSONObjectDoes) {
+    const std::string sha = "\"sha256\": \"" + std::string(64, 'a') + "\"";
+    const auto asset = [&](const std::string& members, const std::string& fonts) {
+        return "{\"LocalID\": \"A\", \"url\": \"u\", \"size\": 1, " + sha + ", " + members +
+               "\"fonts\": [" + fonts + "]}";
+    };
+    struct Case {
+        std::string text;
+        std::vector<std::string> problems;
+        std::vector<std::string> kept; ///< LocalIDs
+    };
+    const std::vector<Case> cases = {
+        {"{\"assets\": [\n " + asset("\"size\": 1.5, ", "{\"postScriptName\": \"F\"}") + ",\n  " +
+             asset("\"LocalID\": \"\", ", "{\"postScriptName\": \"F\"}") + ",\n" +
+             asset("\"size\": 18446744073709551615, ", "{\"postScriptName\": \"F\"}") + ",\n" +
+             asset("", "{\"postScriptName\": \"F\", \"family\": 3}") + ",\n" +
+             asset("", "{\"postScriptName\": \"F\", \"localizedFamilyNames\": []}") + ",\n" +
+             asset("", "{\"postScriptName\": \"F\", \"localizedFamilyNames\": {\"de\": 1}}") +
+             ",\n" +
+             asset("\"LocalID\": \"B\", \"fonts\": 1, ",
+                   "{\"postScriptName\": \"F\", \"localizedFamilyNames\": {\"de\": 1, \"fr\": "
+                   "\"y\", \"de\": \"x\"}}") +
+             "]}",
+         {"2:2 0: no \"size\" in bytes", "3:3 1: no \"LocalID\"", "4:1 2: no \"size\" in bytes",
+          "5:1 3: a \"family\" that is not a string",
+          "6:1 4: \"localizedFamilyNames\" that is not an object",
+          "7:1 5: a localized family name that is not a string"},
+         {"B"}},
+        {"[]", {"malformed: no \"assets\" array"}, {}},
+        {"{\"assets\": [], \"assets\": {}}", {"malformed: no \"assets\" array"}, {}},
+        {"{\"assets\": [{}], \"assets\": [" + asset("", "{\"postScriptName\": \"F\"}") + "]}",
+         {},
+         {"A"}},
+        {"{\"assets\": [{}, {",
+         {"1:13 0: no \"LocalID\"", "malformed: [json.exception.parse_error.101]"},
+         {}},
+    };
+    for (const Case& test : cases) {
+        SCOPED_TRACE(test.text);
+        std::vector<QZCatalogProblem> problems;
+        const QZDownloadableFontCatalog catalog =
+            QZReadDownloadableFontCatalog(test.text, problems);
+        EXPECT_EQ(Problems(problems), test.problems);
+        std::vector<std::string> kept;
+        for (const QZDownloadableFontAsset& entry : catalog.assets)
+            kept.emplace_back(entry.localID);
+        EXPECT_EQ(kept, test.kept);
+    }
+    std::vector<QZCatalogProblem> problems;
+    const auto catalog = QZReadDownloadableFontCatalog(cases[0].text, problems);
+    const QZDownloadableFont& font = catalog.assets.at(0).fonts[0];
+    EXPECT_EQ(font.localizedFamilyNames.size(), 2u);
+    EXPECT_EQ(font.LocalizedFamilyName("de"), "x");
+    EXPECT_EQ(font.LocalizedFamilyName("fr"), "y");
+    EXPECT_EQ(font.LocalizedFamilyName("it"), "");
+}
+
+TEST(CatalogRead, AFileThatCannotBeReadOrIsTooLargeGivesAnEmptyCatalog) {
+    QTemporaryDir directory;
+    const std::string large = (directory.path() + "/large.json").toStdString();
+    QFile file(QString::fromStdString(large));
+    ASSERT_TRUE(file.open(QIODevice::WriteOnly) && file.resize((64 << 20) + 1));
+    file.close();
+    std::vector<QZCatalogProblem> problems;
+    EXPECT_TRUE(QZReadDownloadableFontCatalogFile(large, problems).assets.empty());
+    EXPECT_TRUE(QZReadDownloadableFontCatalogFile(large + ".missing", problems).assets.empty());
+    EXPECT_EQ(Problems(problems),
+              (std::vector<std::string>{"unreadable: larger than 67108864 bytes",
+                                        "unreadable: No such file or directory"}));
 }
 
 } // namespace

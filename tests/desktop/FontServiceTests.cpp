@@ -6,18 +6,24 @@
 #include <QFile>
 #include <QTemporaryDir>
 #include <condition_variable>
+#include <csignal>
 #include <cstdio>
+#include <fcntl.h>
 #include <fontconfig/fontconfig.h>
 #include <mutex>
 #include <openssl/evp.h>
+#include <sys/wait.h>
 #include <thread>
+#include <unistd.h>
 
 #include "desktop/QZFontDownloader.h"
+#include "desktop/QZFontFileWriter.h"
 #include "desktop/QZFontMatching.h"
 #include "desktop/QZFontService.h"
 #include "platform/CFError.h"
 #include "platform/CFNumber.h"
 #include "tests/desktop/DesktopTestEnvironment.h"
+#include "tests/support/LogCapture.h"
 #include "tests/support/LoopbackHTTPServer.h"
 #include "tests/support/PrivateFonts.h"
 #include "tests/support/Values.h"
@@ -29,6 +35,7 @@ using glyphwell::testing::ReadFile;
 using glyphwell::testing::SHA256Of;
 
 using glyphwell::testing::Dict;
+using glyphwell::testing::LogCapture;
 using glyphwell::testing::LoopbackHTTPServer;
 using glyphwell::testing::Ref;
 using glyphwell::testing::Str;
@@ -418,10 +425,27 @@ TEST_F(FontServiceTest, DroppedConnectionFailsWithTheBytesReceived) {
 /// QZDownloadFontAsset on its own, into the download folder.
 class FontDownloaderTest : public FontServiceTest {
 protected:
+    void TearDown() override {
+        QZSetDownloadLimits({});
+        for (auto operation : {QZFontFileOperation::Write, QZFontFileOperation::Sync,
+                               QZFontFileOperation::Link, QZFontFileOperation::Rename})
+            QZInjectFontFileFault(operation, 0);
+        FontServiceTest::TearDown();
+    }
     QZFontDownloadResult Download(const std::string& url, const std::string& body,
-                                  const std::string& localID = "asset") {
-        return QZDownloadFontAsset({localID, url, body.size(), SHA256Of(body)},
-                                   QZFontInstallDirectory(), {}, nullptr);
+                                  const std::string& localID = "asset",
+                                  std::vector<std::string> names = {},
+                                  QZDownloadCancellation* cancellation = nullptr,
+                                  const QZDownloadProgressFunction& progress = {}) {
+        return QZDownloadFontAsset({localID, url, body.size(), SHA256Of(body), std::move(names)},
+                                   QZFontInstallDirectory(), progress, cancellation);
+    }
+    /// Serves `resource` with `body` at `path`; its URL.
+    std::string Serve(const std::string& path, const std::string& body,
+                      LoopbackHTTPServer::Resource resource = {}) {
+        resource.body = body;
+        server_.Serve(path, std::move(resource));
+        return server_.URL(path);
     }
 };
 
@@ -477,6 +501,152 @@ TEST_F(FontDownloaderTest, FailuresSayWhyAndLeaveNoFile) {
         EXPECT_EQ(result.failureReason, test.reason);
         EXPECT_TRUE(DownloadFolder().isEmpty()) << DownloadFolder().join(", ").toStdString();
     }
+}
+
+TEST_F(FontDownloaderTest, ARejectedUpdateLeavesTheInstalledFontAndAVerifiedOneReplacesIt) {
+    const std::string bold = ReadFile(kDejaVu + "DejaVuSans-Bold.ttf");
+    const std::string serif = ReadFile(kDejaVu + "DejaVuSerif.ttf");
+    const std::string installed = (fonts_ + "/glyphwell/bold.ttf").toStdString();
+    ASSERT_EQ(Download(Serve("/v1", bold), bold, "bold", {"DejaVuSans-Bold"}).outcome,
+              QZFontDownloadOutcome::Installed);
+    const int unnamed = open(QZFontInstallDirectory().c_str(), O_TMPFILE | O_RDWR, 0600);
+    if (unnamed >= 0)
+        close(unnamed);
+    using Op = QZFontFileOperation;
+    struct Case {
+        std::string body;
+        Op operation;
+        int error; ///< injected into `operation`
+        std::string reason;
+    };
+    const std::vector<Case> cases = {
+        {std::string(4096, 'x'), Op::Write, 0, "The downloaded file is not a font."},
+        {serif, Op::Write, 0, "The downloaded file does not hold the font “DejaVuSans-Bold”."},
+        {bold, Op::Write, ENOSPC, "The font file cannot be written: No space left on device"},
+        {bold, Op::Sync, EIO, "The font file cannot be written: Input/output error"},
+        {bold, Op::Link, unnamed >= 0 ? EDQUOT : 0,
+         unnamed >= 0 ? "The font file cannot be written: Disk quota exceeded" : ""},
+        {bold, Op::Rename, EROFS, "The font file cannot be written: Read-only file system"},
+    };
+    for (const Case& test : cases) {
+        SCOPED_TRACE(test.reason);
+        QZInjectFontFileFault(test.operation, test.error);
+        const QZFontDownloadResult result =
+            Download(Serve("/v2", test.body), test.body, "bold", {"DejaVuSans-Bold"});
+        QZInjectFontFileFault(test.operation, 0);
+        EXPECT_EQ(result.failureReason, test.reason);
+        EXPECT_EQ(DownloadFolder(), QStringList{"bold.ttf"});
+        EXPECT_TRUE(ReadFile(QString::fromStdString(installed)) == bold);
+        EXPECT_EQ(ListedFile("DejaVuSans-Bold"), installed + "\n");
+    }
+    LogCapture log;
+    const QZFontDownloadResult result =
+        Download(Serve("/v3", serif), serif, "bold", {"DejaVuSerif"});
+    ASSERT_EQ(result.outcome, QZFontDownloadOutcome::Installed) << result.failureReason;
+    EXPECT_TRUE(ReadFile(QString::fromStdString(installed)) == serif);
+    EXPECT_EQ(log.Texts(), std::vector<std::string>{"Replaced the installed font file " +
+                                                    installed + " with a new download"});
+    EXPECT_EQ(QZFindInstalledFont("DejaVuSerif")->file, installed);
+}
+
+TEST_F(FontDownloaderTest, AKilledWriterLeavesNothingOnceTheNextDownloadStarts) {
+    const std::string directory = QZFontInstallDirectory();
+    ASSERT_TRUE(QDir().mkpath(QString::fromStdString(directory)));
+    const std::string mono = ReadFile(kDejaVu + "DejaVuSansMono.ttf");
+    for (const bool allowUnnamed : {true, false}) {
+        SCOPED_TRACE(allowUnnamed ? "unnamed" : "named");
+        int ready[2];
+        ASSERT_EQ(pipe(ready), 0);
+        const pid_t child = fork();
+        if (child == 0) {
+            QZFontFileWriter writer;
+            if (writer.Open(directory, "victim", allowUnnamed) && writer.Write("OTTO", 4) &&
+                write(ready[1], writer.IsUnnamed() ? "u" : "n", 1) == 1)
+                pause();
+            _exit(1);
+        }
+        char kind = 0;
+        ASSERT_EQ(read(ready[0], &kind, 1), 1);
+        close(ready[0]);
+        close(ready[1]);
+        // The temporary of a live writer is kept.
+        QZRemoveStaleFontTemporaries(directory);
+        EXPECT_EQ(DownloadFolder().size(), kind == 'n' ? 1 : 0);
+        kill(child, SIGKILL);
+        waitpid(child, nullptr, 0);
+        LogCapture log;
+        const std::string url = "file://" + (kDejaVu + "DejaVuSansMono.ttf").toStdString();
+        ASSERT_EQ(Download(url, mono, "mono").outcome, QZFontDownloadOutcome::Installed);
+        EXPECT_EQ(DownloadFolder(), QStringList{"mono.ttf"});
+        EXPECT_EQ(log.Texts().size(), kind == 'n' ? 1u : 0u);
+        QFile::remove(fonts_ + "/glyphwell/mono.ttf");
+    }
+}
+
+TEST_F(FontDownloaderTest, SlowAndSilentServersAreGivenUpAndCancelWorksMeanwhile) {
+    const std::string serif = ReadFile(kDejaVu + "DejaVuSerif.ttf");
+    LoopbackHTTPServer::Resource silent;
+    silent.neverAnswer = true;
+    using std::chrono::milliseconds;
+    struct Case {
+        LoopbackHTTPServer::Resource resource;
+        QZDownloadLimits limits;
+        bool cancel;
+        std::string reason; ///< empty: cancelled
+    };
+    const std::vector<Case> cases = {
+        {Throttled(1, milliseconds(20)),
+         {milliseconds(5000), milliseconds(1500), 1024},
+         false,
+         "The download was given up: the server sent less than 1024 bytes per second over 1.5 "
+         "seconds."},
+        {silent,
+         {milliseconds(500), milliseconds(30000), 1024},
+         false,
+         "The server did not answer within 0.5 seconds."},
+        {silent, {}, true, ""},
+        {Throttled(1, milliseconds(20)), {}, true, ""},
+    };
+    int index = 0;
+    for (const Case& test : cases) {
+        SCOPED_TRACE(test.reason);
+        QZSetDownloadLimits(test.limits);
+        const std::string path = "/slow" + std::to_string(index++);
+        const std::string url = Serve(path, serif, test.resource);
+        QZDownloadCancellation cancellation;
+        std::thread canceller([&] {
+            if (test.cancel && server_.WaitForRequests(path, 1, kRunTimeout))
+                cancellation.Cancel();
+        });
+        const auto start = std::chrono::steady_clock::now();
+        const QZFontDownloadResult result = Download(url, serif, "serif", {}, &cancellation);
+        canceller.join();
+        EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(10));
+        EXPECT_EQ(result.outcome,
+                  test.cancel ? QZFontDownloadOutcome::Cancelled : QZFontDownloadOutcome::Failed);
+        EXPECT_EQ(result.failureReason, test.reason);
+        EXPECT_TRUE(DownloadFolder().isEmpty());
+    }
+}
+
+TEST_F(FontDownloaderTest, ASecondRequestForTheSameAssetSharesTheFirstTransfer) {
+    const std::string bold = ReadFile(kDejaVu + "DejaVuSans-Bold.ttf");
+    const std::string url = Serve("/shared", bold, Throttled(16 * 1024, milliseconds(10)));
+    QZFontDownloadResult first;
+    std::thread owner([&] { first = Download(url, bold, "bold"); });
+    ASSERT_TRUE(server_.WaitForRequests("/shared", 1, kRunTimeout));
+    uint64_t lastReported = 0;
+    const QZFontDownloadResult second =
+        Download(url, bold, "bold", {}, nullptr, [&](uint64_t received) {
+            lastReported = received;
+            return true;
+        });
+    owner.join();
+    EXPECT_EQ(server_.RequestCount("/shared"), 1);
+    EXPECT_EQ(first.outcome, QZFontDownloadOutcome::Installed) << first.failureReason;
+    EXPECT_EQ(second.outcome, QZFontDownloadOutcome::Installed) << second.failureReason;
+    EXPECT_EQ(second.path, first.path);
+    EXPECT_EQ(lastReported, bold.size());
 }
 
 TEST(FontFileNames, KeepSafeLocalIDsAndMarkChangedOnesWithAHash) {

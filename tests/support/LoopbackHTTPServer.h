@@ -1,5 +1,6 @@
 // A small HTTP/1.1 server on 127.0.0.1 for tests and benchmarks: serves byte strings by path with
-// a Content-Length, and on demand sends slowly, drops the connection part-way, or redirects.
+// a Content-Length, and on demand drips them slowly, drops the connection part-way, never
+// answers at all, or redirects.
 // Each connection gets its own thread and is closed after one response. Not a general server:
 // it reads the request line only and answers GET and HEAD alike (HEAD without a body).
 #pragma once
@@ -33,6 +34,8 @@ public:
         size_t dropAfter = std::string::npos;
         /// When set: answer "302 Found" with this Location instead of the body.
         std::string redirectTo;
+        /// Read the request, then send nothing until the server stops.
+        bool neverAnswer = false;
     };
 
     /// Listens on 127.0.0.1, on a port the kernel chooses.
@@ -89,6 +92,12 @@ public:
         return found == requestCounts_.end() ? 0 : found->second;
     }
 
+    /// Waits until `path` was requested at least `count` times; false after `timeout`.
+    bool WaitForRequests(const std::string& path, int count, std::chrono::milliseconds timeout) {
+        std::unique_lock<std::mutex> lock(mutex_);
+        return requested_.wait_for(lock, timeout, [&] { return requestCounts_[path] >= count; });
+    }
+
 private:
     void AcceptLoop() {
         for (;;) {
@@ -141,6 +150,7 @@ private:
         {
             std::lock_guard<std::mutex> lock(mutex_);
             ++requestCounts_[path];
+            requested_.notify_all();
             const auto entry = resources_.find(path);
             if (entry != resources_.end())
                 shared = entry->second;
@@ -152,6 +162,11 @@ private:
             return;
         }
         const Resource& resource = *shared;
+        if (resource.neverAnswer) {
+            std::unique_lock<std::mutex> lock(mutex_);
+            stopped_.wait(lock, [this] { return stopping_; });
+            return;
+        }
         if (!resource.redirectTo.empty()) {
             const std::string redirect = "HTTP/1.1 302 Found\r\nLocation: " + resource.redirectTo +
                                          "\r\nContent-Length: 0\r\nConnection: close\r\n\r\n";
@@ -186,6 +201,7 @@ private:
     std::thread acceptor_;
     mutable std::mutex mutex_;
     std::condition_variable stopped_;
+    std::condition_variable requested_;
     bool stopping_ = false;
     std::vector<std::thread> connections_;
     std::map<std::string, std::shared_ptr<const Resource>> resources_;
