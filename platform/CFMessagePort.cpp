@@ -32,9 +32,11 @@
 #include "platform/CFRuntime.h"
 #include "platform/CFString.h"
 #include "platform/Log.h"
+#include "platform/LogEscape.h"
 #include "platform/MessagePortWire.h"
 
 using glyphwell::AppLog;
+using glyphwell::LogEscape;
 using glyphwell::RunLoopDriver;
 using glyphwell::port::FrameAssembler;
 using glyphwell::runtime::CFObject;
@@ -113,23 +115,6 @@ ssize_t ReceiveInto(int descriptor, FrameAssembler& assembler, std::vector<uint8
 std::string ErrorText(int error) {
     char buffer[128];
     return strerror_r(error, buffer, sizeof buffer);
-}
-
-/// `text` with control characters, backslashes and bytes above 0x7E written as \xNN, so that a
-/// path from the environment cannot forge or garble a log line.
-std::string EscapeForLog(const std::string& text) {
-    static const char kHex[] = "0123456789abcdef";
-    std::string escaped;
-    for (const unsigned char byte : text) {
-        if (byte < 0x20 || byte > 0x7E || byte == '\\') {
-            escaped += "\\x";
-            escaped += kHex[byte >> 4];
-            escaped += kHex[byte & 15];
-        } else {
-            escaped += char(byte);
-        }
-    }
-    return escaped;
 }
 
 bool MakeAddress(const std::string& path, sockaddr_un* address) {
@@ -1558,7 +1543,7 @@ std::string SocketDirectory() {
             refusal = Format("its mode %04o lets other users in", unsigned(status.st_mode & 07777));
         if (!refusal.empty()) {
             AppLog("message port: refused the socket directory %s: %s",
-                   EscapeForLog(directory).c_str(), refusal.c_str());
+                   LogEscape(directory).c_str(), refusal.c_str());
             return {};
         }
     }

@@ -667,7 +667,7 @@ TEST_F(MessagePortTest, WithoutARuntimeDirectorySocketsLiveInAPrivateDirectoryOf
     // A home whose name holds a newline: the log line must not be forged by it.
     const std::string home = runtime_.Path() + "/home\nforged";
     const std::string directory = home + "/.glyphwell";
-    const std::string logged = runtime_.Path() + "/home\\x0aforged/.glyphwell";
+    const std::string logged = runtime_.Path() + "/home\\nforged/.glyphwell";
     const bool root = geteuid() == 0;
     struct Case {
         const char* what;
