@@ -75,7 +75,7 @@ void QZInputGuard::Begin() {
         button->setEnabled(false);
         disabled_.emplace_back(button);
     }
-    focusMoved_ = window_->focusWidget();
+    clickedDuringGuard_ = false;
     timer_.start(duration);
 }
 
@@ -85,11 +85,11 @@ void QZInputGuard::Finish() {
         if (button)
             button->setEnabled(true);
     disabled_.clear();
-    // Disabling the focused button moved the focus on; it goes back unless the user moved it.
-    if (window_ && focusBefore_ && window_->focusWidget() == focusMoved_)
+    // Disabling the focused button moved the focus on; it goes back unless the user clicked
+    // elsewhere in the window meanwhile (keys could not move it: they were dropped).
+    if (window_ && window_->isVisible() && focusBefore_ && !clickedDuringGuard_)
         focusBefore_->setFocus(Qt::OtherFocusReason);
     focusBefore_ = nullptr;
-    focusMoved_ = nullptr;
 }
 
 bool QZInputGuard::DropsKeyEvent(QObject* watched, QEvent* event) {
@@ -130,6 +130,11 @@ bool QZInputGuard::eventFilter(QObject* watched, QEvent* event) {
             Finish();
             pressedKeys_.clear();
         }
+        return false;
+    case QEvent::MouseButtonPress:
+        if (isGuarding() && qobject_cast<QWidget*>(watched) &&
+            static_cast<QWidget*>(watched)->window() == window_)
+            clickedDuringGuard_ = true;
         return false;
     case QEvent::ShortcutOverride:
     case QEvent::KeyPress:

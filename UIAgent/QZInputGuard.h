@@ -56,6 +56,6 @@ private:
     QTimer timer_;
     std::vector<QPointer<QAbstractButton>> disabled_;
     QPointer<QWidget> focusBefore_; ///< the focus as the guard began
-    QPointer<QWidget> focusMoved_;  ///< where disabling the buttons moved it
-    QSet<int> pressedKeys_;         ///< keys pressed while shown, after the guard time
+    bool clickedDuringGuard_ = false;
+    QSet<int> pressedKeys_; ///< keys pressed while shown, after the guard time
 };
