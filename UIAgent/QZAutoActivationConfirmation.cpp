@@ -1,7 +1,6 @@
 #include "UIAgent/QZAutoActivationConfirmation.h"
 
 #include <QAccessible>
-#include <QAccessibleWidget>
 #include <QApplication>
 #include <QCheckBox>
 #include <QDialogButtonBox>
@@ -21,6 +20,7 @@
 #include <utility>
 #include <vector>
 
+#include "UIAgent/QZAccessibility.h"
 #include "UIAgent/QZLocalizedString.h"
 #include "UIAgent/QZModalSession.h"
 #include "cfutil/TStackBuffer.h"
@@ -44,7 +44,6 @@ static void InitializeHelpResource() {
 namespace {
 
 constexpr char kCountdownKey[] = "This question closes without an answer in %@.";
-constexpr char kCountdownObjectName[] = "countdown";
 /// Seconds left at which the countdown is announced to screen readers.
 constexpr qint64 kAnnouncedSeconds[] = {60, 30, 10};
 constexpr int kIconSize = 64;
@@ -73,14 +72,6 @@ CFURLRef FirstURL(CFArrayRef array) {
         return nullptr;
     const void* first = CFArrayGetValueAtIndex(array, 0);
     return first && CFGetTypeID(first) == CFURLGetTypeID() ? static_cast<CFURLRef>(first) : nullptr;
-}
-
-/// The countdown is a status region (a status bar to assistive technologies), not a static text.
-QAccessibleInterface* CountdownAccessibleFactory(const QString& className, QObject* object) {
-    if (className == QLatin1String("QLabel") && object &&
-        object->objectName() == QLatin1String(kCountdownObjectName))
-        return new QAccessibleWidget(static_cast<QWidget*>(object), QAccessible::StatusBar);
-    return nullptr;
 }
 
 /// "m:ss" for a number of seconds.
@@ -216,13 +207,12 @@ void QZAutoActivationConfirmation::setupAlert() {
     addHelpButton();
     addFontSample();
 
-    static const bool factoryInstalled = [] {
-        QAccessible::installFactory(CountdownAccessibleFactory);
-        return true;
-    }();
-    (void)factoryInstalled;
-    widgets_->countdown = new QLabel(alert);
-    widgets_->countdown->setObjectName(QLatin1String(kCountdownObjectName));
+    QZInstallAccessibilityFactory();
+    // Named before it has a parent: assistive technologies may ask about it from then on, and
+    // the answer is kept.
+    widgets_->countdown = new QLabel;
+    widgets_->countdown->setObjectName(QLatin1String(kQZStatusRegionObjectName));
+    widgets_->countdown->setParent(alert);
     widgets_->countdown->setTextFormat(Qt::PlainText);
     updateCountdown();
 
@@ -436,8 +426,9 @@ void QZAutoActivationConfirmation::showHelp() {
     InitializeHelpResource();
     if (!widgets_->helpWindow) {
         // A window of the alert's own, so that the alert's modality does not block it.
-        auto* browser = new QTextBrowser(alert_.get());
-        browser->setWindowFlags(Qt::Dialog);
+        auto* browser = new QTextBrowser;
+        browser->setObjectName(QLatin1String(kQZDocumentObjectName));
+        browser->setParent(alert_.get(), Qt::Dialog);
         browser->setWindowTitle(QZLocalizedString("Help"));
         browser->setAccessibleName(QZLocalizedString("Help"));
         browser->setOpenExternalLinks(true);

@@ -8,9 +8,11 @@
 
 #include <QAbstractButton>
 #include <QCheckBox>
+#include <QDialogButtonBox>
 #include <QEvent>
 #include <QEventLoop>
 #include <QLabel>
+#include <QLayout>
 #include <QMessageBox>
 #include <QObject>
 #include <QTimer>
@@ -41,16 +43,19 @@ void ArrangeForKeyboard(QWidget* window) {
         if (label && !label->text().isEmpty()) {
             label->setTextInteractionFlags(label->textInteractionFlags() |
                                            Qt::TextSelectableByKeyboard);
+            label->setFocusPolicy(Qt::StrongFocus);
             order.push_back(label);
         }
     }
     if (QCheckBox* checkBox = box->checkBox())
         order.push_back(checkBox);
-    // The buttons in the order the focus chain has them.
-    for (QWidget* next = box->nextInFocusChain(); next && next != box;
-         next = next->nextInFocusChain())
-        if (auto* button = qobject_cast<QAbstractButton*>(next); button && !button->isCheckable())
-            order.push_back(button);
+    // The buttons in the order they are laid out.
+    if (auto* buttons = box->findChild<QDialogButtonBox*>(); buttons && buttons->layout()) {
+        QLayout* layout = buttons->layout();
+        for (int i = 0; i < layout->count(); ++i)
+            if (auto* button = qobject_cast<QAbstractButton*>(layout->itemAt(i)->widget()))
+                order.push_back(button);
+    }
     for (size_t i = 1; i < order.size(); ++i)
         QWidget::setTabOrder(order[i - 1], order[i]);
 }
@@ -131,10 +136,11 @@ int QZModalSession::Run() {
     // from an earlier run is shown afresh.
     if (window->isVisible() && window->windowModality() != Qt::ApplicationModal)
         window->hide();
-    if (state_->guard)
-        ArrangeForKeyboard(window);
     window->setWindowModality(Qt::ApplicationModal);
     window->show();
+    // After showing: a message box sets its texts' interaction up as it is shown.
+    if (state_->guard)
+        ArrangeForKeyboard(window);
     QZBringToFront(window);
 
     QEventLoop loop;
