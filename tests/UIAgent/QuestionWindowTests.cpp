@@ -2,13 +2,16 @@
 // and what assistive technologies are told. Driven on the offscreen platform.
 #include <QAccessible>
 #include <QCheckBox>
+#include <QDialog>
 #include <QElapsedTimer>
 #include <QLabel>
 #include <QMessageBox>
+#include <QProgressBar>
 #include <QPushButton>
 #include <QTest>
 #include <QTextBrowser>
 
+#include "UIAgent/FontDownloadWindowController.h"
 #include "UIAgent/QZAutoActivationConfirmation.h"
 #include "UIAgent/QZFontDownloadConfirmation.h"
 #include "UIAgent/QZInputGuard.h"
@@ -181,6 +184,17 @@ TEST(QuestionWindows, HaveATitleAFixedSizeTheDialogTypeAndGuardedButtons) {
         EXPECT_TRUE(seen);
     }
     QZNetworkCheck::SetFlagsSourceForTesting(nullptr);
+}
+
+TEST(ProgressWindow, HasATitleAFixedSizeTheDialogTypeAndANamedProgressBar) {
+    EnglishTexts english;
+    FontDownloadWindowController controller(Array({}).as<CFArrayRef>());
+    QDialog* window = controller.window();
+    EXPECT_EQ(window->windowTitle(), "Font Download");
+    EXPECT_EQ(window->windowType(), Qt::Dialog);
+    EXPECT_EQ(window->minimumSize(), window->maximumSize());
+    EXPECT_GE(window->width(), 440);
+    EXPECT_EQ(controller.progressIndicator()->accessibleName(), "Download progress");
 }
 
 TEST(AutoActivationAccessibility, CountdownIsAStatusAnnouncedAtMarksAndActionsRestartTheTimeout) {
