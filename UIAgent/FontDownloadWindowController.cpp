@@ -444,7 +444,6 @@ int FontDownloadWindowController::runErrorAlert(CFTypeRef error) {
         // A child of the window, so that it stays above it.
         QMessageBox alert(window_.get());
         alert.setWindowFlag(Qt::WindowStaysOnTopHint);
-        alert.setWindowTitle(QZLocalizedString("QZ_DOWNLOAD_ERROR_TITLE"));
         alert.setIcon(QMessageBox::Warning);
         alert.setTextFormat(Qt::PlainText);
         alert.setText(description);
@@ -456,6 +455,7 @@ int FontDownloadWindowController::runErrorAlert(CFTypeRef error) {
         alert.setDefaultButton(proceed);
         alert.setEscapeButton(cancel);
         QZModalSession session(&alert, QZModalSession::kQuestion);
+        alert.setWindowTitle(QZLocalizedString("QZ_DOWNLOAD_ERROR_TITLE"));
         connect(&alert, &QMessageBox::buttonClicked, &alert,
                 [&session, proceed, cancel](QAbstractButton* clicked) {
                     if (clicked == proceed)
