@@ -3,8 +3,9 @@
 // font (set in its own face), and the volume when the font file lies on another volume than the
 // system's; it can reveal the candidate files in the file manager without ending the question,
 // offers "don't warn again for this application", opens the agent's help at the alert's section,
-// and answers no by itself when it has seen no keyboard, mouse or wheel input of the agent for
-// the timeout (120 s), counting down visibly.
+// and answers no by itself when it has seen no keyboard, mouse or wheel input of the agent, and no
+// press, toggle or focus through the accessibility bus, for the timeout (120 s), counting down
+// visibly (and for screen readers at 60, 30 and 10 s left).
 //
 // The timeout and a withdrawal end this alert's own modal session only: when the alert ends or
 // is shown again, no timer of it is left pending, so it can never end a later alert or window.
