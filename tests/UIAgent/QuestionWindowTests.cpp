@@ -105,15 +105,6 @@ TEST(InputGuard, DropsButtonInputForASecondAfterEachShowingAndAutoRepeatAlways) 
     }
 }
 
-TEST(InputGuard, ATestOverrideWinsUntilItIsUndone) {
-    const std::chrono::milliseconds fromEnvironment = QZInputGuard::Duration();
-    {
-        GuardDuration guard(250ms);
-        EXPECT_EQ(QZInputGuard::Duration(), 250ms);
-    }
-    EXPECT_EQ(QZInputGuard::Duration(), fromEnvironment);
-}
-
 TEST(WindowActivation, TakesTheTokenOnceFromEitherVariable) {
     struct Row {
         const char* xdg;
