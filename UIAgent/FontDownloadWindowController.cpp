@@ -3,6 +3,7 @@
 #include <QCoreApplication>
 #include <QDialog>
 #include <QLabel>
+#include <QLayout>
 #include <QLocale>
 #include <QMessageBox>
 #include <QProgressBar>
@@ -246,6 +247,16 @@ bool FontDownloadWindowController::Link::Failed(CFDictionaryRef progress) {
     return false;
 }
 
+/// A fixed size, so that tiling compositors float the window rather than tile it: the designed
+/// width, and the height of the contents with room for a second line of status.
+static void FixWindowSize(QDialog& window) {
+    int height = window.sizeHint().height();
+    if (QLayout* layout = window.layout(); layout && layout->hasHeightForWidth())
+        height = layout->totalHeightForWidth(window.minimumWidth());
+    height += window.fontMetrics().lineSpacing();
+    window.setFixedSize(std::max(window.minimumWidth(), window.sizeHint().width()), height);
+}
+
 FontDownloadWindowController::FontDownloadWindowController(CFArrayRef descriptors, QObject* parent)
     : QObject(parent), descriptors_(descriptors), link_(std::make_shared<Link>(this)) {}
 
@@ -287,6 +298,8 @@ void FontDownloadWindowController::windowDidLoad() {
     ui_->progressIndicator->setValue(0);
     setMainStatus(QZLocalizedString("QZ_PREPARING_TO_DOWNLOAD"));
     ui_->minorStatusTextField->clear();
+    ui_->progressIndicator->setAccessibleName(QZLocalizedString("QZ_DOWNLOAD_PROGRESS_NAME"));
+    FixWindowSize(window);
     session_ = std::make_unique<QZModalSession>(&window);
 
     if (!descriptors_ || CFArrayGetCount(descriptors_) == 0)
@@ -441,7 +454,8 @@ int FontDownloadWindowController::runErrorAlert(CFTypeRef error) {
         QPushButton* cancel = alert.addButton(QZLocalizedString("Cancel"), QMessageBox::RejectRole);
         alert.setDefaultButton(proceed);
         alert.setEscapeButton(cancel);
-        QZModalSession session(&alert);
+        QZModalSession session(&alert, QZModalSession::kQuestion);
+        alert.setWindowTitle(QZLocalizedString("QZ_DOWNLOAD_ERROR_TITLE"));
         connect(&alert, &QMessageBox::buttonClicked, &alert,
                 [&session, proceed, cancel](QAbstractButton* clicked) {
                     if (clicked == proceed)

@@ -1,5 +1,6 @@
 #include "UIAgent/QZAutoActivationConfirmation.h"
 
+#include <QAccessible>
 #include <QApplication>
 #include <QCheckBox>
 #include <QDialogButtonBox>
@@ -13,9 +14,13 @@
 #include <QTextBrowser>
 #include <QTimer>
 #include <QUrl>
+#include <algorithm>
+#include <iterator>
+#include <tuple>
 #include <utility>
 #include <vector>
 
+#include "UIAgent/QZAccessibility.h"
 #include "UIAgent/QZLocalizedString.h"
 #include "UIAgent/QZModalSession.h"
 #include "cfutil/TStackBuffer.h"
@@ -39,6 +44,8 @@ static void InitializeHelpResource() {
 namespace {
 
 constexpr char kCountdownKey[] = "This question closes without an answer in %@.";
+/// Seconds left at which the countdown is announced to screen readers.
+constexpr qint64 kAnnouncedSeconds[] = {60, 30, 10};
 constexpr int kIconSize = 64;
 /// Font files beyond this size are not loaded for the sample: it is a courtesy, not worth the
 /// memory.
@@ -84,6 +91,7 @@ struct QZAutoActivationConfirmation::Widgets : QObject {
     QLabel* countdown = nullptr;
     QTextBrowser* helpWindow = nullptr;
     int sampleFontId = -1;
+    qint64 countdownSeconds = -1; ///< the count last shown; -1 before the first
     QTimer timeout;
     QTimer tick;
 
@@ -105,6 +113,8 @@ struct QZAutoActivationConfirmation::Widgets : QObject {
         case QEvent::Enter:
         case QEvent::Leave:
         case QEvent::Wheel:
+        // Also what a screen reader's focus action brings.
+        case QEvent::FocusIn:
             owner->restartTimeout();
             break;
         default:
@@ -116,7 +126,7 @@ struct QZAutoActivationConfirmation::Widgets : QObject {
 
 QZAutoActivationConfirmation::QZAutoActivationConfirmation(CFDictionaryRef properties)
     : alert_(std::make_unique<QMessageBox>()), widgets_(std::make_unique<Widgets>(this)),
-      session_(std::make_unique<QZModalSession>(alert_.get())) {
+      session_(std::make_unique<QZModalSession>(alert_.get(), QZModalSession::kQuestion)) {
     candidateFonts_ = TCFRetained<CFArrayRef>(static_cast<CFArrayRef>(
         GetTypedValue(properties, kQZUIPropertyCandidateFontURLs, CFArrayGetTypeID())));
     request_ = TCFRetained<CFDictionaryRef>(static_cast<CFDictionaryRef>(
@@ -172,7 +182,7 @@ QZAutoActivationConfirmation::~QZAutoActivationConfirmation() {
 
 void QZAutoActivationConfirmation::setupAlert() {
     QMessageBox* alert = alert_.get();
-
+    alert->setWindowTitle(QZLocalizedString("QZ_AUTO_ACTIVATION_TITLE"));
     const QIcon icon = QZApplicationIcon(applicationURL_);
     if (!icon.isNull())
         alert->setIconPixmap(icon.pixmap(kIconSize, kIconSize));
@@ -188,15 +198,35 @@ void QZAutoActivationConfirmation::setupAlert() {
         alert->setText(QZLocalizedFormat("QZ_HEADLINE_FONT", {applicationName_, fontName_}));
     alert->setInformativeText(QZLocalizedString("QZ_DETAIL_FONT_NOT_INSTALLED"));
 
-    const std::pair<const char*, int> buttons[] = {
-        {"QZ_BUTTON_ALLOW", kAllowTag},
-        {"QZ_BUTTON_DISALLOW", kDisallowTag},
-        {"QZ_BUTTON_SHOW_IN_FINDER", kShowInFileManagerTag},
+    addAnswerButtons();
+    alert->setCheckBox(
+        new QCheckBox(QZLocalizedFormat("QZ_DO_NOT_WARN_APPLICATION", {applicationName_})));
+    // A screen reader's toggle reaches the box without any key or mouse input.
+    QObject::connect(alert->checkBox(), &QCheckBox::toggled, widgets_.get(),
+                     [this] { restartTimeout(); });
+    addHelpButton();
+    addFontSample();
+
+    QZInstallAccessibilityFactory();
+    // Named before it has a parent: assistive technologies may ask about it from then on, and
+    // the answer is kept.
+    widgets_->countdown = new QLabel;
+    widgets_->countdown->setObjectName(QLatin1String(kQZStatusRegionObjectName));
+    widgets_->countdown->setParent(alert);
+    widgets_->countdown->setTextFormat(Qt::PlainText);
+    updateCountdown();
+
+    arrangeExtraWidgets();
+}
+
+void QZAutoActivationConfirmation::addAnswerButtons() {
+    QMessageBox* alert = alert_.get();
+    const std::tuple<const char*, int, QMessageBox::ButtonRole> buttons[] = {
+        {"QZ_BUTTON_ALLOW", kAllowTag, QMessageBox::AcceptRole},
+        {"QZ_BUTTON_DISALLOW", kDisallowTag, QMessageBox::RejectRole},
+        {"QZ_BUTTON_SHOW_IN_FINDER", kShowInFileManagerTag, QMessageBox::ActionRole},
     };
-    for (const auto& [key, tag] : buttons) {
-        const QMessageBox::ButtonRole role = tag == kAllowTag      ? QMessageBox::AcceptRole
-                                             : tag == kDisallowTag ? QMessageBox::RejectRole
-                                                                   : QMessageBox::ActionRole;
+    for (const auto& [key, tag, role] : buttons) {
         QPushButton* button = alert->addButton(QZLocalizedString(key), role);
         widgets_->buttons.emplace_back(button, tag);
     }
@@ -210,43 +240,42 @@ void QZAutoActivationConfirmation::setupAlert() {
                              if (button == clicked)
                                  session_->End(tag);
                      });
+}
 
-    alert->setCheckBox(
-        new QCheckBox(QZLocalizedFormat("QZ_DO_NOT_WARN_APPLICATION", {applicationName_})));
-
+void QZAutoActivationConfirmation::addHelpButton() {
     // The help button must not end the question, but every button of a message box closes it:
-    // this one is cut off from the box's handling and opens the help itself.
-    widgets_->help = alert->addButton(QMessageBox::Help);
-    widgets_->help->setText(QZLocalizedString("Help"));
-    if (auto* box = alert->findChild<QDialogButtonBox*>())
+    // this one is cut off from the box's handling and opens the help itself. A button of our own
+    // rather than the standard Help button, which carries an icon none of the others has.
+    widgets_->help = alert_->addButton(QZLocalizedString("Help"), QMessageBox::HelpRole);
+    if (auto* box = alert_->findChild<QDialogButtonBox*>())
         QObject::disconnect(widgets_->help, &QAbstractButton::clicked, box, nullptr);
     QObject::connect(widgets_->help, &QAbstractButton::clicked, widgets_.get(),
                      [this] { showHelp(); });
+    // Pressed through the accessibility bus, it gets no key or mouse input: it counts all the same.
+    QObject::connect(widgets_->help, &QAbstractButton::pressed, widgets_.get(),
+                     [this] { restartTimeout(); });
+}
 
+void QZAutoActivationConfirmation::addFontSample() {
     // The font's name in its own face, from the candidate file, for display only.
     const QString fontPath = QZFilePathOfURL(FirstURL(candidateFonts_));
-    if (const QFileInfo file(fontPath);
-        !fontPath.isEmpty() && file.isFile() && file.size() <= kMaximumSampleFontFileSize) {
-        const int id = QFontDatabase::addApplicationFont(fontPath);
-        const QStringList families = QFontDatabase::applicationFontFamilies(id);
-        if (id >= 0 && !families.isEmpty()) {
-            widgets_->sampleFontId = id;
-            QFont face(families.contains(fontName_) ? fontName_ : families.first());
-            face.setPointSizeF(alert->font().pointSizeF() * 1.6);
-            widgets_->sample = new QLabel(fontName_, alert);
-            widgets_->sample->setTextFormat(Qt::PlainText);
-            widgets_->sample->setFont(face);
-            widgets_->sample->setAccessibleName(fontName_);
-        } else if (id >= 0) {
+    const QFileInfo file(fontPath);
+    if (fontPath.isEmpty() || !file.isFile() || file.size() > kMaximumSampleFontFileSize)
+        return;
+    const int id = QFontDatabase::addApplicationFont(fontPath);
+    const QStringList families = QFontDatabase::applicationFontFamilies(id);
+    if (id < 0 || families.isEmpty()) {
+        if (id >= 0)
             QFontDatabase::removeApplicationFont(id);
-        }
+        return;
     }
-
-    widgets_->countdown = new QLabel(alert);
-    widgets_->countdown->setTextFormat(Qt::PlainText);
-    updateCountdown();
-
-    arrangeExtraWidgets();
+    widgets_->sampleFontId = id;
+    QFont face(families.contains(fontName_) ? fontName_ : families.first());
+    face.setPointSizeF(alert_->font().pointSizeF() * 1.6);
+    widgets_->sample = new QLabel(fontName_, alert_.get());
+    widgets_->sample->setTextFormat(Qt::PlainText);
+    widgets_->sample->setFont(face);
+    widgets_->sample->setAccessibleName(fontName_);
 }
 
 /// Places the font sample above the checkbox and the countdown below it, the buttons last.
@@ -326,17 +355,36 @@ void QZAutoActivationConfirmation::restartTimeout() {
     updateCountdown();
 }
 
+std::chrono::milliseconds QZAutoActivationConfirmation::remainingTime() const {
+    return widgets_->timeout.isActive()
+               ? std::chrono::milliseconds(std::max(widgets_->timeout.remainingTime(), 0))
+               : timeout_;
+}
+
 void QZAutoActivationConfirmation::updateCountdown() {
-    const qint64 remaining = widgets_->timeout.isActive()
-                                 ? qint64(widgets_->timeout.remainingTime())
-                                 : qint64(timeout_.count());
-    const QString text = QZLocalizedFormat(
-        kCountdownKey, {MinutesAndSeconds((std::max<qint64>(remaining, 0) + 999) / 1000)});
     QLabel* label = widgets_->countdown;
-    if (!label || label->text() == text)
+    if (!label)
         return;
-    label->setText(text);
+    const qint64 seconds = (qint64(remainingTime().count()) + 999) / 1000;
+    const QString text = QZLocalizedFormat(kCountdownKey, {MinutesAndSeconds(seconds)});
+    if (label->text() != text)
+        label->setText(text);
+
+    // The visible text changes every second; what a screen reader hears (the status region's
+    // name) changes only as the count passes a mark, and when the timeout was restarted.
+    const qint64 previous = std::exchange(widgets_->countdownSeconds, seconds);
+    const bool passedMark =
+        std::any_of(std::begin(kAnnouncedSeconds), std::end(kAnnouncedSeconds), [&](qint64 mark) {
+            return previous >= 0 && seconds <= mark && mark < previous;
+        });
+    if (!passedMark && previous >= 0 && seconds <= previous)
+        return;
     label->setAccessibleName(text);
+    label->setAccessibleDescription(text);
+    if (passedMark) {
+        QAccessibleEvent announcement(label, QAccessible::Alert);
+        QAccessible::updateAccessibility(&announcement);
+    }
 }
 
 QStringList QZAutoActivationConfirmation::CandidateFileURIs(CFArrayRef candidates) {
@@ -378,11 +426,13 @@ void QZAutoActivationConfirmation::showHelp() {
     InitializeHelpResource();
     if (!widgets_->helpWindow) {
         // A window of the alert's own, so that the alert's modality does not block it.
-        auto* browser = new QTextBrowser(alert_.get());
-        browser->setWindowFlag(Qt::Window);
+        auto* browser = new QTextBrowser;
+        browser->setObjectName(QLatin1String(kQZDocumentObjectName));
+        browser->setParent(alert_.get(), Qt::Dialog);
         browser->setWindowTitle(QZLocalizedString("Help"));
+        browser->setAccessibleName(QZLocalizedString("Help"));
         browser->setOpenExternalLinks(true);
-        browser->resize(560, 480);
+        browser->setFixedSize(560, 480);
         widgets_->helpWindow = browser;
     }
     QUrl page(QStringLiteral("qrc:/help/index.html"));

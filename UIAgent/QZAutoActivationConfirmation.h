@@ -3,8 +3,9 @@
 // font (set in its own face), and the volume when the font file lies on another volume than the
 // system's; it can reveal the candidate files in the file manager without ending the question,
 // offers "don't warn again for this application", opens the agent's help at the alert's section,
-// and answers no by itself when it has seen no keyboard, mouse or wheel input of the agent for
-// the timeout (120 s), counting down visibly.
+// and answers no by itself when it has seen no keyboard, mouse or wheel input of the agent, and no
+// press, toggle or focus through the accessibility bus, for the timeout (120 s), counting down
+// visibly (and for screen readers at 60, 30 and 10 s left).
 //
 // The timeout and a withdrawal end this alert's own modal session only: when the alert ends or
 // is shown again, no timer of it is left pending, so it can never end a later alert or window.
@@ -85,6 +86,9 @@ public:
     /// The timeout of the next showing (tests shorten it).
     void setTimeout(std::chrono::milliseconds timeout) { timeout_ = timeout; }
     std::chrono::milliseconds timeout() const { return timeout_; }
+    /// The time left before the running alert answers no by itself; the full timeout when it is
+    /// not running.
+    std::chrono::milliseconds remainingTime() const;
 
     /// The button that answers `tag`, or null.
     QAbstractButton* buttonWithTag(int tag) const;
@@ -92,7 +96,8 @@ public:
     QCheckBox* suppressionCheckBox() const;
     /// The font's name in its own face; null when the candidate file could not be loaded.
     QLabel* fontSampleLabel() const;
-    /// The visible countdown of the timeout; its accessible name says the same.
+    /// The visible countdown of the timeout: a status region whose accessible name follows the
+    /// text at 60, 30 and 10 s left (and when the timeout restarts), not every second.
     QLabel* countdownLabel() const;
     /// The help window once showHelp opened it, else null.
     QTextBrowser* helpWindow() const;
@@ -103,6 +108,12 @@ public:
 private:
     struct Widgets;
 
+    /// Allow (the default), Disallow (also Escape) and Show in File Manager.
+    void addAnswerButtons();
+    /// The Help button, which opens the help without ending the question.
+    void addHelpButton();
+    /// The font's name in its own face, when the candidate file can be loaded.
+    void addFontSample();
     void restartTimeout();
     void updateCountdown();
     void arrangeExtraWidgets();

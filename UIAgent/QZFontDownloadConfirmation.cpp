@@ -67,7 +67,9 @@ QString LocalizedName(CFDictionaryRef names, const QString& language) {
 } // namespace
 
 QZFontDownloadConfirmation::QZFontDownloadConfirmation(CFDictionaryRef properties, QWidget* parent)
-    : QMessageBox(parent), session_(std::make_unique<QZModalSession>(this)) {
+    : QMessageBox(parent),
+      session_(std::make_unique<QZModalSession>(this, QZModalSession::kQuestion)) {
+    setWindowTitle(QZLocalizedString("QZ_DOWNLOAD_CONFIRMATION_TITLE"));
     TCFRetained<CFMutableDictionaryRef> names(
         CFDictionaryCreateMutable(kCFAllocatorDefault, 0, &kCFTypeDictionaryKeyCallBacks,
                                   &kCFTypeDictionaryValueCallBacks),

@@ -6,13 +6,21 @@
 // rule without any bookkeeping of our own.
 #include "UIAgent/QZModalSession.h"
 
+#include <QAbstractButton>
+#include <QCheckBox>
+#include <QDialogButtonBox>
 #include <QEvent>
 #include <QEventLoop>
+#include <QLabel>
+#include <QLayout>
+#include <QMessageBox>
 #include <QObject>
 #include <QTimer>
 #include <algorithm>
 #include <vector>
 
+#include "UIAgent/QZInputGuard.h"
+#include "UIAgent/QZWindowActivation.h"
 #include "platform/Log.h"
 
 namespace {
@@ -21,6 +29,35 @@ namespace {
 std::vector<QZModalSession*>& RunningSessions() {
     static std::vector<QZModalSession*> sessions;
     return sessions;
+}
+
+/// Lets keyboard and screen-reader users read a message box's texts with Tab, in reading order:
+/// the texts, the checkbox, then the buttons in their order. Other windows are left as they are.
+void ArrangeForKeyboard(QWidget* window) {
+    auto* box = qobject_cast<QMessageBox*>(window);
+    if (!box)
+        return;
+    std::vector<QWidget*> order;
+    for (const char* name : {"qt_msgbox_label", "qt_msgbox_informativelabel"}) {
+        auto* label = box->findChild<QLabel*>(QLatin1String(name));
+        if (label && !label->text().isEmpty()) {
+            label->setTextInteractionFlags(label->textInteractionFlags() |
+                                           Qt::TextSelectableByKeyboard);
+            label->setFocusPolicy(Qt::StrongFocus);
+            order.push_back(label);
+        }
+    }
+    if (QCheckBox* checkBox = box->checkBox())
+        order.push_back(checkBox);
+    // The buttons in the order they are laid out.
+    if (auto* buttons = box->findChild<QDialogButtonBox*>(); buttons && buttons->layout()) {
+        QLayout* layout = buttons->layout();
+        for (int i = 0; i < layout->count(); ++i)
+            if (auto* button = qobject_cast<QAbstractButton*>(layout->itemAt(i)->widget()))
+                order.push_back(button);
+    }
+    for (size_t i = 1; i < order.size(); ++i)
+        QWidget::setTabOrder(order[i - 1], order[i]);
 }
 
 } // namespace
@@ -38,6 +75,7 @@ struct QZModalSession::State : QObject {
     bool ended = false; ///< End was called during the current run
     int code = 0;
     QMetaObject::Connection destroyedConnection;
+    std::unique_ptr<QZInputGuard> guard;
 
     State(QZModalSession* owner, QWidget* w) : session(owner), window(w) {}
 
@@ -53,7 +91,11 @@ struct QZModalSession::State : QObject {
     }
 };
 
-QZModalSession::QZModalSession(QWidget* window) : state_(std::make_unique<State>(this, window)) {}
+QZModalSession::QZModalSession(QWidget* window, Kind kind)
+    : state_(std::make_unique<State>(this, window)) {
+    if (kind == kQuestion)
+        state_->guard = std::make_unique<QZInputGuard>(window);
+}
 
 QZModalSession::~QZModalSession() {
     // A session is destroyed by the code that ran it, after its run returned; a session destroyed
@@ -96,8 +138,10 @@ int QZModalSession::Run() {
         window->hide();
     window->setWindowModality(Qt::ApplicationModal);
     window->show();
-    window->raise();
-    window->activateWindow();
+    // After showing: a message box sets its texts' interaction up as it is shown.
+    if (state_->guard)
+        ArrangeForKeyboard(window);
+    QZBringToFront(window);
 
     QEventLoop loop;
     state_->loop = &loop;
@@ -139,6 +183,10 @@ bool QZModalSession::IsRunning() const {
 QZModalSession* QZModalSession::Innermost() {
     auto& sessions = RunningSessions();
     return sessions.empty() ? nullptr : sessions.back();
+}
+
+QZInputGuard* QZModalSession::inputGuard() const {
+    return state_->guard.get();
 }
 
 int QZModalSession::Depth() {

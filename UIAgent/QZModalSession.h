@@ -7,6 +7,9 @@
 // hides its window at once, and its run returns that code as soon as the sessions above it have
 // returned (a nested loop cannot be left before the loops it contains). Timers that end a session
 // (a timeout, a withdrawal) name their session, never "whatever is innermost".
+//
+// A session of a question (kQuestion) guards its window's buttons against input meant for other
+// windows (QZInputGuard) each time it is shown.
 #pragma once
 
 #include <QPointer>
@@ -18,10 +21,17 @@ inline constexpr int kQZModalResponseAbort = -1001;
 /// The window was closed by the window manager or Escape without a button.
 inline constexpr int kQZModalResponseCancel = -2;
 
+class QZInputGuard;
+
 class QZModalSession {
 public:
+    enum Kind {
+        kWindow,   ///< a window that shows progress: its buttons work at once
+        kQuestion, ///< a question: its buttons are guarded after each showing
+    };
+
     /// A session for `window`; the window is not owned.
-    explicit QZModalSession(QWidget* window);
+    explicit QZModalSession(QWidget* window, Kind kind = kWindow);
     ~QZModalSession();
     QZModalSession(const QZModalSession&) = delete;
     QZModalSession& operator=(const QZModalSession&) = delete;
@@ -39,6 +49,9 @@ public:
     static QZModalSession* Innermost();
     /// Number of sessions running.
     static int Depth();
+
+    /// The guard of a question's window; null for kWindow.
+    QZInputGuard* inputGuard() const;
 
 private:
     struct State;

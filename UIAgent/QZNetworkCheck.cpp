@@ -40,6 +40,7 @@ bool QZNetworkCheck::continueDownload() {
     session_.reset();
     alert_ = std::make_unique<QMessageBox>();
     QMessageBox& alert = *alert_;
+    alert.setWindowTitle(QZLocalizedString("QZ_NETWORK_ALERT_TITLE"));
     alert.setIcon(QMessageBox::Critical);
     alert.setTextFormat(Qt::PlainText);
     alert.setText(QZLocalizedString("Network is not connected."));
@@ -50,7 +51,7 @@ bool QZNetworkCheck::continueDownload() {
         alert.addButton(QZLocalizedString("Continue Download"), QMessageBox::AcceptRole);
     alert.setDefaultButton(cancel);
     alert.setEscapeButton(cancel);
-    session_ = std::make_unique<QZModalSession>(&alert);
+    session_ = std::make_unique<QZModalSession>(&alert, QZModalSession::kQuestion);
     QZModalSession* session = session_.get();
     // The button ends the session with its response before the box hides itself.
     QObject::connect(&alert, &QMessageBox::buttonClicked, &alert,

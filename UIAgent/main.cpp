@@ -18,6 +18,8 @@ int main(int argc, char** argv) {
     QApplication application(argc, argv);
     QApplication::setApplicationName(QStringLiteral("GlyphwellUIAgent"));
     QApplication::setOrganizationDomain(QStringLiteral("glyphwell.org"));
+    // What compositors and task switchers call the agent, with the desktop entry's icon.
+    QApplication::setApplicationDisplayName(QStringLiteral("Glyphwell"));
     QApplication::setDesktopFileName(QStringLiteral("org.glyphwell.Glyphwell.GlyphwellUIAgent"));
     // Alerts come and go; the agent's life is the controller's business.
     QApplication::setQuitOnLastWindowClosed(false);

@@ -138,5 +138,30 @@
         <extracomment>Title of the help window of the font-use alert.</extracomment>
         <translation>Help</translation>
     </message>
+    <message>
+        <source>QZ_AUTO_ACTIVATION_TITLE</source>
+        <extracomment>Title of the alert that asks whether an application may use a font.</extracomment>
+        <translation>Use Font?</translation>
+    </message>
+    <message>
+        <source>QZ_DOWNLOAD_CONFIRMATION_TITLE</source>
+        <extracomment>Title of the alert that asks whether fonts may be downloaded.</extracomment>
+        <translation>Download Fonts?</translation>
+    </message>
+    <message>
+        <source>QZ_NETWORK_ALERT_TITLE</source>
+        <extracomment>Title of the alert shown when the network is not connected.</extracomment>
+        <translation>No Network Connection</translation>
+    </message>
+    <message>
+        <source>QZ_DOWNLOAD_ERROR_TITLE</source>
+        <extracomment>Title of the alert shown when a font download failed.</extracomment>
+        <translation>Font Download Failed</translation>
+    </message>
+    <message>
+        <source>QZ_DOWNLOAD_PROGRESS_NAME</source>
+        <extracomment>Accessible name of the download window's progress bar.</extracomment>
+        <translation>Download progress</translation>
+    </message>
 </context>
 </TS>

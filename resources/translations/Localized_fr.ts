@@ -138,5 +138,30 @@
         <extracomment>Title of the help window of the font-use alert.</extracomment>
         <translation>Aide</translation>
     </message>
+    <message>
+        <source>QZ_AUTO_ACTIVATION_TITLE</source>
+        <extracomment>Title of the alert that asks whether an application may use a font.</extracomment>
+        <translation>Utiliser la police ?</translation>
+    </message>
+    <message>
+        <source>QZ_DOWNLOAD_CONFIRMATION_TITLE</source>
+        <extracomment>Title of the alert that asks whether fonts may be downloaded.</extracomment>
+        <translation>Télécharger des polices ?</translation>
+    </message>
+    <message>
+        <source>QZ_NETWORK_ALERT_TITLE</source>
+        <extracomment>Title of the alert shown when the network is not connected.</extracomment>
+        <translation>Aucune connexion réseau</translation>
+    </message>
+    <message>
+        <source>QZ_DOWNLOAD_ERROR_TITLE</source>
+        <extracomment>Title of the alert shown when a font download failed.</extracomment>
+        <translation>Échec du téléchargement de polices</translation>
+    </message>
+    <message>
+        <source>QZ_DOWNLOAD_PROGRESS_NAME</source>
+        <extracomment>Accessible name of the download window's progress bar.</extracomment>
+        <translation>Progression du téléchargement</translation>
+    </message>
 </context>
 </TS>

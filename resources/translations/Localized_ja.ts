@@ -138,5 +138,30 @@
         <extracomment>Title of the help window of the font-use alert.</extracomment>
         <translation>ヘルプ</translation>
     </message>
+    <message>
+        <source>QZ_AUTO_ACTIVATION_TITLE</source>
+        <extracomment>Title of the alert that asks whether an application may use a font.</extracomment>
+        <translation>フォントを使用しますか？</translation>
+    </message>
+    <message>
+        <source>QZ_DOWNLOAD_CONFIRMATION_TITLE</source>
+        <extracomment>Title of the alert that asks whether fonts may be downloaded.</extracomment>
+        <translation>フォントをダウンロードしますか？</translation>
+    </message>
+    <message>
+        <source>QZ_NETWORK_ALERT_TITLE</source>
+        <extracomment>Title of the alert shown when the network is not connected.</extracomment>
+        <translation>ネットワークに接続されていません</translation>
+    </message>
+    <message>
+        <source>QZ_DOWNLOAD_ERROR_TITLE</source>
+        <extracomment>Title of the alert shown when a font download failed.</extracomment>
+        <translation>フォントのダウンロードに失敗しました</translation>
+    </message>
+    <message>
+        <source>QZ_DOWNLOAD_PROGRESS_NAME</source>
+        <extracomment>Accessible name of the download window's progress bar.</extracomment>
+        <translation>ダウンロードの進行状況</translation>
+    </message>
 </context>
 </TS>

@@ -4,7 +4,9 @@
 // it), creates the application before the first test and destroys it after the last.
 //
 // The tests run on Qt's offscreen platform (the test registration sets QT_QPA_PLATFORM; the
-// environment sets it too when the executable is started by hand).
+// environment sets it too when the executable is started by hand). The questions' input guard is
+// off (GLYPHWELL_INPUT_GUARD_MS=0) unless the environment says otherwise, so that tests may press
+// a button as soon as its window is up; the guard's own tests turn it on.
 #pragma once
 
 #include <QApplication>
@@ -22,6 +24,7 @@ class QtTestEnvironment : public ::testing::Environment {
 public:
     void SetUp() override {
         setenv("QT_QPA_PLATFORM", "offscreen", 0);
+        setenv("GLYPHWELL_INPUT_GUARD_MS", "0", 0);
         static int argc = 1;
         static char name[] = "uiagent_tests";
         static char* argv[] = {name, nullptr};

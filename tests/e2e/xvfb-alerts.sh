@@ -123,7 +123,8 @@ ask() {
     done
     [ -n "$window" ] || fail "no $name alert appeared"
     previous_window=$window
-    sleep 0.5 # mapped is not yet focusable everywhere
+    # Mapped is not yet focusable everywhere, and a question drops keys for 1 s after it shows.
+    sleep 1.2
     timeout 5 xdotool windowfocus --sync "$window" 2>/dev/null || true
     sleep 0.2
     # shellcheck disable=SC2086 # one word per key

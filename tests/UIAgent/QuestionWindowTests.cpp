@@ -1,0 +1,275 @@
+// What every question window shares: the input guard after each showing, the window's properties,
+// and what assistive technologies are told. Driven on the offscreen platform.
+#include <QAccessible>
+#include <QCheckBox>
+#include <QDialog>
+#include <QElapsedTimer>
+#include <QLabel>
+#include <QMessageBox>
+#include <QProgressBar>
+#include <QPushButton>
+#include <QTest>
+#include <QTextBrowser>
+
+#include "UIAgent/FontDownloadWindowController.h"
+#include "UIAgent/QZAutoActivationConfirmation.h"
+#include "UIAgent/QZFontDownloadConfirmation.h"
+#include "UIAgent/QZInputGuard.h"
+#include "UIAgent/QZModalSession.h"
+#include "UIAgent/QZNetworkCheck.h"
+#include "UIAgent/QZWindowActivation.h"
+#include "protocol/QZUIProtocol.h"
+#include "tests/UIAgent/AlertTestSupport.h"
+#include "tests/UIAgent/QtTestEnvironment.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+using namespace glyphwell::testing;
+
+/// The guard at `duration` while it lives (the suite runs with it off).
+struct GuardDuration {
+    explicit GuardDuration(std::chrono::milliseconds duration) {
+        QZInputGuard::SetDurationForTesting(duration);
+    }
+    ~GuardDuration() { QZInputGuard::SetDurationForTesting(-1ms); }
+};
+
+QWidget* KeyTarget(QWidget* window) {
+    return window->focusWidget() ? window->focusWidget() : window;
+}
+
+enum class Input { kReturn, kRepeatedReturn, kClickDefault };
+
+void Send(QWidget* window, QAbstractButton* defaultButton, Input input) {
+    switch (input) {
+    case Input::kReturn:
+        QTest::keyClick(KeyTarget(window), Qt::Key_Return);
+        break;
+    case Input::kRepeatedReturn:
+        // What a key held down since before the window appeared delivers.
+        for (QEvent::Type type : {QEvent::KeyPress, QEvent::KeyRelease}) {
+            QKeyEvent event(type, Qt::Key_Return, Qt::NoModifier, QStringLiteral("\r"), true);
+            QApplication::sendEvent(KeyTarget(window), &event);
+        }
+        break;
+    case Input::kClickDefault:
+        QTest::mouseClick(defaultButton, Qt::LeftButton);
+        break;
+    }
+}
+
+TEST(InputGuard, DropsButtonInputForASecondAfterEachShowingAndAutoRepeatAlways) {
+    GuardDuration guard(1000ms);
+    QMessageBox box;
+    QPushButton* allow = box.addButton(QStringLiteral("Allow"), QMessageBox::AcceptRole);
+    QPushButton* deny = box.addButton(QStringLiteral("Deny"), QMessageBox::RejectRole);
+    box.setDefaultButton(allow);
+    QZModalSession session(&box, QZModalSession::kQuestion);
+    int answer = 0;
+    QObject::connect(&box, &QMessageBox::buttonClicked, [&](QAbstractButton* clicked) {
+        answer = clicked == allow ? 1 : 2;
+        session.End(answer);
+    });
+    struct Row {
+        int atMs;
+        Input input;
+        bool answers;
+    };
+    const Row rows[] = {{100, Input::kReturn, false},
+                        {150, Input::kClickDefault, false},
+                        {1200, Input::kRepeatedReturn, false},
+                        {1250, Input::kReturn, true}};
+    // Twice: the guard starts again when the question is shown again.
+    for (int showing = 1; showing <= 2; ++showing) {
+        answer = 0;
+        QElapsedTimer shown;
+        std::vector<UiScript::Step> steps{{[&] { return box.isVisible(); },
+                                           [&] {
+                                               shown.start();
+                                               EXPECT_FALSE(allow->isEnabled());
+                                               EXPECT_FALSE(deny->isEnabled());
+                                           }}};
+        for (const Row& row : rows)
+            steps.push_back({[&shown, row] { return shown.hasExpired(row.atMs); },
+                             [&, row] {
+                                 SCOPED_TRACE(::testing::Message() << "showing " << showing << ", "
+                                                                   << row.atMs << " ms");
+                                 EXPECT_EQ(allow->isEnabled(), row.atMs > 1000);
+                                 Send(&box, allow, row.input);
+                                 EXPECT_EQ(answer != 0, row.answers);
+                             }});
+        UiScript script(std::move(steps), [&] { session.End(kQZModalResponseStop); });
+        EXPECT_EQ(session.Run(), 1);
+        EXPECT_TRUE(allow->isEnabled() && deny->isEnabled());
+    }
+}
+
+TEST(WindowActivation, TakesTheTokenOnceFromEitherVariable) {
+    struct Row {
+        const char* xdg;
+        const char* startup;
+        const char* token;
+    };
+    const Row rows[] = {{"xdg-1", "startup-1", "xdg-1"},
+                        {nullptr, "startup-2", "startup-2"},
+                        {"", "startup-3", "startup-3"},
+                        {nullptr, nullptr, nullptr}};
+    for (const Row& row : rows) {
+        for (auto [name, value] : {std::pair{"XDG_ACTIVATION_TOKEN", row.xdg},
+                                   std::pair{"DESKTOP_STARTUP_ID", row.startup}})
+            value ? setenv(name, value, 1) : unsetenv(name);
+        EXPECT_EQ(QZTakeActivationToken(), row.token ? QString(row.token) : QString());
+        EXPECT_TRUE(QZTakeActivationToken().isNull()) << "a token is used once";
+        EXPECT_FALSE(getenv("XDG_ACTIVATION_TOKEN") || getenv("DESKTOP_STARTUP_ID"));
+    }
+}
+
+bool InjectOffline(QZNetworkReachabilityFlags* flags) {
+    *flags = 0;
+    return true;
+}
+
+/// Shows each question window, checks it while it is up, and ends it.
+TEST(QuestionWindows, HaveATitleAFixedSizeTheDialogTypeAndGuardedButtons) {
+    EnglishTexts english;
+    GuardDuration guard(60s);
+    Ref request = Dict({{kQZUIPropertyApplicationName, Str("Example Writer").get()},
+                        {kQZUIPropertyFontName, Str("Example Sans").get()}});
+    QZAutoActivationConfirmation activation(request.as<CFDictionaryRef>());
+    QZFontDownloadConfirmation download(nullptr);
+    download.setTargetAppPID(0);
+    QZNetworkCheck::SetFlagsSourceForTesting(&InjectOffline);
+    QZNetworkCheck network;
+
+    struct Row {
+        const char* title;
+        std::function<QMessageBox*()> window;
+        std::function<void()> run, end;
+    };
+    const Row rows[] = {
+        {"Use Font?", [&] { return activation.alert(); }, [&] { activation.showAlert(); },
+         [&] { activation.withdraw(); }},
+        {"Download Fonts?", [&] { return &download; }, [&] { download.showAlert(); },
+         [&] { download.withdraw(); }},
+        {"No Network Connection", [&] { return network.alert(); },
+         [&] { network.continueDownload(); }, [&] { network.withdraw(); }},
+    };
+    for (const Row& row : rows) {
+        SCOPED_TRACE(row.title);
+        bool seen = false;
+        UiScript script({{[&] { return row.window() && row.window()->isVisible(); },
+                          [&] {
+                              QMessageBox* box = row.window();
+                              seen = true;
+                              EXPECT_EQ(box->windowTitle(), row.title);
+                              EXPECT_EQ(box->windowType(), Qt::Dialog);
+                              EXPECT_EQ(box->minimumSize(), box->maximumSize());
+                              for (QAbstractButton* button : box->buttons())
+                                  EXPECT_FALSE(button->isEnabled()) << button->text().toStdString();
+                              row.end();
+                          }}},
+                        row.end);
+        row.run();
+        EXPECT_TRUE(seen);
+    }
+    QZNetworkCheck::SetFlagsSourceForTesting(nullptr);
+}
+
+TEST(ProgressWindow, HasATitleAFixedSizeTheDialogTypeAndANamedProgressBar) {
+    EnglishTexts english;
+    FontDownloadWindowController controller(Array({}).as<CFArrayRef>());
+    QDialog* window = controller.window();
+    EXPECT_EQ(window->windowTitle(), "Font Download");
+    EXPECT_EQ(window->windowType(), Qt::Dialog);
+    EXPECT_EQ(window->minimumSize(), window->maximumSize());
+    EXPECT_GE(window->width(), 440);
+    EXPECT_EQ(controller.progressIndicator()->accessibleName(), "Download progress");
+}
+
+TEST(AutoActivationAccessibility, CountdownIsAStatusAnnouncedAtMarksAndActionsRestartTheTimeout) {
+    EnglishTexts english;
+    Ref request = Dict({{kQZUIPropertyApplicationName, Str("Example Writer").get()}});
+    QZAutoActivationConfirmation confirmation(request.as<CFDictionaryRef>());
+    confirmation.setTimeout(11s);
+    QLabel* countdown = confirmation.countdownLabel();
+    QAccessibleInterface* status = QAccessible::queryAccessibleInterface(countdown);
+    ASSERT_TRUE(status);
+    EXPECT_EQ(status->role(), QAccessible::StatusBar);
+
+    auto text = [](const char* time) {
+        return QStringLiteral("This question closes without an answer in %1.").arg(time);
+    };
+    auto pressThrough = [](QWidget* widget, const QString& action) {
+        QAccessibleInterface* accessible = QAccessible::queryAccessibleInterface(widget);
+        ASSERT_TRUE(accessible && accessible->actionInterface());
+        accessible->actionInterface()->doAction(action);
+    };
+    std::chrono::milliseconds beforeAction{0};
+    QString announced;
+    UiScript script(
+        {// The 10 s mark passed: announced (with the count as it passed, 0:10 unless the machine
+         // lagged); a second later nothing new was told.
+         {[&] { return confirmation.remainingTime() <= 9000ms; },
+          [&] {
+              announced = status->text(QAccessible::Name);
+              EXPECT_TRUE(announced == text("0:10") || announced == text("0:09"))
+                  << announced.toStdString();
+          }},
+         {[&] { return confirmation.remainingTime() <= 8000ms; },
+          [&] {
+              EXPECT_EQ(status->text(QAccessible::Name), announced);
+              beforeAction = confirmation.remainingTime();
+              pressThrough(confirmation.suppressionCheckBox(),
+                           QAccessibleActionInterface::toggleAction());
+          }},
+         {[&] { return confirmation.suppressionCheckBox()->isChecked(); },
+          [&] {
+              EXPECT_GT(confirmation.remainingTime(), beforeAction + 1500ms);
+              EXPECT_EQ(status->text(QAccessible::Name), text("0:11"));
+              beforeAction = confirmation.remainingTime();
+          }},
+         {[&] { return confirmation.remainingTime() < beforeAction - 1100ms; },
+          [&] {
+              pressThrough(confirmation.helpButton(), QAccessibleActionInterface::pressAction());
+          }},
+         {[&] { return confirmation.helpWindow() && confirmation.helpWindow()->isVisible(); },
+          [&] {
+              EXPECT_GT(confirmation.remainingTime(), beforeAction - 1000ms);
+              QTextBrowser* help = confirmation.helpWindow();
+              EXPECT_EQ(help->windowType(), Qt::Dialog);
+              EXPECT_EQ(help->minimumSize(), help->maximumSize());
+              EXPECT_EQ(QAccessible::queryAccessibleInterface(help)->role(), QAccessible::Document);
+              confirmation.withdraw();
+          }}},
+        [&] { confirmation.withdraw(); });
+    confirmation.showAlert();
+    EXPECT_TRUE(script.done());
+    EXPECT_TRUE(confirmation.suppressFurtherAlerts());
+}
+
+TEST(AutoActivationAccessibility, TabGoesThroughTheTextsTheCheckboxThenTheButtons) {
+    EnglishTexts english;
+    Ref request = Dict({{kQZUIPropertyApplicationName, Str("Example Writer").get()}});
+    QZAutoActivationConfirmation confirmation(request.as<CFDictionaryRef>());
+    QStringList order;
+    UiScript script({{[&] { return confirmation.alert()->isVisible(); },
+                      [&] {
+                          QWidget* start = confirmation.alert();
+                          for (QWidget* w = start->nextInFocusChain(); w != start;
+                               w = w->nextInFocusChain())
+                              if (w->isVisible() && (w->focusPolicy() & Qt::TabFocus))
+                                  order << (qobject_cast<QAbstractButton*>(w)
+                                                ? static_cast<QAbstractButton*>(w)->text()
+                                                : w->objectName());
+                          confirmation.withdraw();
+                      }}},
+                    [&] { confirmation.withdraw(); });
+    confirmation.showAlert();
+    EXPECT_EQ(order, QStringList({"qt_msgbox_label", "qt_msgbox_informativelabel",
+                                  "Don’t ask again for Example Writer", "Allow",
+                                  "Show in File Manager", "Don’t Allow", "Help"}))
+        << order.join(" | ").toStdString();
+}
+
+} // namespace
