@@ -10,11 +10,12 @@
 #include <iostream>
 #include <iterator>
 
+#include "cfutil/CFStringUtilities.h"
+#include "cfutil/TCFRetained.h"
 #include "platform/CFMessagePort.h"
 #include "protocol/QZUIProtocol.h"
-#include "serialization/TCFFlattenContext.h"
-#include "serialization/TCFResurrectContext.h"
 #include "tools/TaggedJSON.h"
+#include "tools/ToolInput.h"
 
 namespace glyphwell::tools {
 
@@ -41,14 +42,10 @@ struct PortOptions {
     bool dryRun = false;
 };
 
-std::string Text(CFStringRef string) {
-    const CFIndex length = CFStringGetLength(string);
-    CFIndex needed = 0;
-    CFStringGetBytes(string, CFRangeMake(0, length), kCFStringEncodingUTF8, 0, false, nullptr, 0,
-                     &needed);
-    std::string text(size_t(needed), '\0');
-    CFStringGetBytes(string, CFRangeMake(0, length), kCFStringEncodingUTF8, 0, false,
-                     reinterpret_cast<UInt8*>(text.data()), needed, &needed);
+/// The UTF-8 text of a protocol key.
+std::string Text(CFStringRef key) {
+    std::string text;
+    CFString::GetUTF8(key, text);
     return text;
 }
 
@@ -126,14 +123,10 @@ Json FileURL(const std::string& path) {
         return Json();
     const bool directory = std::filesystem::is_directory(absolute, error);
     const std::string text = absolute.lexically_normal().string();
-    CFURLRef url = CFURLCreateFromFileSystemRepresentation(
+    TCFAdopted<CFURLRef> url(CFURLCreateFromFileSystemRepresentation(
         kCFAllocatorDefault, reinterpret_cast<const UInt8*>(text.data()), CFIndex(text.size()),
-        directory);
-    if (!url)
-        return Json();
-    Json json = ValueToJSON(url);
-    CFRelease(url);
-    return json;
+        directory));
+    return url ? ValueToJSON(url) : Json();
 }
 
 /// Stores the file URL of `path` under `key`; false (said on `err`) when none can be made.
@@ -162,87 +155,67 @@ const char* DescribeStatus(SInt32 status) {
     }
 }
 
-/// Sends `request` (a tagged JSON value; null JSON sends no bytes) and prints the reply.
-int Exchange(const char* verb, const PortOptions& options, SInt32 msgid, const Json* request,
-             std::ostream& out, std::ostream& err) {
-    CFTypeRef value = nullptr;
-    if (request) {
-        std::string error;
-        value = CreateValueFromJSON(*request, &error);
-        if (!value) {
-            err << "glyphwell " << verb << ": " << error << "\n";
-            return 1;
-        }
-    }
-    if (options.dryRun) {
-        out << ValueToJSON(value).dump(options.compact ? -1 : 2) << "\n";
-        if (value)
-            CFRelease(value);
-        return 0;
-    }
-
-    CFMutableDataRef bytes = CFDataCreateMutable(kCFAllocatorDefault, 0);
-    if (value) {
-        // Anything the writer logs means it could not write the value as given.
-        std::string problem;
-        LogSink previous = SetLogSink([&](const LogRecord& record) {
-            if (problem.empty())
-                problem = std::string(record.text);
-        });
-        {
-            TCFFlattenContext context(bytes, false);
-            context.Flatten(value);
-        }
-        SetLogSink(previous);
-        CFRelease(value);
-        if (!problem.empty()) {
-            err << "glyphwell " << verb << ": the request cannot be written: " << problem << "\n";
-            CFRelease(bytes);
-            return 1;
-        }
-    }
-
-    CFStringRef name = CFStringCreateWithBytes(
+/// Sends `bytes` as request `msgid` on the port of `options` and stores the reply's bytes.
+/// False after a message on `err` when nothing listens or the exchange fails.
+bool SendBytes(const char* verb, const PortOptions& options, SInt32 msgid, const std::string& bytes,
+               std::string* reply, std::ostream& err) {
+    TCFAdopted<CFStringRef> name(CFStringCreateWithBytes(
         kCFAllocatorDefault, reinterpret_cast<const UInt8*>(options.name.data()),
-        CFIndex(options.name.size()), kCFStringEncodingUTF8, false);
-    CFMessagePortRef port = name ? CFMessagePortCreateRemote(kCFAllocatorDefault, name) : nullptr;
-    if (name)
-        CFRelease(name);
+        CFIndex(options.name.size()), kCFStringEncodingUTF8, false));
+    TCFAdopted<CFMessagePortRef> port(name ? CFMessagePortCreateRemote(kCFAllocatorDefault, name)
+                                           : nullptr);
     if (!port) {
         err << "glyphwell " << verb << ": nothing answers on the port " << options.name << "\n";
-        CFRelease(bytes);
-        return 1;
+        return false;
     }
-    CFDataRef reply = nullptr;
+    TCFAdopted<CFDataRef> request(CFDataCreate(
+        kCFAllocatorDefault, reinterpret_cast<const UInt8*>(bytes.data()), CFIndex(bytes.size())));
+    CFDataRef replyData = nullptr;
     const SInt32 status =
-        CFMessagePortSendRequest(port, msgid, bytes, options.sendTimeout, options.receiveTimeout,
-                                 kCFRunLoopDefaultMode, &reply);
-    CFRelease(port);
-    CFRelease(bytes);
+        CFMessagePortSendRequest(port, msgid, request, options.sendTimeout, options.receiveTimeout,
+                                 kCFRunLoopDefaultMode, &replyData);
+    TCFAdopted<CFDataRef> replyHolder(replyData);
     if (status != kCFMessagePortSuccess) {
         err << "glyphwell " << verb << ": " << DescribeStatus(status) << " (" << status << ")\n";
-        return 1;
+        return false;
     }
-    if (CFDataGetLength(reply) == 0) {
+    reply->assign(reinterpret_cast<const char*>(CFDataGetBytePtr(replyData)),
+                  size_t(CFDataGetLength(replyData)));
+    return true;
+}
+
+/// Prints the reply bytes as tagged JSON. 0 when they hold an intact value; an empty reply is
+/// said on `err` and is not a failure.
+int PrintReply(const char* verb, const PortOptions& options, const std::string& reply,
+               std::ostream& out, std::ostream& err) {
+    if (reply.empty()) {
         err << "glyphwell " << verb << ": the reply is empty\n";
-        CFRelease(reply);
         return 0;
     }
-
-    // Every line the reader logs goes to `err` as its bare text.
-    LogSink previous = SetLogSink([&](const LogRecord& record) { err << record.text << "\n"; });
-    TCFResurrectContext context(CFDataGetBytePtr(reply), size_t(CFDataGetLength(reply)));
-    CFTypeRef decoded = context.Resurrect(kTCFTypeAny);
-    SetLogSink(previous);
-    out << ValueToJSON(decoded).dump(options.compact ? -1 : 2) << "\n";
+    bool intact = false;
+    out << DecodeToJSON(reply, err, &intact).dump(options.compact ? -1 : 2) << "\n";
     out.flush();
-    const bool good = decoded && !context.IsCorrupted();
-    if (decoded)
-        CFRelease(decoded);
-    CFRelease(reply);
-    if (!good)
+    if (!intact)
         err << "glyphwell " << verb << ": the reply is not a readable value\n";
-    return good ? 0 : 1;
+    return intact ? 0 : 1;
+}
+
+/// Sends `request` (a tagged JSON value; null sends no bytes) and prints the reply, or with
+/// --dry-run prints the request instead.
+int Exchange(const char* verb, const PortOptions& options, SInt32 msgid, const Json* request,
+             std::ostream& out, std::ostream& err) {
+    std::string bytes, error, reply;
+    if (request && !FlattenJSON(*request, &bytes, &error)) {
+        err << "glyphwell " << verb << ": " << error << "\n";
+        return 1;
+    }
+    if (options.dryRun) {
+        out << (request ? *request : Json()).dump(options.compact ? -1 : 2) << "\n";
+        return 0;
+    }
+    if (!SendBytes(verb, options, msgid, bytes, &reply, err))
+        return 1;
+    return PrintReply(verb, options, reply, out, err);
 }
 
 } // namespace
@@ -291,23 +264,10 @@ int RunSend(const std::vector<std::string>& arguments, std::istream& in, std::os
     if (empty)
         return Exchange("send", options, SInt32(msgid), nullptr, out, err);
 
-    std::string text;
-    const std::string inputName = inputPath.empty() || inputPath == "-" ? "<stdin>" : inputPath;
-    if (inputPath.empty() || inputPath == "-") {
-        text.assign(std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>());
-    } else {
-        std::ifstream file(inputPath, std::ios::binary);
-        if (!file) {
-            err << "glyphwell send: cannot open " << inputPath << "\n";
-            return 1;
-        }
-        text.assign(std::istreambuf_iterator<char>(file), std::istreambuf_iterator<char>());
-    }
     Json request;
-    try {
-        request = Json::parse(text);
-    } catch (const nlohmann::json::parse_error& failure) {
-        err << "glyphwell send: " << inputName << ": malformed JSON: " << failure.what() << "\n";
+    std::string error;
+    if (!ReadJSONInput(inputPath, in, &request, &error)) {
+        err << "glyphwell send: " << error << "\n";
         return 1;
     }
     return Exchange("send", options, SInt32(msgid), &request, out, err);

@@ -6,6 +6,7 @@
 #include <optional>
 #include <vector>
 
+#include "cfutil/TCFRetained.h"
 #include "tools/Base64.h"
 
 namespace glyphwell::tools {
@@ -22,26 +23,20 @@ struct InputError {
     std::string what;
 };
 
-/// Owns the references made while a container is being read, so an error releases them.
-class Held {
-public:
-    Held() = default;
-    Held(const Held&) = delete;
-    Held& operator=(const Held&) = delete;
-    ~Held() {
-        for (CFTypeRef value : values_)
-            CFRelease(value);
-    }
-    CFTypeRef Add(CFTypeRef value) {
-        values_.push_back(value);
-        return value;
-    }
-    const void** Data() { return values_.data(); }
-    CFIndex Count() const { return CFIndex(values_.size()); }
+/// The values made while a container is read, each holding its own count, so that an error
+/// thrown part way releases them.
+using Values = std::vector<TCFRetained<CFTypeRef>>;
 
-private:
-    std::vector<CFTypeRef> values_;
-};
+/// Adopts `value` (a new reference) into `values` and returns it.
+CFTypeRef Keep(Values& values, CFTypeRef value) {
+    values.emplace_back(value, kAdopted);
+    return value;
+}
+
+/// The bare references of `values`, for the Create calls that take a C array.
+std::vector<const void*> Pointers(const Values& values) {
+    return std::vector<const void*>(values.begin(), values.end());
+}
 
 std::string Child(const std::string& where, const std::string& step) {
     std::string escaped;
@@ -145,9 +140,7 @@ CFTypeRef CreateUUID(const Json& text, const std::string& where) {
 CFTypeRef CreateCharacterSet(const Json& ranges, const std::string& where) {
     if (!ranges.is_array())
         throw InputError{where, "\"$charset\" must be an array of [first, last] ranges"};
-    CFMutableCharacterSetRef set = CFCharacterSetCreateMutable(kCFAllocatorDefault);
-    Held guard;
-    guard.Add(set);
+    TCFAdopted<CFMutableCharacterSetRef> set(CFCharacterSetCreateMutable(kCFAllocatorDefault));
     for (size_t i = 0; i < ranges.size(); ++i) {
         const Json& range = ranges[i];
         auto isCodePoint = [](const Json& j) {
@@ -168,29 +161,37 @@ CFTypeRef CreateArrayOrSet(const Json& items, const std::string& where, bool isS
     if (!items.is_array())
         throw InputError{where,
                          isSet ? "\"$set\" must be an array" : "\"$array\" must be an array"};
-    Held elements;
+    Values elements;
     for (size_t i = 0; i < items.size(); ++i)
-        elements.Add(Create(items[i], Child(where, i)));
+        Keep(elements, Create(items[i], Child(where, i)));
+    std::vector<const void*> pointers = Pointers(elements);
     if (isSet)
-        return CFSetCreate(kCFAllocatorDefault, elements.Data(), elements.Count(),
+        return CFSetCreate(kCFAllocatorDefault, pointers.data(), CFIndex(pointers.size()),
                            &kCFTypeSetCallBacks);
-    return CFArrayCreate(kCFAllocatorDefault, elements.Data(), elements.Count(),
+    return CFArrayCreate(kCFAllocatorDefault, pointers.data(), CFIndex(pointers.size()),
                          &kCFTypeArrayCallBacks);
+}
+
+/// A new dictionary of the parallel `keys` and `values`, retaining both.
+CFTypeRef CreateDictionary(const Values& keys, const Values& values) {
+    std::vector<const void*> keyPointers = Pointers(keys), valuePointers = Pointers(values);
+    return CFDictionaryCreate(kCFAllocatorDefault, keyPointers.data(), valuePointers.data(),
+                              CFIndex(keyPointers.size()), &kCFTypeDictionaryKeyCallBacks,
+                              &kCFTypeDictionaryValueCallBacks);
 }
 
 CFTypeRef CreateDictionaryFromPairs(const Json& pairs, const std::string& where) {
     if (!pairs.is_array())
         throw InputError{where, "\"$dict\" must be an array of [key, value] pairs"};
-    Held keys, values;
+    Values keys, values;
     for (size_t i = 0; i < pairs.size(); ++i) {
         const std::string at = Child(where, i);
         if (!pairs[i].is_array() || pairs[i].size() != 2)
             throw InputError{at, "a \"$dict\" entry is a [key, value] pair"};
-        keys.Add(Create(pairs[i][0], Child(at, 0)));
-        values.Add(Create(pairs[i][1], Child(at, 1)));
+        Keep(keys, Create(pairs[i][0], Child(at, 0)));
+        Keep(values, Create(pairs[i][1], Child(at, 1)));
     }
-    return CFDictionaryCreate(kCFAllocatorDefault, keys.Data(), values.Data(), keys.Count(),
-                              &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks);
+    return CreateDictionary(keys, values);
 }
 
 CFTypeRef CreateError(const Json& error, const std::string& where) {
@@ -200,13 +201,10 @@ CFTypeRef CreateError(const Json& error, const std::string& where) {
         throw InputError{where, "\"$error\" must be {\"domain\": string, \"code\": integer}"};
     if (error["code"].is_number_unsigned() && error["code"].get<uint64_t>() > uint64_t(INT64_MAX))
         throw InputError{Child(where, "code"), "integer out of range"};
-    CFStringRef domain = CreateString(error["domain"].get<std::string>());
+    TCFAdopted<CFStringRef> domain(CreateString(error["domain"].get<std::string>()));
     if (!domain)
         throw InputError{Child(where, "domain"), "not valid UTF-8"};
-    CFErrorRef value =
-        CFErrorCreate(kCFAllocatorDefault, domain, error["code"].get<int64_t>(), nullptr);
-    CFRelease(domain);
-    return value;
+    return CFErrorCreate(kCFAllocatorDefault, domain, error["code"].get<int64_t>(), nullptr);
 }
 
 CFTypeRef CreateTagged(const Json& object, const std::string& where) {
@@ -268,16 +266,14 @@ CFTypeRef Create(const Json& json, const std::string& where) {
     case Json::value_t::boolean:
         return CFRetain(json.get<bool>() ? kCFBooleanTrue : kCFBooleanFalse);
     case Json::value_t::string: {
-        CFStringRef string = CreateString(json.get_ref<const std::string&>());
+        TCFAdopted<CFStringRef> string(CreateString(json.get_ref<const std::string&>()));
         if (!string)
             throw InputError{where, "string is not valid UTF-8"};
         // The stream carries texts up to this many UTF-8 bytes (and so UTF-16 units); the writer
         // would write a longer one as empty.
-        if (json.get_ref<const std::string&>().size() > kMaxStreamedLength) {
-            CFRelease(string);
+        if (json.get_ref<const std::string&>().size() > kMaxStreamedLength)
             throw InputError{where, "string longer than 1048576 UTF-8 bytes cannot be written"};
-        }
-        return string;
+        return string.Orphan();
     }
     case Json::value_t::number_integer:
     case Json::value_t::number_unsigned: {
@@ -295,13 +291,12 @@ CFTypeRef Create(const Json& json, const std::string& where) {
     case Json::value_t::object: {
         if (!json.empty() && IsTagged(json))
             return CreateTagged(json, where);
-        Held keys, values;
+        Values keys, values;
         for (auto it = json.begin(); it != json.end(); ++it) {
-            keys.Add(Create(Json(it.key()), Child(where, it.key())));
-            values.Add(Create(it.value(), Child(where, it.key())));
+            Keep(keys, Create(Json(it.key()), Child(where, it.key())));
+            Keep(values, Create(it.value(), Child(where, it.key())));
         }
-        return CFDictionaryCreate(kCFAllocatorDefault, keys.Data(), values.Data(), keys.Count(),
-                                  &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks);
+        return CreateDictionary(keys, values);
     }
     default:
         throw InputError{where, "binary JSON values are not supported"};
@@ -341,7 +336,8 @@ Json NumberToJSON(CFNumberRef number) {
 
 Json CharacterSetToJSON(CFCharacterSetRef set) {
     Json ranges = Json::array();
-    CFDataRef bitmap = CFCharacterSetCreateBitmapRepresentation(kCFAllocatorDefault, set);
+    TCFAdopted<CFDataRef> bitmap(
+        CFCharacterSetCreateBitmapRepresentation(kCFAllocatorDefault, set));
     if (!bitmap)
         return Json{{"$charset", ranges}};
     const UInt8* bytes = CFDataGetBytePtr(bitmap);
@@ -373,7 +369,6 @@ Json CharacterSetToJSON(CFCharacterSetRef set) {
     }
     if (open >= 0)
         ranges.push_back(Json::array({open, lastPlane * 0x10000 + 0xFFFF}));
-    CFRelease(bitmap);
     return Json{{"$charset", ranges}};
 }
 
@@ -453,9 +448,9 @@ Json ValueToJSON(CFTypeRef value) {
     if (kind == CFURLGetTypeID())
         return Json{{"$url", StringToUTF8(CFURLGetString(static_cast<CFURLRef>(value)))}};
     if (kind == CFUUIDGetTypeID()) {
-        CFStringRef text = CFUUIDCreateString(kCFAllocatorDefault, static_cast<CFUUIDRef>(value));
+        TCFAdopted<CFStringRef> text(
+            CFUUIDCreateString(kCFAllocatorDefault, static_cast<CFUUIDRef>(value)));
         std::string lower = StringToUTF8(text);
-        CFRelease(text);
         for (char& c : lower)
             c = char(std::tolower(static_cast<unsigned char>(c)));
         return Json{{"$uuid", lower}};

@@ -5,8 +5,10 @@
 #include <fstream>
 #include <sstream>
 
+#include "cfutil/TCFRetained.h"
 #include "tools/Base64.h"
 #include "tools/Commands.h"
+#include "tools/ToolInput.h"
 
 namespace {
 
@@ -114,6 +116,20 @@ TEST(EncodeCommand, RefusesTextTheStreamCannotCarry) {
     EXPECT_EQ(result.status, 1);
     EXPECT_EQ(result.out, "");
     EXPECT_NE(result.err.find("at /0: string longer than 1048576 UTF-8 bytes"), std::string::npos);
+}
+
+// A text with a lone surrogate has no UTF-8 form: the writer gives up on it, and the tool must
+// not send the emptied text in its place.
+TEST(EncodeCommand, RefusesAValueTheWriterCannotCarryUnchanged) {
+    const UniChar lone[] = {'a', 0xD800};
+    TCFAdopted<CFStringRef> text(CFStringCreateWithCharacters(kCFAllocatorDefault, lone, 2));
+    std::string bytes = "left over";
+    EXPECT_FALSE(glyphwell::tools::FlattenValue(text, &bytes));
+    EXPECT_EQ(bytes, "");
+    EXPECT_TRUE(glyphwell::tools::FlattenValue(CFSTR("a"), &bytes));
+    EXPECT_EQ(bytes, std::string("\0\0\0\x07\0\0\0\x01"
+                                 "a",
+                                 9));
 }
 
 TEST(EncodeCommand, ReportsUnknownOptionsAndMissingFiles) {

@@ -134,13 +134,29 @@ TEST_F(SendCommandTest, AskDownloadSendsTheMessageId2Request) {
 }
 
 TEST_F(SendCommandTest, RejectsIncompleteCommandLines) {
-    EXPECT_EQ(Invoke({"send", "--name", kName}, "{}").err, "glyphwell send: --msgid is required\n");
-    EXPECT_EQ(Invoke({"send", "--msgid", "4294967296"}).status, 2);
-    EXPECT_EQ(Invoke({"send", "--msgid", "1", "--timeout", "soon"}).err,
-              "glyphwell send: --timeout takes seconds or \"forever\", not soon\n");
-    EXPECT_EQ(Invoke({"ask-activation", "--font", "X"}).err,
-              "glyphwell ask-activation: give the font files with --candidate\n");
-    EXPECT_EQ(Invoke({"ask-download", "--font"}).status, 2);
-    EXPECT_EQ(Invoke({"ask-download", "--font", ":Family"}).err,
-              "glyphwell ask-download: :Family has no PostScript name\n");
+    struct Case {
+        std::vector<std::string> arguments;
+        const char* message; // the whole of standard error, or null to check the status only
+    } cases[] = {
+        {{"send", "--name", kName}, "glyphwell send: --msgid is required\n"},
+        {{"send", "--msgid", "4294967296"}, nullptr},
+        {{"send", "--msgid", "1", "--timeout", "soon"},
+         "glyphwell send: --timeout takes seconds or \"forever\", not soon\n"},
+        {{"send", "--msgid", "1", "--timeout", "-1"},
+         "glyphwell send: --timeout takes seconds or \"forever\", not -1\n"},
+        {{"send", "--msgid", "1", "--timeout", "inf"},
+         "glyphwell send: --timeout takes seconds or \"forever\", not inf\n"},
+        {{"send", "--msgid", "1", "--send-timeout", "nan"}, nullptr},
+        {{"ask-activation", "--font", "X"},
+         "glyphwell ask-activation: give the font files with --candidate\n"},
+        {{"ask-download", "--font"}, nullptr},
+        {{"ask-download", "--font", ":Family"},
+         "glyphwell ask-download: :Family has no PostScript name\n"},
+    };
+    for (const Case& c : cases) {
+        const Result result = Invoke(c.arguments, "{}");
+        EXPECT_EQ(result.status, 2) << c.arguments.back();
+        if (c.message)
+            EXPECT_EQ(result.err, c.message);
+    }
 }
