@@ -34,6 +34,7 @@ public:
               lastMsgid = msgid;
               lastLength = CFDataGetLength(data);
               std::lock_guard<std::mutex> lock(mutex_);
+              lastRequest_ = BytesOf(data);
               return reply_.empty() ? CFDataCreateCopy(kCFAllocatorDefault, data)
                                     : CreateCFData(reply_);
           }) {}
@@ -45,12 +46,18 @@ public:
         reply_ = bytes;
     }
 
+    std::string LastRequest() {
+        std::lock_guard<std::mutex> lock(mutex_);
+        return lastRequest_;
+    }
+
     std::atomic<SInt32> lastMsgid{0};
     std::atomic<CFIndex> lastLength{-1};
 
 private:
     std::mutex mutex_;
     std::string reply_;
+    std::string lastRequest_;
     PortServer server_;
 };
 
@@ -117,12 +124,22 @@ TEST_F(SendCommandTest, AskActivationBuildsTheMessageId1Request) {
 TEST_F(SendCommandTest, AskDownloadSendsTheMessageId2Request) {
     EchoServer server;
     ASSERT_TRUE(server.Started());
+    // {"QZUIPropertyResult": number 1 of type 7, "QZUIPropertySuppress": number 0 of type 7}
+    const Result reply = Invoke(
+        {"encode"},
+        R"({"QZUIPropertyResult": {"$number": 1, "$type": 7}, "QZUIPropertySuppress": {"$number": 0, "$type": 7}})");
+    ASSERT_EQ(reply.status, 0) << reply.err;
+    server.SetReply(reply.out);
     const Result result = Invoke({"ask-download", "--name", kName, "--compact", "--font",
                                   "ExampleSans-Regular:Example Sans", "Other-Bold", "--app",
                                   "Writer", "--pid", "4242", "--suppress"});
     ASSERT_EQ(result.status, 0) << result.err;
     EXPECT_EQ(server.lastMsgid, 2);
-    EXPECT_EQ(nlohmann::json::parse(result.out), nlohmann::json::parse(R"({
+    EXPECT_EQ(result.out, "{\"QZUIPropertyResult\":{\"$number\":1,\"$type\":7},"
+                          "\"QZUIPropertySuppress\":{\"$number\":0,\"$type\":7}}\n");
+    const Result request = Invoke({"decode", "--compact"}, server.LastRequest());
+    ASSERT_EQ(request.status, 0) << request.err;
+    EXPECT_EQ(nlohmann::json::parse(request.out), nlohmann::json::parse(R"({
         "QZUIPropertyApplicationName": "Writer",
         "QZUIPropertyProcessID": {"$number": 4242, "$type": 9},
         "QZUIPropertyFontProperties": [
@@ -152,6 +169,12 @@ TEST_F(SendCommandTest, RejectsIncompleteCommandLines) {
         {{"ask-download", "--font"}, nullptr},
         {{"ask-download", "--font", ":Family"},
          "glyphwell ask-download: :Family has no PostScript name\n"},
+        {{"ask-download", "--font", "A", "--pid", "x"},
+         "glyphwell ask-download: --pid needs a process id\n"},
+        {{"ask-download", "--font", "A", "--send-timeout", "1"},
+         "glyphwell ask-download: unknown argument --send-timeout\n"},
+        {{"ask-activation", "--candidate", "/a.ttf", "--bundle"},
+         "glyphwell ask-activation: --bundle needs a value\n"},
     };
     for (const Case& c : cases) {
         const Result result = Invoke(c.arguments, "{}");
