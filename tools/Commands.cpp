@@ -1,11 +1,16 @@
 #include "tools/Commands.h"
 
+#include <unistd.h>
+
 #include <fstream>
 #include <iostream>
 
 #include "cfutil/TCFRetained.h"
 #include "serialization/TCFResurrectContext.h"
 #include "tools/SendCommand.h"
+#ifdef GLYPHWELL_CATALOG_TOOL
+#include "tools/CatalogCommand.h"
+#endif
 #include "tools/TaggedJSON.h"
 #include "tools/ToolInput.h"
 
@@ -138,6 +143,20 @@ bool ParseDecodeArguments(const std::vector<std::string>& arguments, DecodeOptio
     return true;
 }
 
+/// `catalog ...`, when the tool was built with the agent's catalog reader. Progress lines go to
+/// a terminal only.
+int RunCatalogVerb(const std::vector<std::string>& arguments, std::istream&, std::ostream& out,
+                   std::ostream& err) {
+#ifdef GLYPHWELL_CATALOG_TOOL
+    return RunCatalog(arguments, out, err, &out == &std::cout && isatty(STDOUT_FILENO));
+#else
+    (void)arguments;
+    (void)out;
+    err << "glyphwell catalog: this glyphwell was built without the agent's catalog reader\n";
+    return 1;
+#endif
+}
+
 } // namespace
 
 int RunEncode(const std::vector<std::string>& arguments, std::istream& in, std::ostream& out,
@@ -202,6 +221,7 @@ int RunTool(const std::vector<std::string>& arguments, std::istream& in, std::os
         {"send", RunSend},
         {"ask-activation", RunAskActivation},
         {"ask-download", RunAskDownload},
+        {"catalog", RunCatalogVerb},
     };
     if (arguments.empty()) {
         err << kUsage;
