@@ -240,6 +240,7 @@ FetchResult FetchAsset(const std::string& url, uint64_t limit, const FetchProgre
     long status = 0;
     curl_easy_getinfo(curl.get(), CURLINFO_RESPONSE_CODE, &status);
     result.size = transfer.received;
+    result.tooLarge = transfer.overLimit;
     if (transfer.overLimit)
         result.error = "more than " + std::to_string(limit) + " bytes";
     else if (code != CURLE_OK)

@@ -55,6 +55,7 @@ std::string AssetURL(const std::string& prefix, const std::string& path);
 /// not; an HTTP status of 400 or more counts as a failure).
 struct FetchResult {
     uint64_t size = 0;
+    bool tooLarge = false; ///< more bytes came than the limit
     std::string sha256;
     std::string error;
 };
@@ -63,7 +64,7 @@ struct FetchResult {
 using FetchProgress = std::function<void(uint64_t received, double seconds)>;
 
 /// Downloads `url` with libcurl (following redirects) and digests it on the way, keeping nothing.
-/// Reading stops after `limit` bytes (the result then says so).
+/// Reading stops when more than `limit` bytes come (the result then says so).
 FetchResult FetchAsset(const std::string& url, uint64_t limit, const FetchProgress& progress);
 
 } // namespace glyphwell::tools

@@ -285,17 +285,18 @@ void FetchAndCompare(const QZDownloadableFontAsset& asset, bool progress, std::o
             out << "\r" << name << ": " << received << " bytes, " << Rate(received, seconds)
                 << "\x1b[K" << std::flush;
         };
-    // One byte more than the catalog says is enough to tell that the file is larger.
-    const FetchResult result =
-        FetchAsset(asset.url, asset.size < UINT64_MAX ? asset.size + 1 : asset.size, report);
+    const FetchResult result = FetchAsset(asset.url, asset.size, report);
     if (progress)
         out << "\n";
-    if (!result.error.empty() && result.size <= asset.size) {
+    if (result.tooLarge) {
+        problems->push_back(name + ": " + Escaped(asset.url) + " has more than " +
+                            std::to_string(asset.size) + " bytes, the catalog says " +
+                            std::to_string(asset.size));
+    } else if (!result.error.empty()) {
         problems->push_back(name + ": cannot download " + Escaped(asset.url) + ": " +
                             Escaped(result.error));
     } else if (result.size != asset.size) {
         problems->push_back(name + ": " + Escaped(asset.url) + " has " +
-                            (result.size > asset.size ? "more than " : "") +
                             std::to_string(result.size) + " bytes, the catalog says " +
                             std::to_string(asset.size));
     } else if (result.sha256 != asset.sha256) {
