@@ -192,6 +192,7 @@ struct Transfer {
     std::chrono::steady_clock::time_point lastReport = start;
 };
 
+/// libcurl's write callback: digests and counts the bytes, ends the transfer over the limit.
 size_t Receive(char* bytes, size_t size, size_t count, void* context) {
     auto* transfer = static_cast<Transfer*>(context);
     const size_t length = size * count;

@@ -163,6 +163,7 @@ bool MergeAsset(Json& assets, const Json& asset) {
     return false;
 }
 
+/// Reads the command line of `add`; false after a usage message on `err`.
 bool ParseAddArguments(const std::vector<std::string>& arguments, AddOptions* options,
                        std::ostream& err) {
     for (size_t i = 0; i < arguments.size(); ++i) {
@@ -187,6 +188,7 @@ bool ParseAddArguments(const std::vector<std::string>& arguments, AddOptions* op
     return true;
 }
 
+/// `catalog add`: every file read first, then the catalog merged and replaced at once.
 int RunAdd(const std::vector<std::string>& arguments, std::ostream& out, std::ostream& err) {
     AddOptions options;
     if (!ParseAddArguments(arguments, &options, err))
@@ -240,6 +242,7 @@ struct ReadOptions {
     bool fetch = false;
 };
 
+/// Reads the command line of `check` or `list`; false after a usage message on `err`.
 bool ParseReadArguments(const char* verb, bool takesFetch,
                         const std::vector<std::string>& arguments, ReadOptions* options,
                         std::ostream& err) {
@@ -305,6 +308,7 @@ void FetchAndCompare(const QZDownloadableFontAsset& asset, bool progress, std::o
     }
 }
 
+/// `catalog check`: the reader's problems, then with --fetch those of each download.
 int RunCheck(const std::vector<std::string>& arguments, std::ostream& out, std::ostream& err,
              bool progress) {
     ReadOptions options;
@@ -336,6 +340,7 @@ int RunCheck(const std::vector<std::string>& arguments, std::ostream& out, std::
     return total == 0 ? 0 : 1;
 }
 
+/// `catalog list`: one tab-separated line per font offered.
 int RunList(const std::vector<std::string>& arguments, std::ostream& out, std::ostream& err) {
     ReadOptions options;
     if (!ParseReadArguments("list", false, arguments, &options, err))

@@ -57,6 +57,7 @@ bool ParseSeconds(const std::string& text, CFTimeInterval* seconds) {
     return true;
 }
 
+/// A decimal signed 32-bit number, the whole of `text`.
 bool ParseInt32(const std::string& text, long* value) {
     char* end = nullptr;
     errno = 0;
@@ -118,6 +119,7 @@ int PrintReply(const char* verb, const PortOptions& options, const std::string& 
     return intact ? 0 : 1;
 }
 
+/// The message for a port error code.
 const char* DescribeStatus(SInt32 status) {
     switch (status) {
     case kCFMessagePortSendTimeout:

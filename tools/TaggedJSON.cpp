@@ -38,6 +38,7 @@ std::vector<const void*> Pointers(const Values& values) {
     return std::vector<const void*>(values.begin(), values.end());
 }
 
+/// The JSON pointer of member `step` below `where` ("~" and "/" escaped).
 std::string Child(const std::string& where, const std::string& step) {
     std::string escaped;
     for (char c : step) {
@@ -51,17 +52,21 @@ std::string Child(const std::string& where, const std::string& step) {
     return (where == "/" ? "" : where) + "/" + escaped;
 }
 
+/// The JSON pointer of element `index` below `where`.
 std::string Child(const std::string& where, size_t index) {
     return Child(where, std::to_string(index));
 }
 
+/// A new string of UTF-8 `text`, or null when it is not UTF-8.
 CFStringRef CreateString(const std::string& text) {
     return CFStringCreateWithBytes(kCFAllocatorDefault, reinterpret_cast<const UInt8*>(text.data()),
                                    CFIndex(text.size()), kCFStringEncodingUTF8, false);
 }
 
+/// The property value of `json` at `where`; throws InputError.
 CFTypeRef Create(const Json& json, const std::string& where);
 
+/// NaN and the infinities, which JSON writes as strings.
 std::optional<double> SpecialFloat(const Json& value) {
     if (!value.is_string())
         return std::nullopt;
@@ -75,6 +80,7 @@ std::optional<double> SpecialFloat(const Json& value) {
     return std::nullopt;
 }
 
+/// {"$number": V, "$type": CODE}: checks the code and that V fits it.
 CFTypeRef CreateNumber(const Json& tagged, const std::string& where) {
     if (tagged.size() != 2 || !tagged.contains("$type"))
         throw InputError{where, "a \"$number\" needs exactly the keys \"$number\" and \"$type\""};
@@ -117,6 +123,7 @@ CFTypeRef CreateNumber(const Json& tagged, const std::string& where) {
     return CFNumberCreate(kCFAllocatorDefault, type, &v);
 }
 
+/// {"$uuid": "8-4-4-4-12"}.
 CFTypeRef CreateUUID(const Json& text, const std::string& where) {
     static const char kShape[] = "xxxxxxxx-xxxx-xxxx-xxxx-xxxxxxxxxxxx";
     const std::string s = text.is_string() ? text.get<std::string>() : std::string();
@@ -137,6 +144,7 @@ CFTypeRef CreateUUID(const Json& text, const std::string& where) {
     return CFUUIDCreateFromUUIDBytes(kCFAllocatorDefault, uuid);
 }
 
+/// {"$charset": [[first, last], ...]}.
 CFTypeRef CreateCharacterSet(const Json& ranges, const std::string& where) {
     if (!ranges.is_array())
         throw InputError{where, "\"$charset\" must be an array of [first, last] ranges"};
@@ -157,6 +165,7 @@ CFTypeRef CreateCharacterSet(const Json& ranges, const std::string& where) {
     return CFCharacterSetCreateCopy(kCFAllocatorDefault, set);
 }
 
+/// A plain or "$array" array, or a "$set".
 CFTypeRef CreateArrayOrSet(const Json& items, const std::string& where, bool isSet) {
     if (!items.is_array())
         throw InputError{where,
@@ -180,6 +189,7 @@ CFTypeRef CreateDictionary(const Values& keys, const Values& values) {
                               &kCFTypeDictionaryValueCallBacks);
 }
 
+/// {"$dict": [[key, value], ...]}, keys of any kind.
 CFTypeRef CreateDictionaryFromPairs(const Json& pairs, const std::string& where) {
     if (!pairs.is_array())
         throw InputError{where, "\"$dict\" must be an array of [key, value] pairs"};
@@ -194,6 +204,7 @@ CFTypeRef CreateDictionaryFromPairs(const Json& pairs, const std::string& where)
     return CreateDictionary(keys, values);
 }
 
+/// {"$error": {"domain": S, "code": N}}.
 CFTypeRef CreateError(const Json& error, const std::string& where) {
     if (!error.is_object() || error.size() != 2 || !error.contains("domain") ||
         !error.contains("code") || !error["domain"].is_string() ||
@@ -207,6 +218,7 @@ CFTypeRef CreateError(const Json& error, const std::string& where) {
     return CFErrorCreate(kCFAllocatorDefault, domain, error["code"].get<int64_t>(), nullptr);
 }
 
+/// A tagged object, by its tag.
 CFTypeRef CreateTagged(const Json& object, const std::string& where) {
     const std::string tag = object.begin().key();
     const Json& body = object.begin().value();
@@ -252,6 +264,7 @@ CFTypeRef CreateTagged(const Json& object, const std::string& where) {
     throw InputError{where, "unknown tag \"" + tag + "\""};
 }
 
+/// True when a key of `object` starts with "$".
 bool IsTagged(const Json& object) {
     for (auto it = object.begin(); it != object.end(); ++it)
         if (!it.key().empty() && it.key()[0] == '$')
@@ -303,6 +316,7 @@ CFTypeRef Create(const Json& json, const std::string& where) {
     }
 }
 
+/// The UTF-8 text of `string`; a unit without a UTF-8 form becomes "?".
 std::string StringToUTF8(CFStringRef string) {
     const CFIndex length = CFStringGetLength(string);
     CFIndex size = 0;
@@ -314,6 +328,7 @@ std::string StringToUTF8(CFStringRef string) {
     return text;
 }
 
+/// Types 10 and 13 plain, others tagged with their code.
 Json NumberToJSON(CFNumberRef number) {
     const CFNumberType type = CFNumberGetType(number);
     if (CFNumberIsFloatType(number)) {
@@ -334,6 +349,7 @@ Json NumberToJSON(CFNumberRef number) {
     return Json{{"$number", v}, {"$type", type}};
 }
 
+/// The code point ranges of `set`, plane by plane.
 Json CharacterSetToJSON(CFCharacterSetRef set) {
     Json ranges = Json::array();
     TCFAdopted<CFDataRef> bitmap(
@@ -377,6 +393,7 @@ struct PairCollector {
     bool plainKeys = true;
 };
 
+/// Applier: gathers a dictionary's pairs and whether all keys are plain.
 void CollectPair(const void* key, const void* value, void* context) {
     auto* collector = static_cast<PairCollector*>(context);
     collector->pairs.emplace_back(key, value);
@@ -386,8 +403,26 @@ void CollectPair(const void* key, const void* value, void* context) {
         collector->plainKeys = false;
 }
 
+/// Applier: gathers a set's members.
 void CollectValue(const void* value, void* context) {
     static_cast<std::vector<CFTypeRef>*>(context)->push_back(value);
+}
+
+/// A dictionary as a plain object when every key is a string without a leading "$", else in the
+/// "$dict" form.
+Json DictionaryToJSON(CFDictionaryRef dictionary) {
+    PairCollector collector;
+    CFDictionaryApplyFunction(dictionary, CollectPair, &collector);
+    if (collector.plainKeys) {
+        Json object = Json::object();
+        for (const auto& [key, item] : collector.pairs)
+            object[StringToUTF8(static_cast<CFStringRef>(key))] = ValueToJSON(item);
+        return object;
+    }
+    Json pairs = Json::array();
+    for (const auto& [key, item] : collector.pairs)
+        pairs.push_back(Json::array({ValueToJSON(key), ValueToJSON(item)}));
+    return Json{{"$dict", pairs}};
 }
 
 } // namespace
@@ -431,20 +466,8 @@ Json ValueToJSON(CFTypeRef value) {
             items.push_back(ValueToJSON(member));
         return Json{{"$set", items}};
     }
-    if (kind == CFDictionaryGetTypeID()) {
-        PairCollector collector;
-        CFDictionaryApplyFunction(static_cast<CFDictionaryRef>(value), CollectPair, &collector);
-        if (collector.plainKeys) {
-            Json object = Json::object();
-            for (const auto& [key, item] : collector.pairs)
-                object[StringToUTF8(static_cast<CFStringRef>(key))] = ValueToJSON(item);
-            return object;
-        }
-        Json pairs = Json::array();
-        for (const auto& [key, item] : collector.pairs)
-            pairs.push_back(Json::array({ValueToJSON(key), ValueToJSON(item)}));
-        return Json{{"$dict", pairs}};
-    }
+    if (kind == CFDictionaryGetTypeID())
+        return DictionaryToJSON(static_cast<CFDictionaryRef>(value));
     if (kind == CFURLGetTypeID())
         return Json{{"$url", StringToUTF8(CFURLGetString(static_cast<CFURLRef>(value)))}};
     if (kind == CFUUIDGetTypeID()) {
