@@ -27,8 +27,13 @@ const char kCodecUsage[] =
     "                                     flattened bytes (file or stdin) to tagged JSON;\n"
     "                                     KIND: any (default), string, number, boolean, data,\n"
     "                                     charset, array, dictionary, set, url, uuid, error\n";
-const std::string kUsage =
-    std::string(kCodecUsage) + kSendUsage + "  help                               this text\n";
+#ifdef GLYPHWELL_CATALOG_TOOL
+const char* const kCatalogVerbUsage = kCatalogUsage;
+#else
+const char* const kCatalogVerbUsage = "";
+#endif
+const std::string kUsage = std::string(kCodecUsage) + kSendUsage + kCatalogVerbUsage +
+                           "  help                               this text\n";
 
 /// The bytes as hexadecimal pairs separated by spaces, with a final newline.
 std::string HexDump(const std::string& bytes) {
