@@ -137,6 +137,7 @@ void TCFFlattenContext::Flatten(void const* value) {
     else {
         CFLog(kCFLogLevelError, "*** don't know how to flatten type %lu (object %@)", kind, value);
         valid = false;
+        failed = true;
         // The job failed as a whole: take back everything it wrote, but nothing from before.
         CFDataSetLength(stream, startLength);
     }
@@ -194,6 +195,7 @@ void TCFFlattenContext::FlattenCFString(__CFString const* string) {
         }
     }
     glyphwell::SystemLog(LOG_ERR, "ERROR: Quzel::TCFFlattenContext::FlattenCFString failed.");
+    failed = true;
     StreamOutHead(stream, kTCFTypeString, 0);
 }
 
@@ -274,6 +276,7 @@ void TCFFlattenContext::FlattenCFURL(__CFURL const* url) {
     if (length > kTCFMaxStringLength) {
         // The reader rejects longer URLs and with them the rest of the stream: write none.
         glyphwell::SystemLog(LOG_ERR, "ERROR: Quzel::TCFFlattenContext::FlattenCFURL failed.");
+        failed = true;
         StreamOutCFIndex(0);
         return;
     }

@@ -38,6 +38,11 @@ public:
     /// The buffer's bytes. NOTE: valid until the buffer next grows.
     virtual const UInt8* GetBytePtr() const;
     virtual CFIndex GetLength() const;
+    /// True once the context met a value it could not write as given: a kind the stream cannot
+    /// carry (the job was then cut back, see Flatten), or a text or URL written empty because it
+    /// has no UTF-8 form or is longer than a reader takes. Callers that must not send a changed
+    /// value ask this instead of watching the log.
+    bool HasFailed() const { return failed; }
 
     // One value of each kind, type id first. They do not check `valid`; Flatten does.
     virtual void FlattenCFString(__CFString const* string);
@@ -86,6 +91,8 @@ public:
 protected:
     __CFData* stream;
     bool valid;
+    /// Set by every writer that gives up on a value; see HasFailed.
+    bool failed = false;
 
 private:
     /// The buffer's length when the context was made: a failed job cuts back to it, so that bytes

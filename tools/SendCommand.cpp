@@ -5,16 +5,16 @@
 #include <cerrno>
 #include <cmath>
 #include <cstdlib>
-#include <filesystem>
-#include <fstream>
 #include <iostream>
-#include <iterator>
+#include <memory>
+#include <span>
 
+#include "cfutil/TCFRetained.h"
+#include "glyphwell/client.h"
 #include "platform/CFMessagePort.h"
 #include "protocol/QZUIProtocol.h"
-#include "serialization/TCFFlattenContext.h"
-#include "serialization/TCFResurrectContext.h"
 #include "tools/TaggedJSON.h"
+#include "tools/ToolInput.h"
 
 namespace glyphwell::tools {
 
@@ -27,7 +27,8 @@ const char kSendUsage[] =
     "  ask-download --font PSNAME[:FAMILY]... [--app NAME] [--bundle PATH] [--pid N]\n"
     "               [--suppress]          ask whether fonts may be downloaded (message id 2)\n"
     "    options of these three: --name PORT, --timeout SECONDS (reply; default: no limit),\n"
-    "    --send-timeout SECONDS (default 10), --compact, --dry-run (print the request only)\n";
+    "    --compact, --dry-run (print the request only); send also --send-timeout SECONDS\n"
+    "    (default 10)\n";
 
 namespace {
 
@@ -40,17 +41,6 @@ struct PortOptions {
     bool compact = false;
     bool dryRun = false;
 };
-
-std::string Text(CFStringRef string) {
-    const CFIndex length = CFStringGetLength(string);
-    CFIndex needed = 0;
-    CFStringGetBytes(string, CFRangeMake(0, length), kCFStringEncodingUTF8, 0, false, nullptr, 0,
-                     &needed);
-    std::string text(size_t(needed), '\0');
-    CFStringGetBytes(string, CFRangeMake(0, length), kCFStringEncodingUTF8, 0, false,
-                     reinterpret_cast<UInt8*>(text.data()), needed, &needed);
-    return text;
-}
 
 /// Seconds: a number >= 0, or "forever".
 bool ParseSeconds(const std::string& text, CFTimeInterval* seconds) {
@@ -67,6 +57,7 @@ bool ParseSeconds(const std::string& text, CFTimeInterval* seconds) {
     return true;
 }
 
+/// A decimal signed 32-bit number, the whole of `text`.
 bool ParseInt32(const std::string& text, long* value) {
     char* end = nullptr;
     errno = 0;
@@ -79,8 +70,9 @@ bool ParseInt32(const std::string& text, long* value) {
 
 /// Handles a port option at arguments[*i], moving *i past its value. 1: taken, 0: not a port
 /// option, -1: a usage error (said on `err`).
+/// `--send-timeout` is taken only with `sendTimeout`: the ask verbs have one timeout for all.
 int TakePortOption(const char* verb, const std::vector<std::string>& arguments, size_t* i,
-                   PortOptions* options, std::ostream& err) {
+                   PortOptions* options, bool sendTimeout, std::ostream& err) {
     const std::string& argument = arguments[*i];
     if (argument == "--compact") {
         options->compact = true;
@@ -90,7 +82,8 @@ int TakePortOption(const char* verb, const std::vector<std::string>& arguments, 
         options->dryRun = true;
         return 1;
     }
-    if (argument != "--name" && argument != "--timeout" && argument != "--send-timeout")
+    if (argument != "--name" && argument != "--timeout" &&
+        (argument != "--send-timeout" || !sendTimeout))
         return 0;
     if (*i + 1 == arguments.size()) {
         err << "glyphwell " << verb << ": " << argument << " needs a value\n";
@@ -110,43 +103,23 @@ int TakePortOption(const char* verb, const std::vector<std::string>& arguments, 
     return 1;
 }
 
-/// The values after a multi-value option: every following argument up to the next option.
-std::vector<std::string> TakeValues(const std::vector<std::string>& arguments, size_t* i) {
-    std::vector<std::string> values;
-    while (*i + 1 < arguments.size() && arguments[*i + 1].rfind("--", 0) != 0)
-        values.push_back(arguments[++*i]);
-    return values;
-}
-
-/// The tagged JSON of the file URL for `path` (made absolute), or null JSON.
-Json FileURL(const std::string& path) {
-    std::error_code error;
-    const std::filesystem::path absolute = std::filesystem::absolute(path, error);
-    if (error)
-        return Json();
-    const bool directory = std::filesystem::is_directory(absolute, error);
-    const std::string text = absolute.lexically_normal().string();
-    CFURLRef url = CFURLCreateFromFileSystemRepresentation(
-        kCFAllocatorDefault, reinterpret_cast<const UInt8*>(text.data()), CFIndex(text.size()),
-        directory);
-    if (!url)
-        return Json();
-    Json json = ValueToJSON(url);
-    CFRelease(url);
-    return json;
-}
-
-/// Stores the file URL of `path` under `key`; false (said on `err`) when none can be made.
-bool AddFileURL(Json* request, const std::string& key, const std::string& path, std::ostream& err) {
-    Json url = FileURL(path);
-    if (url.is_null()) {
-        err << "glyphwell: cannot make a file URL of " << path << "\n";
-        return false;
+/// Prints the reply bytes as tagged JSON. 0 when they hold an intact value; an empty reply is
+/// said on `err` and is not a failure.
+int PrintReply(const char* verb, const PortOptions& options, const std::string& reply,
+               std::ostream& out, std::ostream& err) {
+    if (reply.empty()) {
+        err << "glyphwell " << verb << ": the reply is empty\n";
+        return 0;
     }
-    (*request)[key] = std::move(url);
-    return true;
+    bool intact = false;
+    out << DecodeToJSON(reply, err, &intact).dump(options.compact ? -1 : 2) << "\n";
+    out.flush();
+    if (!intact)
+        err << "glyphwell " << verb << ": the reply is not a readable value\n";
+    return intact ? 0 : 1;
 }
 
+/// The message for a port error code.
 const char* DescribeStatus(SInt32 status) {
     switch (status) {
     case kCFMessagePortSendTimeout:
@@ -162,87 +135,267 @@ const char* DescribeStatus(SInt32 status) {
     }
 }
 
-/// Sends `request` (a tagged JSON value; null JSON sends no bytes) and prints the reply.
-int Exchange(const char* verb, const PortOptions& options, SInt32 msgid, const Json* request,
-             std::ostream& out, std::ostream& err) {
-    CFTypeRef value = nullptr;
-    if (request) {
-        std::string error;
-        value = CreateValueFromJSON(*request, &error);
-        if (!value) {
-            err << "glyphwell " << verb << ": " << error << "\n";
-            return 1;
-        }
-    }
-    if (options.dryRun) {
-        out << ValueToJSON(value).dump(options.compact ? -1 : 2) << "\n";
-        if (value)
-            CFRelease(value);
-        return 0;
-    }
-
-    CFMutableDataRef bytes = CFDataCreateMutable(kCFAllocatorDefault, 0);
-    if (value) {
-        // Anything the writer logs means it could not write the value as given.
-        std::string problem;
-        LogSink previous = SetLogSink([&](const LogRecord& record) {
-            if (problem.empty())
-                problem = std::string(record.text);
-        });
-        {
-            TCFFlattenContext context(bytes, false);
-            context.Flatten(value);
-        }
-        SetLogSink(previous);
-        CFRelease(value);
-        if (!problem.empty()) {
-            err << "glyphwell " << verb << ": the request cannot be written: " << problem << "\n";
-            CFRelease(bytes);
-            return 1;
-        }
-    }
-
-    CFStringRef name = CFStringCreateWithBytes(
+/// Sends `bytes` as request `msgid` on the port of `options` and stores the reply's bytes.
+/// False after a message on `err` when nothing listens or the exchange fails.
+bool SendBytes(const char* verb, const PortOptions& options, SInt32 msgid, const std::string& bytes,
+               std::string* reply, std::ostream& err) {
+    TCFAdopted<CFStringRef> name(CFStringCreateWithBytes(
         kCFAllocatorDefault, reinterpret_cast<const UInt8*>(options.name.data()),
-        CFIndex(options.name.size()), kCFStringEncodingUTF8, false);
-    CFMessagePortRef port = name ? CFMessagePortCreateRemote(kCFAllocatorDefault, name) : nullptr;
-    if (name)
-        CFRelease(name);
+        CFIndex(options.name.size()), kCFStringEncodingUTF8, false));
+    TCFAdopted<CFMessagePortRef> port(name ? CFMessagePortCreateRemote(kCFAllocatorDefault, name)
+                                           : nullptr);
     if (!port) {
         err << "glyphwell " << verb << ": nothing answers on the port " << options.name << "\n";
-        CFRelease(bytes);
-        return 1;
+        return false;
     }
-    CFDataRef reply = nullptr;
+    TCFAdopted<CFDataRef> request(CFDataCreate(
+        kCFAllocatorDefault, reinterpret_cast<const UInt8*>(bytes.data()), CFIndex(bytes.size())));
+    CFDataRef replyData = nullptr;
     const SInt32 status =
-        CFMessagePortSendRequest(port, msgid, bytes, options.sendTimeout, options.receiveTimeout,
-                                 kCFRunLoopDefaultMode, &reply);
-    CFRelease(port);
-    CFRelease(bytes);
+        CFMessagePortSendRequest(port, msgid, request, options.sendTimeout, options.receiveTimeout,
+                                 kCFRunLoopDefaultMode, &replyData);
+    TCFAdopted<CFDataRef> replyHolder(replyData);
     if (status != kCFMessagePortSuccess) {
         err << "glyphwell " << verb << ": " << DescribeStatus(status) << " (" << status << ")\n";
+        return false;
+    }
+    reply->assign(reinterpret_cast<const char*>(CFDataGetBytePtr(replyData)),
+                  size_t(CFDataGetLength(replyData)));
+    return true;
+}
+
+/// Sends `request` (a tagged JSON value; null sends no bytes) and prints the reply, or with
+/// --dry-run prints the request instead.
+int Exchange(const char* verb, const PortOptions& options, SInt32 msgid, const Json* request,
+             std::ostream& out, std::ostream& err) {
+    std::string bytes, error, reply;
+    if (request && !FlattenJSON(*request, &bytes, &error)) {
+        err << "glyphwell " << verb << ": " << error << "\n";
         return 1;
     }
-    if (CFDataGetLength(reply) == 0) {
-        err << "glyphwell " << verb << ": the reply is empty\n";
-        CFRelease(reply);
+    if (options.dryRun) {
+        out << (request ? *request : Json()).dump(options.compact ? -1 : 2) << "\n";
         return 0;
     }
+    if (!SendBytes(verb, options, msgid, bytes, &reply, err))
+        return 1;
+    return PrintReply(verb, options, reply, out, err);
+}
 
-    // Every line the reader logs goes to `err` as its bare text.
-    LogSink previous = SetLogSink([&](const LogRecord& record) { err << record.text << "\n"; });
-    TCFResurrectContext context(CFDataGetBytePtr(reply), size_t(CFDataGetLength(reply)));
-    CFTypeRef decoded = context.Resurrect(kTCFTypeAny);
-    SetLogSink(previous);
-    out << ValueToJSON(decoded).dump(options.compact ? -1 : 2) << "\n";
-    out.flush();
-    const bool good = decoded && !context.IsCorrupted();
-    if (decoded)
-        CFRelease(decoded);
-    CFRelease(reply);
-    if (!good)
-        err << "glyphwell " << verb << ": the reply is not a readable value\n";
-    return good ? 0 : 1;
+/// The values after a multi-value option: every following argument up to the next option.
+std::vector<std::string> TakeValues(const std::vector<std::string>& arguments, size_t* i) {
+    std::vector<std::string> values;
+    while (*i + 1 < arguments.size() && arguments[*i + 1].rfind("--", 0) != 0)
+        values.push_back(arguments[++*i]);
+    return values;
+}
+
+/// What the ask verbs take from their command line.
+struct AskArguments {
+    std::string app, bundle, font, family;
+    std::vector<std::string> candidates;
+    std::vector<std::string> fonts; ///< PSNAME[:FAMILY]
+    long pid = long(getpid());
+    bool suppress = false;
+};
+
+/// One option of an ask verb: how many values it takes, where they go, and what it needs.
+struct AskOption {
+    const char* name;
+    enum Shape { kFlag, kOne, kMany } shape;
+    /// Stores one value (a flag gets ""); false when the value is not acceptable.
+    bool (*store)(AskArguments&, const std::string&);
+    const char* needs;
+};
+
+const AskOption kActivationOptions[] = {
+    {"--candidate", AskOption::kMany,
+     [](AskArguments& a, const std::string& v) { return a.candidates.push_back(v), true; },
+     "at least one file"},
+    {"--font", AskOption::kOne,
+     [](AskArguments& a, const std::string& v) { return a.font = v, true; }, "a value"},
+    {"--family", AskOption::kOne,
+     [](AskArguments& a, const std::string& v) { return a.family = v, true; }, "a value"},
+    {"--app", AskOption::kOne,
+     [](AskArguments& a, const std::string& v) { return a.app = v, true; }, "a value"},
+    {"--bundle", AskOption::kOne,
+     [](AskArguments& a, const std::string& v) { return a.bundle = v, true; }, "a value"},
+};
+
+const AskOption kDownloadOptions[] = {
+    {"--font", AskOption::kMany,
+     [](AskArguments& a, const std::string& v) { return a.fonts.push_back(v), true; },
+     "at least one PSNAME[:FAMILY]"},
+    {"--app", AskOption::kOne,
+     [](AskArguments& a, const std::string& v) { return a.app = v, true; }, "a value"},
+    {"--bundle", AskOption::kOne,
+     [](AskArguments& a, const std::string& v) { return a.bundle = v, true; }, "a value"},
+    {"--pid", AskOption::kOne,
+     [](AskArguments& a, const std::string& v) { return ParseInt32(v, &a.pid); }, "a process id"},
+    {"--suppress", AskOption::kFlag,
+     [](AskArguments& a, const std::string&) { return a.suppress = true; }, ""},
+};
+
+/// Reads an ask verb's command line with its option table. False after a message on `err`.
+bool ParseAskArguments(const char* verb, std::span<const AskOption> table,
+                       const std::vector<std::string>& arguments, AskArguments* values,
+                       PortOptions* options, std::ostream& err) {
+    for (size_t i = 0; i < arguments.size(); ++i) {
+        const int taken = TakePortOption(verb, arguments, &i, options, false, err);
+        if (taken < 0)
+            return false;
+        if (taken > 0)
+            continue;
+        const AskOption* option = nullptr;
+        for (const AskOption& candidate : table)
+            if (arguments[i] == candidate.name)
+                option = &candidate;
+        if (!option) {
+            err << "glyphwell " << verb << ": unknown argument " << arguments[i] << "\n";
+            return false;
+        }
+        std::vector<std::string> given;
+        if (option->shape == AskOption::kMany)
+            given = TakeValues(arguments, &i);
+        else if (option->shape == AskOption::kOne && i + 1 < arguments.size())
+            given.push_back(arguments[++i]);
+        else if (option->shape == AskOption::kFlag)
+            given.emplace_back();
+        bool good = !given.empty();
+        for (const std::string& value : given)
+            good = good && option->store(*values, value);
+        if (!good) {
+            err << "glyphwell " << verb << ": " << option->name << " needs " << option->needs
+                << "\n";
+            return false;
+        }
+    }
+    return true;
+}
+
+/// Frees a request of the client library.
+struct RequestDeleter {
+    void operator()(glyphwell_request* request) const { glyphwell_request_free(request); }
+};
+using Request = std::unique_ptr<glyphwell_request, RequestDeleter>;
+
+/// Sets the application name and bundle of both questions; false after a message on `err`.
+bool SetCommonFields(const char* verb, const AskArguments& values, glyphwell_request* request,
+                     std::ostream& err) {
+    if (!values.app.empty() &&
+        glyphwell_request_set_application_name(request, values.app.c_str()) < 0) {
+        err << "glyphwell " << verb << ": the application name is not UTF-8\n";
+        return false;
+    }
+    if (!values.bundle.empty() &&
+        glyphwell_request_set_bundle_path(request, values.bundle.c_str()) < 0) {
+        err << "glyphwell " << verb << ": cannot make a file URL of " << values.bundle << "\n";
+        return false;
+    }
+    return true;
+}
+
+/// The message id 1 request of `values`; null after a message on `err`.
+Request BuildActivationRequest(const AskArguments& values, std::ostream& err) {
+    Request request(glyphwell_request_new(GLYPHWELL_ASK_ACTIVATION));
+    if (!SetCommonFields("ask-activation", values, request.get(), err))
+        return nullptr;
+    if (!values.font.empty() &&
+        glyphwell_request_add_font(request.get(), values.font.c_str(), values.family.c_str()) < 0) {
+        err << "glyphwell ask-activation: the font names are not UTF-8\n";
+        return nullptr;
+    }
+    for (const std::string& file : values.candidates)
+        if (glyphwell_request_add_candidate_file(request.get(), file.c_str()) < 0) {
+            err << "glyphwell ask-activation: cannot make a file URL of " << file << "\n";
+            return nullptr;
+        }
+    return request;
+}
+
+/// The message id 2 request of `values`; null after a message on `err`.
+Request BuildDownloadRequest(const AskArguments& values, std::ostream& err) {
+    Request request(glyphwell_request_new(GLYPHWELL_ASK_DOWNLOAD));
+    if (!SetCommonFields("ask-download", values, request.get(), err))
+        return nullptr;
+    glyphwell_request_set_process_id(request.get(), int32_t(values.pid));
+    glyphwell_request_set_suppress(request.get(), values.suppress);
+    for (const std::string& font : values.fonts) {
+        const size_t colon = font.find(':');
+        const std::string postScriptName = font.substr(0, colon);
+        const std::string family = colon == std::string::npos ? "" : font.substr(colon + 1);
+        if (postScriptName.empty()) {
+            err << "glyphwell ask-download: " << font << " has no PostScript name\n";
+            return nullptr;
+        }
+        if (glyphwell_request_add_font(request.get(), postScriptName.c_str(), family.c_str()) < 0) {
+            err << "glyphwell ask-download: " << font << " is not UTF-8\n";
+            return nullptr;
+        }
+    }
+    return request;
+}
+
+/// The reply timeout in milliseconds for the client library (-1: no limit).
+int TimeoutMilliseconds(CFTimeInterval seconds) {
+    if (seconds == kCFMessagePortWaitForever || seconds * 1000 >= double(INT32_MAX))
+        return -1;
+    return int(std::ceil(seconds * 1000));
+}
+
+/// One ask verb: its name, its option table, what it cannot go without, and its request.
+struct AskVerb {
+    const char* name;
+    std::span<const AskOption> options;
+    bool (*complete)(const AskArguments&);
+    const char* incomplete;
+    Request (*build)(const AskArguments&, std::ostream&);
+};
+
+const AskVerb kAskActivation = {"ask-activation", kActivationOptions,
+                                [](const AskArguments& a) { return !a.candidates.empty(); },
+                                "give the font files with --candidate", BuildActivationRequest};
+const AskVerb kAskDownload = {"ask-download", kDownloadOptions,
+                              [](const AskArguments& a) { return !a.fonts.empty(); },
+                              "give the fonts with --font", BuildDownloadRequest};
+
+/// Runs an ask verb: the request built with the client library, sent, and the reply printed as
+/// tagged JSON (or the request, with --dry-run).
+int RunAsk(const AskVerb& verb, const std::vector<std::string>& arguments, std::ostream& out,
+           std::ostream& err) {
+    PortOptions options;
+    AskArguments values;
+    if (!ParseAskArguments(verb.name, verb.options, arguments, &values, &options, err))
+        return 2;
+    if (!verb.complete(values)) {
+        err << "glyphwell " << verb.name << ": " << verb.incomplete << "\n";
+        return 2;
+    }
+    Request request = verb.build(values, err);
+    if (!request)
+        return 2;
+    if (options.dryRun) {
+        const void* bytes = nullptr;
+        size_t length = 0;
+        glyphwell_request_get_bytes(request.get(), &bytes, &length);
+        bool intact = false;
+        const Json json =
+            DecodeToJSON(std::string(static_cast<const char*>(bytes), length), err, &intact);
+        out << json.dump(options.compact ? -1 : 2) << "\n";
+        return intact ? 0 : 1;
+    }
+    glyphwell_reply* reply = nullptr;
+    const int status = glyphwell_request_send(request.get(), options.name.c_str(),
+                                              TimeoutMilliseconds(options.receiveTimeout), &reply);
+    if (status != GLYPHWELL_OK) {
+        err << "glyphwell " << verb.name << ": " << glyphwell_status_text(status) << "\n";
+        return 1;
+    }
+    size_t length = 0;
+    const void* bytes = glyphwell_reply_get_bytes(reply, &length);
+    const std::string replyBytes(static_cast<const char*>(bytes), length);
+    glyphwell_reply_free(reply);
+    return PrintReply(verb.name, options, replyBytes, out, err);
 }
 
 } // namespace
@@ -255,7 +408,7 @@ int RunSend(const std::vector<std::string>& arguments, std::istream& in, std::os
     long msgid = 0;
     for (size_t i = 0; i < arguments.size(); ++i) {
         const std::string& argument = arguments[i];
-        const int taken = TakePortOption("send", arguments, &i, &options, err);
+        const int taken = TakePortOption("send", arguments, &i, &options, true, err);
         if (taken < 0)
             return 2;
         if (taken > 0)
@@ -291,23 +444,10 @@ int RunSend(const std::vector<std::string>& arguments, std::istream& in, std::os
     if (empty)
         return Exchange("send", options, SInt32(msgid), nullptr, out, err);
 
-    std::string text;
-    const std::string inputName = inputPath.empty() || inputPath == "-" ? "<stdin>" : inputPath;
-    if (inputPath.empty() || inputPath == "-") {
-        text.assign(std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>());
-    } else {
-        std::ifstream file(inputPath, std::ios::binary);
-        if (!file) {
-            err << "glyphwell send: cannot open " << inputPath << "\n";
-            return 1;
-        }
-        text.assign(std::istreambuf_iterator<char>(file), std::istreambuf_iterator<char>());
-    }
     Json request;
-    try {
-        request = Json::parse(text);
-    } catch (const nlohmann::json::parse_error& failure) {
-        err << "glyphwell send: " << inputName << ": malformed JSON: " << failure.what() << "\n";
+    std::string error;
+    if (!ReadJSONInput(inputPath, in, &request, &error)) {
+        err << "glyphwell send: " << error << "\n";
         return 1;
     }
     return Exchange("send", options, SInt32(msgid), &request, out, err);
@@ -315,141 +455,12 @@ int RunSend(const std::vector<std::string>& arguments, std::istream& in, std::os
 
 int RunAskActivation(const std::vector<std::string>& arguments, std::istream&, std::ostream& out,
                      std::ostream& err) {
-    PortOptions options;
-    std::string font, family, app, bundle;
-    std::vector<std::string> candidates;
-    for (size_t i = 0; i < arguments.size(); ++i) {
-        const std::string& argument = arguments[i];
-        const int taken = TakePortOption("ask-activation", arguments, &i, &options, err);
-        if (taken < 0)
-            return 2;
-        if (taken > 0)
-            continue;
-        if (argument == "--candidate") {
-            const std::vector<std::string> files = TakeValues(arguments, &i);
-            candidates.insert(candidates.end(), files.begin(), files.end());
-            if (files.empty()) {
-                err << "glyphwell ask-activation: --candidate needs at least one file\n";
-                return 2;
-            }
-            continue;
-        }
-        std::string* target = argument == "--font"     ? &font
-                              : argument == "--family" ? &family
-                              : argument == "--app"    ? &app
-                              : argument == "--bundle" ? &bundle
-                                                       : nullptr;
-        if (!target) {
-            err << "glyphwell ask-activation: unknown argument " << argument << "\n";
-            return 2;
-        }
-        if (i + 1 == arguments.size()) {
-            err << "glyphwell ask-activation: " << argument << " needs a value\n";
-            return 2;
-        }
-        *target = arguments[++i];
-    }
-    if (candidates.empty()) {
-        err << "glyphwell ask-activation: give the font files with --candidate\n";
-        return 2;
-    }
-
-    Json request = Json::object();
-    if (!app.empty())
-        request[Text(kQZUIPropertyApplicationName)] = app;
-    if (!bundle.empty() && !AddFileURL(&request, Text(kQZUIPropertyBundleURL), bundle, err))
-        return 1;
-    if (!font.empty())
-        request[Text(kQZUIPropertyFontName)] = font;
-    Json attributes = Json::object();
-    if (!font.empty())
-        attributes[Text(NSFontNameAttribute)] = font;
-    if (!family.empty())
-        attributes[Text(NSFontFamilyAttribute)] = family;
-    if (!attributes.empty())
-        request[Text(kQZUIPropertyRequestDictionary)] = attributes;
-    Json urls = Json::array();
-    for (const std::string& file : candidates) {
-        Json url = FileURL(file);
-        if (url.is_null()) {
-            err << "glyphwell ask-activation: cannot make a file URL of " << file << "\n";
-            return 1;
-        }
-        urls.push_back(url);
-    }
-    request[Text(kQZUIPropertyCandidateFontURLs)] = urls;
-    return Exchange("ask-activation", options, 1, &request, out, err);
+    return RunAsk(kAskActivation, arguments, out, err);
 }
 
 int RunAskDownload(const std::vector<std::string>& arguments, std::istream&, std::ostream& out,
                    std::ostream& err) {
-    PortOptions options;
-    std::string app, bundle;
-    std::vector<std::string> fonts;
-    long pid = long(getpid());
-    bool suppress = false;
-    for (size_t i = 0; i < arguments.size(); ++i) {
-        const std::string& argument = arguments[i];
-        const int taken = TakePortOption("ask-download", arguments, &i, &options, err);
-        if (taken < 0)
-            return 2;
-        if (taken > 0)
-            continue;
-        if (argument == "--font") {
-            const std::vector<std::string> names = TakeValues(arguments, &i);
-            if (names.empty()) {
-                err << "glyphwell ask-download: --font needs at least one PSNAME[:FAMILY]\n";
-                return 2;
-            }
-            fonts.insert(fonts.end(), names.begin(), names.end());
-        } else if (argument == "--suppress") {
-            suppress = true;
-        } else if (argument == "--pid") {
-            if (i + 1 == arguments.size() || !ParseInt32(arguments[i + 1], &pid)) {
-                err << "glyphwell ask-download: --pid needs a process id\n";
-                return 2;
-            }
-            ++i;
-        } else if (argument == "--app" || argument == "--bundle") {
-            if (i + 1 == arguments.size()) {
-                err << "glyphwell ask-download: " << argument << " needs a value\n";
-                return 2;
-            }
-            (argument == "--app" ? app : bundle) = arguments[++i];
-        } else {
-            err << "glyphwell ask-download: unknown argument " << argument << "\n";
-            return 2;
-        }
-    }
-    if (fonts.empty()) {
-        err << "glyphwell ask-download: give the fonts with --font\n";
-        return 2;
-    }
-
-    Json request = Json::object();
-    if (!app.empty())
-        request[Text(kQZUIPropertyApplicationName)] = app;
-    if (!bundle.empty() && !AddFileURL(&request, Text(kQZUIPropertyBundleURL), bundle, err))
-        return 1;
-    request[Text(kQZUIPropertyProcessID)] = Json{{"$number", pid}, {"$type", 9}};
-    Json properties = Json::array();
-    for (const std::string& font : fonts) {
-        const size_t colon = font.find(':');
-        const std::string postScriptName = font.substr(0, colon);
-        if (postScriptName.empty()) {
-            err << "glyphwell ask-download: " << font << " has no PostScript name\n";
-            return 2;
-        }
-        Json attributes = Json::object();
-        attributes[Text(NSFontNameAttribute)] = postScriptName;
-        if (colon != std::string::npos && colon + 1 < font.size())
-            attributes[Text(NSFontFamilyAttribute)] = font.substr(colon + 1);
-        properties.push_back(attributes);
-    }
-    request[Text(kQZUIPropertyFontProperties)] = properties;
-    if (suppress)
-        request[Text(kQZUIPropertySuppress)] = true;
-    return Exchange("ask-download", options, 2, &request, out, err);
+    return RunAsk(kAskDownload, arguments, out, err);
 }
 
 } // namespace glyphwell::tools

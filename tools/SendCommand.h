@@ -1,6 +1,7 @@
 // The glyphwell verbs that talk to the agent over its message port: `send` for any request
 // written as tagged JSON, and `ask-activation` / `ask-download`, which build the message id 1 and
-// 2 requests from flags. Each prints the reply dictionary as tagged JSON.
+// 2 requests from flags with the client library (client/glyphwell/client.h). Each prints the
+// reply as tagged JSON.
 #pragma once
 
 #include <iosfwd>
@@ -15,8 +16,9 @@ namespace glyphwell::tools {
 ///
 /// Port options, shared by every verb here:
 ///   --name NAME          the port (default: the agent's)
-///   --timeout SECONDS    how long to wait for the reply (default: no limit; users take time)
-///   --send-timeout S     how long writing the request may take (default 10)
+///   --timeout SECONDS    how long to wait for the reply (default: no limit; users take time);
+///                        for the ask verbs, the whole exchange
+///   --send-timeout S     `send` only: how long writing the request may take (default 10)
 ///   --compact            one-line JSON
 ///   --dry-run            print the request as tagged JSON instead of sending it
 ///

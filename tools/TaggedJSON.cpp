@@ -6,6 +6,7 @@
 #include <optional>
 #include <vector>
 
+#include "cfutil/TCFRetained.h"
 #include "tools/Base64.h"
 
 namespace glyphwell::tools {
@@ -22,27 +23,22 @@ struct InputError {
     std::string what;
 };
 
-/// Owns the references made while a container is being read, so an error releases them.
-class Held {
-public:
-    Held() = default;
-    Held(const Held&) = delete;
-    Held& operator=(const Held&) = delete;
-    ~Held() {
-        for (CFTypeRef value : values_)
-            CFRelease(value);
-    }
-    CFTypeRef Add(CFTypeRef value) {
-        values_.push_back(value);
-        return value;
-    }
-    const void** Data() { return values_.data(); }
-    CFIndex Count() const { return CFIndex(values_.size()); }
+/// The values made while a container is read, each holding its own count, so that an error
+/// thrown part way releases them.
+using Values = std::vector<TCFRetained<CFTypeRef>>;
 
-private:
-    std::vector<CFTypeRef> values_;
-};
+/// Adopts `value` (a new reference) into `values` and returns it.
+CFTypeRef Keep(Values& values, CFTypeRef value) {
+    values.emplace_back(value, kAdopted);
+    return value;
+}
 
+/// The bare references of `values`, for the Create calls that take a C array.
+std::vector<const void*> Pointers(const Values& values) {
+    return std::vector<const void*>(values.begin(), values.end());
+}
+
+/// The JSON pointer of member `step` below `where` ("~" and "/" escaped).
 std::string Child(const std::string& where, const std::string& step) {
     std::string escaped;
     for (char c : step) {
@@ -56,17 +52,21 @@ std::string Child(const std::string& where, const std::string& step) {
     return (where == "/" ? "" : where) + "/" + escaped;
 }
 
+/// The JSON pointer of element `index` below `where`.
 std::string Child(const std::string& where, size_t index) {
     return Child(where, std::to_string(index));
 }
 
+/// A new string of UTF-8 `text`, or null when it is not UTF-8.
 CFStringRef CreateString(const std::string& text) {
     return CFStringCreateWithBytes(kCFAllocatorDefault, reinterpret_cast<const UInt8*>(text.data()),
                                    CFIndex(text.size()), kCFStringEncodingUTF8, false);
 }
 
+/// The property value of `json` at `where`; throws InputError.
 CFTypeRef Create(const Json& json, const std::string& where);
 
+/// NaN and the infinities, which JSON writes as strings.
 std::optional<double> SpecialFloat(const Json& value) {
     if (!value.is_string())
         return std::nullopt;
@@ -80,6 +80,7 @@ std::optional<double> SpecialFloat(const Json& value) {
     return std::nullopt;
 }
 
+/// {"$number": V, "$type": CODE}: checks the code and that V fits it.
 CFTypeRef CreateNumber(const Json& tagged, const std::string& where) {
     if (tagged.size() != 2 || !tagged.contains("$type"))
         throw InputError{where, "a \"$number\" needs exactly the keys \"$number\" and \"$type\""};
@@ -122,6 +123,7 @@ CFTypeRef CreateNumber(const Json& tagged, const std::string& where) {
     return CFNumberCreate(kCFAllocatorDefault, type, &v);
 }
 
+/// {"$uuid": "8-4-4-4-12"}.
 CFTypeRef CreateUUID(const Json& text, const std::string& where) {
     static const char kShape[] = "xxxxxxxx-xxxx-xxxx-xxxx-xxxxxxxxxxxx";
     const std::string s = text.is_string() ? text.get<std::string>() : std::string();
@@ -142,12 +144,11 @@ CFTypeRef CreateUUID(const Json& text, const std::string& where) {
     return CFUUIDCreateFromUUIDBytes(kCFAllocatorDefault, uuid);
 }
 
+/// {"$charset": [[first, last], ...]}.
 CFTypeRef CreateCharacterSet(const Json& ranges, const std::string& where) {
     if (!ranges.is_array())
         throw InputError{where, "\"$charset\" must be an array of [first, last] ranges"};
-    CFMutableCharacterSetRef set = CFCharacterSetCreateMutable(kCFAllocatorDefault);
-    Held guard;
-    guard.Add(set);
+    TCFAdopted<CFMutableCharacterSetRef> set(CFCharacterSetCreateMutable(kCFAllocatorDefault));
     for (size_t i = 0; i < ranges.size(); ++i) {
         const Json& range = ranges[i];
         auto isCodePoint = [](const Json& j) {
@@ -164,35 +165,46 @@ CFTypeRef CreateCharacterSet(const Json& ranges, const std::string& where) {
     return CFCharacterSetCreateCopy(kCFAllocatorDefault, set);
 }
 
+/// A plain or "$array" array, or a "$set".
 CFTypeRef CreateArrayOrSet(const Json& items, const std::string& where, bool isSet) {
     if (!items.is_array())
         throw InputError{where,
                          isSet ? "\"$set\" must be an array" : "\"$array\" must be an array"};
-    Held elements;
+    Values elements;
     for (size_t i = 0; i < items.size(); ++i)
-        elements.Add(Create(items[i], Child(where, i)));
+        Keep(elements, Create(items[i], Child(where, i)));
+    std::vector<const void*> pointers = Pointers(elements);
     if (isSet)
-        return CFSetCreate(kCFAllocatorDefault, elements.Data(), elements.Count(),
+        return CFSetCreate(kCFAllocatorDefault, pointers.data(), CFIndex(pointers.size()),
                            &kCFTypeSetCallBacks);
-    return CFArrayCreate(kCFAllocatorDefault, elements.Data(), elements.Count(),
+    return CFArrayCreate(kCFAllocatorDefault, pointers.data(), CFIndex(pointers.size()),
                          &kCFTypeArrayCallBacks);
 }
 
+/// A new dictionary of the parallel `keys` and `values`, retaining both.
+CFTypeRef CreateDictionary(const Values& keys, const Values& values) {
+    std::vector<const void*> keyPointers = Pointers(keys), valuePointers = Pointers(values);
+    return CFDictionaryCreate(kCFAllocatorDefault, keyPointers.data(), valuePointers.data(),
+                              CFIndex(keyPointers.size()), &kCFTypeDictionaryKeyCallBacks,
+                              &kCFTypeDictionaryValueCallBacks);
+}
+
+/// {"$dict": [[key, value], ...]}, keys of any kind.
 CFTypeRef CreateDictionaryFromPairs(const Json& pairs, const std::string& where) {
     if (!pairs.is_array())
         throw InputError{where, "\"$dict\" must be an array of [key, value] pairs"};
-    Held keys, values;
+    Values keys, values;
     for (size_t i = 0; i < pairs.size(); ++i) {
         const std::string at = Child(where, i);
         if (!pairs[i].is_array() || pairs[i].size() != 2)
             throw InputError{at, "a \"$dict\" entry is a [key, value] pair"};
-        keys.Add(Create(pairs[i][0], Child(at, 0)));
-        values.Add(Create(pairs[i][1], Child(at, 1)));
+        Keep(keys, Create(pairs[i][0], Child(at, 0)));
+        Keep(values, Create(pairs[i][1], Child(at, 1)));
     }
-    return CFDictionaryCreate(kCFAllocatorDefault, keys.Data(), values.Data(), keys.Count(),
-                              &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks);
+    return CreateDictionary(keys, values);
 }
 
+/// {"$error": {"domain": S, "code": N}}.
 CFTypeRef CreateError(const Json& error, const std::string& where) {
     if (!error.is_object() || error.size() != 2 || !error.contains("domain") ||
         !error.contains("code") || !error["domain"].is_string() ||
@@ -200,15 +212,13 @@ CFTypeRef CreateError(const Json& error, const std::string& where) {
         throw InputError{where, "\"$error\" must be {\"domain\": string, \"code\": integer}"};
     if (error["code"].is_number_unsigned() && error["code"].get<uint64_t>() > uint64_t(INT64_MAX))
         throw InputError{Child(where, "code"), "integer out of range"};
-    CFStringRef domain = CreateString(error["domain"].get<std::string>());
+    TCFAdopted<CFStringRef> domain(CreateString(error["domain"].get<std::string>()));
     if (!domain)
         throw InputError{Child(where, "domain"), "not valid UTF-8"};
-    CFErrorRef value =
-        CFErrorCreate(kCFAllocatorDefault, domain, error["code"].get<int64_t>(), nullptr);
-    CFRelease(domain);
-    return value;
+    return CFErrorCreate(kCFAllocatorDefault, domain, error["code"].get<int64_t>(), nullptr);
 }
 
+/// A tagged object, by its tag.
 CFTypeRef CreateTagged(const Json& object, const std::string& where) {
     const std::string tag = object.begin().key();
     const Json& body = object.begin().value();
@@ -254,6 +264,7 @@ CFTypeRef CreateTagged(const Json& object, const std::string& where) {
     throw InputError{where, "unknown tag \"" + tag + "\""};
 }
 
+/// True when a key of `object` starts with "$".
 bool IsTagged(const Json& object) {
     for (auto it = object.begin(); it != object.end(); ++it)
         if (!it.key().empty() && it.key()[0] == '$')
@@ -268,16 +279,14 @@ CFTypeRef Create(const Json& json, const std::string& where) {
     case Json::value_t::boolean:
         return CFRetain(json.get<bool>() ? kCFBooleanTrue : kCFBooleanFalse);
     case Json::value_t::string: {
-        CFStringRef string = CreateString(json.get_ref<const std::string&>());
+        TCFAdopted<CFStringRef> string(CreateString(json.get_ref<const std::string&>()));
         if (!string)
             throw InputError{where, "string is not valid UTF-8"};
         // The stream carries texts up to this many UTF-8 bytes (and so UTF-16 units); the writer
         // would write a longer one as empty.
-        if (json.get_ref<const std::string&>().size() > kMaxStreamedLength) {
-            CFRelease(string);
+        if (json.get_ref<const std::string&>().size() > kMaxStreamedLength)
             throw InputError{where, "string longer than 1048576 UTF-8 bytes cannot be written"};
-        }
-        return string;
+        return string.Orphan();
     }
     case Json::value_t::number_integer:
     case Json::value_t::number_unsigned: {
@@ -295,19 +304,19 @@ CFTypeRef Create(const Json& json, const std::string& where) {
     case Json::value_t::object: {
         if (!json.empty() && IsTagged(json))
             return CreateTagged(json, where);
-        Held keys, values;
+        Values keys, values;
         for (auto it = json.begin(); it != json.end(); ++it) {
-            keys.Add(Create(Json(it.key()), Child(where, it.key())));
-            values.Add(Create(it.value(), Child(where, it.key())));
+            Keep(keys, Create(Json(it.key()), Child(where, it.key())));
+            Keep(values, Create(it.value(), Child(where, it.key())));
         }
-        return CFDictionaryCreate(kCFAllocatorDefault, keys.Data(), values.Data(), keys.Count(),
-                                  &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks);
+        return CreateDictionary(keys, values);
     }
     default:
         throw InputError{where, "binary JSON values are not supported"};
     }
 }
 
+/// The UTF-8 text of `string`; a unit without a UTF-8 form becomes "?".
 std::string StringToUTF8(CFStringRef string) {
     const CFIndex length = CFStringGetLength(string);
     CFIndex size = 0;
@@ -319,6 +328,7 @@ std::string StringToUTF8(CFStringRef string) {
     return text;
 }
 
+/// Types 10 and 13 plain, others tagged with their code.
 Json NumberToJSON(CFNumberRef number) {
     const CFNumberType type = CFNumberGetType(number);
     if (CFNumberIsFloatType(number)) {
@@ -339,9 +349,11 @@ Json NumberToJSON(CFNumberRef number) {
     return Json{{"$number", v}, {"$type", type}};
 }
 
+/// The code point ranges of `set`, plane by plane.
 Json CharacterSetToJSON(CFCharacterSetRef set) {
     Json ranges = Json::array();
-    CFDataRef bitmap = CFCharacterSetCreateBitmapRepresentation(kCFAllocatorDefault, set);
+    TCFAdopted<CFDataRef> bitmap(
+        CFCharacterSetCreateBitmapRepresentation(kCFAllocatorDefault, set));
     if (!bitmap)
         return Json{{"$charset", ranges}};
     const UInt8* bytes = CFDataGetBytePtr(bitmap);
@@ -373,7 +385,6 @@ Json CharacterSetToJSON(CFCharacterSetRef set) {
     }
     if (open >= 0)
         ranges.push_back(Json::array({open, lastPlane * 0x10000 + 0xFFFF}));
-    CFRelease(bitmap);
     return Json{{"$charset", ranges}};
 }
 
@@ -382,6 +393,7 @@ struct PairCollector {
     bool plainKeys = true;
 };
 
+/// Applier: gathers a dictionary's pairs and whether all keys are plain.
 void CollectPair(const void* key, const void* value, void* context) {
     auto* collector = static_cast<PairCollector*>(context);
     collector->pairs.emplace_back(key, value);
@@ -391,8 +403,26 @@ void CollectPair(const void* key, const void* value, void* context) {
         collector->plainKeys = false;
 }
 
+/// Applier: gathers a set's members.
 void CollectValue(const void* value, void* context) {
     static_cast<std::vector<CFTypeRef>*>(context)->push_back(value);
+}
+
+/// A dictionary as a plain object when every key is a string without a leading "$", else in the
+/// "$dict" form.
+Json DictionaryToJSON(CFDictionaryRef dictionary) {
+    PairCollector collector;
+    CFDictionaryApplyFunction(dictionary, CollectPair, &collector);
+    if (collector.plainKeys) {
+        Json object = Json::object();
+        for (const auto& [key, item] : collector.pairs)
+            object[StringToUTF8(static_cast<CFStringRef>(key))] = ValueToJSON(item);
+        return object;
+    }
+    Json pairs = Json::array();
+    for (const auto& [key, item] : collector.pairs)
+        pairs.push_back(Json::array({ValueToJSON(key), ValueToJSON(item)}));
+    return Json{{"$dict", pairs}};
 }
 
 } // namespace
@@ -436,26 +466,14 @@ Json ValueToJSON(CFTypeRef value) {
             items.push_back(ValueToJSON(member));
         return Json{{"$set", items}};
     }
-    if (kind == CFDictionaryGetTypeID()) {
-        PairCollector collector;
-        CFDictionaryApplyFunction(static_cast<CFDictionaryRef>(value), CollectPair, &collector);
-        if (collector.plainKeys) {
-            Json object = Json::object();
-            for (const auto& [key, item] : collector.pairs)
-                object[StringToUTF8(static_cast<CFStringRef>(key))] = ValueToJSON(item);
-            return object;
-        }
-        Json pairs = Json::array();
-        for (const auto& [key, item] : collector.pairs)
-            pairs.push_back(Json::array({ValueToJSON(key), ValueToJSON(item)}));
-        return Json{{"$dict", pairs}};
-    }
+    if (kind == CFDictionaryGetTypeID())
+        return DictionaryToJSON(static_cast<CFDictionaryRef>(value));
     if (kind == CFURLGetTypeID())
         return Json{{"$url", StringToUTF8(CFURLGetString(static_cast<CFURLRef>(value)))}};
     if (kind == CFUUIDGetTypeID()) {
-        CFStringRef text = CFUUIDCreateString(kCFAllocatorDefault, static_cast<CFUUIDRef>(value));
+        TCFAdopted<CFStringRef> text(
+            CFUUIDCreateString(kCFAllocatorDefault, static_cast<CFUUIDRef>(value)));
         std::string lower = StringToUTF8(text);
-        CFRelease(text);
         for (char& c : lower)
             c = char(std::tolower(static_cast<unsigned char>(c)));
         return Json{{"$uuid", lower}};

@@ -71,15 +71,36 @@ TEST(DecodeCommand, PrintsTheReadersLinesAndFailsOnCorruption) {
                           "dictionary\n");
 }
 
-TEST(DecodeCommand, ExpectedKindMismatchPrintsNull) {
+// Each kind --expect names takes a value of that kind, and a value of any other kind reads null.
+TEST(DecodeCommand, ExpectTakesItsKindOnly) {
+    const std::pair<const char*, const char*> kinds[] = {
+        {"string", R"("abc")"},
+        {"number", "1"},
+        {"boolean", "true"},
+        {"data", R"({"$data":"AA=="})"},
+        {"charset", R"({"$charset":[[65,66]]})"},
+        {"array", "[1]"},
+        {"dictionary", R"({"k":1})"},
+        {"set", R"({"$set":[1]})"},
+        {"url", R"({"$url":"file:///a"})"},
+        {"uuid", R"({"$uuid":"00010203-0405-0607-0809-0a0b0c0d0e0f"})"},
+        {"error", R"({"$error":{"domain":"D","code":1}})"},
+    };
+    for (const auto& [kind, json] : kinds) {
+        const std::string bytes = Invoke({"encode"}, json).out;
+        for (const auto& [expected, unused] : kinds) {
+            const Result result = Invoke({"decode", "--compact", "--expect", expected}, bytes);
+            const bool same = std::string(kind) == expected;
+            EXPECT_EQ(result.status, same ? 0 : 1) << kind << " as " << expected;
+            EXPECT_EQ(result.out, same ? std::string(json) + "\n" : "null\n")
+                << kind << " as " << expected;
+        }
+        EXPECT_EQ(Invoke({"decode", "--compact", "--expect", "any"}, bytes).out,
+                  std::string(json) + "\n");
+    }
     const std::string abc = Bytes({0, 0, 0, 7, 0, 0, 0, 3, 'a', 'b', 'c'});
-    const Result wrong = Invoke({"decode", "--expect", "dictionary"}, abc);
-    EXPECT_EQ(wrong.status, 1);
-    EXPECT_EQ(wrong.out, "null\n");
-    EXPECT_EQ(wrong.err, "Quzel encounters an unexpected type. (7, 16)\n");
-    const Result right = Invoke({"decode", "--expect", "string"}, abc);
-    EXPECT_EQ(right.status, 0);
-    EXPECT_EQ(right.out, "\"abc\"\n");
+    EXPECT_EQ(Invoke({"decode", "--expect", "dictionary"}, abc).err,
+              "Quzel encounters an unexpected type. (7, 16)\n");
 }
 
 TEST(DecodeCommand, NullResultWithoutCorruptionStillFails) {

@@ -5,8 +5,10 @@
 #include <fstream>
 #include <sstream>
 
+#include "cfutil/TCFRetained.h"
 #include "tools/Base64.h"
 #include "tools/Commands.h"
+#include "tools/ToolInput.h"
 
 namespace {
 
@@ -26,40 +28,37 @@ Result Encode(const std::string& input, std::vector<std::string> arguments = {"-
 
 } // namespace
 
-TEST(EncodeCommand, PrintsTheDocumentedBytesAsHex) {
-    EXPECT_EQ(Encode("\"abc\"").out, "00 00 00 07 00 00 00 03 61 62 63\n");
-    EXPECT_EQ(Encode("{}").out, "00 00 00 10 00 00 00 00\n");
-    EXPECT_EQ(Encode("true").out, "00 00 01 03 00 00 00 01 01\n");
-    EXPECT_EQ(Encode(R"({"$number": 1, "$type": 3})").out,
-              "00 00 00 16 00 00 00 03 00 00 00 04 00 00 00 01\n");
-    EXPECT_EQ(Encode(R"({"$number": 1.0, "$type": 6})").out,
-              "00 00 00 16 00 00 00 06 00 00 00 08 3F F0 00 00 00 00 00 00\n");
-    EXPECT_EQ(Encode(R"({"a": true})").out,
-              "00 00 00 10 00 00 00 01 00 00 00 07 00 00 00 01 61 00 00 01 03 00 00 00 01 01\n");
-}
-
-TEST(EncodeCommand, MapsPlainAndTaggedJSONToTheirKinds) {
-    EXPECT_EQ(Encode("7").out, "00 00 00 16 00 00 00 0A 00 00 00 08 00 00 00 00 00 00 00 07\n");
-    EXPECT_EQ(Encode("0.5").out, "00 00 00 16 00 00 00 0D 00 00 00 08 3F E0 00 00 00 00 00 00\n");
-    EXPECT_EQ(Encode("[false]").out, "00 00 00 11 00 00 00 01 00 00 01 03 00 00 00 01 00\n");
-    EXPECT_EQ(Encode(R"({"$array": []})").out, "00 00 00 11 00 00 00 00\n");
-    EXPECT_EQ(Encode(R"({"$set": [true]})").out,
-              "00 00 01 00 00 00 00 01 00 00 01 03 00 00 00 01 01\n");
-    EXPECT_EQ(Encode(R"({"$data": "3q0="})").out, "00 00 00 12 00 00 00 02 DE AD\n");
-    EXPECT_EQ(Encode(R"({"$url": "file:///a"})").out,
-              "00 00 01 01 00 00 00 09 66 69 6C 65 3A 2F 2F 2F 61\n");
-    EXPECT_EQ(Encode(R"({"$uuid": "00010203-0405-0607-0809-0a0b0c0d0e0f"})").out,
-              "00 00 01 02 00 00 00 10 00 01 02 03 04 05 06 07 08 09 0A 0B 0C 0D 0E 0F\n");
-    EXPECT_EQ(Encode(R"({"$error": {"domain": "D", "code": 5}})").out,
-              "00 00 01 04 00 00 00 05 00 00 00 07 00 00 00 01 44\n");
-    EXPECT_EQ(Encode(R"({"$dict": [[1, "x"]]})").out,
-              "00 00 00 10 00 00 00 01 00 00 00 16 00 00 00 0A 00 00 00 08 00 00 00 00 00 00 00 "
-              "01 00 00 00 07 00 00 00 01 78\n");
-    EXPECT_EQ(Encode(R"({"$number": -1, "$type": 7})").out,
-              "00 00 00 16 00 00 00 07 00 00 00 01 FF\n");
-    // A set of just U+0000 is a BMP bitmap whose first word is 0x0001: literal 1, fill 4095.
-    EXPECT_EQ(Encode(R"({"$charset": [[0, 0]]})").out,
-              "00 00 00 1B 00 00 00 0E 00 00 00 00 00 20 00 00 01 00 01 00 FF 0F\n");
+TEST(EncodeCommand, WritesTheDocumentedBytesOfPlainAndTaggedJSON) {
+    const std::pair<std::string, std::string> cases[] = {
+        {"\"abc\"", "00 00 00 07 00 00 00 03 61 62 63\n"},
+        {"{}", "00 00 00 10 00 00 00 00\n"},
+        {"true", "00 00 01 03 00 00 00 01 01\n"},
+        {R"({"$number": 1, "$type": 3})", "00 00 00 16 00 00 00 03 00 00 00 04 00 00 00 01\n"},
+        {R"({"$number": 1.0, "$type": 6})",
+         "00 00 00 16 00 00 00 06 00 00 00 08 3F F0 00 00 00 00 00 00\n"},
+        {R"({"a": true})",
+         "00 00 00 10 00 00 00 01 00 00 00 07 00 00 00 01 61 00 00 01 03 00 00 00 01 01\n"},
+        {"7", "00 00 00 16 00 00 00 0A 00 00 00 08 00 00 00 00 00 00 00 07\n"},
+        {"0.5", "00 00 00 16 00 00 00 0D 00 00 00 08 3F E0 00 00 00 00 00 00\n"},
+        {"[false]", "00 00 00 11 00 00 00 01 00 00 01 03 00 00 00 01 00\n"},
+        {R"({"$array": []})", "00 00 00 11 00 00 00 00\n"},
+        {R"({"$set": [true]})", "00 00 01 00 00 00 00 01 00 00 01 03 00 00 00 01 01\n"},
+        {R"({"$data": "3q0="})", "00 00 00 12 00 00 00 02 DE AD\n"},
+        {R"({"$url": "file:///a"})", "00 00 01 01 00 00 00 09 66 69 6C 65 3A 2F 2F 2F 61\n"},
+        {R"({"$uuid": "00010203-0405-0607-0809-0a0b0c0d0e0f"})",
+         "00 00 01 02 00 00 00 10 00 01 02 03 04 05 06 07 08 09 0A 0B 0C 0D 0E 0F\n"},
+        {R"({"$error": {"domain": "D", "code": 5}})",
+         "00 00 01 04 00 00 00 05 00 00 00 07 00 00 00 01 44\n"},
+        {R"({"$dict": [[1, "x"]]})",
+         "00 00 00 10 00 00 00 01 00 00 00 16 00 00 00 0A 00 00 00 08 00 00 00 00 00 00 00 "
+         "01 00 00 00 07 00 00 00 01 78\n"},
+        {R"({"$number": -1, "$type": 7})", "00 00 00 16 00 00 00 07 00 00 00 01 FF\n"},
+        // A set of just U+0000 is a BMP bitmap whose first word is 0x0001: literal 1, fill 4095.
+        {R"({"$charset": [[0, 0]]})",
+         "00 00 00 1B 00 00 00 0E 00 00 00 00 00 20 00 00 01 00 01 00 FF 0F\n"},
+    };
+    for (const auto& [input, hex] : cases)
+        EXPECT_EQ(Encode(input).out, hex) << input;
 }
 
 TEST(EncodeCommand, WritesRawBytesToAFile) {
@@ -114,6 +113,20 @@ TEST(EncodeCommand, RefusesTextTheStreamCannotCarry) {
     EXPECT_EQ(result.status, 1);
     EXPECT_EQ(result.out, "");
     EXPECT_NE(result.err.find("at /0: string longer than 1048576 UTF-8 bytes"), std::string::npos);
+}
+
+// A text with a lone surrogate has no UTF-8 form: the writer gives up on it, and the tool must
+// not send the emptied text in its place.
+TEST(EncodeCommand, RefusesAValueTheWriterCannotCarryUnchanged) {
+    const UniChar lone[] = {'a', 0xD800};
+    TCFAdopted<CFStringRef> text(CFStringCreateWithCharacters(kCFAllocatorDefault, lone, 2));
+    std::string bytes = "left over";
+    EXPECT_FALSE(glyphwell::tools::FlattenValue(text, &bytes));
+    EXPECT_EQ(bytes, "");
+    EXPECT_TRUE(glyphwell::tools::FlattenValue(CFSTR("a"), &bytes));
+    EXPECT_EQ(bytes, std::string("\0\0\0\x07\0\0\0\x01"
+                                 "a",
+                                 9));
 }
 
 TEST(EncodeCommand, ReportsUnknownOptionsAndMissingFiles) {

@@ -34,6 +34,7 @@ public:
               lastMsgid = msgid;
               lastLength = CFDataGetLength(data);
               std::lock_guard<std::mutex> lock(mutex_);
+              lastRequest_ = BytesOf(data);
               return reply_.empty() ? CFDataCreateCopy(kCFAllocatorDefault, data)
                                     : CreateCFData(reply_);
           }) {}
@@ -45,12 +46,18 @@ public:
         reply_ = bytes;
     }
 
+    std::string LastRequest() {
+        std::lock_guard<std::mutex> lock(mutex_);
+        return lastRequest_;
+    }
+
     std::atomic<SInt32> lastMsgid{0};
     std::atomic<CFIndex> lastLength{-1};
 
 private:
     std::mutex mutex_;
     std::string reply_;
+    std::string lastRequest_;
     PortServer server_;
 };
 
@@ -117,12 +124,22 @@ TEST_F(SendCommandTest, AskActivationBuildsTheMessageId1Request) {
 TEST_F(SendCommandTest, AskDownloadSendsTheMessageId2Request) {
     EchoServer server;
     ASSERT_TRUE(server.Started());
+    // {"QZUIPropertyResult": number 1 of type 7, "QZUIPropertySuppress": number 0 of type 7}
+    const Result reply = Invoke(
+        {"encode"},
+        R"({"QZUIPropertyResult": {"$number": 1, "$type": 7}, "QZUIPropertySuppress": {"$number": 0, "$type": 7}})");
+    ASSERT_EQ(reply.status, 0) << reply.err;
+    server.SetReply(reply.out);
     const Result result = Invoke({"ask-download", "--name", kName, "--compact", "--font",
                                   "ExampleSans-Regular:Example Sans", "Other-Bold", "--app",
                                   "Writer", "--pid", "4242", "--suppress"});
     ASSERT_EQ(result.status, 0) << result.err;
     EXPECT_EQ(server.lastMsgid, 2);
-    EXPECT_EQ(nlohmann::json::parse(result.out), nlohmann::json::parse(R"({
+    EXPECT_EQ(result.out, "{\"QZUIPropertyResult\":{\"$number\":1,\"$type\":7},"
+                          "\"QZUIPropertySuppress\":{\"$number\":0,\"$type\":7}}\n");
+    const Result request = Invoke({"decode", "--compact"}, server.LastRequest());
+    ASSERT_EQ(request.status, 0) << request.err;
+    EXPECT_EQ(nlohmann::json::parse(request.out), nlohmann::json::parse(R"({
         "QZUIPropertyApplicationName": "Writer",
         "QZUIPropertyProcessID": {"$number": 4242, "$type": 9},
         "QZUIPropertyFontProperties": [
@@ -134,13 +151,35 @@ TEST_F(SendCommandTest, AskDownloadSendsTheMessageId2Request) {
 }
 
 TEST_F(SendCommandTest, RejectsIncompleteCommandLines) {
-    EXPECT_EQ(Invoke({"send", "--name", kName}, "{}").err, "glyphwell send: --msgid is required\n");
-    EXPECT_EQ(Invoke({"send", "--msgid", "4294967296"}).status, 2);
-    EXPECT_EQ(Invoke({"send", "--msgid", "1", "--timeout", "soon"}).err,
-              "glyphwell send: --timeout takes seconds or \"forever\", not soon\n");
-    EXPECT_EQ(Invoke({"ask-activation", "--font", "X"}).err,
-              "glyphwell ask-activation: give the font files with --candidate\n");
-    EXPECT_EQ(Invoke({"ask-download", "--font"}).status, 2);
-    EXPECT_EQ(Invoke({"ask-download", "--font", ":Family"}).err,
-              "glyphwell ask-download: :Family has no PostScript name\n");
+    struct Case {
+        std::vector<std::string> arguments;
+        const char* message; // the whole of standard error, or null to check the status only
+    } cases[] = {
+        {{"send", "--name", kName}, "glyphwell send: --msgid is required\n"},
+        {{"send", "--msgid", "4294967296"}, nullptr},
+        {{"send", "--msgid", "1", "--timeout", "soon"},
+         "glyphwell send: --timeout takes seconds or \"forever\", not soon\n"},
+        {{"send", "--msgid", "1", "--timeout", "-1"},
+         "glyphwell send: --timeout takes seconds or \"forever\", not -1\n"},
+        {{"send", "--msgid", "1", "--timeout", "inf"},
+         "glyphwell send: --timeout takes seconds or \"forever\", not inf\n"},
+        {{"send", "--msgid", "1", "--send-timeout", "nan"}, nullptr},
+        {{"ask-activation", "--font", "X"},
+         "glyphwell ask-activation: give the font files with --candidate\n"},
+        {{"ask-download", "--font"}, nullptr},
+        {{"ask-download", "--font", ":Family"},
+         "glyphwell ask-download: :Family has no PostScript name\n"},
+        {{"ask-download", "--font", "A", "--pid", "x"},
+         "glyphwell ask-download: --pid needs a process id\n"},
+        {{"ask-download", "--font", "A", "--send-timeout", "1"},
+         "glyphwell ask-download: unknown argument --send-timeout\n"},
+        {{"ask-activation", "--candidate", "/a.ttf", "--bundle"},
+         "glyphwell ask-activation: --bundle needs a value\n"},
+    };
+    for (const Case& c : cases) {
+        const Result result = Invoke(c.arguments, "{}");
+        EXPECT_EQ(result.status, 2) << c.arguments.back();
+        if (c.message)
+            EXPECT_EQ(result.err, c.message);
+    }
 }

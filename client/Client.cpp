@@ -1,0 +1,595 @@
+// The client library: requests built as property values and flattened, one connection per call
+// to the agent's socket, written and read without blocking, the reply read back and checked.
+//
+// Frames, integers big-endian: request = int32 message id, uint32 length, bytes; reply = uint32
+// length, bytes. A call uses its connection for one request only.
+#include "glyphwell/client.h"
+
+#include <poll.h>
+#include <sys/socket.h>
+#include <sys/un.h>
+#include <time.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstring>
+#include <filesystem>
+#include <new>
+#include <optional>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "cfutil/CFStringUtilities.h"
+#include "cfutil/TCFRetained.h"
+#include "platform/CFMessagePort.h"
+#include "protocol/QZUIProtocol.h"
+#include "serialization/TCFFlattenContext.h"
+#include "serialization/TCFResurrectContext.h"
+
+namespace {
+
+/// One font of a request: PostScript name and family (may be empty).
+struct Font {
+    std::string postScriptName;
+    std::string family;
+};
+
+/// Makes `path` absolute against the current directory; empty when that fails.
+std::string AbsolutePath(const char* path) {
+    std::error_code error;
+    const std::filesystem::path absolute = std::filesystem::absolute(path, error);
+    return error ? std::string() : absolute.lexically_normal().string();
+}
+
+/// True when `text` is valid UTF-8 (a string value can be made of it).
+bool IsUTF8(const char* text) {
+    TCFAdopted<CFStringRef> string(
+        CFStringCreateWithBytes(kCFAllocatorDefault, reinterpret_cast<const UInt8*>(text),
+                                CFIndex(std::strlen(text)), kCFStringEncodingUTF8, false));
+    return string != nullptr;
+}
+
+CFStringRef CreateString(const std::string& text) {
+    return CFStringCreateWithBytes(kCFAllocatorDefault, reinterpret_cast<const UInt8*>(text.data()),
+                                   CFIndex(text.size()), kCFStringEncodingUTF8, false);
+}
+
+/// A new file URL of an absolute path (a directory URL when the path names a directory).
+CFURLRef CreateFileURL(const std::string& path) {
+    std::error_code error;
+    const bool directory = std::filesystem::is_directory(path, error);
+    return CFURLCreateFromFileSystemRepresentation(kCFAllocatorDefault,
+                                                   reinterpret_cast<const UInt8*>(path.data()),
+                                                   CFIndex(path.size()), directory);
+}
+
+/// Builds dictionaries from key/value pairs, each value adopted.
+class DictionaryBuilder {
+public:
+    /// Adds `value` (a new reference, adopted; null is skipped) under `key`.
+    void Add(CFStringRef key, CFTypeRef value) {
+        if (!value)
+            return;
+        keys_.emplace_back(key);
+        values_.emplace_back(value, kAdopted);
+    }
+    /// A new immutable dictionary of the pairs added.
+    CFDictionaryRef Create() const {
+        std::vector<const void*> keys(keys_.begin(), keys_.end());
+        std::vector<const void*> values(values_.begin(), values_.end());
+        return CFDictionaryCreate(kCFAllocatorDefault, keys.data(), values.data(),
+                                  CFIndex(keys.size()), &kCFTypeDictionaryKeyCallBacks,
+                                  &kCFTypeDictionaryValueCallBacks);
+    }
+
+private:
+    std::vector<TCFRetained<CFTypeRef>> keys_;
+    std::vector<TCFRetained<CFTypeRef>> values_;
+};
+
+/// A new array of `values` (each adopted).
+CFArrayRef CreateArray(std::vector<TCFRetained<CFTypeRef>> values) {
+    std::vector<const void*> pointers(values.begin(), values.end());
+    return CFArrayCreate(kCFAllocatorDefault, pointers.data(), CFIndex(pointers.size()),
+                         &kCFTypeArrayCallBacks);
+}
+
+/// The font attribute dictionary {NSFontNameAttribute, NSFontFamilyAttribute when given}.
+CFDictionaryRef CreateFontAttributes(const Font& font) {
+    DictionaryBuilder attributes;
+    attributes.Add(NSFontNameAttribute, CreateString(font.postScriptName));
+    if (!font.family.empty())
+        attributes.Add(NSFontFamilyAttribute, CreateString(font.family));
+    return attributes.Create();
+}
+
+/// Milliseconds of the monotonic clock.
+long long NowMilliseconds() {
+    timespec now{};
+    clock_gettime(CLOCK_MONOTONIC, &now);
+    return static_cast<long long>(now.tv_sec) * 1000 + now.tv_nsec / 1000000;
+}
+
+void PutBigEndian32(std::string* bytes, uint32_t value) {
+    for (int shift = 24; shift >= 0; shift -= 8)
+        bytes->push_back(static_cast<char>((value >> shift) & 0xFF));
+}
+
+} // namespace
+
+struct glyphwell_request {
+    int question = 0;
+    std::string applicationName;
+    std::string bundlePath;
+    std::optional<int32_t> processID;
+    std::vector<std::string> candidatePaths;
+    std::vector<Font> fonts;
+    bool suppress = false;
+    /// The flattened request, made by Flatten and dropped by every change.
+    std::string bytes;
+
+    /// True when the request holds what its question needs.
+    bool IsComplete() const {
+        return question == GLYPHWELL_ASK_ACTIVATION ? !candidatePaths.empty() : !fonts.empty();
+    }
+    /// A new request dictionary.
+    CFDictionaryRef CreateDictionary() const;
+    /// Fills `bytes`; false when the request is incomplete or cannot be written.
+    bool Flatten();
+};
+
+CFDictionaryRef glyphwell_request::CreateDictionary() const {
+    DictionaryBuilder request;
+    if (!applicationName.empty())
+        request.Add(kQZUIPropertyApplicationName, CreateString(applicationName));
+    if (!bundlePath.empty())
+        request.Add(kQZUIPropertyBundleURL, CreateFileURL(bundlePath));
+    if (question == GLYPHWELL_ASK_ACTIVATION) {
+        if (!fonts.empty()) {
+            request.Add(kQZUIPropertyFontName, CreateString(fonts.front().postScriptName));
+            request.Add(kQZUIPropertyRequestDictionary, CreateFontAttributes(fonts.front()));
+        }
+        std::vector<TCFRetained<CFTypeRef>> urls;
+        for (const std::string& path : candidatePaths)
+            urls.emplace_back(CreateFileURL(path), kAdopted);
+        request.Add(kQZUIPropertyCandidateFontURLs, CreateArray(std::move(urls)));
+        return request.Create();
+    }
+    const int32_t pid = processID.value_or(static_cast<int32_t>(getpid()));
+    request.Add(kQZUIPropertyProcessID,
+                CFNumberCreate(kCFAllocatorDefault, kCFNumberIntType, &pid));
+    std::vector<TCFRetained<CFTypeRef>> properties;
+    for (const Font& font : fonts)
+        properties.emplace_back(CreateFontAttributes(font), kAdopted);
+    request.Add(kQZUIPropertyFontProperties, CreateArray(std::move(properties)));
+    if (suppress)
+        request.Add(kQZUIPropertySuppress, CFRetain(kCFBooleanTrue));
+    return request.Create();
+}
+
+bool glyphwell_request::Flatten() {
+    if (!bytes.empty())
+        return true;
+    if (!IsComplete())
+        return false;
+    TCFAdopted<CFDictionaryRef> dictionary(CreateDictionary());
+    TCFAdopted<CFMutableDataRef> buffer(CFDataCreateMutable(kCFAllocatorDefault, 0));
+    if (!dictionary || !buffer)
+        return false;
+    TCFFlattenContext context(buffer, false);
+    context.Flatten(dictionary);
+    if (context.HasFailed())
+        return false;
+    bytes.assign(reinterpret_cast<const char*>(CFDataGetBytePtr(buffer)),
+                 size_t(CFDataGetLength(buffer)));
+    return true;
+}
+
+struct glyphwell_reply {
+    int question = 0;
+    int result = 0;
+    int suppress = 0;
+    std::vector<std::string> candidateURLs;
+    std::string bytes;
+};
+
+namespace {
+
+/// The 0/1 answer stored under `key`, or nothing when absent or not a number.
+std::optional<int> ReadAnswer(CFDictionaryRef reply, CFStringRef key) {
+    CFTypeRef value = CFDictionary::GetValue(reply, key);
+    SInt32 number = 0;
+    if (!value || CFGetTypeID(value) != CFNumberGetTypeID() ||
+        !CFNumberGetValue(static_cast<CFNumberRef>(value), kCFNumberSInt32Type, &number))
+        return std::nullopt;
+    return number != 0 ? 1 : 0;
+}
+
+/// Reads the reply bytes of `question` into `*reply`; GLYPHWELL_ERROR_MALFORMED_REPLY when they
+/// do not hold an intact dictionary with Result and Suppress.
+int ParseReply(int question, std::string bytes, glyphwell_reply* reply) {
+    if (bytes.empty())
+        return GLYPHWELL_ERROR_MALFORMED_REPLY;
+    TCFResurrectContext context(reinterpret_cast<const unsigned char*>(bytes.data()), bytes.size());
+    TCFAdopted<CFDictionaryRef> dictionary(context.RetrieveCFDictionary());
+    if (!dictionary || context.IsCorrupted())
+        return GLYPHWELL_ERROR_MALFORMED_REPLY;
+    const std::optional<int> result = ReadAnswer(dictionary, kQZUIPropertyResult);
+    const std::optional<int> suppress = ReadAnswer(dictionary, kQZUIPropertySuppress);
+    if (!result || !suppress)
+        return GLYPHWELL_ERROR_MALFORMED_REPLY;
+    reply->question = question;
+    reply->result = *result;
+    reply->suppress = *suppress;
+    CFTypeRef urls = CFDictionary::GetValue(dictionary, kQZUIPropertyCandidateFontURLs);
+    if (question == GLYPHWELL_ASK_ACTIVATION && urls && CFGetTypeID(urls) == CFArrayGetTypeID()) {
+        CFArrayRef array = static_cast<CFArrayRef>(urls);
+        for (CFIndex i = 0, n = CFArrayGetCount(array); i < n; ++i) {
+            CFTypeRef url = CFArrayGetValueAtIndex(array, i);
+            std::string text;
+            if (url && CFGetTypeID(url) == CFURLGetTypeID() &&
+                CFString::GetUTF8(CFURLGetString(static_cast<CFURLRef>(url)), text))
+                reply->candidateURLs.push_back(std::move(text));
+        }
+    }
+    reply->bytes = std::move(bytes);
+    return GLYPHWELL_OK;
+}
+
+} // namespace
+
+struct glyphwell_call {
+    enum class Stage { kConnecting, kWriting, kReading, kDone };
+
+    int fd = -1;
+    int question = 0;
+    Stage stage = Stage::kWriting;
+    int outcome = GLYPHWELL_IN_PROGRESS;
+    std::string output; ///< the request frame
+    size_t written = 0;
+    std::string input; ///< the reply frame read so far
+
+    ~glyphwell_call() { Close(); }
+    void Close() {
+        if (fd >= 0)
+            close(fd);
+        fd = -1;
+    }
+    /// Ends the call with `status`.
+    int Finish(int status) {
+        outcome = status;
+        stage = Stage::kDone;
+        Close();
+        return status;
+    }
+    int Connect(const char* portName);
+    int Write();
+    int Read(glyphwell_reply** reply);
+};
+
+int glyphwell_call::Connect(const char* portName) {
+    const std::string path =
+        glyphwell::port::SocketPathForName(portName ? portName : kQZUIAgentPortNameText);
+    sockaddr_un address{};
+    if (path.empty() || path.size() >= sizeof address.sun_path)
+        return Finish(GLYPHWELL_ERROR_NOT_RUNNING);
+    fd = socket(AF_UNIX, SOCK_STREAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0);
+    if (fd < 0)
+        return Finish(GLYPHWELL_ERROR_TRANSPORT);
+    address.sun_family = AF_UNIX;
+    std::memcpy(address.sun_path, path.c_str(), path.size() + 1);
+    if (connect(fd, reinterpret_cast<const sockaddr*>(&address), sizeof address) == 0)
+        return GLYPHWELL_IN_PROGRESS;
+    if (errno == EINPROGRESS || errno == EAGAIN) {
+        // A full listen queue: writable once the agent accepts.
+        stage = Stage::kConnecting;
+        return GLYPHWELL_IN_PROGRESS;
+    }
+    const int error = errno;
+    Finish(error == ENOENT || error == ECONNREFUSED || error == ENOTDIR
+               ? GLYPHWELL_ERROR_NOT_RUNNING
+               : GLYPHWELL_ERROR_TRANSPORT);
+    errno = error;
+    return outcome;
+}
+
+int glyphwell_call::Write() {
+    if (stage == Stage::kConnecting) {
+        int error = 0;
+        socklen_t length = sizeof error;
+        if (getsockopt(fd, SOL_SOCKET, SO_ERROR, &error, &length) != 0)
+            return Finish(GLYPHWELL_ERROR_TRANSPORT);
+        if (error == EINPROGRESS || error == EAGAIN)
+            return GLYPHWELL_IN_PROGRESS;
+        if (error != 0)
+            return Finish(error == ECONNREFUSED ? GLYPHWELL_ERROR_NOT_RUNNING
+                                                : GLYPHWELL_ERROR_TRANSPORT);
+        stage = Stage::kWriting;
+    }
+    while (written < output.size()) {
+        const ssize_t sent =
+            send(fd, output.data() + written, output.size() - written, MSG_NOSIGNAL);
+        if (sent < 0) {
+            if (errno == EINTR)
+                continue;
+            if (errno == EAGAIN || errno == EWOULDBLOCK)
+                return GLYPHWELL_IN_PROGRESS;
+            return Finish(errno == EPIPE || errno == ECONNRESET ? GLYPHWELL_ERROR_DISCONNECTED
+                                                                : GLYPHWELL_ERROR_TRANSPORT);
+        }
+        written += size_t(sent);
+    }
+    stage = Stage::kReading;
+    return GLYPHWELL_IN_PROGRESS;
+}
+
+int glyphwell_call::Read(glyphwell_reply** reply) {
+    char chunk[16384];
+    for (;;) {
+        size_t wanted = sizeof chunk;
+        if (input.size() >= 4) {
+            const auto* head = reinterpret_cast<const unsigned char*>(input.data());
+            const uint32_t length = uint32_t(head[0]) << 24 | uint32_t(head[1]) << 16 |
+                                    uint32_t(head[2]) << 8 | uint32_t(head[3]);
+            if (length > kMessagePortMaxFrame)
+                return Finish(GLYPHWELL_ERROR_MALFORMED_REPLY);
+            const size_t total = 4 + size_t(length);
+            if (input.size() == total) {
+                auto* made = new (std::nothrow) glyphwell_reply;
+                if (!made)
+                    return Finish(GLYPHWELL_ERROR_NO_MEMORY);
+                const int status = ParseReply(question, input.substr(4), made);
+                if (status != GLYPHWELL_OK) {
+                    delete made;
+                    return Finish(status);
+                }
+                *reply = made;
+                return Finish(GLYPHWELL_OK);
+            }
+            wanted = std::min(wanted, total - input.size());
+        } else {
+            wanted = 4 - input.size();
+        }
+        const ssize_t got = recv(fd, chunk, wanted, 0);
+        if (got == 0)
+            return Finish(GLYPHWELL_ERROR_DISCONNECTED);
+        if (got < 0) {
+            if (errno == EINTR)
+                continue;
+            if (errno == EAGAIN || errno == EWOULDBLOCK)
+                return GLYPHWELL_IN_PROGRESS;
+            return Finish(errno == ECONNRESET ? GLYPHWELL_ERROR_DISCONNECTED
+                                              : GLYPHWELL_ERROR_TRANSPORT);
+        }
+        input.append(chunk, size_t(got));
+    }
+}
+
+extern "C" {
+
+const char* glyphwell_status_text(int status) {
+    switch (status) {
+    case GLYPHWELL_OK:
+        return "success";
+    case GLYPHWELL_IN_PROGRESS:
+        return "in progress";
+    case GLYPHWELL_ERROR_INVALID_ARGUMENT:
+        return "invalid argument";
+    case GLYPHWELL_ERROR_NO_MEMORY:
+        return "out of memory";
+    case GLYPHWELL_ERROR_NOT_RUNNING:
+        return "the font agent is not running and cannot be started";
+    case GLYPHWELL_ERROR_TIMED_OUT:
+        return "no reply came in time";
+    case GLYPHWELL_ERROR_DISCONNECTED:
+        return "the font agent went away before replying";
+    case GLYPHWELL_ERROR_MALFORMED_REPLY:
+        return "the reply cannot be read";
+    case GLYPHWELL_ERROR_TRANSPORT:
+        return "the connection to the font agent failed";
+    default:
+        return "unknown status";
+    }
+}
+
+glyphwell_request* glyphwell_request_new(int question) {
+    if (question != GLYPHWELL_ASK_ACTIVATION && question != GLYPHWELL_ASK_DOWNLOAD)
+        return nullptr;
+    auto* request = new (std::nothrow) glyphwell_request;
+    if (request)
+        request->question = question;
+    return request;
+}
+
+void glyphwell_request_free(glyphwell_request* request) {
+    delete request;
+}
+
+int glyphwell_request_set_application_name(glyphwell_request* request, const char* name) {
+    if (!request || !name || !IsUTF8(name))
+        return GLYPHWELL_ERROR_INVALID_ARGUMENT;
+    request->applicationName = name;
+    request->bytes.clear();
+    return GLYPHWELL_OK;
+}
+
+int glyphwell_request_set_bundle_path(glyphwell_request* request, const char* path) {
+    if (!request || !path || !*path)
+        return GLYPHWELL_ERROR_INVALID_ARGUMENT;
+    std::string absolute = AbsolutePath(path);
+    TCFAdopted<CFURLRef> url(absolute.empty() ? nullptr : CreateFileURL(absolute));
+    if (!url)
+        return GLYPHWELL_ERROR_INVALID_ARGUMENT;
+    request->bundlePath = std::move(absolute);
+    request->bytes.clear();
+    return GLYPHWELL_OK;
+}
+
+int glyphwell_request_set_process_id(glyphwell_request* request, int32_t pid) {
+    if (!request || request->question != GLYPHWELL_ASK_DOWNLOAD)
+        return GLYPHWELL_ERROR_INVALID_ARGUMENT;
+    request->processID = pid;
+    request->bytes.clear();
+    return GLYPHWELL_OK;
+}
+
+int glyphwell_request_add_candidate_file(glyphwell_request* request, const char* path) {
+    if (!request || request->question != GLYPHWELL_ASK_ACTIVATION || !path || !*path)
+        return GLYPHWELL_ERROR_INVALID_ARGUMENT;
+    std::string absolute = AbsolutePath(path);
+    TCFAdopted<CFURLRef> url(absolute.empty() ? nullptr : CreateFileURL(absolute));
+    if (!url)
+        return GLYPHWELL_ERROR_INVALID_ARGUMENT;
+    request->candidatePaths.push_back(std::move(absolute));
+    request->bytes.clear();
+    return GLYPHWELL_OK;
+}
+
+int glyphwell_request_add_font(glyphwell_request* request, const char* postscript_name,
+                               const char* family) {
+    if (!request || !postscript_name || !*postscript_name || !IsUTF8(postscript_name) ||
+        (family && !IsUTF8(family)))
+        return GLYPHWELL_ERROR_INVALID_ARGUMENT;
+    if (request->question == GLYPHWELL_ASK_ACTIVATION && !request->fonts.empty())
+        return GLYPHWELL_ERROR_INVALID_ARGUMENT;
+    request->fonts.push_back(Font{postscript_name, family ? family : ""});
+    request->bytes.clear();
+    return GLYPHWELL_OK;
+}
+
+int glyphwell_request_set_suppress(glyphwell_request* request, int suppress) {
+    if (!request || request->question != GLYPHWELL_ASK_DOWNLOAD)
+        return GLYPHWELL_ERROR_INVALID_ARGUMENT;
+    request->suppress = suppress != 0;
+    request->bytes.clear();
+    return GLYPHWELL_OK;
+}
+
+int glyphwell_request_get_bytes(glyphwell_request* request, const void** bytes, size_t* length) {
+    if (!request || !bytes || !length || !request->Flatten())
+        return GLYPHWELL_ERROR_INVALID_ARGUMENT;
+    *bytes = request->bytes.data();
+    *length = request->bytes.size();
+    return GLYPHWELL_OK;
+}
+
+int glyphwell_call_start(glyphwell_request* request, const char* port_name, glyphwell_call** call) {
+    if (call)
+        *call = nullptr;
+    if (!request || !call || !request->Flatten())
+        return GLYPHWELL_ERROR_INVALID_ARGUMENT;
+    auto* made = new (std::nothrow) glyphwell_call;
+    if (!made)
+        return GLYPHWELL_ERROR_NO_MEMORY;
+    made->question = request->question;
+    PutBigEndian32(&made->output, uint32_t(request->question));
+    PutBigEndian32(&made->output, uint32_t(request->bytes.size()));
+    made->output += request->bytes;
+    const int status = made->Connect(port_name);
+    if (status < 0) {
+        const int error = errno;
+        delete made;
+        errno = error;
+        return status;
+    }
+    *call = made;
+    return GLYPHWELL_OK;
+}
+
+int glyphwell_call_get_fd(const glyphwell_call* call) {
+    return call ? call->fd : -1;
+}
+
+short glyphwell_call_get_events(const glyphwell_call* call) {
+    if (!call)
+        return 0;
+    switch (call->stage) {
+    case glyphwell_call::Stage::kConnecting:
+    case glyphwell_call::Stage::kWriting:
+        return POLLOUT;
+    case glyphwell_call::Stage::kReading:
+        return POLLIN;
+    default:
+        return 0;
+    }
+}
+
+int glyphwell_call_dispatch(glyphwell_call* call, glyphwell_reply** reply) {
+    if (!call || !reply)
+        return GLYPHWELL_ERROR_INVALID_ARGUMENT;
+    *reply = nullptr;
+    if (call->stage == glyphwell_call::Stage::kDone)
+        return call->outcome;
+    if (call->stage != glyphwell_call::Stage::kReading) {
+        const int status = call->Write();
+        if (status != GLYPHWELL_IN_PROGRESS || call->stage != glyphwell_call::Stage::kReading)
+            return status;
+    }
+    return call->Read(reply);
+}
+
+void glyphwell_call_free(glyphwell_call* call) {
+    delete call;
+}
+
+int glyphwell_request_send(glyphwell_request* request, const char* port_name, int timeout_ms,
+                           glyphwell_reply** reply) {
+    if (reply)
+        *reply = nullptr;
+    if (!reply)
+        return GLYPHWELL_ERROR_INVALID_ARGUMENT;
+    glyphwell_call* call = nullptr;
+    int status = glyphwell_call_start(request, port_name, &call);
+    const long long deadline = timeout_ms < 0 ? -1 : NowMilliseconds() + timeout_ms;
+    while (status >= 0) {
+        status = glyphwell_call_dispatch(call, reply);
+        if (status != GLYPHWELL_IN_PROGRESS)
+            break;
+        long long wait = -1;
+        if (deadline >= 0) {
+            wait = deadline - NowMilliseconds();
+            if (wait <= 0) {
+                status = GLYPHWELL_ERROR_TIMED_OUT;
+                break;
+            }
+        }
+        pollfd entry{glyphwell_call_get_fd(call), glyphwell_call_get_events(call), 0};
+        if (poll(&entry, 1, wait > INT32_MAX ? INT32_MAX : int(wait)) < 0 && errno != EINTR) {
+            status = GLYPHWELL_ERROR_TRANSPORT;
+            break;
+        }
+    }
+    glyphwell_call_free(call);
+    return status == GLYPHWELL_IN_PROGRESS ? GLYPHWELL_ERROR_TRANSPORT : status;
+}
+
+int glyphwell_reply_get_result(const glyphwell_reply* reply) {
+    return reply ? reply->result : -1;
+}
+
+int glyphwell_reply_get_suppress(const glyphwell_reply* reply) {
+    return reply ? reply->suppress : -1;
+}
+
+size_t glyphwell_reply_get_candidate_count(const glyphwell_reply* reply) {
+    return reply ? reply->candidateURLs.size() : 0;
+}
+
+const char* glyphwell_reply_get_candidate_url(const glyphwell_reply* reply, size_t index) {
+    if (!reply || index >= reply->candidateURLs.size())
+        return nullptr;
+    return reply->candidateURLs[index].c_str();
+}
+
+const void* glyphwell_reply_get_bytes(const glyphwell_reply* reply, size_t* length) {
+    if (length)
+        *length = reply ? reply->bytes.size() : 0;
+    return reply ? reply->bytes.data() : nullptr;
+}
+
+void glyphwell_reply_free(glyphwell_reply* reply) {
+    delete reply;
+}
+
+} // extern "C"

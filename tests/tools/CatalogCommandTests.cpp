@@ -1,0 +1,236 @@
+// `glyphwell catalog` on the installed DejaVu fonts and a font collection, checked offline and
+// against a loopback HTTP server. The verb exists when the tool is built with the agent's
+// libraries.
+#ifdef GLYPHWELL_CATALOG_TOOL
+#include <gtest/gtest.h>
+#include <openssl/evp.h>
+
+#include <filesystem>
+#include <fstream>
+#include <nlohmann/json.hpp>
+#include <sstream>
+
+#include "support/LoopbackHTTPServer.h"
+#include "tools/Commands.h"
+
+namespace {
+
+namespace fs = std::filesystem;
+using Json = nlohmann::ordered_json;
+
+const std::string kDejaVu = "/usr/share/fonts/truetype/dejavu/";
+const std::string kCollection = "/usr/share/fonts/truetype/wqy/wqy-microhei.ttc";
+
+struct Result {
+    int status;
+    std::string out;
+    std::string err;
+};
+
+std::string Contents(const std::string& path) {
+    std::ifstream file(path, std::ios::binary);
+    return std::string(std::istreambuf_iterator<char>(file), std::istreambuf_iterator<char>());
+}
+
+/// SHA-256 in hexadecimal, computed here rather than by the code under test.
+std::string SHA256Of(const std::string& bytes) {
+    unsigned char digest[EVP_MAX_MD_SIZE];
+    unsigned int length = 0;
+    EVP_Digest(bytes.data(), bytes.size(), digest, &length, EVP_sha256(), nullptr);
+    std::string hex;
+    for (unsigned int i = 0; i < length; ++i) {
+        char pair[3];
+        std::snprintf(pair, sizeof pair, "%02x", digest[i]);
+        hex += pair;
+    }
+    return hex;
+}
+
+class CatalogCommandTest : public ::testing::Test {
+protected:
+    void SetUp() override {
+        char pattern[] = "/tmp/gw-catalog-XXXXXX";
+        directory_ = mkdtemp(pattern);
+        catalog_ = directory_ + "/fonts.json";
+    }
+    void TearDown() override { fs::remove_all(directory_); }
+
+    Result Run(std::vector<std::string> arguments) {
+        arguments.insert(arguments.begin(), "catalog");
+        std::istringstream in;
+        std::ostringstream out, err;
+        const int status = glyphwell::tools::RunTool(arguments, in, out, err);
+        return {status, out.str(), err.str()};
+    }
+    Result Add(const std::vector<std::string>& files, const std::string& prefix) {
+        std::vector<std::string> arguments = {"add"};
+        arguments.insert(arguments.end(), files.begin(), files.end());
+        arguments.insert(arguments.end(), {"--url-prefix", prefix, "--catalog", catalog_});
+        return Run(arguments);
+    }
+    void Write(const std::string& text) { std::ofstream(catalog_, std::ios::binary) << text; }
+
+    std::string directory_;
+    std::string catalog_;
+};
+
+} // namespace
+
+TEST_F(CatalogCommandTest, AddsEveryFaceAndKeepsWhatItDidNotTouch) {
+    if (!fs::exists(kCollection))
+        GTEST_SKIP() << kCollection << " is not installed (fonts-wqy-microhei)";
+    Write(R"({"publisher": "kept", "assets": [{"LocalID": "Other", "url": "http://o/x.ttf",
+              "size": 1, "sha256": "00", "fonts": [{"postScriptName": "X"}], "note": 1}]})");
+    Result result = Add({kDejaVu + "DejaVuSans-Bold.ttf", kCollection}, "http://h/fonts");
+    ASSERT_EQ(result.status, 0) << result.err;
+    const std::string bold = Contents(kDejaVu + "DejaVuSans-Bold.ttf");
+    EXPECT_EQ(result.out, "added DejaVuSans-Bold (1 font, " + std::to_string(bold.size()) +
+                              " bytes) http://h/fonts/DejaVuSans-Bold.ttf\n"
+                              "added WenQuanYiMicroHei+WenQuanYiMicroHeiMono (2 fonts, " +
+                              std::to_string(fs::file_size(kCollection)) +
+                              " bytes) http://h/fonts/wqy-microhei.ttc\n" + catalog_ +
+                              ": 3 assets\n");
+    Json document = Json::parse(Contents(catalog_));
+    EXPECT_EQ(document["publisher"], "kept");
+    ASSERT_EQ(document["assets"].size(), 3u);
+    EXPECT_EQ(document["assets"][0]["note"], 1);
+    EXPECT_EQ(document["assets"][1],
+              Json::parse(R"({"LocalID": "DejaVuSans-Bold",
+        "url": "http://h/fonts/DejaVuSans-Bold.ttf", "size": )" +
+                          std::to_string(bold.size()) + R"(, "sha256": ")" + SHA256Of(bold) + R"(",
+        "fonts": [{"postScriptName": "DejaVuSans-Bold", "family": "DejaVu Sans"}]})"));
+    const Json& collection = document["assets"][2];
+    ASSERT_EQ(collection["fonts"].size(), 2u);
+    EXPECT_EQ(collection["fonts"][1]["postScriptName"], "WenQuanYiMicroHeiMono");
+    EXPECT_EQ(collection["fonts"][0]["localizedFamilyNames"]["zh-Hans"], "文泉驿微米黑");
+
+    // Adding a file again updates its entry in place.
+    result = Add({kDejaVu + "DejaVuSans-Bold.ttf"}, "https://mirror/f/");
+    ASSERT_EQ(result.status, 0) << result.err;
+    EXPECT_EQ(result.out.substr(0, 24), "updated DejaVuSans-Bold ");
+    document = Json::parse(Contents(catalog_));
+    ASSERT_EQ(document["assets"].size(), 3u);
+    EXPECT_EQ(document["assets"][1]["url"], "https://mirror/f/DejaVuSans-Bold.ttf");
+    EXPECT_EQ(Run({"check", catalog_}).status, 1); // "Other" has no proper SHA-256
+}
+
+TEST_F(CatalogCommandTest, RefusesBadInputAndLeavesTheCatalogAlone) {
+    const std::string notAFont = directory_ + "/notes.ttf";
+    std::ofstream(notAFont) << "not a font";
+    struct Case {
+        const char* catalog;
+        std::vector<std::string> arguments;
+        int status;
+        std::string message;
+    } cases[] = {
+        {"{\"assets\": []}",
+         {"add", kDejaVu + "DejaVuSans.ttf", notAFont, "--url-prefix", "u"},
+         1,
+         notAFont + ": not a font file fontconfig can read"},
+        {"[1, 2]",
+         {"add", kDejaVu + "DejaVuSans.ttf", "--url-prefix", "u"},
+         1,
+         ": no \"assets\" array; fix or remove it first"},
+        {"{", {"add", kDejaVu + "DejaVuSans.ttf", "--url-prefix", "u"}, 1, ": not JSON"},
+        {"{}", {"add", kDejaVu + "DejaVuSans.ttf"}, 2, "give the font files and --url-prefix"},
+        {"{}", {"check", "--bogus"}, 2, "unknown option --bogus"},
+        {"{}", {"list", "a", "b"}, 2, "more than one catalog given"},
+        {"{}", {"remove"}, 2, "give add, check or list"},
+    };
+    for (const Case& c : cases) {
+        Write(c.catalog);
+        std::vector<std::string> arguments = c.arguments;
+        if (arguments[0] == "add")
+            arguments.insert(arguments.end(), {"--catalog", catalog_});
+        const Result result = Run(arguments);
+        EXPECT_EQ(result.status, c.status) << c.message;
+        EXPECT_NE(result.err.find(c.message), std::string::npos) << result.err;
+        EXPECT_EQ(Contents(catalog_), c.catalog);
+    }
+}
+
+TEST_F(CatalogCommandTest, ReportsADamagedEntryWithItsPlace) {
+    const std::string good = R"({"LocalID": "A", "url": "http://h/a.ttf", "size": 3,
+        "sha256": ")" + std::string(64, 'a') +
+                             R"(", "fonts": [{"postScriptName": "A"}]})";
+    struct Case {
+        std::string text;
+        std::string line;
+    } cases[] = {
+        {R"({"assets": [)" + good + R"(, {"LocalID": "B", "url": "u", "size": 1, "fonts": []}]})",
+         "Skipping asset 1 of the downloadable font catalog " + catalog_ + ": "},
+        {R"({"assets": [)" + good + "," + good + "]}",
+         "Skipping asset 1 of the downloadable font catalog " + catalog_ +
+             ": duplicate \"LocalID\" A"},
+        {"{\"assets\": 5}", "Cannot parse the downloadable font catalog " + catalog_},
+    };
+    for (const Case& c : cases) {
+        Write(c.text);
+        const Result result = Run({"check", catalog_});
+        EXPECT_EQ(result.status, 1) << c.text;
+        EXPECT_EQ(result.out.find(c.line), 0u) << result.out;
+        EXPECT_NE(result.out.find("; 1 problem\n"), std::string::npos) << result.out;
+    }
+    Write(R"({"assets": [)" + good + "]}");
+    EXPECT_EQ(Run({"check", catalog_}).out, catalog_ + ": 1 assets, 1 fonts; 0 problems\n");
+}
+
+TEST_F(CatalogCommandTest, FetchComparesEveryAssetWithTheCatalog) {
+    glyphwell::testing::LoopbackHTTPServer server;
+    ASSERT_TRUE(server.IsListening());
+    const std::string sans = Contents(kDejaVu + "DejaVuSans-Bold.ttf");
+    const std::string serif = Contents(kDejaVu + "DejaVuSerif.ttf");
+    ASSERT_EQ(
+        Add({kDejaVu + "DejaVuSans-Bold.ttf", kDejaVu + "DejaVuSerif.ttf"}, server.URL("/fonts"))
+            .status,
+        0);
+    EXPECT_EQ(Run({"check", catalog_}).status, 0);
+    server.Serve("/fonts/DejaVuSans-Bold.ttf", {sans});
+
+    std::string changed = serif;
+    changed[1000] ^= 1;
+    struct Case {
+        const char* what;
+        bool serve;
+        std::string body;
+        std::string problem; // empty: clean
+    } cases[] = {
+        {"intact", true, serif, ""},
+        {"one byte changed", true, changed,
+         "asset DejaVuSerif: " + server.URL("/fonts/DejaVuSerif.ttf") + " has the SHA-256 " +
+             SHA256Of(changed) + ", the catalog says " + SHA256Of(serif) + "\n"},
+        {"shorter", true, serif.substr(0, 100),
+         "asset DejaVuSerif: " + server.URL("/fonts/DejaVuSerif.ttf") +
+             " has 100 bytes, the catalog says " + std::to_string(serif.size()) + "\n"},
+        {"longer", true, serif + "x",
+         "asset DejaVuSerif: " + server.URL("/fonts/DejaVuSerif.ttf") + " has more than " +
+             std::to_string(serif.size()) + " bytes, the catalog says " +
+             std::to_string(serif.size()) + "\n"},
+        {"missing", false, "", "asset DejaVuSerif: cannot download "},
+    };
+    for (const Case& c : cases) {
+        server.Serve("/fonts/DejaVuSerif.ttf", {c.body});
+        if (!c.serve)
+            server.Serve("/fonts/DejaVuSerif.ttf", {"", 1 << 20, {}, std::string::npos, "/gone"});
+        const Result result = Run({"check", catalog_, "--fetch"});
+        EXPECT_EQ(result.status, c.problem.empty() ? 0 : 1) << c.what;
+        const std::string summary = catalog_ + ": 2 assets, 2 fonts, downloaded; " +
+                                    (c.problem.empty() ? "0 problems\n" : "1 problem\n");
+        if (c.serve)
+            EXPECT_EQ(result.out, c.problem + summary) << c.what;
+        else
+            EXPECT_EQ(result.out.find(c.problem), 0u) << result.out;
+    }
+}
+
+TEST_F(CatalogCommandTest, ListsWhatIsOfferedAndWhatIsInstalled) {
+    Write(R"({"assets": [{"LocalID": "S", "url": "http://h/s", "size": 7, "sha256": ")" +
+          std::string(64, '0') + R"(", "fonts": [{"postScriptName": "DejaVuSans-Bold",
+          "family": "DejaVu Sans"}, {"postScriptName": "Nobody-Regular"}]}]})");
+    const Result result = Run({"list", catalog_});
+    EXPECT_EQ(result.status, 0) << result.err;
+    EXPECT_EQ(result.out, "installed\tDejaVuSans-Bold\tDejaVu Sans\tS\t7\n"
+                          "offered\tNobody-Regular\t\tS\t7\n");
+}
+
+#endif // GLYPHWELL_CATALOG_TOOL

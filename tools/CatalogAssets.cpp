@@ -1,0 +1,260 @@
+#include "tools/CatalogAssets.h"
+
+#include <curl/curl.h>
+#include <fcntl.h>
+#include <fontconfig/fontconfig.h>
+#include <openssl/evp.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <chrono>
+#include <cstdio>
+#include <cstring>
+#include <filesystem>
+#include <fstream>
+#include <memory>
+
+namespace glyphwell::tools {
+
+namespace {
+
+/// The catalog's language identifier for a fontconfig language tag: Chinese tags by script,
+/// the others unchanged.
+std::string LanguageIdentifier(const std::string& tag) {
+    if (tag == "zh-cn" || tag == "zh-sg")
+        return "zh-Hans";
+    if (tag == "zh-tw" || tag == "zh-hk" || tag == "zh-mo")
+        return "zh-Hant";
+    return tag;
+}
+
+/// The face described by one fontconfig pattern; false when it has no PostScript name.
+bool FaceOfPattern(FcPattern* pattern, FontFace* face) {
+    FcChar8* text = nullptr;
+    if (FcPatternGetString(pattern, FC_POSTSCRIPT_NAME, 0, &text) != FcResultMatch || !*text)
+        return false;
+    face->postScriptName = reinterpret_cast<const char*>(text);
+    // Families and their languages are parallel lists; the first family is the font's own.
+    for (int i = 0; FcPatternGetString(pattern, FC_FAMILY, i, &text) == FcResultMatch; ++i) {
+        const std::string family = reinterpret_cast<const char*>(text);
+        if (i == 0)
+            face->family = family;
+        FcChar8* language = nullptr;
+        if (FcPatternGetString(pattern, FC_FAMILYLANG, i, &language) != FcResultMatch)
+            continue;
+        const std::string identifier = LanguageIdentifier(reinterpret_cast<const char*>(language));
+        if (family != face->family && !identifier.empty())
+            face->localizedFamilyNames.emplace(identifier, family);
+    }
+    return true;
+}
+
+} // namespace
+
+bool ReadFontFaces(const std::string& path, std::vector<FontFace>* faces, std::string* error) {
+    faces->clear();
+    std::unique_ptr<FcFontSet, decltype(&FcFontSetDestroy)> set(FcFontSetCreate(),
+                                                                FcFontSetDestroy);
+    const unsigned count = set ? FcFreeTypeQueryAll(reinterpret_cast<const FcChar8*>(path.c_str()),
+                                                    -1, nullptr, nullptr, set.get())
+                               : 0;
+    if (count == 0) {
+        *error = path + ": not a font file fontconfig can read";
+        return false;
+    }
+    for (int i = 0; i < set->nfont; ++i) {
+        int index = 0;
+        FcPatternGetInteger(set->fonts[i], FC_INDEX, 0, &index);
+        if (index >> 16) // a named instance of a variable font
+            continue;
+        FontFace face;
+        if (!FaceOfPattern(set->fonts[i], &face)) {
+            *error = path + ": face " + std::to_string(index) + " has no PostScript name";
+            return false;
+        }
+        faces->push_back(std::move(face));
+    }
+    return true;
+}
+
+SHA256::SHA256() : context_(EVP_MD_CTX_new()) {
+    auto* context = static_cast<EVP_MD_CTX*>(context_);
+    if (context && EVP_DigestInit_ex(context, EVP_sha256(), nullptr) != 1) {
+        EVP_MD_CTX_free(context);
+        context_ = nullptr;
+    }
+}
+
+SHA256::~SHA256() {
+    EVP_MD_CTX_free(static_cast<EVP_MD_CTX*>(context_));
+}
+
+void SHA256::Update(const void* bytes, size_t count) {
+    auto* context = static_cast<EVP_MD_CTX*>(context_);
+    if (context && EVP_DigestUpdate(context, bytes, count) != 1) {
+        EVP_MD_CTX_free(context);
+        context_ = nullptr;
+    }
+}
+
+std::string SHA256::HexDigest() {
+    unsigned char digest[EVP_MAX_MD_SIZE];
+    unsigned int length = 0;
+    auto* context = static_cast<EVP_MD_CTX*>(context_);
+    if (!context || EVP_DigestFinal_ex(context, digest, &length) != 1)
+        return {};
+    static const char digits[] = "0123456789abcdef";
+    std::string hex;
+    for (unsigned int i = 0; i < length; ++i) {
+        hex += digits[digest[i] >> 4];
+        hex += digits[digest[i] & 15];
+    }
+    return hex;
+}
+
+bool DigestFile(const std::string& path, uint64_t* size, std::string* sha256, std::string* error) {
+    std::ifstream file(path, std::ios::binary);
+    if (!file) {
+        *error = path + ": cannot open: " + std::strerror(errno);
+        return false;
+    }
+    SHA256 digest;
+    char buffer[65536];
+    *size = 0;
+    while (file) {
+        file.read(buffer, sizeof buffer);
+        digest.Update(buffer, size_t(file.gcount()));
+        *size += uint64_t(file.gcount());
+    }
+    *sha256 = digest.HexDigest();
+    if (file.bad() || sha256->empty()) {
+        *error = path + ": cannot read";
+        return false;
+    }
+    return true;
+}
+
+bool ReplaceFileAtomically(const std::string& path, const std::string& text, std::string* error) {
+    const std::filesystem::path target(path);
+    std::string pattern =
+        (target.parent_path().empty() ? std::filesystem::path(".") : target.parent_path()) /
+        ("." + target.filename().string() + ".XXXXXX");
+    const int fd = mkstemp(pattern.data());
+    if (fd < 0) {
+        *error = "cannot write beside " + path + ": " + std::strerror(errno);
+        return false;
+    }
+    bool good = fchmod(fd, 0644) == 0;
+    for (size_t done = 0; good && done < text.size();) {
+        const ssize_t written = write(fd, text.data() + done, text.size() - done);
+        if (written < 0 && errno == EINTR)
+            continue;
+        good = written > 0;
+        done += good ? size_t(written) : 0;
+    }
+    good = good && fsync(fd) == 0;
+    const int savedErrno = errno;
+    good = close(fd) == 0 && good;
+    if (good && rename(pattern.c_str(), path.c_str()) == 0)
+        return true;
+    *error = "cannot write " + path + ": " + std::strerror(good ? errno : savedErrno);
+    unlink(pattern.c_str());
+    return false;
+}
+
+std::string AssetURL(const std::string& prefix, const std::string& path) {
+    static const char digits[] = "0123456789ABCDEF";
+    std::string url = prefix;
+    if (url.empty() || url.back() != '/')
+        url += '/';
+    for (const unsigned char c : std::filesystem::path(path).filename().string()) {
+        if (std::isalnum(c) || c == '-' || c == '.' || c == '_' || c == '~') {
+            url += char(c);
+        } else {
+            url += '%';
+            url += digits[c >> 4];
+            url += digits[c & 15];
+        }
+    }
+    return url;
+}
+
+namespace {
+
+/// What the transfer callbacks share.
+struct Transfer {
+    SHA256 digest;
+    uint64_t received = 0;
+    uint64_t limit = 0;
+    bool overLimit = false;
+    const FetchProgress* progress = nullptr;
+    std::chrono::steady_clock::time_point start = std::chrono::steady_clock::now();
+    std::chrono::steady_clock::time_point lastReport = start;
+};
+
+/// libcurl's write callback: digests and counts the bytes, ends the transfer over the limit.
+size_t Receive(char* bytes, size_t size, size_t count, void* context) {
+    auto* transfer = static_cast<Transfer*>(context);
+    const size_t length = size * count;
+    if (transfer->received + length > transfer->limit) {
+        transfer->overLimit = true;
+        return 0; // ends the transfer
+    }
+    transfer->digest.Update(bytes, length);
+    transfer->received += length;
+    const auto now = std::chrono::steady_clock::now();
+    if (*transfer->progress && now - transfer->lastReport >= std::chrono::milliseconds(200)) {
+        transfer->lastReport = now;
+        (*transfer->progress)(transfer->received,
+                              std::chrono::duration<double>(now - transfer->start).count());
+    }
+    return length;
+}
+
+} // namespace
+
+FetchResult FetchAsset(const std::string& url, uint64_t limit, const FetchProgress& progress) {
+    static const CURLcode initialized = curl_global_init(CURL_GLOBAL_DEFAULT);
+    FetchResult result;
+    std::unique_ptr<CURL, decltype(&curl_easy_cleanup)> curl(
+        initialized == CURLE_OK ? curl_easy_init() : nullptr, curl_easy_cleanup);
+    if (!curl) {
+        result.error = "libcurl cannot be set up";
+        return result;
+    }
+    Transfer transfer;
+    transfer.limit = limit;
+    transfer.progress = &progress;
+    char message[CURL_ERROR_SIZE] = "";
+    curl_easy_setopt(curl.get(), CURLOPT_URL, url.c_str());
+    curl_easy_setopt(curl.get(), CURLOPT_FOLLOWLOCATION, 1L);
+    curl_easy_setopt(curl.get(), CURLOPT_MAXREDIRS, 10L);
+    curl_easy_setopt(curl.get(), CURLOPT_NOSIGNAL, 1L);
+    curl_easy_setopt(curl.get(), CURLOPT_CONNECTTIMEOUT, 30L);
+    // Give up on a transfer that moves less than 1 byte a second for 60 s.
+    curl_easy_setopt(curl.get(), CURLOPT_LOW_SPEED_LIMIT, 1L);
+    curl_easy_setopt(curl.get(), CURLOPT_LOW_SPEED_TIME, 60L);
+    curl_easy_setopt(curl.get(), CURLOPT_ERRORBUFFER, message);
+    curl_easy_setopt(curl.get(), CURLOPT_WRITEFUNCTION, Receive);
+    curl_easy_setopt(curl.get(), CURLOPT_WRITEDATA, &transfer);
+    const CURLcode code = curl_easy_perform(curl.get());
+    long status = 0;
+    curl_easy_getinfo(curl.get(), CURLINFO_RESPONSE_CODE, &status);
+    result.size = transfer.received;
+    result.tooLarge = transfer.overLimit;
+    if (transfer.overLimit)
+        result.error = "more than " + std::to_string(limit) + " bytes";
+    else if (code != CURLE_OK)
+        result.error = *message ? message : curl_easy_strerror(code);
+    else if (status >= 400)
+        result.error = "HTTP status " + std::to_string(status);
+    else
+        result.sha256 = transfer.digest.HexDigest();
+    if (progress)
+        progress(transfer.received,
+                 std::chrono::duration<double>(std::chrono::steady_clock::now() - transfer.start)
+                     .count());
+    return result;
+}
+
+} // namespace glyphwell::tools
