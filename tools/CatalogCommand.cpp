@@ -13,6 +13,7 @@
 #include "desktop/QZDownloadableFontCatalog.h"
 #include "desktop/QZFontMatching.h"
 #include "platform/Log.h"
+#include "platform/LogEscape.h"
 #include "tools/CatalogAssets.h"
 
 namespace glyphwell::tools {
@@ -31,19 +32,9 @@ using Json = nlohmann::ordered_json;
 /// The agent's catalogs are at most this large.
 constexpr uint64_t kMaximumCatalogSize = 64u << 20;
 
-/// `text` with control characters and DEL written as \xNN, for printing outside values.
-std::string Escaped(const std::string& text) {
-    std::string escaped;
-    for (const unsigned char c : text) {
-        if (c < 0x20 || c == 0x7F) {
-            char code[5];
-            std::snprintf(code, sizeof code, "\\x%02X", c);
-            escaped += code;
-        } else {
-            escaped += char(c);
-        }
-    }
-    return escaped;
+/// `text` escaped as every outside value the agent logs, for printing catalog values.
+std::string Escaped(std::string_view text) {
+    return glyphwell::LogEscape(text);
 }
 
 /// The catalog the agent would read: the first search path that exists, else the first one.
@@ -288,7 +279,7 @@ void FetchAndCompare(const QZDownloadableFontAsset& asset, bool progress, std::o
             out << "\r" << name << ": " << received << " bytes, " << Rate(received, seconds)
                 << "\x1b[K" << std::flush;
         };
-    const FetchResult result = FetchAsset(asset.url, asset.size, report);
+    const FetchResult result = FetchAsset(std::string(asset.url), asset.size, report);
     if (progress)
         out << "\n";
     if (result.tooLarge) {
@@ -304,7 +295,7 @@ void FetchAndCompare(const QZDownloadableFontAsset& asset, bool progress, std::o
                             std::to_string(asset.size));
     } else if (result.sha256 != asset.sha256) {
         problems->push_back(name + ": " + Escaped(asset.url) + " has the SHA-256 " + result.sha256 +
-                            ", the catalog says " + asset.sha256);
+                            ", the catalog says " + std::string(asset.sha256));
     }
 }
 
@@ -356,8 +347,8 @@ int RunList(const std::vector<std::string>& arguments, std::ostream& out, std::o
         err << problem << "\n";
     for (const QZDownloadableFontAsset& asset : catalog.assets)
         for (const QZDownloadableFont& font : asset.fonts)
-            out << (QZIsFontInstalled(font.postScriptName) ? "installed" : "offered") << "\t"
-                << Escaped(font.postScriptName) << "\t" << Escaped(font.family) << "\t"
+            out << (QZIsFontInstalled(std::string(font.postScriptName)) ? "installed" : "offered")
+                << "\t" << Escaped(font.postScriptName) << "\t" << Escaped(font.family) << "\t"
                 << Escaped(asset.localID) << "\t" << asset.size << "\n";
     // fontconfig holds its configuration until told to let go.
     FcFini();
