@@ -27,7 +27,7 @@
 #include <string>
 
 #include "cfutil/TStackBuffer.h"
-#include "platform/CFRuntime.h"
+#include "platform/CFKind.h"
 #include "platform/Log.h"
 
 namespace {
@@ -207,8 +207,7 @@ CFStringRef TCFStringUniquerImp::Insert(Entry* entry) {
     }
 
     // Only this thread knows the string yet: the flag is set before the release store below.
-    const_cast<glyphwell::runtime::CFObject*>(glyphwell::runtime::AsObject(entry->string))
-        ->MakeImmortal();
+    CFMakeShared(entry->string);
     size_t slot = table->Home(entry->hash);
     while (table->slots[slot].load(std::memory_order_relaxed))
         slot = (slot + 1) & table->mask;

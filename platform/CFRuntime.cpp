@@ -131,8 +131,16 @@ CFStringRef CFCopyTypeIDDescription(CFTypeID typeID) {
         "CFString", "CFData",       "CFCharacterSet", "CFArray",
         "CFSet",    "CFDictionary", "CFURL",          "CFUUID",
         "CFError",  "CFDate",       "CFMessagePort",  "CFRunLoopSource"};
-    if (typeID == 0 || typeID >= kKindCount)
+    if (typeID == 0)
         return nullptr;
+    if (typeID >= kKindCount) {
+        std::string name = RegisteredKindName(typeID);
+        return name.empty()
+                   ? nullptr
+                   : CFStringCreateWithBytes(kCFAllocatorDefault,
+                                             reinterpret_cast<const UInt8*>(name.data()),
+                                             CFIndex(name.size()), kCFStringEncodingUTF8, false);
+    }
     return CFStringCreateWithCString(kCFAllocatorDefault, names[typeID], kCFStringEncodingUTF8);
 }
 
