@@ -125,13 +125,16 @@ CFArrayRef CFArrayCreateCopy(CFAllocatorRef, CFArrayRef array) {
     return createArray(source->values.data(), countOf(source), &source->callBacks, false);
 }
 
-CFMutableArrayRef CFArrayCreateMutable(CFAllocatorRef, CFIndex, const CFArrayCallBacks* callBacks) {
+CFMutableArrayRef CFArrayCreateMutable(CFAllocatorRef, CFIndex capacity,
+                                       const CFArrayCallBacks* callBacks) {
+    if (!GW_CHECK_ARGUMENT(capacity >= 0))
+        return nullptr;
     return new __CFArray(callBacks, true);
 }
 
-CFMutableArrayRef CFArrayCreateMutableCopy(CFAllocatorRef, CFIndex, CFArrayRef array) {
+CFMutableArrayRef CFArrayCreateMutableCopy(CFAllocatorRef, CFIndex capacity, CFArrayRef array) {
     const __CFArray* source = arrayOf(array);
-    if (!source)
+    if (!source || !GW_CHECK_ARGUMENT(capacity >= 0))
         return nullptr;
     return createArray(source->values.data(), countOf(source), &source->callBacks, true);
 }

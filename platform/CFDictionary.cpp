@@ -6,99 +6,26 @@
 #include "platform/Log.h"
 
 using glyphwell::runtime::CallEqual;
-using glyphwell::runtime::CallRelease;
-using glyphwell::runtime::CallRetain;
-using glyphwell::runtime::CFObject;
-using glyphwell::runtime::ElementReleaser;
+using glyphwell::runtime::HashedCollection;
 using glyphwell::runtime::HashedEntry;
-using glyphwell::runtime::HashedTable;
 using glyphwell::runtime::kDictionaryKind;
 using glyphwell::runtime::PutMode;
 using glyphwell::runtime::ReportInvalidArgument;
 using Where = glyphwell::runtime::SourceLocation;
 
-/// A dictionary: a hashed table of pairs, each key and value holding the count its retain
-/// callback took.
-struct __CFDictionary final : CFObject {
+/// A dictionary: a hashed collection of pairs.
+struct __CFDictionary final : HashedCollection {
     __CFDictionary(const CFDictionaryKeyCallBacks* keyCallBacks,
                    const CFDictionaryValueCallBacks* valueCallBacks, bool isMutable)
-        : CFObject(kDictionaryKind),
-          keyCallBacks(keyCallBacks ? *keyCallBacks : CFDictionaryKeyCallBacks{}),
-          valueCallBacks(valueCallBacks ? *valueCallBacks : CFDictionaryValueCallBacks{}),
-          isMutable(isMutable), table(this->keyCallBacks.hash, this->keyCallBacks.equal) {}
+        : HashedCollection(kDictionaryKind, "CFDictionary", keyCallBacks, valueCallBacks,
+                           isMutable) {}
 
-    ~__CFDictionary() override {
-        ElementReleaser releaser;
-        table.ForEach([&](const HashedEntry& entry) {
-            releaser.Release(keyCallBacks.release, entry.key);
-            releaser.Release(valueCallBacks.release, entry.value);
-        });
-    }
-
-    // Same count, and every key of this one is in `other` with an equal value.
-    bool Equals(const CFObject& other) const override {
-        const auto& that = static_cast<const __CFDictionary&>(other);
-        if (table.Count() != that.table.Count())
-            return false;
-        return !table.Any([&](const HashedEntry& entry) {
-            CFIndex position = that.Find(entry.key);
-            return position < 0 || !CallEqual(valueCallBacks.equal, entry.value,
-                                              that.table.EntryAt(position).value);
-        });
-    }
-
-    CFHashCode Hash() const override { return CFHashCode(table.Count()); }
-
-    std::string Description() const override {
-        std::string text = glyphwell::runtime::DescriptionPrefix(this, "CFDictionary");
-        text += "{count = " + std::to_string(table.Count()) + ", entries = (\n";
-        table.ForEach([&](const HashedEntry& entry) {
-            text += '\t';
-            text += glyphwell::runtime::CallDescribe(keyCallBacks.copyDescription, entry.key);
-            text += " = ";
-            text += glyphwell::runtime::CallDescribe(valueCallBacks.copyDescription, entry.value);
-            text += '\n';
-        });
-        text += ")}";
-        return text;
-    }
-
-    CFIndex Find(const void* key) const { return table.Find(key, table.HashOf(key)); }
-
-    void Put(const void* key, const void* value, PutMode mode) {
-        CFHashCode hash = table.HashOf(key);
-        CFIndex position = table.Find(key, hash);
-        if (position < 0) {
-            if (mode != PutMode::ReplaceOnly)
-                table.Append(CallRetain(keyCallBacks.retain, key),
-                             CallRetain(valueCallBacks.retain, value), hash);
-            return;
-        }
-        if (mode == PutMode::AddOnly)
-            return;
-        // The key keeps its object and place. Retain the new value first: it may be the old one.
-        const void* retained = CallRetain(valueCallBacks.retain, value);
-        HashedEntry& entry = table.EntryAt(position);
-        const void* replaced = entry.value;
-        entry.value = retained;
-        CallRelease(valueCallBacks.release, replaced);
-    }
-
-    // A new dictionary with the same callbacks and pairs, each retained again.
+    /// A new dictionary with the same callbacks and pairs, each retained again.
     __CFDictionary* Copy(bool copyIsMutable) const {
         auto* copy = new __CFDictionary(&keyCallBacks, &valueCallBacks, copyIsMutable);
-        copy->table.Reserve(table.Count());
-        table.ForEach([&](const HashedEntry& entry) {
-            copy->table.Append(CallRetain(keyCallBacks.retain, entry.key),
-                               CallRetain(valueCallBacks.retain, entry.value), entry.hash);
-        });
+        CopyEntriesTo(*copy);
         return copy;
     }
-
-    CFDictionaryKeyCallBacks keyCallBacks;
-    CFDictionaryValueCallBacks valueCallBacks;
-    bool isMutable;
-    HashedTable table;
 };
 
 namespace {
@@ -149,16 +76,18 @@ CFDictionaryRef CFDictionaryCreateCopy(CFAllocatorRef, CFDictionaryRef dictionar
     return source->Copy(false);
 }
 
-CFMutableDictionaryRef CFDictionaryCreateMutable(CFAllocatorRef, CFIndex,
+CFMutableDictionaryRef CFDictionaryCreateMutable(CFAllocatorRef, CFIndex capacity,
                                                  const CFDictionaryKeyCallBacks* keyCallBacks,
                                                  const CFDictionaryValueCallBacks* valueCallBacks) {
+    if (!GW_CHECK_ARGUMENT(capacity >= 0))
+        return nullptr;
     return new __CFDictionary(keyCallBacks, valueCallBacks, true);
 }
 
-CFMutableDictionaryRef CFDictionaryCreateMutableCopy(CFAllocatorRef, CFIndex,
+CFMutableDictionaryRef CFDictionaryCreateMutableCopy(CFAllocatorRef, CFIndex capacity,
                                                      CFDictionaryRef dictionary) {
     const __CFDictionary* source = dictionaryOf(dictionary);
-    return source ? source->Copy(true) : nullptr;
+    return source && GW_CHECK_ARGUMENT(capacity >= 0) ? source->Copy(true) : nullptr;
 }
 
 CFIndex CFDictionaryGetCount(CFDictionaryRef dictionary) {
@@ -256,9 +185,7 @@ void CFDictionaryRemoveValue(CFMutableDictionaryRef dictionary, const void* key)
     CFIndex position = object ? object->Find(key) : -1;
     if (position < 0)
         return;
-    HashedEntry removed = object->table.Remove(position);
-    CallRelease(object->keyCallBacks.release, removed.key);
-    CallRelease(object->valueCallBacks.release, removed.value);
+    object->ReleaseEntry(object->table.Remove(position));
 }
 
 void CFDictionaryRemoveAllValues(CFMutableDictionaryRef dictionary) {
@@ -266,8 +193,6 @@ void CFDictionaryRemoveAllValues(CFMutableDictionaryRef dictionary) {
     if (!object)
         return;
     // Empty the dictionary before releasing, so release callbacks see a consistent dictionary.
-    for (const HashedEntry& entry : object->table.TakeAll()) {
-        CallRelease(object->keyCallBacks.release, entry.key);
-        CallRelease(object->valueCallBacks.release, entry.value);
-    }
+    for (const HashedEntry& entry : object->table.TakeAll())
+        object->ReleaseEntry(entry);
 }

@@ -5,6 +5,7 @@
 #include <cstring>
 #include <limits>
 
+#include "platform/ArgumentChecks.h"
 #include "platform/CFRuntime.h"
 #include "platform/Log.h"
 
@@ -215,7 +216,7 @@ template <class T> static T Load(const void* valuePtr) {
 }
 
 CFNumberRef CFNumberCreate(CFAllocatorRef, CFNumberType type, const void* valuePtr) {
-    if (!IsValidType(type) || !valuePtr)
+    if (!GW_CHECK_ARGUMENT(IsValidType(type)) || !GW_CHECK_ARGUMENT(valuePtr != nullptr))
         return nullptr;
     if (IsFloatType(type)) {
         double real = CFNumberTypeByteSize(type) == 4 ? double(Load<float>(valuePtr))
@@ -242,26 +243,26 @@ CFNumberRef CFNumberCreate(CFAllocatorRef, CFNumberType type, const void* valueP
 
 CFNumberType CFNumberGetType(CFNumberRef number) {
     const __CFNumber* object = AsNumber(number);
-    GW_ASSERT(object != nullptr);
+    GW_CHECK_ARGUMENT(object != nullptr);
     return object ? object->type : 0;
 }
 
 CFIndex CFNumberGetByteSize(CFNumberRef number) {
     const __CFNumber* object = AsNumber(number);
-    GW_ASSERT(object != nullptr);
+    GW_CHECK_ARGUMENT(object != nullptr);
     return object ? CFNumberTypeByteSize(object->type) : 0;
 }
 
 Boolean CFNumberIsFloatType(CFNumberRef number) {
     const __CFNumber* object = AsNumber(number);
-    GW_ASSERT(object != nullptr);
+    GW_CHECK_ARGUMENT(object != nullptr);
     return object && object->isFloat;
 }
 
 Boolean CFNumberGetValue(CFNumberRef number, CFNumberType type, void* valuePtr) {
     const __CFNumber* object = AsNumber(number);
-    GW_ASSERT(object != nullptr);
-    GW_ASSERT(valuePtr != nullptr);
+    GW_CHECK_ARGUMENT(object != nullptr);
+    GW_CHECK_ARGUMENT(valuePtr != nullptr);
     if (!object || !valuePtr || !IsValidType(type))
         return false;
     CFIndex size = CFNumberTypeByteSize(type);
@@ -308,7 +309,7 @@ Boolean CFNumberGetValue(CFNumberRef number, CFNumberType type, void* valuePtr) 
 CFComparisonResult CFNumberCompare(CFNumberRef a, CFNumberRef b, void*) {
     const __CFNumber* left = AsNumber(a);
     const __CFNumber* right = AsNumber(b);
-    GW_ASSERT(left != nullptr && right != nullptr);
+    GW_CHECK_ARGUMENT(left != nullptr && right != nullptr);
     if (!left || !right)
         return kCFCompareEqualTo;
     return CompareNumbers(*left, *right);
@@ -316,6 +317,6 @@ CFComparisonResult CFNumberCompare(CFNumberRef a, CFNumberRef b, void*) {
 
 Boolean CFBooleanGetValue(CFBooleanRef boolean) {
     const __CFBoolean* object = glyphwell::runtime::As<__CFBoolean>(boolean, kBooleanKind);
-    GW_ASSERT(object != nullptr);
+    GW_CHECK_ARGUMENT(object != nullptr);
     return object && object->value;
 }

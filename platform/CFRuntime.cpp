@@ -2,6 +2,7 @@
 
 #include <cstdio>
 
+#include "platform/ArgumentChecks.h"
 #include "platform/CFString.h"
 #include "platform/Log.h"
 
@@ -78,25 +79,25 @@ const CFAllocatorRef kCFAllocatorMalloc = &mallocAllocator;
 const CFAllocatorRef kCFAllocatorNull = &nullAllocator;
 
 CFTypeRef CFRetain(CFTypeRef value) {
-    GW_ASSERT(value != nullptr);
+    GW_CHECK_ARGUMENT(value != nullptr);
     if (value)
         AsObject(value)->Retain();
     return value;
 }
 
 void CFRelease(CFTypeRef value) {
-    GW_ASSERT(value != nullptr);
+    GW_CHECK_ARGUMENT(value != nullptr);
     if (value && AsObject(value)->ReleaseShouldDestroy())
         delete AsObject(value);
 }
 
 CFIndex CFGetRetainCount(CFTypeRef value) {
-    GW_ASSERT(value != nullptr);
+    GW_CHECK_ARGUMENT(value != nullptr);
     return value ? AsObject(value)->RetainCount() : 0;
 }
 
 CFTypeID CFGetTypeID(CFTypeRef value) {
-    GW_ASSERT(value != nullptr);
+    GW_CHECK_ARGUMENT(value != nullptr);
     return value ? AsObject(value)->Kind() : 0;
 }
 
@@ -111,12 +112,12 @@ Boolean CFEqual(CFTypeRef a, CFTypeRef b) {
 }
 
 CFHashCode CFHash(CFTypeRef value) {
-    GW_ASSERT(value != nullptr);
+    GW_CHECK_ARGUMENT(value != nullptr);
     return value ? AsObject(value)->Hash() : 0;
 }
 
 CFStringRef CFCopyDescription(CFTypeRef value) {
-    GW_ASSERT(value != nullptr);
+    GW_CHECK_ARGUMENT(value != nullptr);
     if (!value)
         return nullptr;
     std::string text = AsObject(value)->Description();

@@ -5,83 +5,36 @@
 #include "platform/CFCollectionStorage.h"
 #include "platform/Log.h"
 
-using glyphwell::runtime::CallRelease;
-using glyphwell::runtime::CallRetain;
-using glyphwell::runtime::CFObject;
-using glyphwell::runtime::ElementReleaser;
+using glyphwell::runtime::HashedCollection;
 using glyphwell::runtime::HashedEntry;
-using glyphwell::runtime::HashedTable;
 using glyphwell::runtime::kSetKind;
 using glyphwell::runtime::PutMode;
 using glyphwell::runtime::ReportInvalidArgument;
 using Where = glyphwell::runtime::SourceLocation;
 
-/// A set: its members are the keys of a hashed table, each holding the count its retain
-/// callback took.
-struct __CFSet final : CFObject {
+/// The key callbacks that a set's callbacks amount to (the two records have the same fields).
+static CFDictionaryKeyCallBacks KeyCallBacksOf(const CFSetCallBacks* callBacks) {
+    if (!callBacks)
+        return {};
+    return {callBacks->version,         callBacks->retain, callBacks->release,
+            callBacks->copyDescription, callBacks->equal,  callBacks->hash};
+}
+
+/// A set: its members are the keys of a hashed collection.
+struct __CFSet final : HashedCollection {
     __CFSet(const CFSetCallBacks* callBacks, bool isMutable)
-        : CFObject(kSetKind), callBacks(callBacks ? *callBacks : CFSetCallBacks{}),
-          isMutable(isMutable), table(this->callBacks.hash, this->callBacks.equal) {}
+        : __CFSet(KeyCallBacksOf(callBacks), isMutable) {}
+    __CFSet(const CFDictionaryKeyCallBacks& keys, bool isMutable)
+        : HashedCollection(kSetKind, "CFSet", &keys, nullptr, isMutable) {}
 
-    ~__CFSet() override {
-        ElementReleaser releaser;
-        table.ForEach(
-            [&](const HashedEntry& entry) { releaser.Release(callBacks.release, entry.key); });
-    }
+    void Put(const void* value, PutMode mode) { HashedCollection::Put(value, nullptr, mode); }
 
-    bool Equals(const CFObject& other) const override {
-        const auto& that = static_cast<const __CFSet&>(other);
-        return table.Count() == that.table.Count() &&
-               !table.Any([&](const HashedEntry& entry) { return that.Find(entry.key) < 0; });
-    }
-
-    CFHashCode Hash() const override { return CFHashCode(table.Count()); }
-
-    std::string Description() const override {
-        std::string text = glyphwell::runtime::DescriptionPrefix(this, "CFSet");
-        text += "{count = " + std::to_string(table.Count()) + ", values = (\n";
-        table.ForEach([&](const HashedEntry& entry) {
-            text += '\t';
-            text += glyphwell::runtime::CallDescribe(callBacks.copyDescription, entry.key);
-            text += '\n';
-        });
-        text += ")}";
-        return text;
-    }
-
-    CFIndex Find(const void* value) const { return table.Find(value, table.HashOf(value)); }
-
-    void Put(const void* value, PutMode mode) {
-        CFHashCode hash = table.HashOf(value);
-        CFIndex position = table.Find(value, hash);
-        if (position < 0) {
-            if (mode != PutMode::ReplaceOnly)
-                table.Append(CallRetain(callBacks.retain, value), nullptr, hash);
-            return;
-        }
-        if (mode == PutMode::AddOnly)
-            return;
-        // Retain the newcomer first: it may be the member it replaces.
-        const void* retained = CallRetain(callBacks.retain, value);
-        HashedEntry& entry = table.EntryAt(position);
-        const void* replaced = entry.key;
-        entry.key = retained;
-        CallRelease(callBacks.release, replaced);
-    }
-
-    // A new set with the same callbacks and members, each retained again.
+    /// A new set with the same callbacks and members, each retained again.
     __CFSet* Copy(bool copyIsMutable) const {
-        auto* copy = new __CFSet(&callBacks, copyIsMutable);
-        copy->table.Reserve(table.Count());
-        table.ForEach([&](const HashedEntry& entry) {
-            copy->table.Append(CallRetain(callBacks.retain, entry.key), nullptr, entry.hash);
-        });
+        auto* copy = new __CFSet(keyCallBacks, copyIsMutable);
+        CopyEntriesTo(*copy);
         return copy;
     }
-
-    CFSetCallBacks callBacks;
-    bool isMutable;
-    HashedTable table;
 };
 
 namespace {
@@ -130,13 +83,16 @@ CFSetRef CFSetCreateCopy(CFAllocatorRef, CFSetRef set) {
     return source->Copy(false);
 }
 
-CFMutableSetRef CFSetCreateMutable(CFAllocatorRef, CFIndex, const CFSetCallBacks* callBacks) {
+CFMutableSetRef CFSetCreateMutable(CFAllocatorRef, CFIndex capacity,
+                                   const CFSetCallBacks* callBacks) {
+    if (!GW_CHECK_ARGUMENT(capacity >= 0))
+        return nullptr;
     return new __CFSet(callBacks, true);
 }
 
-CFMutableSetRef CFSetCreateMutableCopy(CFAllocatorRef, CFIndex, CFSetRef set) {
+CFMutableSetRef CFSetCreateMutableCopy(CFAllocatorRef, CFIndex capacity, CFSetRef set) {
     const __CFSet* source = setOf(set);
-    return source ? source->Copy(true) : nullptr;
+    return source && GW_CHECK_ARGUMENT(capacity >= 0) ? source->Copy(true) : nullptr;
 }
 
 CFIndex CFSetGetCount(CFSetRef set) {
@@ -207,8 +163,7 @@ void CFSetRemoveValue(CFMutableSetRef set, const void* value) {
     CFIndex position = object ? object->Find(value) : -1;
     if (position < 0)
         return;
-    HashedEntry removed = object->table.Remove(position);
-    CallRelease(object->callBacks.release, removed.key);
+    object->ReleaseEntry(object->table.Remove(position));
 }
 
 void CFSetRemoveAllValues(CFMutableSetRef set) {
@@ -217,5 +172,5 @@ void CFSetRemoveAllValues(CFMutableSetRef set) {
         return;
     // Empty the set before releasing, so release callbacks see a consistent set.
     for (const HashedEntry& entry : object->table.TakeAll())
-        CallRelease(object->callBacks.release, entry.key);
+        object->ReleaseEntry(entry);
 }
