@@ -131,7 +131,7 @@ const __CFData* AsData(CFDataRef data) {
     return glyphwell::runtime::As<__CFData>(data, kDataKind);
 }
 
-// The mutable data behind `data`, or null (reported) when it is missing or immutable.
+/// The mutable data behind `data`, or null (reported) when it is missing or immutable.
 __CFData* AsMutableData(CFMutableDataRef data, const glyphwell::runtime::SourceLocation& where =
                                                    glyphwell::runtime::SourceLocation::current()) {
     __CFData* object = glyphwell::runtime::AsMutable<__CFData>(data, kDataKind);
@@ -148,7 +148,7 @@ bool RangeInside(CFRange range, CFIndex length,
                                           "RangeInside(range, object->length)");
 }
 
-// A new data object with a copy of `length` bytes, `capacity` reserved (a hint only).
+/// A new data object with a copy of `length` bytes, `capacity` reserved (a hint only).
 __CFData* NewData(bool isMutable, const UInt8* bytes, CFIndex length, CFIndex capacity) {
     __CFData* data = new __CFData(isMutable, nullptr, 0, 0, true);
     // The capacity is only a hint: a huge one is not taken as a reason to allocate.

@@ -30,15 +30,15 @@ struct __CFDictionary final : HashedCollection {
 
 namespace {
 
-// The dictionary behind a reference, or null (reported) when it is not one.
-__CFDictionary* dictionaryOf(const void* dictionary, const Where& where = Where::current()) {
+/// The dictionary behind a reference, or null (reported) when it is not one.
+__CFDictionary* DictionaryOf(const void* dictionary, const Where& where = Where::current()) {
     return glyphwell::runtime::CheckedObject<__CFDictionary>(dictionary, kDictionaryKind,
                                                              "dictionary is a CFDictionary", where);
 }
 
-// The dictionary behind a reference when it may be changed, else null (reported).
-__CFDictionary* mutableDictionaryOf(const void* dictionary, const Where& where = Where::current()) {
-    __CFDictionary* object = dictionaryOf(dictionary, where);
+/// The dictionary behind a reference when it may be changed, else null (reported).
+__CFDictionary* MutableDictionaryOf(const void* dictionary, const Where& where = Where::current()) {
+    __CFDictionary* object = DictionaryOf(dictionary, where);
     if (object && !object->isMutable) {
         ReportInvalidArgument("dictionary is mutable", where);
         return nullptr;
@@ -68,7 +68,7 @@ CFDictionaryRef CFDictionaryCreate(CFAllocatorRef, const void** keys, const void
 
 // A copy of an immutable dictionary is the dictionary itself: nothing can tell them apart.
 CFDictionaryRef CFDictionaryCreateCopy(CFAllocatorRef, CFDictionaryRef dictionary) {
-    const __CFDictionary* source = dictionaryOf(dictionary);
+    const __CFDictionary* source = DictionaryOf(dictionary);
     if (!source)
         return nullptr;
     if (!source->isMutable)
@@ -86,12 +86,12 @@ CFMutableDictionaryRef CFDictionaryCreateMutable(CFAllocatorRef, CFIndex capacit
 
 CFMutableDictionaryRef CFDictionaryCreateMutableCopy(CFAllocatorRef, CFIndex capacity,
                                                      CFDictionaryRef dictionary) {
-    const __CFDictionary* source = dictionaryOf(dictionary);
+    const __CFDictionary* source = DictionaryOf(dictionary);
     return source && GW_CHECK_ARGUMENT(capacity >= 0) ? source->Copy(true) : nullptr;
 }
 
 CFIndex CFDictionaryGetCount(CFDictionaryRef dictionary) {
-    const __CFDictionary* object = dictionaryOf(dictionary);
+    const __CFDictionary* object = DictionaryOf(dictionary);
     return object ? object->table.Count() : 0;
 }
 
@@ -100,7 +100,7 @@ CFIndex CFDictionaryGetCountOfKey(CFDictionaryRef dictionary, const void* key) {
 }
 
 CFIndex CFDictionaryGetCountOfValue(CFDictionaryRef dictionary, const void* value) {
-    const __CFDictionary* object = dictionaryOf(dictionary);
+    const __CFDictionary* object = DictionaryOf(dictionary);
     if (!object)
         return 0;
     CFIndex count = 0;
@@ -111,12 +111,12 @@ CFIndex CFDictionaryGetCountOfValue(CFDictionaryRef dictionary, const void* valu
 }
 
 Boolean CFDictionaryContainsKey(CFDictionaryRef dictionary, const void* key) {
-    const __CFDictionary* object = dictionaryOf(dictionary);
+    const __CFDictionary* object = DictionaryOf(dictionary);
     return object && object->Find(key) >= 0;
 }
 
 Boolean CFDictionaryContainsValue(CFDictionaryRef dictionary, const void* value) {
-    const __CFDictionary* object = dictionaryOf(dictionary);
+    const __CFDictionary* object = DictionaryOf(dictionary);
     return object && object->table.Any([&](const HashedEntry& entry) {
         return CallEqual(object->valueCallBacks.equal, entry.value, value);
     });
@@ -129,7 +129,7 @@ const void* CFDictionaryGetValue(CFDictionaryRef dictionary, const void* key) {
 
 Boolean CFDictionaryGetValueIfPresent(CFDictionaryRef dictionary, const void* key,
                                       const void** value) {
-    const __CFDictionary* object = dictionaryOf(dictionary);
+    const __CFDictionary* object = DictionaryOf(dictionary);
     CFIndex position = object ? object->Find(key) : -1;
     if (position < 0)
         return false;
@@ -140,7 +140,7 @@ Boolean CFDictionaryGetValueIfPresent(CFDictionaryRef dictionary, const void* ke
 
 void CFDictionaryGetKeysAndValues(CFDictionaryRef dictionary, const void** keys,
                                   const void** values) {
-    const __CFDictionary* object = dictionaryOf(dictionary);
+    const __CFDictionary* object = DictionaryOf(dictionary);
     if (!object)
         return;
     object->table.ForEach([&](const HashedEntry& entry) {
@@ -153,7 +153,7 @@ void CFDictionaryGetKeysAndValues(CFDictionaryRef dictionary, const void** keys,
 
 void CFDictionaryApplyFunction(CFDictionaryRef dictionary, CFDictionaryApplierFunction applier,
                                void* context) {
-    const __CFDictionary* object = dictionaryOf(dictionary);
+    const __CFDictionary* object = DictionaryOf(dictionary);
     if (!object)
         return;
     if (!applier) {
@@ -165,23 +165,23 @@ void CFDictionaryApplyFunction(CFDictionaryRef dictionary, CFDictionaryApplierFu
 }
 
 void CFDictionaryAddValue(CFMutableDictionaryRef dictionary, const void* key, const void* value) {
-    if (__CFDictionary* object = mutableDictionaryOf(dictionary))
+    if (__CFDictionary* object = MutableDictionaryOf(dictionary))
         object->Put(key, value, PutMode::AddOnly);
 }
 
 void CFDictionarySetValue(CFMutableDictionaryRef dictionary, const void* key, const void* value) {
-    if (__CFDictionary* object = mutableDictionaryOf(dictionary))
+    if (__CFDictionary* object = MutableDictionaryOf(dictionary))
         object->Put(key, value, PutMode::AddOrReplace);
 }
 
 void CFDictionaryReplaceValue(CFMutableDictionaryRef dictionary, const void* key,
                               const void* value) {
-    if (__CFDictionary* object = mutableDictionaryOf(dictionary))
+    if (__CFDictionary* object = MutableDictionaryOf(dictionary))
         object->Put(key, value, PutMode::ReplaceOnly);
 }
 
 void CFDictionaryRemoveValue(CFMutableDictionaryRef dictionary, const void* key) {
-    __CFDictionary* object = mutableDictionaryOf(dictionary);
+    __CFDictionary* object = MutableDictionaryOf(dictionary);
     CFIndex position = object ? object->Find(key) : -1;
     if (position < 0)
         return;
@@ -189,7 +189,7 @@ void CFDictionaryRemoveValue(CFMutableDictionaryRef dictionary, const void* key)
 }
 
 void CFDictionaryRemoveAllValues(CFMutableDictionaryRef dictionary) {
-    __CFDictionary* object = mutableDictionaryOf(dictionary);
+    __CFDictionary* object = MutableDictionaryOf(dictionary);
     if (!object)
         return;
     // Empty the dictionary before releasing, so release callbacks see a consistent dictionary.

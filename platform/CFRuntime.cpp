@@ -150,22 +150,22 @@ void CFShow(CFTypeRef value) {
     std::fprintf(stderr, "%s\n", text.c_str());
 }
 
-static const void* retainValue(CFAllocatorRef, const void* value) {
+static const void* RetainValue(CFAllocatorRef, const void* value) {
     return CFRetain(value);
 }
-static void releaseValue(CFAllocatorRef, const void* value) {
+static void ReleaseValue(CFAllocatorRef, const void* value) {
     CFRelease(value);
 }
 
-const CFArrayCallBacks kCFTypeArrayCallBacks = {0, retainValue, releaseValue, CFCopyDescription,
+const CFArrayCallBacks kCFTypeArrayCallBacks = {0, RetainValue, ReleaseValue, CFCopyDescription,
                                                 CFEqual};
-const CFSetCallBacks kCFTypeSetCallBacks = {0,       retainValue, releaseValue, CFCopyDescription,
+const CFSetCallBacks kCFTypeSetCallBacks = {0,       RetainValue, ReleaseValue, CFCopyDescription,
                                             CFEqual, CFHash};
 const CFDictionaryKeyCallBacks kCFTypeDictionaryKeyCallBacks = {
-    0, retainValue, releaseValue, CFCopyDescription, CFEqual, CFHash};
-const CFDictionaryValueCallBacks kCFTypeDictionaryValueCallBacks = {0, retainValue, releaseValue,
+    0, RetainValue, ReleaseValue, CFCopyDescription, CFEqual, CFHash};
+const CFDictionaryValueCallBacks kCFTypeDictionaryValueCallBacks = {0, RetainValue, ReleaseValue,
                                                                     CFCopyDescription, CFEqual};
 const CFDictionaryKeyCallBacks kCFCopyStringDictionaryKeyCallBacks = {
-    0, retainValue, releaseValue, CFCopyDescription, CFEqual, CFHash};
+    0, RetainValue, ReleaseValue, CFCopyDescription, CFEqual, CFHash};
 const CFSetCallBacks kCFCopyStringSetCallBacks = {
-    0, retainValue, releaseValue, CFCopyDescription, CFEqual, CFHash};
+    0, RetainValue, ReleaseValue, CFCopyDescription, CFEqual, CFHash};

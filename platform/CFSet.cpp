@@ -39,14 +39,14 @@ struct __CFSet final : HashedCollection {
 
 namespace {
 
-// The set behind a reference, or null (reported) when it is not one.
-__CFSet* setOf(const void* set, const Where& where = Where::current()) {
+/// The set behind a reference, or null (reported) when it is not one.
+__CFSet* SetOf(const void* set, const Where& where = Where::current()) {
     return glyphwell::runtime::CheckedObject<__CFSet>(set, kSetKind, "set is a CFSet", where);
 }
 
-// The set behind a reference when it may be changed, else null (reported).
-__CFSet* mutableSetOf(const void* set, const Where& where = Where::current()) {
-    __CFSet* object = setOf(set, where);
+/// The set behind a reference when it may be changed, else null (reported).
+__CFSet* MutableSetOf(const void* set, const Where& where = Where::current()) {
+    __CFSet* object = SetOf(set, where);
     if (object && !object->isMutable) {
         ReportInvalidArgument("set is mutable", where);
         return nullptr;
@@ -75,7 +75,7 @@ CFSetRef CFSetCreate(CFAllocatorRef, const void** values, CFIndex count,
 
 // A copy of an immutable set is the set itself: nothing can tell them apart.
 CFSetRef CFSetCreateCopy(CFAllocatorRef, CFSetRef set) {
-    const __CFSet* source = setOf(set);
+    const __CFSet* source = SetOf(set);
     if (!source)
         return nullptr;
     if (!source->isMutable)
@@ -91,22 +91,22 @@ CFMutableSetRef CFSetCreateMutable(CFAllocatorRef, CFIndex capacity,
 }
 
 CFMutableSetRef CFSetCreateMutableCopy(CFAllocatorRef, CFIndex capacity, CFSetRef set) {
-    const __CFSet* source = setOf(set);
+    const __CFSet* source = SetOf(set);
     return source && GW_CHECK_ARGUMENT(capacity >= 0) ? source->Copy(true) : nullptr;
 }
 
 CFIndex CFSetGetCount(CFSetRef set) {
-    const __CFSet* object = setOf(set);
+    const __CFSet* object = SetOf(set);
     return object ? object->table.Count() : 0;
 }
 
 CFIndex CFSetGetCountOfValue(CFSetRef set, const void* value) {
-    const __CFSet* object = setOf(set);
+    const __CFSet* object = SetOf(set);
     return object && object->Find(value) >= 0 ? 1 : 0;
 }
 
 Boolean CFSetContainsValue(CFSetRef set, const void* value) {
-    const __CFSet* object = setOf(set);
+    const __CFSet* object = SetOf(set);
     return object && object->Find(value) >= 0;
 }
 
@@ -116,7 +116,7 @@ const void* CFSetGetValue(CFSetRef set, const void* value) {
 }
 
 Boolean CFSetGetValueIfPresent(CFSetRef set, const void* candidate, const void** value) {
-    const __CFSet* object = setOf(set);
+    const __CFSet* object = SetOf(set);
     CFIndex position = object ? object->Find(candidate) : -1;
     if (position < 0)
         return false;
@@ -126,14 +126,14 @@ Boolean CFSetGetValueIfPresent(CFSetRef set, const void* candidate, const void**
 }
 
 void CFSetGetValues(CFSetRef set, const void** values) {
-    const __CFSet* object = setOf(set);
+    const __CFSet* object = SetOf(set);
     if (!object || !values)
         return;
     object->table.ForEach([&](const HashedEntry& entry) { *values++ = entry.key; });
 }
 
 void CFSetApplyFunction(CFSetRef set, CFSetApplierFunction applier, void* context) {
-    const __CFSet* object = setOf(set);
+    const __CFSet* object = SetOf(set);
     if (!object)
         return;
     if (!applier) {
@@ -144,22 +144,22 @@ void CFSetApplyFunction(CFSetRef set, CFSetApplierFunction applier, void* contex
 }
 
 void CFSetAddValue(CFMutableSetRef set, const void* value) {
-    if (__CFSet* object = mutableSetOf(set))
+    if (__CFSet* object = MutableSetOf(set))
         object->Put(value, PutMode::AddOnly);
 }
 
 void CFSetSetValue(CFMutableSetRef set, const void* value) {
-    if (__CFSet* object = mutableSetOf(set))
+    if (__CFSet* object = MutableSetOf(set))
         object->Put(value, PutMode::AddOrReplace);
 }
 
 void CFSetReplaceValue(CFMutableSetRef set, const void* value) {
-    if (__CFSet* object = mutableSetOf(set))
+    if (__CFSet* object = MutableSetOf(set))
         object->Put(value, PutMode::ReplaceOnly);
 }
 
 void CFSetRemoveValue(CFMutableSetRef set, const void* value) {
-    __CFSet* object = mutableSetOf(set);
+    __CFSet* object = MutableSetOf(set);
     CFIndex position = object ? object->Find(value) : -1;
     if (position < 0)
         return;
@@ -167,7 +167,7 @@ void CFSetRemoveValue(CFMutableSetRef set, const void* value) {
 }
 
 void CFSetRemoveAllValues(CFMutableSetRef set) {
-    __CFSet* object = mutableSetOf(set);
+    __CFSet* object = MutableSetOf(set);
     if (!object)
         return;
     // Empty the set before releasing, so release callbacks see a consistent set.

@@ -47,8 +47,8 @@ int HexValue(UniChar c) {
     return -1;
 }
 
-// Fills `bytes` with random bytes from the kernel; std::random_device only if the kernel call
-// is unavailable.
+/// Fills `bytes` with random bytes from the kernel; std::random_device only if the kernel call
+/// is unavailable.
 void RandomBytes(UInt8* bytes, size_t count) {
     size_t filled = 0;
     while (filled < count) {
