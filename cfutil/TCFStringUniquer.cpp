@@ -235,7 +235,9 @@ CFStringRef TCFStringUniquerImp::GetUniqueString(const char* bytes, CFIndex leng
 /// path, whose every call would otherwise save and restore the registers this needs.
 __attribute__((noinline)) CFStringRef TCFStringUniquerImp::Enter(const char* bytes, CFIndex length,
                                                                  size_t keyLength, uint32_t hash) {
-    auto* entry = static_cast<Entry*>(std::malloc(sizeof(Entry) + keyLength + 1));
+    // Freed on every way out until the table takes it, an allocation failing (throwing) included.
+    std::unique_ptr<Entry, decltype(&std::free)> entry(
+        static_cast<Entry*>(std::malloc(sizeof(Entry) + keyLength + 1)), &std::free);
     if (!entry)
         return nullptr;
     std::memcpy(entry->Key(), bytes, keyLength);
@@ -247,16 +249,22 @@ __attribute__((noinline)) CFStringRef TCFStringUniquerImp::Enter(const char* byt
     if (!entry->string) {
         CFLog(kCFLogLevelError, "string %s (length %d : %lu) could not be converted to CFString!",
               entry->Key(), int(length), static_cast<unsigned long>(keyLength));
-        std::free(entry);
         return nullptr;
     }
 
-    CFStringRef unique = Insert(entry);
+    CFStringRef unique = nullptr;
+    try {
+        unique = Insert(entry.get());
+    } catch (...) { // the table could not grow: it is unchanged
+        CFRelease(entry->string);
+        throw;
+    }
     if (unique != entry->string) {
         // Another thread entered the same key first; its string is the one handed out.
         CFRelease(entry->string);
-        std::free(entry);
+        return unique;
     }
+    entry.release(); // now the table's, for the life of the process
     return unique;
 }
 

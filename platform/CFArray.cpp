@@ -1,6 +1,7 @@
 #include "platform/CFArray.h"
 
 #include <algorithm>
+#include <memory>
 #include <string>
 #include <vector>
 
@@ -93,11 +94,12 @@ CFIndex CountOf(const __CFArray* array) {
 /// A new array holding `count` values from `values`, retained.
 __CFArray* CreateArray(const void* const* values, CFIndex count, const CFArrayCallBacks* callBacks,
                        bool isMutable) {
-    auto* array = new __CFArray(callBacks, isMutable);
+    // Held until complete, so that an allocation failing on the way loses nothing.
+    auto array = std::make_unique<__CFArray>(callBacks, isMutable);
     array->values.reserve(size_t(count));
     for (CFIndex i = 0; i < count; ++i)
         array->values.push_back(array->Retain(values[i]));
-    return array;
+    return array.release();
 }
 
 } // namespace

@@ -4,6 +4,7 @@
 #include <cstdlib>
 #include <cstring>
 #include <functional>
+#include <memory>
 #include <new>
 #include <vector>
 
@@ -150,14 +151,14 @@ bool RangeInside(CFRange range, CFIndex length,
 
 /// A new data object with a copy of `length` bytes, `capacity` reserved (a hint only).
 __CFData* NewData(bool isMutable, const UInt8* bytes, CFIndex length, CFIndex capacity) {
-    __CFData* data = new __CFData(isMutable, nullptr, 0, 0, true);
+    auto data = std::make_unique<__CFData>(isMutable, nullptr, 0, 0, true); // held until complete
     // The capacity is only a hint: a huge one is not taken as a reason to allocate.
     constexpr CFIndex kLargestHint = CFIndex(1) << 24;
     data->Reserve(std::max(length, std::min(capacity, kLargestHint)));
     if (length > 0)
         std::memcpy(data->bytes, bytes, size_t(length));
     data->length = length;
-    return data;
+    return data.release();
 }
 
 } // namespace

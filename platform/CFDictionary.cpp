@@ -1,5 +1,6 @@
 #include "platform/CFDictionary.h"
 
+#include <memory>
 #include <string>
 
 #include "platform/CFCollectionStorage.h"
@@ -59,11 +60,12 @@ CFDictionaryRef CFDictionaryCreate(CFAllocatorRef, const void** keys, const void
         ReportInvalidArgument("count >= 0 and keys, values != NULL", Where::current());
         return nullptr;
     }
-    auto* dictionary = new __CFDictionary(keyCallBacks, valueCallBacks, false);
+    // Held until complete, so that an allocation failing on the way loses nothing.
+    auto dictionary = std::make_unique<__CFDictionary>(keyCallBacks, valueCallBacks, false);
     dictionary->table.Reserve(count);
     for (CFIndex i = 0; i < count; ++i)
         dictionary->Put(keys[i], values[i], PutMode::AddOrReplace);
-    return dictionary;
+    return dictionary.release();
 }
 
 // A copy of an immutable dictionary is the dictionary itself: nothing can tell them apart.

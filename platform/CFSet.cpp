@@ -1,5 +1,6 @@
 #include "platform/CFSet.h"
 
+#include <memory>
 #include <string>
 
 #include "platform/CFCollectionStorage.h"
@@ -66,11 +67,11 @@ CFSetRef CFSetCreate(CFAllocatorRef, const void** values, CFIndex count,
         ReportInvalidArgument("count >= 0 and values != NULL", Where::current());
         return nullptr;
     }
-    auto* set = new __CFSet(callBacks, false);
+    auto set = std::make_unique<__CFSet>(callBacks, false); // held until complete
     set->table.Reserve(count);
     for (CFIndex i = 0; i < count; ++i)
         set->Put(values[i], PutMode::AddOnly);
-    return set;
+    return set.release();
 }
 
 // A copy of an immutable set is the set itself: nothing can tell them apart.
