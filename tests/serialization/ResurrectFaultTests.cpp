@@ -8,8 +8,8 @@
 #include <string>
 #include <vector>
 
-#include "serialization/TCFFlattenContext.h"
 #include "serialization/TCFResurrectContext.h"
+#include "support/FlattenedBytes.h"
 #include "support/LogCapture.h"
 #include "support/Values.h"
 
@@ -69,14 +69,9 @@ Ref RichValue() {
 
 TEST(ResurrectFaults, EveryFailedAllocationStopsTheReadAsCorruptWithoutLeaks) {
     Ref value = RichValue();
-    Ref buffer(CFDataCreateMutable(nullptr, 0));
-    {
-        TCFFlattenContext writer(const_cast<__CFData*>(buffer.as<CFDataRef>()), false);
-        writer.Flatten(value.get());
-    }
-    const UInt8* bytes = CFDataGetBytePtr(buffer.as<CFDataRef>());
-    const unsigned long length =
-        static_cast<unsigned long>(CFDataGetLength(buffer.as<CFDataRef>()));
+    const std::vector<uint8_t> stream = FlattenedBytes(value.get());
+    const UInt8* bytes = stream.data();
+    const unsigned long length = stream.size();
 
     long failures = 0;
     for (long nth = 0;; ++nth) {
