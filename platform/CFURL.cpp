@@ -215,13 +215,11 @@ bool UTF8Of(CFStringRef string, std::string& out,
     CheckArgument(string != nullptr, "string != nullptr", where);
     if (!string)
         return false;
-    const UniChar* units = CFStringGetCharactersPtr(string);
-    if (!units)
+    std::optional<std::string> bytes = glyphwell::UTF8String(string);
+    if (!bytes)
         return false;
-    out.clear();
-    return text::EncodeUTF8(std::u16string_view(reinterpret_cast<const char16_t*>(units),
-                                                size_t(CFStringGetLength(string))),
-                            out);
+    out = std::move(*bytes);
+    return true;
 }
 
 /// "." and ".." segments taken out of `path` (RFC 3986 section 5.2.4). A relative path keeps
