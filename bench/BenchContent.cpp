@@ -8,6 +8,7 @@
 #include <utility>
 
 #include "serialization/TCFFlattenContext.h"
+#include "support/FlattenedBytes.h"
 
 namespace bench {
 namespace {
@@ -260,15 +261,7 @@ std::vector<StreamCase> MakeStreamCases() {
 } // namespace
 
 std::vector<unsigned char> Flatten(CFTypeRef value) {
-    CFMutableDataRef data = CFDataCreateMutable(nullptr, 0);
-    {
-        TCFFlattenContext context(data, false);
-        context.Flatten(value);
-    }
-    const UInt8* bytes = CFDataGetBytePtr(data);
-    std::vector<unsigned char> copy(bytes, bytes + CFDataGetLength(data));
-    CFRelease(data);
-    return copy;
+    return glyphwell::testing::FlattenedBytes(value);
 }
 
 const std::vector<StreamCase>& StreamCases() {

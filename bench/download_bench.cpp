@@ -29,7 +29,7 @@
 #include "desktop/QZFontMatching.h"
 #include "desktop/QZFontService.h"
 #include "platform/PropertyValues.h"
-#include "tests/support/LoopbackHTTPServer.h"
+#include "support/LoopbackHTTPServer.h"
 
 extern char** environ;
 

@@ -28,7 +28,7 @@
 #include "UIAgent/FontDownloadWindowController.h"
 #include "desktop/QZFontMatching.h"
 #include "platform/PropertyValues.h"
-#include "tests/support/LoopbackHTTPServer.h"
+#include "support/LoopbackHTTPServer.h"
 
 namespace {
 

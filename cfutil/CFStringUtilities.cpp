@@ -32,20 +32,9 @@ CFStringRef CFString::CopyAsString(UInt32 code) {
 }
 
 bool CFString::GetUTF8(CFStringRef string, std::string& out) {
-    out.clear();
-    if (!string)
-        return false;
-    CFIndex length = CFStringGetLength(string);
-    CFIndex size = 0;
-    CFRange range = CFRangeMake(0, length);
-    if (CFStringGetBytes(string, range, kCFStringEncodingUTF8, 0, false, nullptr, 0, &size) !=
-        length)
-        return false;
-    out.resize(size_t(size));
-    CFStringGetBytes(string, range, kCFStringEncodingUTF8, 0, false,
-                     reinterpret_cast<UInt8*>(out.data()), size, &size);
-    out.resize(size_t(size));
-    return true;
+    std::optional<std::string> bytes = glyphwell::UTF8String(string);
+    out = bytes ? std::move(*bytes) : std::string();
+    return bytes.has_value();
 }
 
 bool StringEqual(CFStringRef a, CFStringRef b) {

@@ -1,37 +1,20 @@
 #include "cfutil/CFUserDirectories.h"
 
 #include <algorithm>
-#include <cerrno>
 #include <cstdlib>
 #include <cstring>
-#include <pwd.h>
 #include <string_view>
-#include <unistd.h>
 
 #include "cfutil/CFStringUtilities.h"
+#include "platform/HomeDirectory.h"
 
 namespace {
 
-/// The home directory of `user` (the current user when null) from the password database; false
-/// when there is no entry or its home is not an absolute path.
+/// The home directory of `user` from the password database, or the current user's home
+/// directory ($HOME first) when `user` is null; false when there is none.
 bool HomeDirectoryPath(const char* user, std::string& home) {
-    long suggested = sysconf(_SC_GETPW_R_SIZE_MAX);
-    std::vector<char> buffer(suggested > 0 ? size_t(suggested) : 4096);
-    passwd entry{};
-    passwd* found = nullptr;
-    for (;;) {
-        int error = user ? getpwnam_r(user, &entry, buffer.data(), buffer.size(), &found)
-                         : getpwuid_r(getuid(), &entry, buffer.data(), buffer.size(), &found);
-        if (error != ERANGE)
-            break;
-        if (buffer.size() >= (size_t(1) << 20))
-            return false; // no sane entry needs more; give up rather than grow forever
-        buffer.resize(buffer.size() * 2);
-    }
-    if (!found || !found->pw_dir || found->pw_dir[0] != '/')
-        return false;
-    home = found->pw_dir;
-    return true;
+    home = user ? glyphwell::PasswordDatabaseHome(user) : glyphwell::HomeDirectory();
+    return !home.empty();
 }
 
 /// The value of the environment variable `name` when it is an absolute path.

@@ -1,4 +1,4 @@
-// Where a user's files live on Linux: home directories from the password database, the per-user
+// Where a user's files live on Linux: home directories ($HOME, the password database), the per-user
 // directories of the XDG base directory scheme, and the XDG data directories searched for shared
 // data such as the MIME database.
 //
@@ -12,11 +12,10 @@
 
 #include "platform/CFURL.h"
 
-/// A new directory URL (ending in "/") of the home directory of the user named `user`, or of
-/// the current user (by real user id) when `user` is null, as the password database gives it
-/// (getpwnam_r / getpwuid_r; $HOME is not consulted). Null when there is no such user, the
-/// entry has no home directory, or the entry's home is not an absolute path. Returns a new
-/// reference; the caller releases it.
+/// A new directory URL (ending in "/") of the home directory of the user named `user`, as the
+/// password database gives it, or of the current user when `user` is null ($HOME when it is set
+/// and absolute, else the password database: glyphwell::HomeDirectory). Null when there is no
+/// such user or no absolute home. Returns a new reference; the caller releases it.
 CFURLRef CFCopyHomeDirectoryURLForUser(CFStringRef user);
 
 /// The per-user directories that a configuration string names, and where they are found:

@@ -48,20 +48,13 @@ CFNumberRef TCFNumber::CreateForString(CFStringRef string) {
     locale_t cLocale = CLocale();
     if (!string || !cLocale)
         return nullptr;
-    CFIndex length = CFStringGetLength(string);
-    CFIndex maxSize = CFStringGetMaximumSizeForEncoding(length, kCFStringEncodingUTF8);
-    if (maxSize < 0)
-        return nullptr;
-    TStackBuffer<char, 30> text(uint64_t(maxSize) + 1);
     // The byte count tells where the text really ends, so that a string holding U+0000 is not
     // read as the number before it.
-    CFIndex used = 0;
-    if (CFStringGetBytes(string, CFRangeMake(0, length), kCFStringEncodingUTF8, 0, false,
-                         reinterpret_cast<UInt8*>(text.GetBuffer()), maxSize, &used) != length)
+    const std::optional<std::string> text = glyphwell::UTF8String(string);
+    if (!text)
         return nullptr;
-    text[uint64_t(used)] = '\0';
-    const char* begin = text.GetBuffer();
-    const char* end = begin + used;
+    const char* begin = text->c_str();
+    const char* end = begin + text->size();
 
     char* stop = nullptr;
     long integer = strtol_l(begin, &stop, 10, cLocale); // saturates out of range; accepted

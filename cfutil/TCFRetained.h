@@ -15,14 +15,9 @@
 struct adopted_t {};
 /// Selects the constructor overload that makes a file (never a directory) URL from a path.
 struct is_file_t {};
-/// Tags of the same scheme that no operation of this library takes.
-struct is_directory_t {};
-struct escape_string_t {};
 
 inline constexpr adopted_t kAdopted{};
 inline constexpr is_file_t kIsFile{};
-inline constexpr is_directory_t kIsDirectory{};
-inline constexpr escape_string_t kEscapeString{};
 
 /// Retains `ref` when it is non-null and returns it unchanged; null yields null.
 template <class T> inline T TCFSafeRetain(T ref) {

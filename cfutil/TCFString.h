@@ -38,8 +38,9 @@ public:
     CFStringRef CreateSubstring(CFRange range) const;
 
     /// `path` with a leading tilde expanded: "~" and "~/x" name the current user's home
-    /// directory, "~name" and "~name/x" the home directory of user `name`, both as given by the
-    /// password database (never $HOME), without a trailing slash ("/" excepted). Everything after
+    /// directory ($HOME when set and absolute, else the password database), "~name" and
+    /// "~name/x" the home directory of user `name` from the password database, without a
+    /// trailing slash ("/" excepted). Everything after
     /// the user part is kept as it is. A path that does not start with "~", or that names a user
     /// without a home directory, is returned itself, retained (a null path yields null).
     /// Returns a new reference (possibly to `path`); the caller releases it.

@@ -27,7 +27,7 @@
 #include <string>
 
 #include "cfutil/TStackBuffer.h"
-#include "platform/CFRuntime.h"
+#include "platform/CFKind.h"
 #include "platform/Log.h"
 
 namespace {
@@ -207,8 +207,7 @@ CFStringRef TCFStringUniquerImp::Insert(Entry* entry) {
     }
 
     // Only this thread knows the string yet: the flag is set before the release store below.
-    const_cast<glyphwell::runtime::CFObject*>(glyphwell::runtime::AsObject(entry->string))
-        ->MakeImmortal();
+    CFMakeShared(entry->string);
     size_t slot = table->Home(entry->hash);
     while (table->slots[slot].load(std::memory_order_relaxed))
         slot = (slot + 1) & table->mask;
@@ -236,7 +235,9 @@ CFStringRef TCFStringUniquerImp::GetUniqueString(const char* bytes, CFIndex leng
 /// path, whose every call would otherwise save and restore the registers this needs.
 __attribute__((noinline)) CFStringRef TCFStringUniquerImp::Enter(const char* bytes, CFIndex length,
                                                                  size_t keyLength, uint32_t hash) {
-    auto* entry = static_cast<Entry*>(std::malloc(sizeof(Entry) + keyLength + 1));
+    // Freed on every way out until the table takes it, an allocation failing (throwing) included.
+    std::unique_ptr<Entry, decltype(&std::free)> entry(
+        static_cast<Entry*>(std::malloc(sizeof(Entry) + keyLength + 1)), &std::free);
     if (!entry)
         return nullptr;
     std::memcpy(entry->Key(), bytes, keyLength);
@@ -248,16 +249,22 @@ __attribute__((noinline)) CFStringRef TCFStringUniquerImp::Enter(const char* byt
     if (!entry->string) {
         CFLog(kCFLogLevelError, "string %s (length %d : %lu) could not be converted to CFString!",
               entry->Key(), int(length), static_cast<unsigned long>(keyLength));
-        std::free(entry);
         return nullptr;
     }
 
-    CFStringRef unique = Insert(entry);
+    CFStringRef unique = nullptr;
+    try {
+        unique = Insert(entry.get());
+    } catch (...) { // the table could not grow: it is unchanged
+        CFRelease(entry->string);
+        throw;
+    }
     if (unique != entry->string) {
         // Another thread entered the same key first; its string is the one handed out.
         CFRelease(entry->string);
-        std::free(entry);
+        return unique;
     }
+    entry.release(); // now the table's, for the life of the process
     return unique;
 }
 

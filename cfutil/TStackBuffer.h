@@ -17,23 +17,7 @@
 #include <type_traits>
 #include <vector>
 
-/// The part of every TStackBuffer that does not depend on the element type.
-class TStackBufferBase {
-public:
-    TStackBufferBase(const TStackBufferBase&) = delete;
-    TStackBufferBase& operator=(const TStackBufferBase&) = delete;
-
-    /// The number of elements the buffer currently offers.
-    uint64_t GetCount() const { return count_; }
-
-protected:
-    explicit TStackBufferBase(uint64_t count) : count_(count) {}
-    ~TStackBufferBase() = default;
-
-    uint64_t count_;
-};
-
-template <class T, uint64_t N> class TStackBuffer : public TStackBufferBase {
+template <class T, uint64_t N> class TStackBuffer {
     static_assert(std::is_trivial_v<T>, "elements are copied and zeroed, never constructed");
 
 public:
@@ -42,6 +26,11 @@ public:
     explicit TStackBuffer(uint64_t count);
     /// Frees the heap storage.
     ~TStackBuffer() = default;
+    TStackBuffer(const TStackBuffer&) = delete;
+    TStackBuffer& operator=(const TStackBuffer&) = delete;
+
+    /// The number of elements the buffer currently offers.
+    uint64_t GetCount() const { return count_; }
 
     /// The first element: on the heap when the heap storage is in use, else inline.
     T* GetBuffer() { return heap_.empty() ? inline_ : heap_.data(); }
@@ -62,12 +51,12 @@ private:
     void MoveToInline(uint64_t count);
     void MoveToHeap();
 
+    uint64_t count_;
     alignas(16) T inline_[N];
     std::vector<T> heap_; ///< empty, with no allocation, while the inline storage is in use
 };
 
-template <class T, uint64_t N>
-TStackBuffer<T, N>::TStackBuffer(uint64_t count) : TStackBufferBase(count) {
+template <class T, uint64_t N> TStackBuffer<T, N>::TStackBuffer(uint64_t count) : count_(count) {
     if (count <= N)
         std::fill_n(inline_, N, T());
     else

@@ -1,6 +1,7 @@
 #include "platform/CFArray.h"
 
 #include <algorithm>
+#include <memory>
 #include <string>
 #include <vector>
 
@@ -63,15 +64,15 @@ struct __CFArray final : CFObject {
 
 namespace {
 
-// The array behind a reference, or null (reported) when it is not one.
-__CFArray* arrayOf(const void* array, const Where& where = Where::current()) {
+/// The array behind a reference, or null (reported) when it is not one.
+__CFArray* ArrayOf(const void* array, const Where& where = Where::current()) {
     return glyphwell::runtime::CheckedObject<__CFArray>(array, kArrayKind, "array is a CFArray",
                                                         where);
 }
 
-// The array behind a reference when it may be changed, else null (reported).
-__CFArray* mutableArrayOf(const void* array, const Where& where = Where::current()) {
-    __CFArray* object = arrayOf(array, where);
+/// The array behind a reference when it may be changed, else null (reported).
+__CFArray* MutableArrayOf(const void* array, const Where& where = Where::current()) {
+    __CFArray* object = ArrayOf(array, where);
     if (object && !object->isMutable) {
         ReportInvalidArgument("array is mutable", where);
         return nullptr;
@@ -79,25 +80,26 @@ __CFArray* mutableArrayOf(const void* array, const Where& where = Where::current
     return object;
 }
 
-bool indexInside(CFIndex index, CFIndex end, const Where& where = Where::current()) {
+bool IndexInside(CFIndex index, CFIndex end, const Where& where = Where::current()) {
     bool inside = index >= 0 && index < end;
     if (!inside)
         ReportInvalidArgument("index lies inside the array", where);
     return inside;
 }
 
-CFIndex countOf(const __CFArray* array) {
+CFIndex CountOf(const __CFArray* array) {
     return CFIndex(array->values.size());
 }
 
-// A new array holding `count` values from `values`, retained.
-__CFArray* createArray(const void* const* values, CFIndex count, const CFArrayCallBacks* callBacks,
+/// A new array holding `count` values from `values`, retained.
+__CFArray* CreateArray(const void* const* values, CFIndex count, const CFArrayCallBacks* callBacks,
                        bool isMutable) {
-    auto* array = new __CFArray(callBacks, isMutable);
+    // Held until complete, so that an allocation failing on the way loses nothing.
+    auto array = std::make_unique<__CFArray>(callBacks, isMutable);
     array->values.reserve(size_t(count));
     for (CFIndex i = 0; i < count; ++i)
         array->values.push_back(array->Retain(values[i]));
-    return array;
+    return array.release();
 }
 
 } // namespace
@@ -112,53 +114,56 @@ CFArrayRef CFArrayCreate(CFAllocatorRef, const void** values, CFIndex count,
         ReportInvalidArgument("count >= 0 and values != NULL", Where::current());
         return nullptr;
     }
-    return createArray(values, count, callBacks, false);
+    return CreateArray(values, count, callBacks, false);
 }
 
 // A copy of an immutable array is the array itself: nothing can tell them apart.
 CFArrayRef CFArrayCreateCopy(CFAllocatorRef, CFArrayRef array) {
-    const __CFArray* source = arrayOf(array);
+    const __CFArray* source = ArrayOf(array);
     if (!source)
         return nullptr;
     if (!source->isMutable)
         return static_cast<CFArrayRef>(CFRetain(array));
-    return createArray(source->values.data(), countOf(source), &source->callBacks, false);
+    return CreateArray(source->values.data(), CountOf(source), &source->callBacks, false);
 }
 
-CFMutableArrayRef CFArrayCreateMutable(CFAllocatorRef, CFIndex, const CFArrayCallBacks* callBacks) {
+CFMutableArrayRef CFArrayCreateMutable(CFAllocatorRef, CFIndex capacity,
+                                       const CFArrayCallBacks* callBacks) {
+    if (!GW_CHECK_ARGUMENT(capacity >= 0))
+        return nullptr;
     return new __CFArray(callBacks, true);
 }
 
-CFMutableArrayRef CFArrayCreateMutableCopy(CFAllocatorRef, CFIndex, CFArrayRef array) {
-    const __CFArray* source = arrayOf(array);
-    if (!source)
+CFMutableArrayRef CFArrayCreateMutableCopy(CFAllocatorRef, CFIndex capacity, CFArrayRef array) {
+    const __CFArray* source = ArrayOf(array);
+    if (!source || !GW_CHECK_ARGUMENT(capacity >= 0))
         return nullptr;
-    return createArray(source->values.data(), countOf(source), &source->callBacks, true);
+    return CreateArray(source->values.data(), CountOf(source), &source->callBacks, true);
 }
 
 CFIndex CFArrayGetCount(CFArrayRef array) {
-    const __CFArray* object = arrayOf(array);
-    return object ? countOf(object) : 0;
+    const __CFArray* object = ArrayOf(array);
+    return object ? CountOf(object) : 0;
 }
 
 const void* CFArrayGetValueAtIndex(CFArrayRef array, CFIndex index) {
-    const __CFArray* object = arrayOf(array);
-    if (!object || !indexInside(index, countOf(object)))
+    const __CFArray* object = ArrayOf(array);
+    if (!object || !IndexInside(index, CountOf(object)))
         return nullptr;
     return object->values[size_t(index)];
 }
 
 void CFArrayGetValues(CFArrayRef array, CFRange range, const void** values) {
-    const __CFArray* object = arrayOf(array);
-    if (!object || !CheckRange(range, countOf(object), Where::current()) ||
+    const __CFArray* object = ArrayOf(array);
+    if (!object || !CheckRange(range, CountOf(object), Where::current()) ||
         (range.length > 0 && !values))
         return;
     std::copy_n(object->values.begin() + range.location, range.length, values);
 }
 
 CFIndex CFArrayGetCountOfValue(CFArrayRef array, CFRange range, const void* value) {
-    const __CFArray* object = arrayOf(array);
-    if (!object || !CheckRange(range, countOf(object), Where::current()))
+    const __CFArray* object = ArrayOf(array);
+    if (!object || !CheckRange(range, CountOf(object), Where::current()))
         return 0;
     CFIndex count = 0;
     for (CFIndex i = range.location; i < range.location + range.length; ++i)
@@ -171,8 +176,8 @@ Boolean CFArrayContainsValue(CFArrayRef array, CFRange range, const void* value)
 }
 
 CFIndex CFArrayGetFirstIndexOfValue(CFArrayRef array, CFRange range, const void* value) {
-    const __CFArray* object = arrayOf(array);
-    if (!object || !CheckRange(range, countOf(object), Where::current()))
+    const __CFArray* object = ArrayOf(array);
+    if (!object || !CheckRange(range, CountOf(object), Where::current()))
         return kCFNotFound;
     for (CFIndex i = range.location; i < range.location + range.length; ++i)
         if (CallEqual(object->callBacks.equal, object->values[size_t(i)], value))
@@ -181,8 +186,8 @@ CFIndex CFArrayGetFirstIndexOfValue(CFArrayRef array, CFRange range, const void*
 }
 
 CFIndex CFArrayGetLastIndexOfValue(CFArrayRef array, CFRange range, const void* value) {
-    const __CFArray* object = arrayOf(array);
-    if (!object || !CheckRange(range, countOf(object), Where::current()))
+    const __CFArray* object = ArrayOf(array);
+    if (!object || !CheckRange(range, CountOf(object), Where::current()))
         return kCFNotFound;
     for (CFIndex i = range.location + range.length; i-- > range.location;)
         if (CallEqual(object->callBacks.equal, object->values[size_t(i)], value))
@@ -194,14 +199,14 @@ CFIndex CFArrayGetLastIndexOfValue(CFArrayRef array, CFRange range, const void* 
 // (a caller error) cannot make the walk leave the storage.
 void CFArrayApplyFunction(CFArrayRef array, CFRange range, CFArrayApplierFunction applier,
                           void* context) {
-    const __CFArray* object = arrayOf(array);
-    if (!object || !CheckRange(range, countOf(object), Where::current()))
+    const __CFArray* object = ArrayOf(array);
+    if (!object || !CheckRange(range, CountOf(object), Where::current()))
         return;
     if (!applier) {
         ReportInvalidArgument("applier != NULL", Where::current());
         return;
     }
-    for (CFIndex i = range.location; i < range.location + range.length && i < countOf(object); ++i)
+    for (CFIndex i = range.location; i < range.location + range.length && i < CountOf(object); ++i)
         applier(object->values[size_t(i)], context);
 }
 
@@ -209,8 +214,8 @@ void CFArrayApplyFunction(CFArrayRef array, CFRange range, CFArrayApplierFunctio
 // element equal to it when there is one, else the first greater one, else the range's end.
 CFIndex CFArrayBSearchValues(CFArrayRef array, CFRange range, const void* value,
                              CFComparatorFunction comparator, void* context) {
-    const __CFArray* object = arrayOf(array);
-    if (!object || !CheckRange(range, countOf(object), Where::current()))
+    const __CFArray* object = ArrayOf(array);
+    if (!object || !CheckRange(range, CountOf(object), Where::current()))
         return kCFNotFound;
     if (!comparator) {
         ReportInvalidArgument("comparator != NULL", Where::current());
@@ -229,23 +234,23 @@ CFIndex CFArrayBSearchValues(CFArrayRef array, CFRange range, const void* value,
 }
 
 void CFArrayAppendValue(CFMutableArrayRef array, const void* value) {
-    if (__CFArray* object = mutableArrayOf(array))
+    if (__CFArray* object = MutableArrayOf(array))
         object->values.push_back(object->Retain(value));
 }
 
 void CFArrayInsertValueAtIndex(CFMutableArrayRef array, CFIndex index, const void* value) {
-    __CFArray* object = mutableArrayOf(array);
-    if (!object || !indexInside(index, countOf(object) + 1))
+    __CFArray* object = MutableArrayOf(array);
+    if (!object || !IndexInside(index, CountOf(object) + 1))
         return;
     object->values.insert(object->values.begin() + index, object->Retain(value));
 }
 
 void CFArraySetValueAtIndex(CFMutableArrayRef array, CFIndex index, const void* value) {
-    __CFArray* object = mutableArrayOf(array);
-    if (!object || !indexInside(index, countOf(object) + 1))
+    __CFArray* object = MutableArrayOf(array);
+    if (!object || !IndexInside(index, CountOf(object) + 1))
         return;
     const void* retained = object->Retain(value);
-    if (index == countOf(object)) {
+    if (index == CountOf(object)) {
         object->values.push_back(retained);
         return;
     }
@@ -255,8 +260,8 @@ void CFArraySetValueAtIndex(CFMutableArrayRef array, CFIndex index, const void* 
 }
 
 void CFArrayRemoveValueAtIndex(CFMutableArrayRef array, CFIndex index) {
-    __CFArray* object = mutableArrayOf(array);
-    if (!object || !indexInside(index, countOf(object)))
+    __CFArray* object = MutableArrayOf(array);
+    if (!object || !IndexInside(index, CountOf(object)))
         return;
     const void* removed = object->values[size_t(index)];
     object->values.erase(object->values.begin() + index);
@@ -264,7 +269,7 @@ void CFArrayRemoveValueAtIndex(CFMutableArrayRef array, CFIndex index) {
 }
 
 void CFArrayRemoveAllValues(CFMutableArrayRef array) {
-    __CFArray* object = mutableArrayOf(array);
+    __CFArray* object = MutableArrayOf(array);
     if (!object)
         return;
     // Empty the array before releasing, so release callbacks see a consistent array.
@@ -276,8 +281,8 @@ void CFArrayRemoveAllValues(CFMutableArrayRef array) {
 
 void CFArrayReplaceValues(CFMutableArrayRef array, CFRange range, const void** newValues,
                           CFIndex newCount) {
-    __CFArray* object = mutableArrayOf(array);
-    if (!object || !CheckRange(range, countOf(object), Where::current()))
+    __CFArray* object = MutableArrayOf(array);
+    if (!object || !CheckRange(range, CountOf(object), Where::current()))
         return;
     if (newCount < 0 || (newCount > 0 && !newValues)) {
         ReportInvalidArgument("newCount >= 0 and newValues != NULL", Where::current());
@@ -296,16 +301,16 @@ void CFArrayReplaceValues(CFMutableArrayRef array, CFRange range, const void** n
 }
 
 void CFArrayExchangeValuesAtIndices(CFMutableArrayRef array, CFIndex index1, CFIndex index2) {
-    __CFArray* object = mutableArrayOf(array);
-    if (!object || !indexInside(index1, countOf(object)) || !indexInside(index2, countOf(object)))
+    __CFArray* object = MutableArrayOf(array);
+    if (!object || !IndexInside(index1, CountOf(object)) || !IndexInside(index2, CountOf(object)))
         return;
     std::swap(object->values[size_t(index1)], object->values[size_t(index2)]);
 }
 
 void CFArraySortValues(CFMutableArrayRef array, CFRange range, CFComparatorFunction comparator,
                        void* context) {
-    __CFArray* object = mutableArrayOf(array);
-    if (!object || !CheckRange(range, countOf(object), Where::current()))
+    __CFArray* object = MutableArrayOf(array);
+    if (!object || !CheckRange(range, CountOf(object), Where::current()))
         return;
     if (!comparator) {
         ReportInvalidArgument("comparator != NULL", Where::current());
@@ -318,9 +323,9 @@ void CFArraySortValues(CFMutableArrayRef array, CFRange range, CFComparatorFunct
 }
 
 void CFArrayAppendArray(CFMutableArrayRef array, CFArrayRef other, CFRange range) {
-    __CFArray* object = mutableArrayOf(array);
-    const __CFArray* source = arrayOf(other);
-    if (!object || !source || !CheckRange(range, countOf(source), Where::current()))
+    __CFArray* object = MutableArrayOf(array);
+    const __CFArray* source = ArrayOf(other);
+    if (!object || !source || !CheckRange(range, CountOf(source), Where::current()))
         return;
     // Copy first: `other` may be `array` itself, whose storage moves as it grows.
     auto first = source->values.begin() + range.location;

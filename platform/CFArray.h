@@ -1,5 +1,8 @@
 // Ordered collections. Elements are visited in index order. Index arguments are the caller's to
-// keep in range; an out-of-range index is reported through the assertion handler and ignored.
+// keep in range; an out-of-range index is bad input.
+//
+// Bad input: reported once through the assertion handler (naming the function called); then
+// creators give null, readers 0, false or null, and modifiers change nothing (see CFBase.h).
 #pragma once
 
 #include "platform/CFBase.h"

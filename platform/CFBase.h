@@ -7,6 +7,13 @@
 // releases with CFRelease; a Get operation returns a reference the caller does not own.
 // Reference counts are atomic, so values may be retained and released on any thread; a value
 // itself is not changed after creation unless it is one of the mutable kinds.
+//
+// Bad input, the same rule for every operation: an invalid argument (a null or foreign
+// reference, a negative count, length or capacity, a range or index outside the value, a change
+// to an immutable value, an unknown type code) is reported once through the assertion handler,
+// which names the public function called. Then an operation that creates or copies returns
+// null, one that reads returns 0, false or null, and one that modifies changes nothing.
+// Zero-length input with a null pointer is valid.
 #pragma once
 
 #include <cstdint>

@@ -10,6 +10,7 @@
 #include <string>
 #include <vector>
 
+#include "platform/ArgumentChecks.h"
 #include "platform/CFData.h"
 #include "platform/CFRuntime.h"
 #include "platform/CFString.h"
@@ -152,22 +153,29 @@ struct __CFCharacterSet final : public CFObject {
 
 namespace {
 
-const __CFCharacterSet* Get(CFCharacterSetRef set) {
+const __CFCharacterSet* Get(CFCharacterSetRef set,
+                            const glyphwell::runtime::SourceLocation& where =
+                                glyphwell::runtime::SourceLocation::current()) {
     const __CFCharacterSet* object = As<__CFCharacterSet>(set, kCharacterSetKind);
-    GW_ASSERT(object != nullptr);
+    CheckArgument(object != nullptr, "object != nullptr", where);
     return object;
 }
 
 /// The mutable set behind `set`, or null (reported) when it is null or immutable.
-__CFCharacterSet* GetMutable(CFMutableCharacterSetRef set) {
+__CFCharacterSet* GetMutable(CFMutableCharacterSetRef set,
+                             const glyphwell::runtime::SourceLocation& where =
+                                 glyphwell::runtime::SourceLocation::current()) {
     __CFCharacterSet* object = AsMutable<__CFCharacterSet>(set, kCharacterSetKind);
-    GW_ASSERT(object != nullptr && object->isMutable);
+    CheckArgument(object != nullptr && object->isMutable, "object != nullptr && object->isMutable",
+                  where);
     return object && object->isMutable ? object : nullptr;
 }
 
 /// Clips `range` to the code space; false when nothing of it is left.
-bool ClipRange(CFRange range, uint32_t& first, uint32_t& last) {
-    GW_ASSERT(range.length >= 0);
+bool ClipRange(CFRange range, uint32_t& first, uint32_t& last,
+               const glyphwell::runtime::SourceLocation& where =
+                   glyphwell::runtime::SourceLocation::current()) {
+    CheckArgument(range.length >= 0, "range.length >= 0", where);
     if (range.length <= 0)
         return false;
     // Wide arithmetic: location + length may overflow a CFIndex.
@@ -210,7 +218,9 @@ CFTypeID CFCharacterSetGetTypeID() {
 
 CFCharacterSetRef CFCharacterSetCreateWithBitmapRepresentation(CFAllocatorRef,
                                                                CFDataRef representation) {
-    size_t length = representation ? size_t(CFDataGetLength(representation)) : 0;
+    if (!GW_CHECK_ARGUMENT(representation != nullptr))
+        return nullptr;
+    size_t length = size_t(CFDataGetLength(representation));
     if (length == 0)
         return new __CFCharacterSet(false);
     if (length < kPlaneBytes || (length - kPlaneBytes) % kPlaneRecordBytes != 0 ||
@@ -248,6 +258,8 @@ CFDataRef CFCharacterSetCreateBitmapRepresentation(CFAllocatorRef allocator,
 }
 
 CFCharacterSetRef CFCharacterSetCreateWithCharactersInRange(CFAllocatorRef, CFRange range) {
+    if (!GW_CHECK_ARGUMENT(range.length >= 0))
+        return nullptr;
     auto* set = new __CFCharacterSet(false);
     uint32_t first, last;
     if (ClipRange(range, first, last))
@@ -256,10 +268,10 @@ CFCharacterSetRef CFCharacterSetCreateWithCharactersInRange(CFAllocatorRef, CFRa
 }
 
 CFCharacterSetRef CFCharacterSetCreateWithCharactersInString(CFAllocatorRef, CFStringRef string) {
+    if (!GW_CHECK_ARGUMENT(string != nullptr))
+        return nullptr;
     auto* set = new __CFCharacterSet(false);
-    GW_ASSERT(string != nullptr);
-    if (string)
-        AddString(*set, string);
+    AddString(*set, string);
     return set;
 }
 
@@ -275,7 +287,8 @@ CFMutableCharacterSetRef CFCharacterSetCreateMutable(CFAllocatorRef) {
 }
 
 CFMutableCharacterSetRef CFCharacterSetCreateMutableCopy(CFAllocatorRef, CFCharacterSetRef set) {
-    return CopyOf(Get(set), true);
+    const __CFCharacterSet* object = Get(set);
+    return object ? CopyOf(object, true) : nullptr;
 }
 
 Boolean CFCharacterSetIsCharacterMember(CFCharacterSetRef set, UniChar character) {
@@ -309,7 +322,7 @@ void CFCharacterSetRemoveCharactersInRange(CFMutableCharacterSetRef set, CFRange
 
 void CFCharacterSetAddCharactersInString(CFMutableCharacterSetRef set, CFStringRef string) {
     __CFCharacterSet* object = GetMutable(set);
-    GW_ASSERT(string != nullptr);
+    GW_CHECK_ARGUMENT(string != nullptr);
     if (object && string)
         AddString(*object, string);
 }

@@ -4,6 +4,9 @@
 // Bitmap representation: the Basic Multilingual Plane's 8192 bytes, code point c at bit (c & 7)
 // of byte (c >> 3); then, for each plane 1-16 that has members, in increasing order, one byte
 // with the plane number followed by that plane's 8192 bytes.
+//
+// Bad input: reported once through the assertion handler (naming the function called); then
+// creators give null, readers 0, false or null, and modifiers change nothing (see CFBase.h).
 #pragma once
 
 #include "platform/CFBase.h"
@@ -11,14 +14,15 @@
 CFTypeID CFCharacterSetGetTypeID();
 
 /// A new set from a bitmap representation. A representation of exactly 8192 + k × 8193 bytes
-/// (k from 0 to 16, plane bytes 1-16, each plane once) is accepted; a null or empty data object
-/// yields the empty set; anything else yields null.
+/// (k from 0 to 16, plane bytes 1-16, each plane once) is accepted; an empty data object yields
+/// the empty set; anything else (a null data object included) yields null.
 CFCharacterSetRef CFCharacterSetCreateWithBitmapRepresentation(CFAllocatorRef allocator,
                                                                CFDataRef representation);
 /// A new data object with the set's bitmap representation (the BMP bitmap always, the other
 /// planes only when they have members).
 CFDataRef CFCharacterSetCreateBitmapRepresentation(CFAllocatorRef allocator, CFCharacterSetRef set);
-/// A new set of the code points in `range` (clipped to 0 ... 0x10FFFF).
+/// A new set of the code points in `range` (clipped to 0 ... 0x10FFFF); null for a negative
+/// length.
 CFCharacterSetRef CFCharacterSetCreateWithCharactersInRange(CFAllocatorRef allocator,
                                                             CFRange range);
 /// A new set of the characters of `string` (surrogate pairs count as one code point).

@@ -10,18 +10,6 @@
 
 namespace glyphwell::runtime {
 
-void ReportInvalidArgument(const char* condition, const SourceLocation& where) {
-    AssertionFailure(condition, where.function_name(), where.file_name(), int(where.line()));
-}
-
-bool CheckRange(CFRange range, CFIndex count, const SourceLocation& where) {
-    bool inside = range.location >= 0 && range.length >= 0 && range.location <= count &&
-                  range.length <= count - range.location;
-    if (!inside)
-        ReportInvalidArgument("range lies inside the collection", where);
-    return inside;
-}
-
 // ---------------------------------------------------------------------------------------------
 // ElementReleaser
 
@@ -245,6 +233,89 @@ void HashedTable::Rebuild(size_t count) {
     entries_.reserve(count);
     for (size_t position = 0; position < entries_.size(); ++position)
         PlaceInIndex(entries_[position].hash, position);
+}
+
+// ---------------------------------------------------------------------------------------------
+// HashedCollection
+
+HashedCollection::HashedCollection(CFTypeID kind, const char* kindName,
+                                   const CFDictionaryKeyCallBacks* keyCallBacks,
+                                   const CFDictionaryValueCallBacks* valueCallBacks, bool isMutable)
+    : CFObject(kind), keyCallBacks(keyCallBacks ? *keyCallBacks : CFDictionaryKeyCallBacks{}),
+      valueCallBacks(valueCallBacks ? *valueCallBacks : CFDictionaryValueCallBacks{}),
+      isMutable(isMutable), table(this->keyCallBacks.hash, this->keyCallBacks.equal),
+      kindName_(kindName) {}
+
+HashedCollection::~HashedCollection() {
+    ElementReleaser releaser;
+    table.ForEach([&](const HashedEntry& entry) {
+        releaser.Release(keyCallBacks.release, entry.key);
+        releaser.Release(valueCallBacks.release, entry.value);
+    });
+}
+
+bool HashedCollection::Equals(const CFObject& other) const {
+    const auto& that = static_cast<const HashedCollection&>(other);
+    if (table.Count() != that.table.Count())
+        return false;
+    return !table.Any([&](const HashedEntry& entry) {
+        CFIndex position = that.Find(entry.key);
+        return position < 0 ||
+               !CallEqual(valueCallBacks.equal, entry.value, that.table.EntryAt(position).value);
+    });
+}
+
+std::string HashedCollection::Description() const {
+    const bool isSet = Kind() == kSetKind;
+    std::string text = DescriptionPrefix(this, kindName_);
+    text += "{count = " + std::to_string(table.Count()) +
+            (isSet ? ", values = (\n" : ", entries = (\n");
+    table.ForEach([&](const HashedEntry& entry) {
+        text += '\t';
+        text += CallDescribe(keyCallBacks.copyDescription, entry.key);
+        if (!isSet) {
+            text += " = ";
+            text += CallDescribe(valueCallBacks.copyDescription, entry.value);
+        }
+        text += '\n';
+    });
+    text += ")}";
+    return text;
+}
+
+void HashedCollection::Put(const void* key, const void* value, PutMode mode) {
+    CFHashCode hash = table.HashOf(key);
+    CFIndex position = table.Find(key, hash);
+    if (position < 0) {
+        if (mode != PutMode::ReplaceOnly)
+            table.Append(CallRetain(keyCallBacks.retain, key),
+                         CallRetain(valueCallBacks.retain, value), hash);
+        return;
+    }
+    if (mode == PutMode::AddOnly)
+        return;
+    // Retain the newcomer first: it may be the one it replaces.
+    const bool isSet = Kind() == kSetKind;
+    const void* retained =
+        isSet ? CallRetain(keyCallBacks.retain, key) : CallRetain(valueCallBacks.retain, value);
+    HashedEntry& entry = table.EntryAt(position);
+    const void*& slot = isSet ? entry.key : entry.value;
+    const void* replaced = slot;
+    slot = retained;
+    CallRelease(isSet ? keyCallBacks.release : valueCallBacks.release, replaced);
+}
+
+void HashedCollection::ReleaseEntry(const HashedEntry& entry) const {
+    CallRelease(keyCallBacks.release, entry.key);
+    CallRelease(valueCallBacks.release, entry.value);
+}
+
+void HashedCollection::CopyEntriesTo(HashedCollection& copy) const {
+    copy.table.Reserve(table.Count());
+    table.ForEach([&](const HashedEntry& entry) {
+        copy.table.Append(CallRetain(keyCallBacks.retain, entry.key),
+                          CallRetain(valueCallBacks.retain, entry.value), entry.hash);
+    });
 }
 
 } // namespace glyphwell::runtime

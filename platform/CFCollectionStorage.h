@@ -1,6 +1,5 @@
-// Storage shared by the container kinds (internal to platform/): argument checks that report
-// through the assertion handler, the element releaser that keeps the destruction of nested
-// containers flat, and the hashed table behind sets and dictionaries.
+// Storage shared by the container kinds (internal to platform/): the element releaser that keeps
+// the destruction of nested containers flat, and the hashed table behind sets and dictionaries.
 //
 // The hashed table differs from std::unordered_map in two ways the containers need: entries are
 // kept in insertion order (a dense vector, enumerated front to back), and keys are hashed and
@@ -12,51 +11,13 @@
 #pragma once
 
 #include <cstddef>
+#include <string>
 #include <vector>
 
+#include "platform/ArgumentChecks.h"
 #include "platform/CFRuntime.h"
 
 namespace glyphwell::runtime {
-
-/// Where a public function was called from: the part of std::source_location the checks use,
-/// built on the compiler builtins, which every compiler we build with has (std::source_location
-/// does not compile with clang 14 over libstdc++ 12). The function is named without signature.
-class SourceLocation {
-public:
-    static constexpr SourceLocation current(const char* function = __builtin_FUNCTION(),
-                                            const char* file = __builtin_FILE(),
-                                            unsigned line = __builtin_LINE()) noexcept {
-        return SourceLocation(function, file, line);
-    }
-    constexpr const char* function_name() const noexcept { return function_; }
-    constexpr const char* file_name() const noexcept { return file_; }
-    constexpr unsigned line() const noexcept { return line_; }
-
-private:
-    constexpr SourceLocation(const char* function, const char* file, unsigned line) noexcept
-        : function_(function), file_(file), line_(line) {}
-    const char* function_;
-    const char* file_;
-    unsigned line_;
-};
-
-/// Reports a failed argument check through the assertion handler, naming the public function
-/// in which it happened.
-void ReportInvalidArgument(const char* condition, const SourceLocation& where);
-
-/// The object behind `value` as kind T, or null (reported as `condition`) when `value` is null
-/// or of another kind.
-template <class T>
-T* CheckedObject(const void* value, CFTypeID kind, const char* condition,
-                 const SourceLocation& where) {
-    T* object = AsMutable<T>(value, kind);
-    if (!object)
-        ReportInvalidArgument(condition, where);
-    return object;
-}
-
-/// Whether `range` lies inside a sequence of `count` elements; reported when it does not.
-bool CheckRange(CFRange range, CFIndex count, const SourceLocation& where);
 
 /// Gives back a destroyed container's counts on its elements. The first releaser on a thread
 /// calls the release callbacks at once; releasers created while it lives (by the destructors of
@@ -215,6 +176,42 @@ private:
     unsigned slotShift_ = 64;   ///< 64 - log2(slots_.size())
     CFIndex liveCount_ = 0;
     size_t removedCount_ = 0;
+};
+
+/// What sets and dictionaries share: a hashed table whose keys (a set's members) and values each
+/// hold the count their retain callback took, with insertion, copying, equality, description and
+/// destruction written once. A set has no value callbacks and leaves every value null.
+class HashedCollection : public CFObject {
+public:
+    HashedCollection(CFTypeID kind, const char* kindName,
+                     const CFDictionaryKeyCallBacks* keyCallBacks,
+                     const CFDictionaryValueCallBacks* valueCallBacks, bool isMutable);
+    ~HashedCollection() override;
+
+    /// Same count, and every key of this one is in `other` with an equal value.
+    bool Equals(const CFObject& other) const override;
+    CFHashCode Hash() const override { return CFHashCode(table.Count()); }
+    std::string Description() const override;
+
+    /// The position of the entry whose key equals `key`, or -1.
+    CFIndex Find(const void* key) const { return table.Find(key, table.HashOf(key)); }
+    /// Stores `key` (and `value`, for a dictionary) as `mode` says. Replacing in a dictionary
+    /// changes the value and keeps the key; in a set it changes the member.
+    void Put(const void* key, const void* value, PutMode mode);
+    /// Gives back the counts of a removed entry.
+    void ReleaseEntry(const HashedEntry& entry) const;
+
+    const CFDictionaryKeyCallBacks keyCallBacks;
+    const CFDictionaryValueCallBacks valueCallBacks;
+    const bool isMutable;
+    HashedTable table;
+
+protected:
+    /// Appends every entry of this collection to the empty `copy`, each retained again.
+    void CopyEntriesTo(HashedCollection& copy) const;
+
+private:
+    const char* kindName_;
 };
 
 } // namespace glyphwell::runtime

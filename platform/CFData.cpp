@@ -4,9 +4,11 @@
 #include <cstdlib>
 #include <cstring>
 #include <functional>
+#include <memory>
 #include <new>
 #include <vector>
 
+#include "platform/ArgumentChecks.h"
 #include "platform/CFRuntime.h"
 #include "platform/Log.h"
 
@@ -130,28 +132,33 @@ const __CFData* AsData(CFDataRef data) {
     return glyphwell::runtime::As<__CFData>(data, kDataKind);
 }
 
-// The mutable data behind `data`, or null (reported) when it is missing or immutable.
-__CFData* AsMutableData(CFMutableDataRef data) {
+/// The mutable data behind `data`, or null (reported) when it is missing or immutable.
+__CFData* AsMutableData(CFMutableDataRef data, const glyphwell::runtime::SourceLocation& where =
+                                                   glyphwell::runtime::SourceLocation::current()) {
     __CFData* object = glyphwell::runtime::AsMutable<__CFData>(data, kDataKind);
-    GW_ASSERT(object != nullptr && object->isMutable);
+    glyphwell::runtime::CheckArgument(object != nullptr && object->isMutable,
+                                      "object != nullptr && object->isMutable", where);
     return object && object->isMutable ? object : nullptr;
 }
 
-bool RangeInside(CFRange range, CFIndex length) {
-    return range.location >= 0 && range.length >= 0 && range.location <= length &&
-           range.length <= length - range.location;
+/// Whether `range` lies inside data of `length` bytes; reported for the caller when it does not.
+bool RangeInside(CFRange range, CFIndex length,
+                 const glyphwell::runtime::SourceLocation& where =
+                     glyphwell::runtime::SourceLocation::current()) {
+    return glyphwell::runtime::CheckRange(range, length, where,
+                                          "RangeInside(range, object->length)");
 }
 
-// A new data object with a copy of `length` bytes, `capacity` reserved (a hint only).
+/// A new data object with a copy of `length` bytes, `capacity` reserved (a hint only).
 __CFData* NewData(bool isMutable, const UInt8* bytes, CFIndex length, CFIndex capacity) {
-    __CFData* data = new __CFData(isMutable, nullptr, 0, 0, true);
+    auto data = std::make_unique<__CFData>(isMutable, nullptr, 0, 0, true); // held until complete
     // The capacity is only a hint: a huge one is not taken as a reason to allocate.
     constexpr CFIndex kLargestHint = CFIndex(1) << 24;
     data->Reserve(std::max(length, std::min(capacity, kLargestHint)));
     if (length > 0)
         std::memcpy(data->bytes, bytes, size_t(length));
     data->length = length;
-    return data;
+    return data.release();
 }
 
 } // namespace
@@ -161,7 +168,7 @@ CFTypeID CFDataGetTypeID() {
 }
 
 CFDataRef CFDataCreate(CFAllocatorRef, const UInt8* bytes, CFIndex length) {
-    GW_ASSERT(length >= 0 && (bytes != nullptr || length == 0));
+    GW_CHECK_ARGUMENT(length >= 0 && (bytes != nullptr || length == 0));
     if (length < 0 || (!bytes && length > 0))
         return nullptr;
     return NewData(false, bytes, length, 0);
@@ -169,7 +176,7 @@ CFDataRef CFDataCreate(CFAllocatorRef, const UInt8* bytes, CFIndex length) {
 
 CFDataRef CFDataCreateWithBytesNoCopy(CFAllocatorRef, const UInt8* bytes, CFIndex length,
                                       CFAllocatorRef bytesDeallocator) {
-    GW_ASSERT(length >= 0 && (bytes != nullptr || length == 0));
+    GW_CHECK_ARGUMENT(length >= 0 && (bytes != nullptr || length == 0));
     if (length < 0 || (!bytes && length > 0))
         return nullptr;
     bool freeBytes = bytesDeallocator != kCFAllocatorNull;
@@ -178,35 +185,34 @@ CFDataRef CFDataCreateWithBytesNoCopy(CFAllocatorRef, const UInt8* bytes, CFInde
 
 CFDataRef CFDataCreateCopy(CFAllocatorRef, CFDataRef data) {
     const __CFData* source = AsData(data);
-    GW_ASSERT(source != nullptr);
+    GW_CHECK_ARGUMENT(source != nullptr);
     if (!source)
         return nullptr;
     return NewData(false, source->bytes, source->length, 0);
 }
 
 CFMutableDataRef CFDataCreateMutable(CFAllocatorRef, CFIndex capacity) {
-    GW_ASSERT(capacity >= 0);
-    return NewData(true, nullptr, 0, std::max<CFIndex>(capacity, 0));
+    if (!GW_CHECK_ARGUMENT(capacity >= 0))
+        return nullptr;
+    return NewData(true, nullptr, 0, capacity);
 }
 
 CFMutableDataRef CFDataCreateMutableCopy(CFAllocatorRef, CFIndex capacity, CFDataRef data) {
     const __CFData* source = AsData(data);
-    GW_ASSERT(source != nullptr);
-    GW_ASSERT(capacity >= 0);
-    if (!source)
+    if (!GW_CHECK_ARGUMENT(source != nullptr) || !GW_CHECK_ARGUMENT(capacity >= 0))
         return nullptr;
-    return NewData(true, source->bytes, source->length, std::max<CFIndex>(capacity, 0));
+    return NewData(true, source->bytes, source->length, capacity);
 }
 
 CFIndex CFDataGetLength(CFDataRef data) {
     const __CFData* object = AsData(data);
-    GW_ASSERT(object != nullptr);
+    GW_CHECK_ARGUMENT(object != nullptr);
     return object ? object->length : 0;
 }
 
 const UInt8* CFDataGetBytePtr(CFDataRef data) {
     const __CFData* object = AsData(data);
-    GW_ASSERT(object != nullptr);
+    GW_CHECK_ARGUMENT(object != nullptr);
     return object ? object->bytes : nullptr;
 }
 
@@ -217,11 +223,10 @@ UInt8* CFDataGetMutableBytePtr(CFMutableDataRef data) {
 
 void CFDataGetBytes(CFDataRef data, CFRange range, UInt8* buffer) {
     const __CFData* object = AsData(data);
-    GW_ASSERT(object != nullptr);
+    GW_CHECK_ARGUMENT(object != nullptr);
     if (!object)
         return;
-    GW_ASSERT(RangeInside(range, object->length));
-    GW_ASSERT(buffer != nullptr || range.length == 0);
+    GW_CHECK_ARGUMENT(buffer != nullptr || range.length == 0);
     if (!RangeInside(range, object->length) || range.length == 0 || !buffer)
         return;
     std::memcpy(buffer, object->bytes + range.location, size_t(range.length));
@@ -229,7 +234,7 @@ void CFDataGetBytes(CFDataRef data, CFRange range, UInt8* buffer) {
 
 void CFDataSetLength(CFMutableDataRef data, CFIndex length) {
     __CFData* object = AsMutableData(data);
-    GW_ASSERT(length >= 0);
+    GW_CHECK_ARGUMENT(length >= 0);
     if (!object || length < 0)
         return;
     if (length <= object->length) {
@@ -241,10 +246,10 @@ void CFDataSetLength(CFMutableDataRef data, CFIndex length) {
 
 void CFDataIncreaseLength(CFMutableDataRef data, CFIndex extraLength) {
     __CFData* object = AsMutableData(data);
-    GW_ASSERT(extraLength >= 0);
+    GW_CHECK_ARGUMENT(extraLength >= 0);
     if (!object || extraLength < 0)
         return;
-    GW_ASSERT(extraLength <= PTRDIFF_MAX - object->length);
+    GW_CHECK_ARGUMENT(extraLength <= PTRDIFF_MAX - object->length);
     if (extraLength > PTRDIFF_MAX - object->length)
         return;
     object->Append(nullptr, extraLength);
@@ -252,10 +257,10 @@ void CFDataIncreaseLength(CFMutableDataRef data, CFIndex extraLength) {
 
 void CFDataAppendBytes(CFMutableDataRef data, const UInt8* bytes, CFIndex length) {
     __CFData* object = AsMutableData(data);
-    GW_ASSERT(length >= 0 && (bytes != nullptr || length == 0));
+    GW_CHECK_ARGUMENT(length >= 0 && (bytes != nullptr || length == 0));
     if (!object || length <= 0 || !bytes)
         return;
-    GW_ASSERT(length <= PTRDIFF_MAX - object->length);
+    GW_CHECK_ARGUMENT(length <= PTRDIFF_MAX - object->length);
     if (length > PTRDIFF_MAX - object->length)
         return;
     object->Append(bytes, length);
@@ -266,11 +271,10 @@ void CFDataReplaceBytes(CFMutableDataRef data, CFRange range, const UInt8* newBy
     __CFData* object = AsMutableData(data);
     if (!object)
         return;
-    GW_ASSERT(RangeInside(range, object->length));
-    GW_ASSERT(newLength >= 0 && (newBytes != nullptr || newLength == 0));
+    GW_CHECK_ARGUMENT(newLength >= 0 && (newBytes != nullptr || newLength == 0));
     if (!RangeInside(range, object->length) || newLength < 0 || (!newBytes && newLength > 0))
         return;
-    GW_ASSERT(newLength - range.length <= PTRDIFF_MAX - object->length);
+    GW_CHECK_ARGUMENT(newLength - range.length <= PTRDIFF_MAX - object->length);
     if (newLength - range.length > PTRDIFF_MAX - object->length)
         return;
     object->Replace(range, newBytes, newLength);
@@ -280,7 +284,6 @@ void CFDataDeleteBytes(CFMutableDataRef data, CFRange range) {
     __CFData* object = AsMutableData(data);
     if (!object)
         return;
-    GW_ASSERT(RangeInside(range, object->length));
     if (RangeInside(range, object->length))
         object->Replace(range, nullptr, 0);
 }

@@ -3,6 +3,9 @@
 //
 // NOTE: CFDataGetBytePtr and CFDataGetMutableBytePtr are valid until the data object next
 // changes its length (append, set length, increase, replace, delete) or is destroyed.
+//
+// Bad input: reported once through the assertion handler (naming the function called); then
+// creators give null, readers 0, false or null, and modifiers change nothing (see CFBase.h).
 #pragma once
 
 #include "platform/CFBase.h"

@@ -4,6 +4,7 @@
 #include <cstring>
 #include <ctime>
 
+#include "platform/ArgumentChecks.h"
 #include "platform/CFRuntime.h"
 #include "platform/Log.h"
 
@@ -89,7 +90,7 @@ CFDateRef CFDateCreate(CFAllocatorRef, CFAbsoluteTime at) {
 
 CFAbsoluteTime CFDateGetAbsoluteTime(CFDateRef date) {
     const __CFDate* object = glyphwell::runtime::As<__CFDate>(date, kDateKind);
-    GW_ASSERT(object != nullptr);
+    GW_CHECK_ARGUMENT(object != nullptr);
     return object ? object->at : 0;
 }
 

@@ -1,5 +1,8 @@
 // Dates and the null value: kinds that exist on the platform but that the flattened value
 // stream does not carry.
+//
+// Bad input: reported once through the assertion handler (naming the function called); then
+// creators give null, readers 0, false or null, and modifiers change nothing (see CFBase.h).
 #pragma once
 
 #include "platform/CFBase.h"

@@ -1,117 +1,45 @@
 #include "platform/CFDictionary.h"
 
+#include <memory>
 #include <string>
 
 #include "platform/CFCollectionStorage.h"
 #include "platform/Log.h"
 
 using glyphwell::runtime::CallEqual;
-using glyphwell::runtime::CallRelease;
-using glyphwell::runtime::CallRetain;
-using glyphwell::runtime::CFObject;
-using glyphwell::runtime::ElementReleaser;
+using glyphwell::runtime::HashedCollection;
 using glyphwell::runtime::HashedEntry;
-using glyphwell::runtime::HashedTable;
 using glyphwell::runtime::kDictionaryKind;
 using glyphwell::runtime::PutMode;
 using glyphwell::runtime::ReportInvalidArgument;
 using Where = glyphwell::runtime::SourceLocation;
 
-/// A dictionary: a hashed table of pairs, each key and value holding the count its retain
-/// callback took.
-struct __CFDictionary final : CFObject {
+/// A dictionary: a hashed collection of pairs.
+struct __CFDictionary final : HashedCollection {
     __CFDictionary(const CFDictionaryKeyCallBacks* keyCallBacks,
                    const CFDictionaryValueCallBacks* valueCallBacks, bool isMutable)
-        : CFObject(kDictionaryKind),
-          keyCallBacks(keyCallBacks ? *keyCallBacks : CFDictionaryKeyCallBacks{}),
-          valueCallBacks(valueCallBacks ? *valueCallBacks : CFDictionaryValueCallBacks{}),
-          isMutable(isMutable), table(this->keyCallBacks.hash, this->keyCallBacks.equal) {}
+        : HashedCollection(kDictionaryKind, "CFDictionary", keyCallBacks, valueCallBacks,
+                           isMutable) {}
 
-    ~__CFDictionary() override {
-        ElementReleaser releaser;
-        table.ForEach([&](const HashedEntry& entry) {
-            releaser.Release(keyCallBacks.release, entry.key);
-            releaser.Release(valueCallBacks.release, entry.value);
-        });
-    }
-
-    // Same count, and every key of this one is in `other` with an equal value.
-    bool Equals(const CFObject& other) const override {
-        const auto& that = static_cast<const __CFDictionary&>(other);
-        if (table.Count() != that.table.Count())
-            return false;
-        return !table.Any([&](const HashedEntry& entry) {
-            CFIndex position = that.Find(entry.key);
-            return position < 0 || !CallEqual(valueCallBacks.equal, entry.value,
-                                              that.table.EntryAt(position).value);
-        });
-    }
-
-    CFHashCode Hash() const override { return CFHashCode(table.Count()); }
-
-    std::string Description() const override {
-        std::string text = glyphwell::runtime::DescriptionPrefix(this, "CFDictionary");
-        text += "{count = " + std::to_string(table.Count()) + ", entries = (\n";
-        table.ForEach([&](const HashedEntry& entry) {
-            text += '\t';
-            text += glyphwell::runtime::CallDescribe(keyCallBacks.copyDescription, entry.key);
-            text += " = ";
-            text += glyphwell::runtime::CallDescribe(valueCallBacks.copyDescription, entry.value);
-            text += '\n';
-        });
-        text += ")}";
-        return text;
-    }
-
-    CFIndex Find(const void* key) const { return table.Find(key, table.HashOf(key)); }
-
-    void Put(const void* key, const void* value, PutMode mode) {
-        CFHashCode hash = table.HashOf(key);
-        CFIndex position = table.Find(key, hash);
-        if (position < 0) {
-            if (mode != PutMode::ReplaceOnly)
-                table.Append(CallRetain(keyCallBacks.retain, key),
-                             CallRetain(valueCallBacks.retain, value), hash);
-            return;
-        }
-        if (mode == PutMode::AddOnly)
-            return;
-        // The key keeps its object and place. Retain the new value first: it may be the old one.
-        const void* retained = CallRetain(valueCallBacks.retain, value);
-        HashedEntry& entry = table.EntryAt(position);
-        const void* replaced = entry.value;
-        entry.value = retained;
-        CallRelease(valueCallBacks.release, replaced);
-    }
-
-    // A new dictionary with the same callbacks and pairs, each retained again.
+    /// A new dictionary with the same callbacks and pairs, each retained again.
     __CFDictionary* Copy(bool copyIsMutable) const {
         auto* copy = new __CFDictionary(&keyCallBacks, &valueCallBacks, copyIsMutable);
-        copy->table.Reserve(table.Count());
-        table.ForEach([&](const HashedEntry& entry) {
-            copy->table.Append(CallRetain(keyCallBacks.retain, entry.key),
-                               CallRetain(valueCallBacks.retain, entry.value), entry.hash);
-        });
+        CopyEntriesTo(*copy);
         return copy;
     }
-
-    CFDictionaryKeyCallBacks keyCallBacks;
-    CFDictionaryValueCallBacks valueCallBacks;
-    bool isMutable;
-    HashedTable table;
 };
 
 namespace {
 
-// The dictionary behind a reference, or null (reported) when it is not one.
-__CFDictionary* dictionaryOf(const void* dictionary, const Where& where = Where::current()) {
+/// The dictionary behind a reference, or null (reported) when it is not one.
+__CFDictionary* DictionaryOf(const void* dictionary, const Where& where = Where::current()) {
     return glyphwell::runtime::CheckedObject<__CFDictionary>(dictionary, kDictionaryKind,
                                                              "dictionary is a CFDictionary", where);
 }
 
-// The dictionary behind a reference when it may be changed, else null (reported).
-__CFDictionary* mutableDictionaryOf(const void* dictionary, const Where& where = Where::current()) {
-    __CFDictionary* object = dictionaryOf(dictionary, where);
+/// The dictionary behind a reference when it may be changed, else null (reported).
+__CFDictionary* MutableDictionaryOf(const void* dictionary, const Where& where = Where::current()) {
+    __CFDictionary* object = DictionaryOf(dictionary, where);
     if (object && !object->isMutable) {
         ReportInvalidArgument("dictionary is mutable", where);
         return nullptr;
@@ -132,16 +60,17 @@ CFDictionaryRef CFDictionaryCreate(CFAllocatorRef, const void** keys, const void
         ReportInvalidArgument("count >= 0 and keys, values != NULL", Where::current());
         return nullptr;
     }
-    auto* dictionary = new __CFDictionary(keyCallBacks, valueCallBacks, false);
+    // Held until complete, so that an allocation failing on the way loses nothing.
+    auto dictionary = std::make_unique<__CFDictionary>(keyCallBacks, valueCallBacks, false);
     dictionary->table.Reserve(count);
     for (CFIndex i = 0; i < count; ++i)
         dictionary->Put(keys[i], values[i], PutMode::AddOrReplace);
-    return dictionary;
+    return dictionary.release();
 }
 
 // A copy of an immutable dictionary is the dictionary itself: nothing can tell them apart.
 CFDictionaryRef CFDictionaryCreateCopy(CFAllocatorRef, CFDictionaryRef dictionary) {
-    const __CFDictionary* source = dictionaryOf(dictionary);
+    const __CFDictionary* source = DictionaryOf(dictionary);
     if (!source)
         return nullptr;
     if (!source->isMutable)
@@ -149,20 +78,22 @@ CFDictionaryRef CFDictionaryCreateCopy(CFAllocatorRef, CFDictionaryRef dictionar
     return source->Copy(false);
 }
 
-CFMutableDictionaryRef CFDictionaryCreateMutable(CFAllocatorRef, CFIndex,
+CFMutableDictionaryRef CFDictionaryCreateMutable(CFAllocatorRef, CFIndex capacity,
                                                  const CFDictionaryKeyCallBacks* keyCallBacks,
                                                  const CFDictionaryValueCallBacks* valueCallBacks) {
+    if (!GW_CHECK_ARGUMENT(capacity >= 0))
+        return nullptr;
     return new __CFDictionary(keyCallBacks, valueCallBacks, true);
 }
 
-CFMutableDictionaryRef CFDictionaryCreateMutableCopy(CFAllocatorRef, CFIndex,
+CFMutableDictionaryRef CFDictionaryCreateMutableCopy(CFAllocatorRef, CFIndex capacity,
                                                      CFDictionaryRef dictionary) {
-    const __CFDictionary* source = dictionaryOf(dictionary);
-    return source ? source->Copy(true) : nullptr;
+    const __CFDictionary* source = DictionaryOf(dictionary);
+    return source && GW_CHECK_ARGUMENT(capacity >= 0) ? source->Copy(true) : nullptr;
 }
 
 CFIndex CFDictionaryGetCount(CFDictionaryRef dictionary) {
-    const __CFDictionary* object = dictionaryOf(dictionary);
+    const __CFDictionary* object = DictionaryOf(dictionary);
     return object ? object->table.Count() : 0;
 }
 
@@ -171,7 +102,7 @@ CFIndex CFDictionaryGetCountOfKey(CFDictionaryRef dictionary, const void* key) {
 }
 
 CFIndex CFDictionaryGetCountOfValue(CFDictionaryRef dictionary, const void* value) {
-    const __CFDictionary* object = dictionaryOf(dictionary);
+    const __CFDictionary* object = DictionaryOf(dictionary);
     if (!object)
         return 0;
     CFIndex count = 0;
@@ -182,12 +113,12 @@ CFIndex CFDictionaryGetCountOfValue(CFDictionaryRef dictionary, const void* valu
 }
 
 Boolean CFDictionaryContainsKey(CFDictionaryRef dictionary, const void* key) {
-    const __CFDictionary* object = dictionaryOf(dictionary);
+    const __CFDictionary* object = DictionaryOf(dictionary);
     return object && object->Find(key) >= 0;
 }
 
 Boolean CFDictionaryContainsValue(CFDictionaryRef dictionary, const void* value) {
-    const __CFDictionary* object = dictionaryOf(dictionary);
+    const __CFDictionary* object = DictionaryOf(dictionary);
     return object && object->table.Any([&](const HashedEntry& entry) {
         return CallEqual(object->valueCallBacks.equal, entry.value, value);
     });
@@ -200,7 +131,7 @@ const void* CFDictionaryGetValue(CFDictionaryRef dictionary, const void* key) {
 
 Boolean CFDictionaryGetValueIfPresent(CFDictionaryRef dictionary, const void* key,
                                       const void** value) {
-    const __CFDictionary* object = dictionaryOf(dictionary);
+    const __CFDictionary* object = DictionaryOf(dictionary);
     CFIndex position = object ? object->Find(key) : -1;
     if (position < 0)
         return false;
@@ -211,7 +142,7 @@ Boolean CFDictionaryGetValueIfPresent(CFDictionaryRef dictionary, const void* ke
 
 void CFDictionaryGetKeysAndValues(CFDictionaryRef dictionary, const void** keys,
                                   const void** values) {
-    const __CFDictionary* object = dictionaryOf(dictionary);
+    const __CFDictionary* object = DictionaryOf(dictionary);
     if (!object)
         return;
     object->table.ForEach([&](const HashedEntry& entry) {
@@ -224,7 +155,7 @@ void CFDictionaryGetKeysAndValues(CFDictionaryRef dictionary, const void** keys,
 
 void CFDictionaryApplyFunction(CFDictionaryRef dictionary, CFDictionaryApplierFunction applier,
                                void* context) {
-    const __CFDictionary* object = dictionaryOf(dictionary);
+    const __CFDictionary* object = DictionaryOf(dictionary);
     if (!object)
         return;
     if (!applier) {
@@ -236,38 +167,34 @@ void CFDictionaryApplyFunction(CFDictionaryRef dictionary, CFDictionaryApplierFu
 }
 
 void CFDictionaryAddValue(CFMutableDictionaryRef dictionary, const void* key, const void* value) {
-    if (__CFDictionary* object = mutableDictionaryOf(dictionary))
+    if (__CFDictionary* object = MutableDictionaryOf(dictionary))
         object->Put(key, value, PutMode::AddOnly);
 }
 
 void CFDictionarySetValue(CFMutableDictionaryRef dictionary, const void* key, const void* value) {
-    if (__CFDictionary* object = mutableDictionaryOf(dictionary))
+    if (__CFDictionary* object = MutableDictionaryOf(dictionary))
         object->Put(key, value, PutMode::AddOrReplace);
 }
 
 void CFDictionaryReplaceValue(CFMutableDictionaryRef dictionary, const void* key,
                               const void* value) {
-    if (__CFDictionary* object = mutableDictionaryOf(dictionary))
+    if (__CFDictionary* object = MutableDictionaryOf(dictionary))
         object->Put(key, value, PutMode::ReplaceOnly);
 }
 
 void CFDictionaryRemoveValue(CFMutableDictionaryRef dictionary, const void* key) {
-    __CFDictionary* object = mutableDictionaryOf(dictionary);
+    __CFDictionary* object = MutableDictionaryOf(dictionary);
     CFIndex position = object ? object->Find(key) : -1;
     if (position < 0)
         return;
-    HashedEntry removed = object->table.Remove(position);
-    CallRelease(object->keyCallBacks.release, removed.key);
-    CallRelease(object->valueCallBacks.release, removed.value);
+    object->ReleaseEntry(object->table.Remove(position));
 }
 
 void CFDictionaryRemoveAllValues(CFMutableDictionaryRef dictionary) {
-    __CFDictionary* object = mutableDictionaryOf(dictionary);
+    __CFDictionary* object = MutableDictionaryOf(dictionary);
     if (!object)
         return;
     // Empty the dictionary before releasing, so release callbacks see a consistent dictionary.
-    for (const HashedEntry& entry : object->table.TakeAll()) {
-        CallRelease(object->keyCallBacks.release, entry.key);
-        CallRelease(object->valueCallBacks.release, entry.value);
-    }
+    for (const HashedEntry& entry : object->table.TakeAll())
+        object->ReleaseEntry(entry);
 }

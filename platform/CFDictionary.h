@@ -1,5 +1,8 @@
 // Key-value collections; keys are distinct by the key equality callback. Enumeration follows
 // insertion order (a replaced value keeps its key's place), which callers must not rely on.
+//
+// Bad input: reported once through the assertion handler (naming the function called); then
+// creators give null, readers 0, false or null, and modifiers change nothing (see CFBase.h).
 #pragma once
 
 #include "platform/CFBase.h"

@@ -1,5 +1,6 @@
 #include "platform/CFError.h"
 
+#include "platform/ArgumentChecks.h"
 #include "platform/CFDictionary.h"
 #include "platform/CFRuntime.h"
 #include "platform/CFString.h"
@@ -74,19 +75,19 @@ CFErrorRef CFErrorCreate(CFAllocatorRef, CFStringRef domain, CFIndex code,
 
 CFStringRef CFErrorGetDomain(CFErrorRef error) {
     const __CFError* object = AsError(error);
-    GW_ASSERT(object != nullptr);
+    GW_CHECK_ARGUMENT(object != nullptr);
     return object ? object->domain : nullptr;
 }
 
 CFIndex CFErrorGetCode(CFErrorRef error) {
     const __CFError* object = AsError(error);
-    GW_ASSERT(object != nullptr);
+    GW_CHECK_ARGUMENT(object != nullptr);
     return object ? object->code : 0;
 }
 
 CFDictionaryRef CFErrorCopyUserInfo(CFErrorRef error) {
     const __CFError* object = AsError(error);
-    GW_ASSERT(object != nullptr);
+    GW_CHECK_ARGUMENT(object != nullptr);
     if (!object)
         return nullptr;
     if (object->userInfo)

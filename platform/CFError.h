@@ -1,4 +1,7 @@
 // Errors: a domain string, a code and an optional user-info dictionary.
+//
+// Bad input: reported once through the assertion handler (naming the function called); then
+// creators give null, readers 0, false or null, and modifiers change nothing (see CFBase.h).
 #pragma once
 
 #include "platform/CFBase.h"

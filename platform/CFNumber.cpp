@@ -5,6 +5,7 @@
 #include <cstring>
 #include <limits>
 
+#include "platform/ArgumentChecks.h"
 #include "platform/CFRuntime.h"
 #include "platform/Log.h"
 
@@ -25,8 +26,8 @@ bool IsValidType(CFNumberType type) {
     return type >= 1 && type <= kCFNumberMaxType;
 }
 
-// Exact three-way comparison of an integer with a double that is not NaN: no conversion that
-// could round takes place.
+/// Exact three-way comparison of an integer with a double that is not NaN: no conversion that
+/// could round takes place.
 int CompareIntegerWithDouble(int64_t integer, double value) {
     constexpr double kTwoTo63 = 9223372036854775808.0;
     if (value >= kTwoTo63)
@@ -41,16 +42,16 @@ int CompareIntegerWithDouble(int64_t integer, double value) {
     return fraction > 0 ? -1 : fraction < 0 ? 1 : 0;
 }
 
-// The number's value stored as a signed integer of `bits` bits: the low bits, and whether the
-// value fits.
+/// The number's value stored as a signed integer of `bits` bits: the low bits, and whether the
+/// value fits.
 template <class T> bool StoreInteger(int64_t value, void* out) {
     T narrowed = T(value); // modular since C++20
     std::memcpy(out, &narrowed, sizeof narrowed);
     return int64_t(narrowed) == value;
 }
 
-// A double converted to integer type T: truncated toward zero, saturated at T's limits, NaN
-// gives 0. Exact only when nothing was cut.
+/// A double converted to integer type T: truncated toward zero, saturated at T's limits, NaN
+/// gives 0. Exact only when nothing was cut.
 template <class T> bool StoreFromDouble(double value, void* out) {
     using Limits = std::numeric_limits<T>;
     // -2^(bits-1) and 2^(bits-1) are exact doubles.
@@ -75,8 +76,8 @@ template <class T> bool StoreFromDouble(double value, void* out) {
     return exact;
 }
 
-// A double rounded to the nearest float. Doing the overflowing cast by hand keeps it defined:
-// beyond the float range the result is the largest float or infinity, as round-to-nearest gives.
+/// A double rounded to the nearest float. Doing the overflowing cast by hand keeps it defined:
+/// beyond the float range the result is the largest float or infinity, as round-to-nearest gives.
 float RoundToFloat(double value) {
     constexpr double kTwoTo128 = 340282366920938463463374607431768211456.0;
     constexpr float kMax = std::numeric_limits<float>::max();
@@ -207,7 +208,7 @@ CFIndex CFNumberTypeByteSize(CFNumberType type) {
     return IsValidType(type) ? sizes[type] : 0;
 }
 
-// Reads a value of type T from possibly unaligned memory.
+/// Reads a value of type T from possibly unaligned memory.
 template <class T> static T Load(const void* valuePtr) {
     T value;
     std::memcpy(&value, valuePtr, sizeof value);
@@ -215,7 +216,7 @@ template <class T> static T Load(const void* valuePtr) {
 }
 
 CFNumberRef CFNumberCreate(CFAllocatorRef, CFNumberType type, const void* valuePtr) {
-    if (!IsValidType(type) || !valuePtr)
+    if (!GW_CHECK_ARGUMENT(IsValidType(type)) || !GW_CHECK_ARGUMENT(valuePtr != nullptr))
         return nullptr;
     if (IsFloatType(type)) {
         double real = CFNumberTypeByteSize(type) == 4 ? double(Load<float>(valuePtr))
@@ -242,26 +243,26 @@ CFNumberRef CFNumberCreate(CFAllocatorRef, CFNumberType type, const void* valueP
 
 CFNumberType CFNumberGetType(CFNumberRef number) {
     const __CFNumber* object = AsNumber(number);
-    GW_ASSERT(object != nullptr);
+    GW_CHECK_ARGUMENT(object != nullptr);
     return object ? object->type : 0;
 }
 
 CFIndex CFNumberGetByteSize(CFNumberRef number) {
     const __CFNumber* object = AsNumber(number);
-    GW_ASSERT(object != nullptr);
+    GW_CHECK_ARGUMENT(object != nullptr);
     return object ? CFNumberTypeByteSize(object->type) : 0;
 }
 
 Boolean CFNumberIsFloatType(CFNumberRef number) {
     const __CFNumber* object = AsNumber(number);
-    GW_ASSERT(object != nullptr);
+    GW_CHECK_ARGUMENT(object != nullptr);
     return object && object->isFloat;
 }
 
 Boolean CFNumberGetValue(CFNumberRef number, CFNumberType type, void* valuePtr) {
     const __CFNumber* object = AsNumber(number);
-    GW_ASSERT(object != nullptr);
-    GW_ASSERT(valuePtr != nullptr);
+    GW_CHECK_ARGUMENT(object != nullptr);
+    GW_CHECK_ARGUMENT(valuePtr != nullptr);
     if (!object || !valuePtr || !IsValidType(type))
         return false;
     CFIndex size = CFNumberTypeByteSize(type);
@@ -308,7 +309,7 @@ Boolean CFNumberGetValue(CFNumberRef number, CFNumberType type, void* valuePtr) 
 CFComparisonResult CFNumberCompare(CFNumberRef a, CFNumberRef b, void*) {
     const __CFNumber* left = AsNumber(a);
     const __CFNumber* right = AsNumber(b);
-    GW_ASSERT(left != nullptr && right != nullptr);
+    GW_CHECK_ARGUMENT(left != nullptr && right != nullptr);
     if (!left || !right)
         return kCFCompareEqualTo;
     return CompareNumbers(*left, *right);
@@ -316,6 +317,6 @@ CFComparisonResult CFNumberCompare(CFNumberRef a, CFNumberRef b, void*) {
 
 Boolean CFBooleanGetValue(CFBooleanRef boolean) {
     const __CFBoolean* object = glyphwell::runtime::As<__CFBoolean>(boolean, kBooleanKind);
-    GW_ASSERT(object != nullptr);
+    GW_CHECK_ARGUMENT(object != nullptr);
     return object && object->value;
 }

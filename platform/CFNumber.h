@@ -1,6 +1,9 @@
 // Numbers and booleans. A number keeps the type code it was created with (1-16) and that
 // code's byte size, and converts to any other code on request, saying whether the conversion
 // was exact. The two booleans are shared constants.
+//
+// Bad input: reported once through the assertion handler (naming the function called); then
+// creators give null, readers 0, false or null, and modifiers change nothing (see CFBase.h).
 #pragma once
 
 #include "platform/CFBase.h"

@@ -2,6 +2,7 @@
 
 #include <cstdio>
 
+#include "platform/ArgumentChecks.h"
 #include "platform/CFString.h"
 #include "platform/Log.h"
 
@@ -78,25 +79,25 @@ const CFAllocatorRef kCFAllocatorMalloc = &mallocAllocator;
 const CFAllocatorRef kCFAllocatorNull = &nullAllocator;
 
 CFTypeRef CFRetain(CFTypeRef value) {
-    GW_ASSERT(value != nullptr);
+    GW_CHECK_ARGUMENT(value != nullptr);
     if (value)
         AsObject(value)->Retain();
     return value;
 }
 
 void CFRelease(CFTypeRef value) {
-    GW_ASSERT(value != nullptr);
+    GW_CHECK_ARGUMENT(value != nullptr);
     if (value && AsObject(value)->ReleaseShouldDestroy())
         delete AsObject(value);
 }
 
 CFIndex CFGetRetainCount(CFTypeRef value) {
-    GW_ASSERT(value != nullptr);
+    GW_CHECK_ARGUMENT(value != nullptr);
     return value ? AsObject(value)->RetainCount() : 0;
 }
 
 CFTypeID CFGetTypeID(CFTypeRef value) {
-    GW_ASSERT(value != nullptr);
+    GW_CHECK_ARGUMENT(value != nullptr);
     return value ? AsObject(value)->Kind() : 0;
 }
 
@@ -111,12 +112,12 @@ Boolean CFEqual(CFTypeRef a, CFTypeRef b) {
 }
 
 CFHashCode CFHash(CFTypeRef value) {
-    GW_ASSERT(value != nullptr);
+    GW_CHECK_ARGUMENT(value != nullptr);
     return value ? AsObject(value)->Hash() : 0;
 }
 
 CFStringRef CFCopyDescription(CFTypeRef value) {
-    GW_ASSERT(value != nullptr);
+    GW_CHECK_ARGUMENT(value != nullptr);
     if (!value)
         return nullptr;
     std::string text = AsObject(value)->Description();
@@ -131,8 +132,16 @@ CFStringRef CFCopyTypeIDDescription(CFTypeID typeID) {
         "CFString", "CFData",       "CFCharacterSet", "CFArray",
         "CFSet",    "CFDictionary", "CFURL",          "CFUUID",
         "CFError",  "CFDate",       "CFMessagePort",  "CFRunLoopSource"};
-    if (typeID == 0 || typeID >= kKindCount)
+    if (typeID == 0)
         return nullptr;
+    if (typeID >= kKindCount) {
+        std::string name = RegisteredKindName(typeID);
+        return name.empty()
+                   ? nullptr
+                   : CFStringCreateWithBytes(kCFAllocatorDefault,
+                                             reinterpret_cast<const UInt8*>(name.data()),
+                                             CFIndex(name.size()), kCFStringEncodingUTF8, false);
+    }
     return CFStringCreateWithCString(kCFAllocatorDefault, names[typeID], kCFStringEncodingUTF8);
 }
 
@@ -141,22 +150,22 @@ void CFShow(CFTypeRef value) {
     std::fprintf(stderr, "%s\n", text.c_str());
 }
 
-static const void* retainValue(CFAllocatorRef, const void* value) {
+static const void* RetainValue(CFAllocatorRef, const void* value) {
     return CFRetain(value);
 }
-static void releaseValue(CFAllocatorRef, const void* value) {
+static void ReleaseValue(CFAllocatorRef, const void* value) {
     CFRelease(value);
 }
 
-const CFArrayCallBacks kCFTypeArrayCallBacks = {0, retainValue, releaseValue, CFCopyDescription,
+const CFArrayCallBacks kCFTypeArrayCallBacks = {0, RetainValue, ReleaseValue, CFCopyDescription,
                                                 CFEqual};
-const CFSetCallBacks kCFTypeSetCallBacks = {0,       retainValue, releaseValue, CFCopyDescription,
+const CFSetCallBacks kCFTypeSetCallBacks = {0,       RetainValue, ReleaseValue, CFCopyDescription,
                                             CFEqual, CFHash};
 const CFDictionaryKeyCallBacks kCFTypeDictionaryKeyCallBacks = {
-    0, retainValue, releaseValue, CFCopyDescription, CFEqual, CFHash};
-const CFDictionaryValueCallBacks kCFTypeDictionaryValueCallBacks = {0, retainValue, releaseValue,
+    0, RetainValue, ReleaseValue, CFCopyDescription, CFEqual, CFHash};
+const CFDictionaryValueCallBacks kCFTypeDictionaryValueCallBacks = {0, RetainValue, ReleaseValue,
                                                                     CFCopyDescription, CFEqual};
 const CFDictionaryKeyCallBacks kCFCopyStringDictionaryKeyCallBacks = {
-    0, retainValue, releaseValue, CFCopyDescription, CFEqual, CFHash};
+    0, RetainValue, ReleaseValue, CFCopyDescription, CFEqual, CFHash};
 const CFSetCallBacks kCFCopyStringSetCallBacks = {
-    0, retainValue, releaseValue, CFCopyDescription, CFEqual, CFHash};
+    0, RetainValue, ReleaseValue, CFCopyDescription, CFEqual, CFHash};

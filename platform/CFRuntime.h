@@ -1,4 +1,5 @@
-// The object model behind every property value (internal to platform/). Each kind is a class
+// The object model behind every property value (internal to platform/; kinds defined above
+// platform/ use platform/CFKind.h). Each kind is a class
 // derived from CFObject; a CFTypeRef points at the CFObject part, which sits at the start of
 // every value, so the conversions below are plain pointer casts.
 #pragma once
@@ -96,5 +97,8 @@ void CallRelease(CFReleaseCallBack release, const void* value);
 bool CallEqual(CFEqualCallBack equal, const void* a, const void* b);
 CFHashCode CallHash(CFHashCallBack hash, const void* value);
 std::string CallDescribe(CFCopyDescriptionCallBack describe, const void* value);
+
+/// The name of a kind registered through CFKindRegister; empty when `kind` is none.
+std::string RegisteredKindName(CFTypeID kind);
 
 } // namespace glyphwell::runtime

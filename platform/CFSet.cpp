@@ -1,99 +1,53 @@
 #include "platform/CFSet.h"
 
+#include <memory>
 #include <string>
 
 #include "platform/CFCollectionStorage.h"
 #include "platform/Log.h"
 
-using glyphwell::runtime::CallRelease;
-using glyphwell::runtime::CallRetain;
-using glyphwell::runtime::CFObject;
-using glyphwell::runtime::ElementReleaser;
+using glyphwell::runtime::HashedCollection;
 using glyphwell::runtime::HashedEntry;
-using glyphwell::runtime::HashedTable;
 using glyphwell::runtime::kSetKind;
 using glyphwell::runtime::PutMode;
 using glyphwell::runtime::ReportInvalidArgument;
 using Where = glyphwell::runtime::SourceLocation;
 
-/// A set: its members are the keys of a hashed table, each holding the count its retain
-/// callback took.
-struct __CFSet final : CFObject {
+/// The key callbacks that a set's callbacks amount to (the two records have the same fields).
+static CFDictionaryKeyCallBacks KeyCallBacksOf(const CFSetCallBacks* callBacks) {
+    if (!callBacks)
+        return {};
+    return {callBacks->version,         callBacks->retain, callBacks->release,
+            callBacks->copyDescription, callBacks->equal,  callBacks->hash};
+}
+
+/// A set: its members are the keys of a hashed collection.
+struct __CFSet final : HashedCollection {
     __CFSet(const CFSetCallBacks* callBacks, bool isMutable)
-        : CFObject(kSetKind), callBacks(callBacks ? *callBacks : CFSetCallBacks{}),
-          isMutable(isMutable), table(this->callBacks.hash, this->callBacks.equal) {}
+        : __CFSet(KeyCallBacksOf(callBacks), isMutable) {}
+    __CFSet(const CFDictionaryKeyCallBacks& keys, bool isMutable)
+        : HashedCollection(kSetKind, "CFSet", &keys, nullptr, isMutable) {}
 
-    ~__CFSet() override {
-        ElementReleaser releaser;
-        table.ForEach(
-            [&](const HashedEntry& entry) { releaser.Release(callBacks.release, entry.key); });
-    }
+    void Put(const void* value, PutMode mode) { HashedCollection::Put(value, nullptr, mode); }
 
-    bool Equals(const CFObject& other) const override {
-        const auto& that = static_cast<const __CFSet&>(other);
-        return table.Count() == that.table.Count() &&
-               !table.Any([&](const HashedEntry& entry) { return that.Find(entry.key) < 0; });
-    }
-
-    CFHashCode Hash() const override { return CFHashCode(table.Count()); }
-
-    std::string Description() const override {
-        std::string text = glyphwell::runtime::DescriptionPrefix(this, "CFSet");
-        text += "{count = " + std::to_string(table.Count()) + ", values = (\n";
-        table.ForEach([&](const HashedEntry& entry) {
-            text += '\t';
-            text += glyphwell::runtime::CallDescribe(callBacks.copyDescription, entry.key);
-            text += '\n';
-        });
-        text += ")}";
-        return text;
-    }
-
-    CFIndex Find(const void* value) const { return table.Find(value, table.HashOf(value)); }
-
-    void Put(const void* value, PutMode mode) {
-        CFHashCode hash = table.HashOf(value);
-        CFIndex position = table.Find(value, hash);
-        if (position < 0) {
-            if (mode != PutMode::ReplaceOnly)
-                table.Append(CallRetain(callBacks.retain, value), nullptr, hash);
-            return;
-        }
-        if (mode == PutMode::AddOnly)
-            return;
-        // Retain the newcomer first: it may be the member it replaces.
-        const void* retained = CallRetain(callBacks.retain, value);
-        HashedEntry& entry = table.EntryAt(position);
-        const void* replaced = entry.key;
-        entry.key = retained;
-        CallRelease(callBacks.release, replaced);
-    }
-
-    // A new set with the same callbacks and members, each retained again.
+    /// A new set with the same callbacks and members, each retained again.
     __CFSet* Copy(bool copyIsMutable) const {
-        auto* copy = new __CFSet(&callBacks, copyIsMutable);
-        copy->table.Reserve(table.Count());
-        table.ForEach([&](const HashedEntry& entry) {
-            copy->table.Append(CallRetain(callBacks.retain, entry.key), nullptr, entry.hash);
-        });
+        auto* copy = new __CFSet(keyCallBacks, copyIsMutable);
+        CopyEntriesTo(*copy);
         return copy;
     }
-
-    CFSetCallBacks callBacks;
-    bool isMutable;
-    HashedTable table;
 };
 
 namespace {
 
-// The set behind a reference, or null (reported) when it is not one.
-__CFSet* setOf(const void* set, const Where& where = Where::current()) {
+/// The set behind a reference, or null (reported) when it is not one.
+__CFSet* SetOf(const void* set, const Where& where = Where::current()) {
     return glyphwell::runtime::CheckedObject<__CFSet>(set, kSetKind, "set is a CFSet", where);
 }
 
-// The set behind a reference when it may be changed, else null (reported).
-__CFSet* mutableSetOf(const void* set, const Where& where = Where::current()) {
-    __CFSet* object = setOf(set, where);
+/// The set behind a reference when it may be changed, else null (reported).
+__CFSet* MutableSetOf(const void* set, const Where& where = Where::current()) {
+    __CFSet* object = SetOf(set, where);
     if (object && !object->isMutable) {
         ReportInvalidArgument("set is mutable", where);
         return nullptr;
@@ -113,16 +67,16 @@ CFSetRef CFSetCreate(CFAllocatorRef, const void** values, CFIndex count,
         ReportInvalidArgument("count >= 0 and values != NULL", Where::current());
         return nullptr;
     }
-    auto* set = new __CFSet(callBacks, false);
+    auto set = std::make_unique<__CFSet>(callBacks, false); // held until complete
     set->table.Reserve(count);
     for (CFIndex i = 0; i < count; ++i)
         set->Put(values[i], PutMode::AddOnly);
-    return set;
+    return set.release();
 }
 
 // A copy of an immutable set is the set itself: nothing can tell them apart.
 CFSetRef CFSetCreateCopy(CFAllocatorRef, CFSetRef set) {
-    const __CFSet* source = setOf(set);
+    const __CFSet* source = SetOf(set);
     if (!source)
         return nullptr;
     if (!source->isMutable)
@@ -130,27 +84,30 @@ CFSetRef CFSetCreateCopy(CFAllocatorRef, CFSetRef set) {
     return source->Copy(false);
 }
 
-CFMutableSetRef CFSetCreateMutable(CFAllocatorRef, CFIndex, const CFSetCallBacks* callBacks) {
+CFMutableSetRef CFSetCreateMutable(CFAllocatorRef, CFIndex capacity,
+                                   const CFSetCallBacks* callBacks) {
+    if (!GW_CHECK_ARGUMENT(capacity >= 0))
+        return nullptr;
     return new __CFSet(callBacks, true);
 }
 
-CFMutableSetRef CFSetCreateMutableCopy(CFAllocatorRef, CFIndex, CFSetRef set) {
-    const __CFSet* source = setOf(set);
-    return source ? source->Copy(true) : nullptr;
+CFMutableSetRef CFSetCreateMutableCopy(CFAllocatorRef, CFIndex capacity, CFSetRef set) {
+    const __CFSet* source = SetOf(set);
+    return source && GW_CHECK_ARGUMENT(capacity >= 0) ? source->Copy(true) : nullptr;
 }
 
 CFIndex CFSetGetCount(CFSetRef set) {
-    const __CFSet* object = setOf(set);
+    const __CFSet* object = SetOf(set);
     return object ? object->table.Count() : 0;
 }
 
 CFIndex CFSetGetCountOfValue(CFSetRef set, const void* value) {
-    const __CFSet* object = setOf(set);
+    const __CFSet* object = SetOf(set);
     return object && object->Find(value) >= 0 ? 1 : 0;
 }
 
 Boolean CFSetContainsValue(CFSetRef set, const void* value) {
-    const __CFSet* object = setOf(set);
+    const __CFSet* object = SetOf(set);
     return object && object->Find(value) >= 0;
 }
 
@@ -160,7 +117,7 @@ const void* CFSetGetValue(CFSetRef set, const void* value) {
 }
 
 Boolean CFSetGetValueIfPresent(CFSetRef set, const void* candidate, const void** value) {
-    const __CFSet* object = setOf(set);
+    const __CFSet* object = SetOf(set);
     CFIndex position = object ? object->Find(candidate) : -1;
     if (position < 0)
         return false;
@@ -170,14 +127,14 @@ Boolean CFSetGetValueIfPresent(CFSetRef set, const void* candidate, const void**
 }
 
 void CFSetGetValues(CFSetRef set, const void** values) {
-    const __CFSet* object = setOf(set);
+    const __CFSet* object = SetOf(set);
     if (!object || !values)
         return;
     object->table.ForEach([&](const HashedEntry& entry) { *values++ = entry.key; });
 }
 
 void CFSetApplyFunction(CFSetRef set, CFSetApplierFunction applier, void* context) {
-    const __CFSet* object = setOf(set);
+    const __CFSet* object = SetOf(set);
     if (!object)
         return;
     if (!applier) {
@@ -188,34 +145,33 @@ void CFSetApplyFunction(CFSetRef set, CFSetApplierFunction applier, void* contex
 }
 
 void CFSetAddValue(CFMutableSetRef set, const void* value) {
-    if (__CFSet* object = mutableSetOf(set))
+    if (__CFSet* object = MutableSetOf(set))
         object->Put(value, PutMode::AddOnly);
 }
 
 void CFSetSetValue(CFMutableSetRef set, const void* value) {
-    if (__CFSet* object = mutableSetOf(set))
+    if (__CFSet* object = MutableSetOf(set))
         object->Put(value, PutMode::AddOrReplace);
 }
 
 void CFSetReplaceValue(CFMutableSetRef set, const void* value) {
-    if (__CFSet* object = mutableSetOf(set))
+    if (__CFSet* object = MutableSetOf(set))
         object->Put(value, PutMode::ReplaceOnly);
 }
 
 void CFSetRemoveValue(CFMutableSetRef set, const void* value) {
-    __CFSet* object = mutableSetOf(set);
+    __CFSet* object = MutableSetOf(set);
     CFIndex position = object ? object->Find(value) : -1;
     if (position < 0)
         return;
-    HashedEntry removed = object->table.Remove(position);
-    CallRelease(object->callBacks.release, removed.key);
+    object->ReleaseEntry(object->table.Remove(position));
 }
 
 void CFSetRemoveAllValues(CFMutableSetRef set) {
-    __CFSet* object = mutableSetOf(set);
+    __CFSet* object = MutableSetOf(set);
     if (!object)
         return;
     // Empty the set before releasing, so release callbacks see a consistent set.
     for (const HashedEntry& entry : object->table.TakeAll())
-        CallRelease(object->callBacks.release, entry.key);
+        object->ReleaseEntry(entry);
 }

@@ -1,5 +1,8 @@
 // Unordered collections of distinct values (by the equality callback). Enumeration follows
 // insertion order, which callers must not rely on.
+//
+// Bad input: reported once through the assertion handler (naming the function called); then
+// creators give null, readers 0, false or null, and modifiers change nothing (see CFBase.h).
 #pragma once
 
 #include "platform/CFBase.h"

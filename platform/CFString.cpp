@@ -10,6 +10,7 @@
 #include <string>
 #include <unordered_map>
 
+#include "platform/ArgumentChecks.h"
 #include "platform/CFRuntime.h"
 #include "platform/Log.h"
 #include "platform/TextCodec.h"
@@ -58,25 +59,28 @@ namespace {
 
 /// The string behind `string`; reports a null or foreign reference through the assertion
 /// handler and returns null.
-const __CFString* Get(CFStringRef string) {
+const __CFString* Get(CFStringRef string, const glyphwell::runtime::SourceLocation& where =
+                                              glyphwell::runtime::SourceLocation::current()) {
     const __CFString* object = As<__CFString>(string, kStringKind);
-    GW_ASSERT(object != nullptr);
+    CheckArgument(object != nullptr, "object != nullptr", where);
     return object;
 }
 
 /// The mutable string behind `string`, or null (reported) when it is null or immutable.
-__CFString* GetMutable(CFMutableStringRef string) {
+__CFString* GetMutable(CFMutableStringRef string,
+                       const glyphwell::runtime::SourceLocation& where =
+                           glyphwell::runtime::SourceLocation::current()) {
     __CFString* object = AsMutable<__CFString>(string, kStringKind);
-    GW_ASSERT(object != nullptr && object->isMutable);
+    CheckArgument(object != nullptr && object->isMutable, "object != nullptr && object->isMutable",
+                  where);
     return object && object->isMutable ? object : nullptr;
 }
 
 /// True when `range` lies inside a string of `length` units; reported otherwise.
-bool RangeInside(CFRange range, size_t length) {
-    bool inside = range.location >= 0 && range.length >= 0 && size_t(range.location) <= length &&
-                  size_t(range.length) <= length - size_t(range.location);
-    GW_ASSERT(inside);
-    return inside;
+bool RangeInside(CFRange range, size_t length,
+                 const glyphwell::runtime::SourceLocation& where =
+                     glyphwell::runtime::SourceLocation::current()) {
+    return CheckRange(range, CFIndex(length), where, "range lies inside the string");
 }
 
 CFStringRef Make(std::u16string units) {
@@ -135,7 +139,7 @@ CFTypeID CFStringGetTypeID() {
 }
 
 CFStringRef __CFStringMakeConstantString(const char* utf8) {
-    GW_ASSERT(utf8 != nullptr);
+    GW_CHECK_ARGUMENT(utf8 != nullptr);
     if (!utf8)
         return nullptr;
     ConstantTable& table = Constants();
@@ -151,7 +155,7 @@ CFStringRef __CFStringMakeConstantString(const char* utf8) {
 
 CFStringRef CFStringCreateWithBytes(CFAllocatorRef, const UInt8* bytes, CFIndex numBytes,
                                     CFStringEncoding encoding, Boolean isExternalRepresentation) {
-    GW_ASSERT(numBytes >= 0 && (bytes != nullptr || numBytes == 0));
+    GW_CHECK_ARGUMENT(numBytes >= 0 && (bytes != nullptr || numBytes == 0));
     if (numBytes < 0 || (!bytes && numBytes != 0))
         return nullptr;
     std::u16string units;
@@ -162,7 +166,7 @@ CFStringRef CFStringCreateWithBytes(CFAllocatorRef, const UInt8* bytes, CFIndex 
 
 CFStringRef CFStringCreateWithCString(CFAllocatorRef allocator, const char* cString,
                                       CFStringEncoding encoding) {
-    GW_ASSERT(cString != nullptr);
+    GW_CHECK_ARGUMENT(cString != nullptr);
     if (!cString)
         return nullptr;
     return CFStringCreateWithBytes(allocator, reinterpret_cast<const UInt8*>(cString),
@@ -170,8 +174,9 @@ CFStringRef CFStringCreateWithCString(CFAllocatorRef allocator, const char* cStr
 }
 
 CFStringRef CFStringCreateWithCharacters(CFAllocatorRef, const UniChar* chars, CFIndex numChars) {
-    GW_ASSERT(numChars >= 0 && (chars != nullptr || numChars == 0));
-    if (numChars <= 0 || !chars)
+    if (!GW_CHECK_ARGUMENT(numChars >= 0 && (chars != nullptr || numChars == 0)))
+        return nullptr;
+    if (numChars == 0)
         return Make(std::u16string());
     return Make(std::u16string(reinterpret_cast<const char16_t*>(chars), size_t(numChars)));
 }
@@ -195,7 +200,7 @@ CFStringRef CFStringCreateWithSubstring(CFAllocatorRef, CFStringRef string, CFRa
     if (!object)
         return nullptr;
     if (!RangeInside(range, object->units.size()))
-        return Make(std::u16string());
+        return nullptr;
     return Make(object->units.substr(size_t(range.location), size_t(range.length)));
 }
 
@@ -211,13 +216,18 @@ CFStringRef CFStringCreateWithFormat(CFAllocatorRef, CFDictionaryRef, CFStringRe
     return Make(text::DecodeUTF8Lenient(formatted));
 }
 
-CFMutableStringRef CFStringCreateMutable(CFAllocatorRef, CFIndex) {
+CFMutableStringRef CFStringCreateMutable(CFAllocatorRef, CFIndex maxLength) {
+    if (!GW_CHECK_ARGUMENT(maxLength >= 0))
+        return nullptr;
     return new __CFString(std::u16string(), true);
 }
 
-CFMutableStringRef CFStringCreateMutableCopy(CFAllocatorRef, CFIndex, CFStringRef string) {
+CFMutableStringRef CFStringCreateMutableCopy(CFAllocatorRef, CFIndex maxLength,
+                                             CFStringRef string) {
     const __CFString* object = Get(string);
-    return new __CFString(object ? object->units : std::u16string(), true);
+    if (!object || !GW_CHECK_ARGUMENT(maxLength >= 0))
+        return nullptr;
+    return new __CFString(object->units, true);
 }
 
 // ---------------------------------------------------------------------------------------------
@@ -234,7 +244,7 @@ void CFStringAppend(CFMutableStringRef string, CFStringRef appended) {
 void CFStringAppendCString(CFMutableStringRef string, const char* cString,
                            CFStringEncoding encoding) {
     __CFString* object = GetMutable(string);
-    GW_ASSERT(cString != nullptr);
+    GW_CHECK_ARGUMENT(cString != nullptr);
     if (!object || !cString)
         return;
     std::u16string units;
@@ -245,7 +255,7 @@ void CFStringAppendCString(CFMutableStringRef string, const char* cString,
 
 void CFStringAppendCharacters(CFMutableStringRef string, const UniChar* chars, CFIndex numChars) {
     __CFString* object = GetMutable(string);
-    GW_ASSERT(numChars >= 0 && (chars != nullptr || numChars == 0));
+    GW_CHECK_ARGUMENT(numChars >= 0 && (chars != nullptr || numChars == 0));
     if (object && chars && numChars > 0)
         object->units.append(reinterpret_cast<const char16_t*>(chars), size_t(numChars));
 }
@@ -286,7 +296,7 @@ UniChar CFStringGetCharacterAtIndex(CFStringRef string, CFIndex index) {
 
 void CFStringGetCharacters(CFStringRef string, CFRange range, UniChar* buffer) {
     const __CFString* object = Get(string);
-    GW_ASSERT(buffer != nullptr || range.length == 0);
+    GW_CHECK_ARGUMENT(buffer != nullptr || range.length == 0);
     if (!object || !buffer || !RangeInside(range, object->units.size()))
         return;
     std::memcpy(buffer, object->units.data() + range.location,
@@ -320,7 +330,7 @@ CFIndex CFStringGetBytes(CFStringRef string, CFRange range, CFStringEncoding enc
 Boolean CFStringGetCString(CFStringRef string, char* buffer, CFIndex bufferSize,
                            CFStringEncoding encoding) {
     const __CFString* object = Get(string);
-    GW_ASSERT(buffer != nullptr || bufferSize == 0);
+    GW_CHECK_ARGUMENT(buffer != nullptr || bufferSize == 0);
     if (!object || !buffer || bufferSize <= 0)
         return false;
     // Room for the terminator is kept back from the conversion.
@@ -338,7 +348,7 @@ const char* CFStringGetCStringPtr(CFStringRef, CFStringEncoding) {
 }
 
 CFIndex CFStringGetMaximumSizeForEncoding(CFIndex length, CFStringEncoding encoding) {
-    GW_ASSERT(length >= 0);
+    GW_CHECK_ARGUMENT(length >= 0);
     size_t perUnit = text::MaxBytesPerUnit(encoding);
     if (length < 0 || perUnit == 0 || size_t(length) > size_t(LONG_MAX) / perUnit)
         return kCFNotFound;
@@ -426,4 +436,23 @@ Boolean CFStringHasPrefix(CFStringRef string, CFStringRef prefix) {
 Boolean CFStringHasSuffix(CFStringRef string, CFStringRef suffix) {
     return CFStringFindWithOptions(string, suffix, CFRangeMake(0, CFStringGetLength(string)),
                                    kCFCompareAnchored | kCFCompareBackwards, nullptr);
+}
+
+std::optional<std::string> glyphwell::UTF8String(CFStringRef string, UInt8 lossByte) {
+    if (!string)
+        return std::nullopt;
+    const __CFString* object = Get(string);
+    if (!object)
+        return std::nullopt;
+    std::string bytes;
+    if (text::EncodeUTF8(object->units, bytes))
+        return bytes;
+    if (lossByte == 0)
+        return std::nullopt;
+    text::EncodeResult result;
+    text::Encode(object->units, kCFStringEncodingUTF8, lossByte, false, nullptr, 0, result);
+    bytes.assign(result.bytes, '\0');
+    text::Encode(object->units, kCFStringEncodingUTF8, lossByte, false,
+                 reinterpret_cast<uint8_t*>(bytes.data()), bytes.size(), result);
+    return bytes;
 }

@@ -1,6 +1,12 @@
 // Strings: immutable (or mutable) sequences of UTF-16 code units, with conversion to and from
 // byte encodings. Text is never normalised; equality compares code units.
+//
+// Bad input: reported once through the assertion handler (naming the function called); then
+// creators give null, readers 0, false or null, and modifiers change nothing (see CFBase.h).
 #pragma once
+
+#include <optional>
+#include <string>
 
 #include "platform/CFBase.h"
 
@@ -44,13 +50,14 @@ CFStringRef CFStringCreateWithBytes(CFAllocatorRef allocator, const UInt8* bytes
 /// Text from a zero-terminated C string.
 CFStringRef CFStringCreateWithCString(CFAllocatorRef allocator, const char* cString,
                                       CFStringEncoding encoding);
+/// Text from `numChars` UTF-16 units; null for a negative count (or a null `chars` with units).
 CFStringRef CFStringCreateWithCharacters(CFAllocatorRef allocator, const UniChar* chars,
                                          CFIndex numChars);
 /// Text from a path in the file-system representation (UTF-8 on Linux).
 CFStringRef CFStringCreateWithFileSystemRepresentation(CFAllocatorRef allocator,
                                                        const char* buffer);
 CFStringRef CFStringCreateCopy(CFAllocatorRef allocator, CFStringRef string);
-/// The units of `range`; the caller keeps the range inside the string.
+/// The units of `range`; null when the range is not inside the string.
 CFStringRef CFStringCreateWithSubstring(CFAllocatorRef allocator, CFStringRef string,
                                         CFRange range);
 /// printf-style formatting; "%@" inserts a value's description.
@@ -112,3 +119,12 @@ Boolean CFStringFindWithOptions(CFStringRef string, CFStringRef toFind, CFRange 
                                 CFStringCompareFlags options, CFRange* result);
 Boolean CFStringHasPrefix(CFStringRef string, CFStringRef prefix);
 Boolean CFStringHasSuffix(CFStringRef string, CFStringRef suffix);
+
+namespace glyphwell {
+
+/// The UTF-8 bytes of `string` (a U+0000 in it stays a zero byte). Empty for a null string, and,
+/// when `lossByte` is 0, for a string holding a lone surrogate, which has no UTF-8 form; otherwise
+/// `lossByte` stands in for each lone surrogate.
+std::optional<std::string> UTF8String(CFStringRef string, UInt8 lossByte = 0);
+
+} // namespace glyphwell

@@ -14,6 +14,7 @@
 #include <string_view>
 #include <vector>
 
+#include "platform/ArgumentChecks.h"
 #include "platform/CFRuntime.h"
 #include "platform/Log.h"
 #include "platform/TextCodec.h"
@@ -208,17 +209,17 @@ CFStringRef CreateString(std::string_view s) {
 }
 
 /// The UTF-8 form of `string`; false for null or an unpaired surrogate.
-bool UTF8Of(CFStringRef string, std::string& out) {
-    GW_ASSERT(string != nullptr);
+bool UTF8Of(CFStringRef string, std::string& out,
+            const glyphwell::runtime::SourceLocation& where =
+                glyphwell::runtime::SourceLocation::current()) {
+    CheckArgument(string != nullptr, "string != nullptr", where);
     if (!string)
         return false;
-    const UniChar* units = CFStringGetCharactersPtr(string);
-    if (!units)
+    std::optional<std::string> bytes = glyphwell::UTF8String(string);
+    if (!bytes)
         return false;
-    out.clear();
-    return text::EncodeUTF8(std::u16string_view(reinterpret_cast<const char16_t*>(units),
-                                                size_t(CFStringGetLength(string))),
-                            out);
+    out = std::move(*bytes);
+    return true;
 }
 
 /// "." and ".." segments taken out of `path` (RFC 3986 section 5.2.4). A relative path keeps
@@ -301,16 +302,20 @@ struct __CFURL final : public CFObject {
 
 namespace {
 
-const __CFURL* Get(CFURLRef url) {
+const __CFURL* Get(CFURLRef url, const glyphwell::runtime::SourceLocation& where =
+                                     glyphwell::runtime::SourceLocation::current()) {
     const __CFURL* object = As<__CFURL>(url, kURLKind);
-    GW_ASSERT(object != nullptr);
+    CheckArgument(object != nullptr, "object != nullptr", where);
     return object;
 }
 
 /// A new URL for `text` relative to `base`; null when `text` is not UTF-8 or not a reference.
 /// A reference with a scheme is absolute already: the base is not kept.
-CFURLRef CreateURL(std::string text, CFURLRef base) {
-    GW_ASSERT(base == nullptr || CFGetTypeID(base) == kURLKind);
+CFURLRef CreateURL(std::string text, CFURLRef base,
+                   const glyphwell::runtime::SourceLocation& where =
+                       glyphwell::runtime::SourceLocation::current()) {
+    CheckArgument(base == nullptr || CFGetTypeID(base) == kURLKind,
+                  "base == nullptr || CFGetTypeID(base) == kURLKind", where);
     if (base && CFGetTypeID(base) != kURLKind)
         base = nullptr;
     if (!text::IsValidUTF8(reinterpret_cast<const uint8_t*>(text.data()), text.size()))
@@ -441,7 +446,7 @@ CFTypeID CFURLGetTypeID() {
 
 CFURLRef CFURLCreateWithBytes(CFAllocatorRef, const UInt8* bytes, CFIndex length,
                               CFStringEncoding encoding, CFURLRef baseURL) {
-    GW_ASSERT(length >= 0 && (bytes != nullptr || length == 0));
+    GW_CHECK_ARGUMENT(length >= 0 && (bytes != nullptr || length == 0));
     if (length < 0 || (!bytes && length != 0))
         return nullptr;
     std::string text;
@@ -470,7 +475,7 @@ CFURLRef CFURLCreateWithFileSystemPath(CFAllocatorRef allocator, CFStringRef pat
 CFURLRef CFURLCreateWithFileSystemPathRelativeToBase(CFAllocatorRef, CFStringRef path,
                                                      CFURLPathStyle style, Boolean isDirectory,
                                                      CFURLRef baseURL) {
-    GW_ASSERT(style == kCFURLPOSIXPathStyle);
+    GW_CHECK_ARGUMENT(style == kCFURLPOSIXPathStyle);
     std::string bytes;
     if (style != kCFURLPOSIXPathStyle || !UTF8Of(path, bytes))
         return nullptr;
@@ -479,7 +484,7 @@ CFURLRef CFURLCreateWithFileSystemPathRelativeToBase(CFAllocatorRef, CFStringRef
 
 CFURLRef CFURLCreateFromFileSystemRepresentation(CFAllocatorRef, const UInt8* buffer,
                                                  CFIndex length, Boolean isDirectory) {
-    GW_ASSERT(length >= 0 && (buffer != nullptr || length == 0));
+    GW_CHECK_ARGUMENT(length >= 0 && (buffer != nullptr || length == 0));
     if (length <= 0 || !buffer)
         return nullptr;
     return CreateWithPathBytes(
@@ -555,7 +560,7 @@ CFStringRef CFURLCopyHostName(CFURLRef url) {
 
 CFStringRef CFURLCopyFileSystemPath(CFURLRef url, CFURLPathStyle style) {
     const __CFURL* object = Get(url);
-    GW_ASSERT(style == kCFURLPOSIXPathStyle);
+    GW_CHECK_ARGUMENT(style == kCFURLPOSIXPathStyle);
     std::string path;
     if (!object || style != kCFURLPOSIXPathStyle || !FileSystemPathOf(AbsoluteText(object), path))
         return nullptr;
@@ -596,7 +601,7 @@ CFStringRef CFURLCopyFragment(CFURLRef url, CFStringRef charactersToLeaveEscaped
 Boolean CFURLGetFileSystemRepresentation(CFURLRef url, Boolean resolveAgainstBase, UInt8* buffer,
                                          CFIndex maxBufLen) {
     const __CFURL* object = Get(url);
-    GW_ASSERT(buffer != nullptr);
+    GW_CHECK_ARGUMENT(buffer != nullptr);
     std::string path;
     if (!object || !buffer ||
         !FileSystemPathOf(resolveAgainstBase ? AbsoluteText(object) : object->text, path) ||

@@ -1,5 +1,8 @@
 // URLs: a UTF-8 string (RFC 3986 reference) and an optional base URL it is relative to. Parsing
 // and resolution follow RFC 3986.
+//
+// Bad input: reported once through the assertion handler (naming the function called); then
+// creators give null, readers 0, false or null, and modifiers change nothing (see CFBase.h).
 #pragma once
 
 #include "platform/CFBase.h"

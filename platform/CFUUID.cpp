@@ -6,6 +6,7 @@
 #include <cstring>
 #include <random>
 
+#include "platform/ArgumentChecks.h"
 #include "platform/CFRuntime.h"
 #include "platform/CFString.h"
 #include "platform/Log.h"
@@ -46,8 +47,8 @@ int HexValue(UniChar c) {
     return -1;
 }
 
-// Fills `bytes` with random bytes from the kernel; std::random_device only if the kernel call
-// is unavailable.
+/// Fills `bytes` with random bytes from the kernel; std::random_device only if the kernel call
+/// is unavailable.
 void RandomBytes(UInt8* bytes, size_t count) {
     size_t filled = 0;
     while (filled < count) {
@@ -130,7 +131,7 @@ CFUUIDRef CFUUIDCreateFromString(CFAllocatorRef, CFStringRef string) {
 
 CFStringRef CFUUIDCreateString(CFAllocatorRef, CFUUIDRef uuid) {
     const __CFUUID* object = glyphwell::runtime::As<__CFUUID>(uuid, kUUIDKind);
-    GW_ASSERT(object != nullptr);
+    GW_CHECK_ARGUMENT(object != nullptr);
     if (!object)
         return nullptr;
     return CFStringCreateWithCString(kCFAllocatorDefault, UUIDText(object->bytes).c_str(),
@@ -140,7 +141,7 @@ CFStringRef CFUUIDCreateString(CFAllocatorRef, CFUUIDRef uuid) {
 CFUUIDBytes CFUUIDGetUUIDBytes(CFUUIDRef uuid) {
     CFUUIDBytes result{};
     const __CFUUID* object = glyphwell::runtime::As<__CFUUID>(uuid, kUUIDKind);
-    GW_ASSERT(object != nullptr);
+    GW_CHECK_ARGUMENT(object != nullptr);
     if (object)
         std::memcpy(&result, object->bytes, sizeof result);
     return result;

@@ -29,7 +29,7 @@ struct SinkState {
     std::shared_ptr<const LogSink> sink; ///< null: the default sink
 };
 
-// Never destroyed, so that lines logged by static destructors still find it.
+/// Never destroyed, so that lines logged by static destructors still find it.
 SinkState& State() {
     static SinkState* state = new SinkState;
     return *state;
@@ -46,13 +46,13 @@ void DefaultSink(const LogRecord& record) {
     std::fprintf(stderr, "%.*s\n", length, record.text.data());
 }
 
-// A va_list that can be passed by reference on every ABI (on some it is an array type).
+/// A va_list that can be passed by reference on every ABI (on some it is an array type).
 struct Arguments {
     va_list list;
 };
 
-// Appends `value` formatted by the single printf directive `directive`. A directive the C
-// library cannot format (a wide string that does not convert) is copied as it stands.
+/// Appends `value` formatted by the single printf directive `directive`. A directive the C
+/// library cannot format (a wide string that does not convert) is copied as it stands.
 template <class T> void AppendDirective(std::string& out, const std::string& directive, T value) {
     char buffer[128];
     int needed = std::snprintf(buffer, sizeof buffer, directive.c_str(), value);
@@ -72,7 +72,7 @@ template <class T> void AppendDirective(std::string& out, const std::string& dir
 
 enum class Length { None, Char, Short, Long, LongLong, IntMax, Size, PtrDiff, LongDouble };
 
-// Reads a decimal field (a width or precision) into `value`; false when it does not fit an int.
+/// Reads a decimal field (a width or precision) into `value`; false when it does not fit an int.
 bool ReadDecimal(const char*& p, long long& value) {
     value = 0;
     while (*p >= '0' && *p <= '9') {
@@ -83,12 +83,9 @@ bool ReadDecimal(const char*& p, long long& value) {
     return true;
 }
 
-// Formats one directive that starts at `p` (just after the '%'), taking its arguments from
-// `arguments`. Returns false when the directive is broken (unknown conversion, positional
-// argument, a length that does not go with the conversion, too wide a field); the caller then
-// copies its text unchanged. `p` is left after the directive's last character.
-bool FormatDirective(std::string& out, const char*& p, Arguments& arguments) {
-    std::string directive = "%";
+/// Reads the flags, width and precision of a directive at `p` into `directive` (which holds the
+/// '%'), taking '*' fields from `arguments`; false when a field is too wide or positional.
+bool ReadField(const char*& p, Arguments& arguments, std::string& directive) {
     while (*p && std::strchr("-+ #0", *p))
         directive += *p++;
 
@@ -127,10 +124,13 @@ bool FormatDirective(std::string& out, const char*& p, Arguments& arguments) {
             directive.append(digits, p);
         }
     }
+    return true;
+}
 
-    const std::string fieldPart = directive; // '%', flags, width and precision
+/// Reads a length modifier at `p`, appending it to `directive`.
+Length ReadLength(const char*& p, std::string& directive) {
+    const char* start = p;
     Length length = Length::None;
-    const char* lengthStart = p;
     switch (*p) {
     case 'h':
         length = p[1] == 'h' ? Length::Char : Length::Short;
@@ -141,27 +141,101 @@ bool FormatDirective(std::string& out, const char*& p, Arguments& arguments) {
         p += length == Length::LongLong ? 2 : 1;
         break;
     case 'j':
-        length = Length::IntMax;
-        ++p;
-        break;
     case 'z':
-        length = Length::Size;
-        ++p;
-        break;
     case 't':
-        length = Length::PtrDiff;
-        ++p;
-        break;
     case 'L':
-        length = Length::LongDouble;
+        length = *p == 'j'   ? Length::IntMax
+                 : *p == 'z' ? Length::Size
+                 : *p == 't' ? Length::PtrDiff
+                             : Length::LongDouble;
         ++p;
         break;
     default:
         break;
     }
-    directive.append(lengthStart, p);
+    directive.append(start, p);
+    return length;
+}
 
-    char conversion = *p;
+/// Formats an integer conversion: `Signed` chooses the signed or unsigned type of each length.
+template <bool Signed>
+bool AppendInteger(std::string& out, const std::string& directive, Length length,
+                   Arguments& arguments) {
+    using Int = std::conditional_t<Signed, int, unsigned int>;
+    using Long = std::conditional_t<Signed, long, unsigned long>;
+    using LongLong = std::conditional_t<Signed, long long, unsigned long long>;
+    using IntMax = std::conditional_t<Signed, intmax_t, uintmax_t>;
+    using Size = std::conditional_t<Signed, std::make_signed_t<size_t>, size_t>;
+    using PtrDiff = std::conditional_t<Signed, ptrdiff_t, std::make_unsigned_t<ptrdiff_t>>;
+    switch (length) {
+    case Length::None:
+    case Length::Char:
+    case Length::Short:
+        AppendDirective(out, directive, va_arg(arguments.list, Int));
+        return true;
+    case Length::Long:
+        AppendDirective(out, directive, va_arg(arguments.list, Long));
+        return true;
+    case Length::LongLong:
+        AppendDirective(out, directive, va_arg(arguments.list, LongLong));
+        return true;
+    case Length::IntMax:
+        AppendDirective(out, directive, va_arg(arguments.list, IntMax));
+        return true;
+    case Length::Size:
+        AppendDirective(out, directive, va_arg(arguments.list, Size));
+        return true;
+    case Length::PtrDiff:
+        AppendDirective(out, directive, va_arg(arguments.list, PtrDiff));
+        return true;
+    case Length::LongDouble:
+        return false;
+    }
+    return false;
+}
+
+/// Formats a 'c' or 's' conversion (wide with the 'l' length); a null string reads "(null)".
+bool AppendText(std::string& out, const std::string& directive, char conversion, Length length,
+                Arguments& arguments) {
+    if (length != Length::None && length != Length::Long)
+        return false;
+    const bool wide = length == Length::Long;
+    if (conversion == 'c') {
+        if (wide)
+            AppendDirective(out, directive, va_arg(arguments.list, wint_t));
+        else
+            AppendDirective(out, directive, va_arg(arguments.list, int));
+    } else if (wide) {
+        const wchar_t* text = va_arg(arguments.list, const wchar_t*);
+        AppendDirective(out, directive, text ? text : L"(null)");
+    } else {
+        const char* text = va_arg(arguments.list, const char*);
+        AppendDirective(out, directive, text ? text : "(null)");
+    }
+    return true;
+}
+
+/// Formats "%@": the description of a property value, with the field of `fieldPart` applied as
+/// to a "%s" (a length modifier means nothing here and is dropped).
+void AppendDescription(std::string& out, const std::string& fieldPart, Arguments& arguments) {
+    std::string text = Describe(va_arg(arguments.list, CFTypeRef));
+    if (fieldPart.size() == 1)
+        out += text;
+    else
+        AppendDirective(out, fieldPart + "s", text.c_str());
+}
+
+/// Formats one directive that starts at `p` (just after the '%'), taking its arguments from
+/// `arguments`. Returns false when the directive is broken (unknown conversion, positional
+/// argument, a length that does not go with the conversion, too wide a field); the caller then
+/// copies its text unchanged. `p` is left after the directive's last character.
+bool FormatDirective(std::string& out, const char*& p, Arguments& arguments) {
+    std::string directive = "%";
+    if (!ReadField(p, arguments, directive))
+        return false;
+    const std::string fieldPart = directive; // '%', flags, width and precision
+    const Length length = ReadLength(p, directive);
+    const char conversion = *p;
     if (!conversion)
         return false;
     ++p;
@@ -170,61 +244,12 @@ bool FormatDirective(std::string& out, const char*& p, Arguments& arguments) {
     switch (conversion) {
     case 'd':
     case 'i':
-        switch (length) {
-        case Length::None:
-        case Length::Char:
-        case Length::Short:
-            AppendDirective(out, directive, va_arg(arguments.list, int));
-            return true;
-        case Length::Long:
-            AppendDirective(out, directive, va_arg(arguments.list, long));
-            return true;
-        case Length::LongLong:
-            AppendDirective(out, directive, va_arg(arguments.list, long long));
-            return true;
-        case Length::IntMax:
-            AppendDirective(out, directive, va_arg(arguments.list, intmax_t));
-            return true;
-        case Length::Size:
-            AppendDirective(out, directive, va_arg(arguments.list, std::make_signed_t<size_t>));
-            return true;
-        case Length::PtrDiff:
-            AppendDirective(out, directive, va_arg(arguments.list, ptrdiff_t));
-            return true;
-        case Length::LongDouble:
-            return false;
-        }
-        return false;
+        return AppendInteger<true>(out, directive, length, arguments);
     case 'u':
     case 'o':
     case 'x':
     case 'X':
-        switch (length) {
-        case Length::None:
-        case Length::Char:
-        case Length::Short:
-            AppendDirective(out, directive, va_arg(arguments.list, unsigned int));
-            return true;
-        case Length::Long:
-            AppendDirective(out, directive, va_arg(arguments.list, unsigned long));
-            return true;
-        case Length::LongLong:
-            AppendDirective(out, directive, va_arg(arguments.list, unsigned long long));
-            return true;
-        case Length::IntMax:
-            AppendDirective(out, directive, va_arg(arguments.list, uintmax_t));
-            return true;
-        case Length::Size:
-            AppendDirective(out, directive, va_arg(arguments.list, size_t));
-            return true;
-        case Length::PtrDiff:
-            AppendDirective(out, directive,
-                            va_arg(arguments.list, std::make_unsigned_t<ptrdiff_t>));
-            return true;
-        case Length::LongDouble:
-            return false;
-        }
-        return false;
+        return AppendInteger<false>(out, directive, length, arguments);
     case 'f':
     case 'F':
     case 'e':
@@ -233,36 +258,16 @@ bool FormatDirective(std::string& out, const char*& p, Arguments& arguments) {
     case 'G':
     case 'a':
     case 'A':
-        if (length == Length::LongDouble) {
+        if (length == Length::LongDouble)
             AppendDirective(out, directive, va_arg(arguments.list, long double));
-            return true;
-        }
-        if (length != Length::None && length != Length::Long)
+        else if (length == Length::None || length == Length::Long)
+            AppendDirective(out, directive, va_arg(arguments.list, double));
+        else
             return false;
-        AppendDirective(out, directive, va_arg(arguments.list, double));
         return true;
     case 'c':
-        if (length == Length::None) {
-            AppendDirective(out, directive, va_arg(arguments.list, int));
-            return true;
-        }
-        if (length == Length::Long) {
-            AppendDirective(out, directive, va_arg(arguments.list, wint_t));
-            return true;
-        }
-        return false;
     case 's':
-        if (length == Length::None) {
-            const char* text = va_arg(arguments.list, const char*);
-            AppendDirective(out, directive, text ? text : "(null)");
-            return true;
-        }
-        if (length == Length::Long) {
-            const wchar_t* text = va_arg(arguments.list, const wchar_t*);
-            AppendDirective(out, directive, text ? text : L"(null)");
-            return true;
-        }
-        return false;
+        return AppendText(out, directive, conversion, length, arguments);
     case 'p':
         if (length != Length::None)
             return false;
@@ -276,17 +281,9 @@ bool FormatDirective(std::string& out, const char*& p, Arguments& arguments) {
     case '%':
         out += '%';
         return true;
-    case '@': {
-        std::string text = Describe(va_arg(arguments.list, CFTypeRef));
-        if (fieldPart.size() == 1) {
-            out += text;
-            return true;
-        }
-        // Flags, width and precision apply to the description as to a "%s"; a length
-        // modifier means nothing here and is dropped.
-        AppendDirective(out, fieldPart + "s", text.c_str());
+    case '@':
+        AppendDescription(out, fieldPart, arguments);
         return true;
-    }
     default:
         return false;
     }

@@ -221,6 +221,46 @@ bool DecodeUTF32(const uint8_t* p, size_t n, bool bigEndian, bool external, std:
 // ---------------------------------------------------------------------------------------------
 // Encoding.
 
+/// The character at `units[i]`, a surrogate pair read whole (`take` is then 2). False for an
+/// unpaired surrogate, with `c` that unit.
+[[gnu::always_inline]] inline bool ReadCharacter(const char16_t* units, size_t n, size_t i,
+                                                 uint32_t& c, size_t& take) {
+    c = units[i];
+    take = 1;
+    if (!IsSurrogate(c))
+        return true;
+    if (IsHighSurrogate(c) && i + 1 < n && IsLowSurrogate(units[i + 1])) {
+        c = 0x10000 + ((c - 0xD800) << 10) + (units[i + 1] - 0xDC00);
+        take = 2;
+        return true;
+    }
+    return false;
+}
+
+/// Writes the UTF-8 form of the scalar value `c` (not a surrogate) at `out`; returns its length.
+[[gnu::always_inline]] inline size_t EncodeUTF8Scalar(uint32_t c, uint8_t* out) {
+    if (c < 0x80) {
+        out[0] = uint8_t(c);
+        return 1;
+    }
+    if (c < 0x800) {
+        out[0] = uint8_t(0xC0 | c >> 6);
+        out[1] = uint8_t(0x80 | (c & 0x3F));
+        return 2;
+    }
+    if (c < 0x10000) {
+        out[0] = uint8_t(0xE0 | c >> 12);
+        out[1] = uint8_t(0x80 | (c >> 6 & 0x3F));
+        out[2] = uint8_t(0x80 | (c & 0x3F));
+        return 3;
+    }
+    out[0] = uint8_t(0xF0 | c >> 18);
+    out[1] = uint8_t(0x80 | (c >> 12 & 0x3F));
+    out[2] = uint8_t(0x80 | (c >> 6 & 0x3F));
+    out[3] = uint8_t(0x80 | (c & 0x3F));
+    return 4;
+}
+
 /// EncodeUTF8Counted into a buffer with room for the longest form (3 bytes per unit), so no
 /// unit can run out of space: one tight loop, no capacity checks. This is the stream writer's
 /// case, and the same rules give the same bytes.
@@ -261,35 +301,15 @@ void EncodeUTF8WithRoom(std::u16string_view units, uint8_t lossByte, uint8_t* bu
         }
         if (i == n)
             break;
-        const uint32_t c = src[i];
-        if (c < 0x80) {
-            buffer[pos++] = uint8_t(c);
-            ++i;
-        } else if (c < 0x800) {
-            buffer[pos] = uint8_t(0xC0 | c >> 6);
-            buffer[pos + 1] = uint8_t(0x80 | (c & 0x3F));
-            pos += 2;
-            ++i;
-        } else if (!IsSurrogate(c)) {
-            buffer[pos] = uint8_t(0xE0 | c >> 12);
-            buffer[pos + 1] = uint8_t(0x80 | (c >> 6 & 0x3F));
-            buffer[pos + 2] = uint8_t(0x80 | (c & 0x3F));
-            pos += 3;
-            ++i;
-        } else if (IsHighSurrogate(c) && i + 1 < n && IsLowSurrogate(src[i + 1])) {
-            const uint32_t pair = 0x10000 + ((c - 0xD800) << 10) + (src[i + 1] - 0xDC00);
-            buffer[pos] = uint8_t(0xF0 | pair >> 18);
-            buffer[pos + 1] = uint8_t(0x80 | (pair >> 12 & 0x3F));
-            buffer[pos + 2] = uint8_t(0x80 | (pair >> 6 & 0x3F));
-            buffer[pos + 3] = uint8_t(0x80 | (pair & 0x3F));
-            pos += 4;
-            i += 2;
-        } else if (lossByte != 0) { // an unpaired surrogate
+        uint32_t c;
+        size_t take;
+        if (ReadCharacter(src, n, i, c, take))
+            pos += EncodeUTF8Scalar(c, buffer + pos);
+        else if (lossByte != 0) // an unpaired surrogate
             buffer[pos++] = lossByte;
-            ++i;
-        } else {
+        else
             break;
-        }
+        i += take;
     }
     result.unitsConverted = i;
     result.bytes = pos;
@@ -335,29 +355,11 @@ void EncodeUTF8Counted(std::u16string_view units, uint8_t lossByte, uint8_t* buf
             break;
 
         // A non-ASCII unit, or no room left for the next ASCII one.
-        uint32_t c = src[i];
-        size_t take = 1, length;
+        uint32_t c;
+        size_t take, length;
         uint8_t bytes[4];
-        if (c < 0x80) {
-            length = 1;
-            bytes[0] = uint8_t(c);
-        } else if (c < 0x800) {
-            length = 2;
-            bytes[0] = uint8_t(0xC0 | c >> 6);
-            bytes[1] = uint8_t(0x80 | (c & 0x3F));
-        } else if (!IsSurrogate(c)) {
-            length = 3;
-            bytes[0] = uint8_t(0xE0 | c >> 12);
-            bytes[1] = uint8_t(0x80 | (c >> 6 & 0x3F));
-            bytes[2] = uint8_t(0x80 | (c & 0x3F));
-        } else if (IsHighSurrogate(c) && i + 1 < n && IsLowSurrogate(src[i + 1])) {
-            c = 0x10000 + ((c - 0xD800) << 10) + (src[i + 1] - 0xDC00);
-            take = 2;
-            length = 4;
-            bytes[0] = uint8_t(0xF0 | c >> 18);
-            bytes[1] = uint8_t(0x80 | (c >> 12 & 0x3F));
-            bytes[2] = uint8_t(0x80 | (c >> 6 & 0x3F));
-            bytes[3] = uint8_t(0x80 | (c & 0x3F));
+        if (ReadCharacter(src, n, i, c, take)) {
+            length = EncodeUTF8Scalar(c, bytes);
         } else if (lossByte != 0) { // an unpaired surrogate
             length = 1;
             bytes[0] = lossByte;
@@ -434,15 +436,9 @@ void EncodeGeneric(std::u16string_view units, Form form, uint8_t lossByte, bool 
     }
     const size_t n = units.size();
     while (i < n) {
-        uint32_t c = units[i];
-        size_t take = 1;
-        bool lone = false;
-        if (IsHighSurrogate(c) && i + 1 < n && IsLowSurrogate(units[i + 1])) {
-            c = 0x10000 + ((c - 0xD800) << 10) + (units[i + 1] - 0xDC00);
-            take = 2;
-        } else if (IsSurrogate(c)) {
-            lone = true;
-        }
+        uint32_t c;
+        size_t take;
+        const bool lone = !ReadCharacter(units.data(), n, i, c, take);
         uint8_t bytes[4];
         size_t length = EncodeOne(form, c, lone, bytes);
         if (length == 0) {

@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <cstring>
+#include <new>
 #include <vector>
 
 #include "bitmap/QZBitmapRepresentation.h"
@@ -19,19 +20,30 @@ namespace {
 /// table grows by doubling with the elements actually read, so its size follows them rather than
 /// the count the stream claims. The inline storage is not cleared (clearing it cost more than
 /// reading a small dictionary's pairs): every element is stored before it is read.
+///
+/// The table owns one count of each element added, and gives them back when it goes, so that
+/// whatever stops a read (a missing element, an allocation that fails) loses nothing.
 class ElementTable {
 public:
     ElementTable() = default;
     ElementTable(const ElementTable&) = delete;
     ElementTable& operator=(const ElementTable&) = delete;
+    ~ElementTable() { ReleaseAll(); }
 
-    /// Makes room for element `index` of a container of `count` elements (`index` < `count`).
-    void Reserve(unsigned long index, long count) {
-        if (index >= capacity_)
+    /// Adds `element` (non-null; its count is taken over) as element Count() of a container of
+    /// `count` elements.
+    void Add(void const* element, long count) {
+        if (count_ >= capacity_)
             Grow(count);
+        elements_[count_++] = element;
     }
-    void const*& operator[](unsigned long index) { return elements_[index]; }
+    unsigned long Count() const { return count_; }
     void const** Data() { return elements_; }
+    /// Gives back the count of every element, last first.
+    void ReleaseAll() {
+        while (count_ > 0)
+            CFRelease(elements_[--count_]);
+    }
 
 private:
     void Grow(long count);
@@ -41,6 +53,7 @@ private:
     std::vector<void const*> heap_;
     void const** elements_ = inline_;
     unsigned long capacity_ = kInlineCount;
+    unsigned long count_ = 0;
 };
 
 /// Doubles the table, up to `count` elements. Only the elements below the old capacity, all
@@ -55,22 +68,14 @@ void ElementTable::Grow(long count) {
     capacity_ = grown;
 }
 
-void ReleaseElements(ElementTable& table, long count) {
-    for (long i = count - 1; i >= 0; --i)
-        TCFSafeRelease(table[static_cast<unsigned long>(i)]);
-}
-
 /// Reads the `count` elements of an array or set into `table`. One missing element loses them
-/// all: false, with the elements read so far released.
+/// all: false (the table releases the elements read so far).
 bool ResurrectElements(TCFResurrectContext& context, long count, ElementTable& table) {
     for (long i = 0; i < count; ++i) {
-        table.Reserve(static_cast<unsigned long>(i), count);
-        void const*& element = table[static_cast<unsigned long>(i)];
-        element = context.Resurrect(kTCFTypeAny);
-        if (!element) {
-            ReleaseElements(table, i);
+        void const* element = context.Resurrect(kTCFTypeAny);
+        if (!element)
             return false;
-        }
+        table.Add(element, count);
     }
     return true;
 }
@@ -215,6 +220,17 @@ __CFError* TCFResurrectContext::RetrieveCFError() {
 void const* TCFResurrectContext::Resurrect(TCFType expected) {
     if (!cursor)
         return nullptr;
+    // An allocation that fails anywhere below ends the read as corrupt input does; whatever was
+    // read so far is owned by the frames being unwound and released by them.
+    try {
+        return ResurrectValue(expected);
+    } catch (const std::bad_alloc&) {
+        ResurrectionError("memory");
+        return nullptr;
+    }
+}
+
+void const* TCFResurrectContext::ResurrectValue(TCFType expected) {
     const TCFType type = StreamInTCFTypeID();
     if (expected != kTCFTypeAny && type != expected) {
         CFLog(kCFLogLevelError, "Quzel encounters an unexpected type. (%d, %d)",
@@ -361,10 +377,7 @@ __CFArray const* TCFResurrectContext::ResurrectCFArray() {
     ElementTable table;
     if (!ResurrectElements(*this, count, table))
         return nullptr;
-    CFArrayRef array =
-        CFArrayCreate(kCFAllocatorDefault, table.Data(), count, &kCFTypeArrayCallBacks);
-    ReleaseElements(table, count);
-    return array;
+    return CFArrayCreate(kCFAllocatorDefault, table.Data(), count, &kCFTypeArrayCallBacks);
 }
 
 __CFSet const* TCFResurrectContext::ResurrectCFSet() {
@@ -372,38 +385,27 @@ __CFSet const* TCFResurrectContext::ResurrectCFSet() {
     ElementTable table;
     if (!ResurrectElements(*this, count, table))
         return nullptr;
-    CFSetRef set = CFSetCreate(kCFAllocatorDefault, table.Data(), count, &kCFTypeSetCallBacks);
-    ReleaseElements(table, count);
-    return set;
+    return CFSetCreate(kCFAllocatorDefault, table.Data(), count, &kCFTypeSetCallBacks);
 }
 
 __CFDictionary const* TCFResurrectContext::ResurrectCFDictionary() {
     long count = ContainerCount("cfdict");
     ElementTable keys, values;
     for (long i = 0; i < count; ++i) {
-        const unsigned long index = static_cast<unsigned long>(i);
-        keys.Reserve(index, count);
-        values.Reserve(index, count);
-        void const*& key = keys[index];
-        void const*& value = values[index];
-        key = Resurrect(kTCFTypeAny);
-        value = Resurrect(kTCFTypeAny);
+        TCFAdopted<CFTypeRef> key(Resurrect(kTCFTypeAny));
+        TCFAdopted<CFTypeRef> value(Resurrect(kTCFTypeAny));
         if (!key || !value) {
             CFLog(
                 kCFLogLevelError,
                 "*** ResurrectCFDictionary missing either a key or a value, truncating dictionary");
-            TCFSafeRelease(key);
-            TCFSafeRelease(value);
-            count = i;
             break;
         }
+        keys.Add(key.Orphan(), count);
+        values.Add(value.Orphan(), count);
     }
-    CFDictionaryRef dictionary =
-        CFDictionaryCreate(kCFAllocatorDefault, keys.Data(), values.Data(), count,
-                           &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks);
-    ReleaseElements(keys, count);
-    ReleaseElements(values, count);
-    return dictionary;
+    return CFDictionaryCreate(kCFAllocatorDefault, keys.Data(), values.Data(),
+                              static_cast<CFIndex>(keys.Count()), &kCFTypeDictionaryKeyCallBacks,
+                              &kCFTypeDictionaryValueCallBacks);
 }
 
 __CFURL const* TCFResurrectContext::ResurrectCFURL() {

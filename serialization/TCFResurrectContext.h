@@ -15,7 +15,9 @@
 //    length (8192 + k × 8193 bytes, k from 0 to 16);
 //  - reads text with or without a leading UTF-8 byte-order mark;
 //  - turns a number type code outside 1-16 into a number of type 10 (long) holding the value read
-//    as a signed integer of the given width.
+//    as a signed integer of the given width;
+//  - treats an allocation that fails (std::bad_alloc) as corrupt input ("memory"): null, nothing
+//    leaked.
 //
 // Results: every Resurrect or Retrieve result is a new reference the caller releases, except the
 // shared true, false and empty string, whose release has no effect. Strings come from the
@@ -102,6 +104,8 @@ private:
 
     /// The element count of an array or set, or 0 with "cfarray" reported when out of range.
     long ContainerCount(const char* label);
+    /// Resurrect without the guard against failed allocations.
+    void const* ResurrectValue(TCFType expected);
 };
 
 /// Reverses the bytes of a 2-, 4- or 8-byte value in place; any other size is left alone.

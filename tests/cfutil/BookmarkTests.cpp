@@ -53,23 +53,6 @@ protected:
 
 } // namespace
 
-TEST(BookmarkDefaults, NineKeysInOrderCreatedOnce) {
-    CFArrayRef keys = TCFBookmark::GetDefaultProperties();
-    ASSERT_EQ(CFArrayGetCount(keys), 9);
-    const CFStringRef expected[] = {kCFURLNameKey,
-                                    kCFURLParentDirectoryURLKey,
-                                    kCFURLIsRegularFileKey,
-                                    kCFURLIsDirectoryKey,
-                                    kCFURLIsSymbolicLinkKey,
-                                    kCFURLCreationDateKey,
-                                    kCFURLContentModificationDateKey,
-                                    kCFURLFileSizeKey,
-                                    _kCFURLFileSizeOfResourceForkKey};
-    for (CFIndex i = 0; i < 9; ++i)
-        EXPECT_TRUE(CFEqual(CFArrayGetValueAtIndex(keys, i), expected[i])) << i;
-    EXPECT_EQ(TCFBookmark::GetDefaultProperties(), keys);
-}
-
 TEST(BookmarkRecord, ReadsEveryValueKind) {
     Ref properties = PropertiesOf(Hex(kRecord));
     ASSERT_TRUE(properties);

@@ -5,13 +5,13 @@
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
-#include <map>
 #include <optional>
 #include <string>
 
 #include <gtest/gtest.h>
 
 #include "platform/PropertyValues.h"
+#include "support/ScopedEnvironment.h"
 
 namespace glyphwell::testing {
 
@@ -47,12 +47,7 @@ protected:
     void TearDown() override {
         std::error_code ignored;
         std::filesystem::remove_all(directory_, ignored);
-        for (const auto& [name, value] : savedEnvironment_) {
-            if (value)
-                setenv(name.c_str(), value->c_str(), 1);
-            else
-                unsetenv(name.c_str());
-        }
+        environment_.reset();
     }
 
     /// The path of `name` inside the temporary directory.
@@ -68,20 +63,15 @@ protected:
 
     /// Sets (or, with null, unsets) an environment variable until the end of the test.
     void SetEnvironment(const std::string& name, const char* value) {
-        if (!savedEnvironment_.count(name)) {
-            const char* old = getenv(name.c_str());
-            savedEnvironment_[name] = old ? std::optional<std::string>(old) : std::nullopt;
-        }
-        if (value)
-            setenv(name.c_str(), value, 1);
-        else
-            unsetenv(name.c_str());
+        if (!environment_)
+            environment_.emplace();
+        environment_->Set(name, value);
     }
 
     std::string directory_;
 
 private:
-    std::map<std::string, std::optional<std::string>> savedEnvironment_;
+    std::optional<ScopedEnvironment> environment_;
 };
 
 } // namespace glyphwell::testing

@@ -130,33 +130,6 @@ TEST(StackBuffer, GrowingKeepsElementsAndAddsZerosWhetherSpillingOrOnHeap) {
     }
 }
 
-TEST(StackBuffer, SpillingCopiesOldCountThenGrowsToTwiceItOrNewCount) {
-    {
-        TStackBuffer<char, 30> buffer(10);
-        AllocationRecorder recorder;
-        buffer.SetCount(40);
-        recorder.Stop();
-        // Exactly the 10 inline elements, then max(2 * 10, 40).
-        EXPECT_EQ(recorder.Sizes(), (std::vector<std::size_t>{10, 40}));
-        EXPECT_EQ(recorder.Frees(), 1u);
-    }
-    {
-        TStackBuffer<char, 30> buffer(25);
-        AllocationRecorder recorder;
-        buffer.SetCount(31);
-        recorder.Stop();
-        // Exactly the 25 inline elements, then max(2 * 25, 31).
-        EXPECT_EQ(recorder.Sizes(), (std::vector<std::size_t>{25, 50}));
-    }
-    {
-        TStackBuffer<char, 30> buffer(0);
-        AllocationRecorder recorder;
-        buffer.SetCount(31);
-        recorder.Stop();
-        EXPECT_EQ(recorder.Sizes(), std::vector<std::size_t>{31});
-    }
-}
-
 TEST(StackBuffer, ResizingWithinInlineStorageNeitherMovesNorZeroes) {
     TStackBuffer<char, 30> buffer(20);
     FillWithIndexPlusOne(buffer);

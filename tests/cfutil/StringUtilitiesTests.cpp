@@ -9,6 +9,8 @@
 #include "cfutil/CFStringUtilities.h"
 #include "cfutil/FileTestSupport.h"
 #include "cfutil/TCFString.h"
+#include "platform/HomeDirectory.h"
+#include "support/ScopedEnvironment.h"
 #include "support/Values.h"
 
 using glyphwell::testing::Ref;
@@ -16,12 +18,6 @@ using glyphwell::testing::Str;
 using glyphwell::testing::TextOf;
 
 namespace {
-
-/// The home directory that the password database gives for the current user.
-std::string CurrentHome() {
-    passwd* entry = getpwuid(getuid());
-    return entry ? entry->pw_dir : "";
-}
 
 std::string Expand(const std::string& path) {
     Ref input = Str(path);
@@ -37,13 +33,30 @@ std::string WithoutSuffix(const std::string& language) {
 
 } // namespace
 
-TEST(TildeExpansion, CurrentUserHomeReplacesALeadingTilde) {
-    std::string home = CurrentHome();
-    ASSERT_FALSE(home.empty());
-    ASSERT_NE(home, "/");
-    EXPECT_EQ(Expand("~"), home);
-    EXPECT_EQ(Expand("~/"), home + "/");
-    EXPECT_EQ(Expand("~/Documents/a~b/../c"), home + "/Documents/a~b/../c");
+// The current user's home is $HOME when it is set and absolute, else the password database's;
+// tilde expansion follows it.
+TEST(HomeDirectory, HomeVariableWhenAbsoluteElsePasswordDatabase) {
+    const std::string database = glyphwell::PasswordDatabaseHome(nullptr);
+    ASSERT_FALSE(database.empty());
+    ASSERT_NE(database, "/");
+    const struct {
+        const char* home;
+        std::string expected;
+    } rows[] = {
+        {nullptr, database},
+        {"", database},
+        {"relative/home", database},
+        {"/srv/elsewhere", "/srv/elsewhere"},
+    };
+    glyphwell::testing::ScopedEnvironment environment;
+    for (const auto& row : rows) {
+        environment.Set("HOME", row.home);
+        SCOPED_TRACE(row.home ? row.home : "(unset)");
+        EXPECT_EQ(glyphwell::HomeDirectory(), row.expected);
+        EXPECT_EQ(Expand("~"), row.expected);
+        EXPECT_EQ(Expand("~/"), row.expected + "/");
+        EXPECT_EQ(Expand("~/Documents/a~b/../c"), row.expected + "/Documents/a~b/../c");
+    }
 }
 
 TEST(TildeExpansion, NamedUserHomeComesFromThePasswordDatabase) {
@@ -52,18 +65,6 @@ TEST(TildeExpansion, NamedUserHomeComesFromThePasswordDatabase) {
     std::string home = root->pw_dir;
     EXPECT_EQ(Expand("~root"), home);
     EXPECT_EQ(Expand("~root/x/y"), home + "/x/y");
-}
-
-TEST(TildeExpansion, IgnoresHomeEnvironmentVariable) {
-    const char* saved = getenv("HOME");
-    std::string previous = saved ? saved : "";
-    setenv("HOME", "/elsewhere", 1);
-    std::string expanded = Expand("~/x");
-    if (saved)
-        setenv("HOME", previous.c_str(), 1);
-    else
-        unsetenv("HOME");
-    EXPECT_EQ(expanded, CurrentHome() + "/x");
 }
 
 TEST(TildeExpansion, HomeOfRootDirectoryStaysASingleSlash) {

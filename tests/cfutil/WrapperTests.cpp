@@ -70,13 +70,6 @@ TEST(Retained, AdoptReleasesThePreviousReference) {
     CFRelease(second);
 }
 
-TEST(Retained, SafeHelpersAcceptNull) {
-    EXPECT_EQ(TCFSafeRetain<CFStringRef>(nullptr), nullptr);
-    TCFSafeRelease(nullptr);
-    TCFRetained<CFStringRef> empty(nullptr);
-    EXPECT_EQ(empty.Orphan(), nullptr);
-}
-
 TEST(SafeEqual, ComparesNullsByIdentityAndValuesByContent) {
     TCFString a(NewString("same"));
     TCFString b(NewString("same"));
@@ -140,51 +133,6 @@ TEST(OwningWrappers, OrphanHandsOutTheCountAndLeavesNothingToRelease) {
     // wrapper would be a use after free.
     for (CFTypeRef orphan : orphans)
         CFRelease(orphan);
-}
-
-TEST(ViewWrappers, NullReadsAsEmpty) {
-    TCFStr string(nullptr);
-    char buffer[4] = "abc";
-    EXPECT_EQ(string.GetLength(), 0);
-    EXPECT_EQ(string.GetCharacterAtIndex(0), 0);
-    EXPECT_EQ(string.GetMaxSize(kCFStringEncodingUTF8), 0);
-    EXPECT_FALSE(string.GetCString(buffer, sizeof buffer, kCFStringEncodingUTF8));
-    EXPECT_EQ(string.GetMaxSizeOfFileSystemRepresentation(), 0);
-    EXPECT_FALSE(string.GetFileSystemRepresentation(buffer, sizeof buffer));
-    CFRange found = string.Find(CFSTR("a"), 0);
-    EXPECT_EQ(found.location, kCFNotFound);
-    EXPECT_EQ(found.length, 0);
-    EXPECT_FALSE(string.HasPrefix(CFSTR("")));
-    EXPECT_EQ(string.CreateSubstring(CFRangeMake(0, 0)), nullptr);
-    EXPECT_STREQ(buffer, "abc");
-
-    TCFBlob blob(nullptr);
-    EXPECT_EQ(blob.GetPtr(), nullptr);
-    EXPECT_EQ(blob.GetLength(), 0);
-    EXPECT_EQ(TCFBlob::GetDataPtr(nullptr), nullptr);
-
-    TCFDict dictionary(nullptr);
-    const void* keys[1] = {&buffer};
-    const void* values[1] = {&buffer};
-    EXPECT_EQ(dictionary.GetCount(), 0);
-    EXPECT_EQ(dictionary.GetValue(CFSTR("key")), nullptr);
-    dictionary.GetKeysAndValues(keys, values);
-    EXPECT_EQ(keys[0], &buffer);
-    EXPECT_EQ(values[0], &buffer);
-
-    TCFDeque<CFStringRef> array(nullptr);
-    EXPECT_EQ(array.GetCount(), 0);
-    EXPECT_EQ(array.At(0), nullptr);
-
-    TCFSet<CFStringRef> set(nullptr);
-    EXPECT_EQ(set.GetCount(), 0);
-    EXPECT_FALSE(set.ContainsValue(CFSTR("a")));
-    set.GetValues(values);
-    EXPECT_EQ(values[0], &buffer);
-
-    TCFURL url(nullptr);
-    EXPECT_EQ(url.CopyAbsoluteURL(), nullptr);
-    EXPECT_TRUE(url == nullptr);
 }
 
 TEST(StringWrappers, BytesAreDecodedAsPlainText) {

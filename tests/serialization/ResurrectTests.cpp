@@ -7,6 +7,7 @@
 
 #include "serialization/TCFFlattenContext.h"
 #include "serialization/TCFResurrectContext.h"
+#include "support/FlattenedBytes.h"
 #include "support/LogCapture.h"
 #include "support/Values.h"
 
@@ -53,16 +54,6 @@ std::string Text(CFTypeRef string) {
     CFStringGetCString(static_cast<CFStringRef>(string), buffer, sizeof buffer,
                        kCFStringEncodingUTF8);
     return buffer;
-}
-
-std::vector<uint8_t> Flatten(CFTypeRef value) {
-    Ref buffer(CFDataCreateMutable(nullptr, 0));
-    {
-        TCFFlattenContext context(const_cast<__CFData*>(buffer.as<CFDataRef>()), false);
-        context.Flatten(value);
-    }
-    const UInt8* bytes = CFDataGetBytePtr(buffer.as<CFDataRef>());
-    return std::vector<uint8_t>(bytes, bytes + CFDataGetLength(buffer.as<CFDataRef>()));
 }
 
 } // namespace
@@ -251,7 +242,8 @@ TEST(ResurrectContainers, SetCountsAreReportedWithTheArrayLabel) {
 
 TEST(ResurrectContainers, DictionaryIsTruncatedAtTheFirstMissingPair) {
     Ref a = Str("a"), b = Str("b");
-    auto bytes = Flatten(Dict({{a.get(), kCFBooleanTrue}, {b.get(), kCFBooleanFalse}}).get());
+    auto bytes =
+        FlattenedBytes(Dict({{a.get(), kCFBooleanTrue}, {b.get(), kCFBooleanFalse}}).get());
     bytes[7] = 3; // the count says three pairs
     const Read read = Dictionary(bytes);
     ASSERT_TRUE(read.value);
@@ -273,7 +265,7 @@ TEST(ResurrectContainers, DictionaryBeyondThirtyPairsKeepsEveryPairBeforeTheCut)
     }
     Ref whole(CFDictionaryCreate(nullptr, keyRefs.data(), valueRefs.data(), 40,
                                  &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks));
-    auto bytes = Flatten(whole.get());
+    auto bytes = FlattenedBytes(whole.get());
     ASSERT_EQ(bytes.size(), 8u + 40 * 20);
     EXPECT_TRUE(CFEqual(Dictionary(bytes).value.get(), whole.get()));
 
@@ -324,7 +316,7 @@ TEST(ResurrectDepth, AcceptsDeepNestingAndRejectsDeeperAsCorrupt) {
 
 TEST(ResurrectCharacterSets, DecompressesOnlyPlausibleBitmaps) {
     Ref set(CFCharacterSetCreateWithCharactersInRange(nullptr, CFRangeMake('A', 26)));
-    const Read good = Any(Flatten(set.get()));
+    const Read good = Any(FlattenedBytes(set.get()));
     ASSERT_TRUE(good.value);
     EXPECT_TRUE(CFEqual(good.value.get(), set.get()));
 
@@ -365,9 +357,9 @@ TEST(ResurrectExamples, EveryWrittenExampleReadsBackEqual) {
         return v;
     }();
     for (const Ref& value : values) {
-        const Read read = Any(Flatten(value.get()));
+        const Read read = Any(FlattenedBytes(value.get()));
         EXPECT_TRUE(CFEqual(read.value.get(), value.get()));
         EXPECT_TRUE(read.log.empty());
     }
-    EXPECT_EQ(Any(Flatten(kCFBooleanTrue)).value.get(), kCFBooleanTrue);
+    EXPECT_EQ(Any(FlattenedBytes(kCFBooleanTrue)).value.get(), kCFBooleanTrue);
 }

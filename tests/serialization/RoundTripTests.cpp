@@ -7,6 +7,7 @@
 
 #include "serialization/TCFFlattenContext.h"
 #include "serialization/TCFResurrectContext.h"
+#include "support/FlattenedBytes.h"
 #include "support/LogCapture.h"
 #include "support/Values.h"
 
@@ -173,16 +174,6 @@ private:
     std::mt19937 random_;
 };
 
-std::vector<uint8_t> Flatten(CFTypeRef value) {
-    Ref buffer(CFDataCreateMutable(nullptr, 0));
-    {
-        TCFFlattenContext context(const_cast<__CFData*>(buffer.as<CFDataRef>()), false);
-        context.Flatten(value);
-    }
-    const UInt8* bytes = CFDataGetBytePtr(buffer.as<CFDataRef>());
-    return std::vector<uint8_t>(bytes, bytes + CFDataGetLength(buffer.as<CFDataRef>()));
-}
-
 Ref ReadBack(const std::vector<uint8_t>& bytes) {
     TCFResurrectContext context(bytes.data(), bytes.size());
     Ref value(context.Resurrect(kTCFTypeAny));
@@ -212,7 +203,7 @@ TEST(RoundTrip, GeneratedTreesOfEveryKindReadBackEqual) {
     ValueGenerator generator(20261206);
     for (int i = 0; i < 400; ++i) {
         Ref value = generator.Any(4);
-        Ref back = ReadBack(Flatten(value.get()));
+        Ref back = ReadBack(FlattenedBytes(value.get()));
         ASSERT_TRUE(back) << "tree " << i << ": " << glyphwell::Describe(value.get());
         EXPECT_TRUE(CFEqual(back.get(), value.get()))
             << "tree " << i << ": " << glyphwell::Describe(value.get()) << "\nread back as "
@@ -231,7 +222,7 @@ TEST(RoundTrip, WideContainersAndTextsAtTheLimits) {
         values.push_back(items.back().get());
     }
     Ref wide(CFArrayCreate(nullptr, values.data(), CFIndex(values.size()), &kCFTypeArrayCallBacks));
-    EXPECT_TRUE(CFEqual(ReadBack(Flatten(wide.get())).get(), wide.get()));
+    EXPECT_TRUE(CFEqual(ReadBack(FlattenedBytes(wide.get())).get(), wide.get()));
 
     for (const std::string& text : {std::string(0x100000, 'x'),
                                     [] {
@@ -247,7 +238,7 @@ TEST(RoundTrip, WideContainersAndTextsAtTheLimits) {
                                         return s;
                                     }()}) {
         Ref string = Str(text);
-        EXPECT_TRUE(CFEqual(ReadBack(Flatten(string.get())).get(), string.get()));
+        EXPECT_TRUE(CFEqual(ReadBack(FlattenedBytes(string.get())).get(), string.get()));
     }
 }
 
@@ -257,7 +248,7 @@ TEST(RoundTrip, CharacterSetsWithEveryPlane) {
         CFCharacterSetAddCharactersInRange(
             const_cast<__CFCharacterSet*>(set.as<CFCharacterSetRef>()),
             CFRangeMake(plane * 0x10000 + plane * 97, 1 + plane));
-    Ref back = ReadBack(Flatten(set.get()));
+    Ref back = ReadBack(FlattenedBytes(set.get()));
     EXPECT_TRUE(CFEqual(back.get(), set.get()));
     EXPECT_TRUE(
         CFCharacterSetIsLongCharacterMember(back.as<CFCharacterSetRef>(), 0x10000 * 16 + 16 * 97));
@@ -269,6 +260,6 @@ TEST(RoundTrip, DeepestAcceptedNestingReadsAndReleases) {
         const void* inner = value.get();
         value = Ref(CFArrayCreate(nullptr, &inner, 1, &kCFTypeArrayCallBacks));
     }
-    Ref back = ReadBack(Flatten(value.get()));
+    Ref back = ReadBack(FlattenedBytes(value.get()));
     EXPECT_TRUE(CFEqual(back.get(), value.get()));
 }
