@@ -16,6 +16,8 @@
 #include <QUrl>
 #include <algorithm>
 #include <iterator>
+#include <optional>
+#include <string>
 #include <tuple>
 #include <utility>
 #include <vector>
@@ -23,7 +25,6 @@
 #include "UIAgent/QZAccessibility.h"
 #include "UIAgent/QZLocalizedString.h"
 #include "UIAgent/QZModalSession.h"
-#include "cfutil/TStackBuffer.h"
 #include "desktop/QZDesktopEntry.h"
 #include "desktop/QZFileManager.h"
 #include "desktop/QZQtStrings.h"
@@ -399,21 +400,11 @@ QStringList QZAutoActivationConfirmation::CandidateFileURIs(CFArrayRef candidate
         TCFRetained<CFStringRef> scheme(absolute ? CFURLCopyScheme(absolute) : nullptr, kAdopted);
         if (!scheme || CFStringCompare(scheme, CFSTR("file"), kCFCompareCaseInsensitive) != 0)
             continue;
-        CFStringRef text = CFURLGetString(absolute);
-        const CFIndex length = text ? CFStringGetLength(text) : 0;
-        if (length == 0)
+        // A string without a UTF-8 form (a lone surrogate) is left out.
+        const std::optional<std::string> text = glyphwell::UTF8String(CFURLGetString(absolute));
+        if (!text || text->empty())
             continue;
-        const CFIndex maximum = CFStringGetMaximumSizeForEncoding(length, kCFStringEncodingUTF8);
-        TStackBuffer<UInt8, 30> buffer(uint64_t(maximum) + 1);
-        CFIndex used = 0;
-        const CFIndex converted =
-            CFStringGetBytes(text, CFRangeMake(0, length), kCFStringEncodingUTF8, 0, true,
-                             buffer.GetBuffer(), maximum, &used);
-        // A string that stops short has no UTF-8 form (a lone surrogate): leave it out.
-        if (converted != length)
-            continue;
-        buffer[uint64_t(used)] = 0;
-        uris << QString::fromUtf8(reinterpret_cast<const char*>(buffer.GetBuffer()), used);
+        uris << QString::fromStdString(*text);
     }
     return uris;
 }

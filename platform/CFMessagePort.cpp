@@ -2,7 +2,6 @@
 
 #include <fcntl.h>
 #include <poll.h>
-#include <pwd.h>
 #include <sys/epoll.h>
 #include <sys/eventfd.h>
 #include <sys/file.h>
@@ -31,6 +30,7 @@
 #include "platform/CFRunLoopInternal.h"
 #include "platform/CFRuntime.h"
 #include "platform/CFString.h"
+#include "platform/HomeDirectory.h"
 #include "platform/Log.h"
 #include "platform/LogEscape.h"
 #include "platform/MessagePortWire.h"
@@ -59,20 +59,6 @@ constexpr std::chrono::milliseconds kDefaultStallTimeout{30000};
 constexpr size_t kDefaultUnfinishedLimit = size_t(128) << 20;
 
 using Clock = std::chrono::steady_clock;
-
-std::string UTF8(CFStringRef string) {
-    if (!string)
-        return {};
-    const CFIndex length = CFStringGetLength(string);
-    CFIndex needed = 0;
-    if (CFStringGetBytes(string, CFRangeMake(0, length), kCFStringEncodingUTF8, 0, false, nullptr,
-                         0, &needed) != length)
-        return {};
-    std::string text(size_t(needed), '\0');
-    CFStringGetBytes(string, CFRangeMake(0, length), kCFStringEncodingUTF8, 0, false,
-                     reinterpret_cast<UInt8*>(text.data()), needed, &needed);
-    return text;
-}
 
 /// A data object adopting a frame's body (no copy); empty for an empty body.
 CFDataRef CreateDataAdopting(glyphwell::port::FrameBody& body) {
@@ -1374,7 +1360,7 @@ CFMessagePortRef CFMessagePortCreateLocal(CFAllocatorRef, CFStringRef name,
     GW_ASSERT(name != nullptr);
     if (!name)
         return nullptr;
-    const std::string text = UTF8(name);
+    const std::string text = glyphwell::UTF8String(name).value_or("");
     const std::string path = glyphwell::port::SocketPathForName(text);
 
     int listening = TakeActivationSocket(text);
@@ -1420,7 +1406,7 @@ CFMessagePortRef CFMessagePortCreateRemote(CFAllocatorRef, CFStringRef name) {
     GW_ASSERT(name != nullptr);
     if (!name)
         return nullptr;
-    const std::string text = UTF8(name);
+    const std::string text = glyphwell::UTF8String(name).value_or("");
     const std::string path = glyphwell::port::SocketPathForName(text);
     if (path.empty())
         return nullptr;
@@ -1493,28 +1479,13 @@ CFStringRef CFMessagePortGetName(CFMessagePortRef port) {
 
 namespace glyphwell::port {
 
-std::string HomeDirectory() {
-    const char* home = getenv("HOME");
-    if (home && home[0] == '/')
-        return home;
-    passwd entry{};
-    passwd* found = nullptr;
-    std::vector<char> buffer(16384);
-    while (getpwuid_r(geteuid(), &entry, buffer.data(), buffer.size(), &found) == ERANGE &&
-           buffer.size() < (1u << 20))
-        buffer.resize(buffer.size() * 2);
-    if (found && found->pw_dir && found->pw_dir[0] == '/')
-        return found->pw_dir;
-    return {};
-}
-
 std::string SocketDirectory() {
     std::string directory;
     const char* runtimeDirectory = getenv("XDG_RUNTIME_DIR");
     if (runtimeDirectory && runtimeDirectory[0] == '/') {
         directory = runtimeDirectory;
     } else {
-        directory = HomeDirectory();
+        directory = glyphwell::HomeDirectory();
         if (directory.empty()) {
             AppLog("message port: no socket directory: neither XDG_RUNTIME_DIR nor a home "
                    "directory is known");

@@ -121,10 +121,6 @@ CFStringRef CFMessagePortGetName(CFMessagePortRef port);
 
 namespace glyphwell::port {
 
-/// The user's home directory: $HOME when set and absolute, else the password database's entry
-/// for the effective user; empty when neither is known.
-std::string HomeDirectory();
-
 /// The directory of the sockets, shared by servers and clients: $XDG_RUNTIME_DIR when set and
 /// absolute; otherwise <home>/.glyphwell, created with mode 0700 when missing. That directory is
 /// refused (empty result, one log line naming the path and the reason) when it is a symbolic

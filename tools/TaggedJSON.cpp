@@ -316,16 +316,9 @@ CFTypeRef Create(const Json& json, const std::string& where) {
     }
 }
 
-/// The UTF-8 text of `string`; a unit without a UTF-8 form becomes "?".
+/// The UTF-8 form of `string`, with '?' for each lone surrogate (which has no UTF-8 form).
 std::string StringToUTF8(CFStringRef string) {
-    const CFIndex length = CFStringGetLength(string);
-    CFIndex size = 0;
-    CFStringGetBytes(string, CFRangeMake(0, length), kCFStringEncodingUTF8, '?', false, nullptr, 0,
-                     &size);
-    std::string text(size_t(size), '\0');
-    CFStringGetBytes(string, CFRangeMake(0, length), kCFStringEncodingUTF8, '?', false,
-                     reinterpret_cast<UInt8*>(text.data()), size, &size);
-    return text;
+    return glyphwell::UTF8String(string, '?').value_or("");
 }
 
 /// Types 10 and 13 plain, others tagged with their code.
