@@ -2,6 +2,7 @@
 // answers, withdrawal when the requesting process dies, display names by preferred language, the
 // download size counted once per asset, and validity.
 #include <QDir>
+#include <QLabel>
 #include <QMessageBox>
 #include <QPushButton>
 #include <QTemporaryDir>
@@ -11,6 +12,7 @@
 #include <unistd.h>
 
 #include "UIAgent/QZFontDownloadConfirmation.h"
+#include "UIAgent/QZLocalizedString.h"
 #include "protocol/QZUIProtocol.h"
 #include "tests/UIAgent/AlertTestSupport.h"
 #include "tests/UIAgent/QtTestEnvironment.h"
@@ -60,10 +62,10 @@ protected:
                      "fonts": [{"postScriptName": "Mono"}]}]})")
                       .arg(kHash)
                       .toUtf8());
-        Confirmation::SetPreferredLanguageForTesting("en-US");
+        QZSetPreferredLanguagesForTesting({"en-US"});
     }
     void TearDown() override {
-        Confirmation::SetPreferredLanguageForTesting(QString());
+        QZSetPreferredLanguagesForTesting({});
         qunsetenv("XDG_DATA_HOME");
         qunsetenv("XDG_DATA_DIRS");
     }
@@ -173,7 +175,7 @@ TEST_F(DownloadConfirmationTest, OneDisplayNameIsNamedAndEachAssetIsCountedOnce)
     EXPECT_TRUE(one.valid());
     EXPECT_EQ(one.text(), "Example Writer needs to download the font “Example Sans”.");
     EXPECT_EQ(one.informativeText(),
-              "The font “Example Sans” is 3.23 MB. Do you want to download it?");
+              "The font “Example Sans” is 3.2 MB. Do you want to download it?");
     EXPECT_EQ(CFDictionaryGetCount(one.localizedFontNamesDict()), 3);
     EXPECT_EQ(NameFor(one, "Sans-Italic"), "Example Sans");
 
@@ -181,7 +183,7 @@ TEST_F(DownloadConfirmationTest, OneDisplayNameIsNamedAndEachAssetIsCountedOnce)
     Confirmation several(Request({regular_.get(), otherFamily.get()}).as<CFDictionaryRef>());
     EXPECT_EQ(several.text(), "Example Writer needs to download fonts.");
     EXPECT_EQ(several.informativeText(),
-              "The download is 3.23 MB in total. Do you want to download the fonts?");
+              "The download is 3.2 MB in total. Do you want to download the fonts?");
 }
 
 TEST_F(DownloadConfirmationTest, NothingToDownloadIsNotValid) {
@@ -195,29 +197,87 @@ TEST_F(DownloadConfirmationTest, NothingToDownloadIsNotValid) {
     EXPECT_EQ(CFDictionaryGetCount(empty.localizedFontNamesDict()), 0);
 }
 
-TEST_F(DownloadConfirmationTest, TheLongestLanguageKeyThatPrefixesThePreferredLanguageWins) {
-    Ref font = Font("Sans-Regular", "Example Sans",
-                    {{"zh", "zh name"}, {"zh-Hans", "zh-Hans name"}, {"en", "en name"}});
-    auto attributes = font.as<CFDictionaryRef>();
-    EXPECT_EQ(Confirmation::DisplayName(attributes, "zh-Hans-CN"), "zh-Hans name");
-    EXPECT_EQ(Confirmation::DisplayName(attributes, "zh-Hans"), "zh-Hans name");
-    EXPECT_EQ(Confirmation::DisplayName(attributes, "zh-Hant-TW"), "zh name");
-    EXPECT_EQ(Confirmation::DisplayName(attributes, "en-GB"), "en name");
-
-    Ref noFrench = Font("Sans-Regular", "Example Sans", {{"en", "en name"}, {"ja", "ja name"}});
+TEST_F(DownloadConfirmationTest, TheUsersLanguagesInTurnPickTheLongestMatchingKey) {
+    using Names = std::initializer_list<std::pair<const char*, const char*>>;
+    const Names shortestFirst = {{"zh", "zh"},
+                                 {"zh-Hans", "zh-Hans"},
+                                 {"zh-Hant", "zh-Hant"},
+                                 {"en", "en"},
+                                 {"en-GB", "en-GB"}};
+    const Names longestFirst = {{"en-GB", "en-GB"},
+                                {"zh-Hant", "zh-Hant"},
+                                {"zh-Hans", "zh-Hans"},
+                                {"en", "en"},
+                                {"zh", "zh"}};
+    struct Case {
+        QStringList languages;
+        const char* expected;
+    } cases[] = {
+        {{"zh-Hans-CN"}, "zh-Hans"},
+        {{"zh-CN"}, "zh-Hans"},
+        {{"zh-TW"}, "zh-Hant"},
+        {{"zh-HK"}, "zh-Hant"},
+        {{"zh_MO"}, "zh-Hant"},
+        {{"en-GB"}, "en-GB"},
+        {{"en-US"}, "en"},
+        // No key serves the first language: the next one decides.
+        {{"fr-FR", "de", "zh-TW", "en"}, "zh-Hant"},
+        {{"fr"}, "Example Sans"},
+        {{}, "Example Sans"},
+    };
+    for (const Names* order : {&shortestFirst, &longestFirst}) {
+        Ref font = Font("Sans-Regular", "Example Sans", *order);
+        for (const Case& c : cases)
+            EXPECT_EQ(Confirmation::DisplayName(font.as<CFDictionaryRef>(), c.languages),
+                      c.expected)
+                << c.languages.join(',').toStdString()
+                << (order == &longestFirst ? " longest" : "");
+    }
     Ref noFamily = Font("Sans-Regular", nullptr, {{"en", "en name"}});
-    EXPECT_EQ(Confirmation::DisplayName(noFrench.as<CFDictionaryRef>(), "fr"), "Example Sans");
-    EXPECT_EQ(Confirmation::DisplayName(noFamily.as<CFDictionaryRef>(), "fr"), "Sans-Regular");
+    EXPECT_EQ(Confirmation::DisplayName(noFamily.as<CFDictionaryRef>(), {"fr"}), "Sans-Regular");
+}
 
-    Confirmation::SetPreferredLanguageForTesting("zh-Hans-CN");
+TEST_F(DownloadConfirmationTest, TheCatalogsNamesStandInForThoseTheRequestLacks) {
+    WriteFile(data_.filePath("glyphwell/downloadable-fonts.json"),
+              QStringLiteral(R"({"assets": [{"LocalID": "A", "url": "https://f/A", "size": 757000,
+                 "sha256": "%1", "fonts": [{"postScriptName": "Sans-Regular",
+                 "family": "Catalog Sans", "localizedFamilyNames": {"ja": "カタログ"}}]}]})")
+                  .arg(kHash)
+                  .toUtf8());
+    Ref bare = Font("Sans-Regular", nullptr);
+    QZSetPreferredLanguagesForTesting({"ja-JP"});
+    Confirmation japanese(Request({bare.get()}).as<CFDictionaryRef>());
+    EXPECT_EQ(NameFor(japanese, "Sans-Regular"), "カタログ");
+    // The request's own family beats the catalog's; sizes read as the progress window writes them.
+    QZSetPreferredLanguagesForTesting({"fr"});
+    Confirmation french(Request({regular_.get()}).as<CFDictionaryRef>());
+    EXPECT_EQ(NameFor(french, "Sans-Regular"), "Example Sans");
+    EXPECT_EQ(french.informativeText(),
+              "The font “Example Sans” is 757 kB. Do you want to download it?");
+    Confirmation catalogFamily(Request({bare.get()}).as<CFDictionaryRef>());
+    EXPECT_EQ(NameFor(catalogFamily, "Sans-Regular"), "Catalog Sans");
+}
+
+TEST_F(DownloadConfirmationTest, AVeryLongNameIsElidedWithTheFullNameInTheTooltip) {
+    const std::string longName(100, 'W');
+    Ref font = Font("Sans-Regular", longName.c_str());
     Confirmation confirmation(Request({font.get()}).as<CFDictionaryRef>());
-    EXPECT_EQ(NameFor(confirmation, "Sans-Regular"), "zh-Hans name");
+    EXPECT_EQ(NameFor(confirmation, "Sans-Regular"), longName);
+    EXPECT_FALSE(confirmation.text().contains(QString::fromStdString(longName)));
+    EXPECT_TRUE(confirmation.text().contains(u'…'));
+    auto* label = confirmation.findChild<QLabel*>("qt_msgbox_label");
+    ASSERT_NE(label, nullptr);
+    EXPECT_EQ(label->toolTip().toStdString(), longName);
+    EXPECT_EQ(label->accessibleDescription().toStdString(), longName);
+    confirmation.show();
+    EXPECT_LT(confirmation.width(), 800);
+    confirmation.hide();
 }
 
 TEST_F(DownloadConfirmationTest, ApplicationNameFallsBackToTheLocalizedDesktopEntry) {
     const QString entry = WriteFile(data_.filePath("writer.desktop"),
                                     "[Desktop Entry]\nName=Writer\nName[de]=Schreiber\n");
-    Confirmation::SetPreferredLanguageForTesting("de-DE");
+    QZSetPreferredLanguagesForTesting({"de-DE"});
     Confirmation confirmation(
         Dict({{kQZUIPropertyBundleURL, FileURL(entry).get()}}).as<CFDictionaryRef>());
     EXPECT_EQ(confirmation.applicationName(), "Schreiber");

@@ -11,8 +11,10 @@
 #include <QProgressBar>
 #include <QPushButton>
 #include <QTemporaryDir>
+#include <climits>
 #include <condition_variable>
 #include <cstdio>
+#include <limits>
 #include <mutex>
 #include <openssl/evp.h>
 
@@ -177,7 +179,7 @@ protected:
         ASSERT_FALSE(QZIsFontInstalled("DejaVuSansMono"));
 
         QZNetworkCheck::SetFlagsSourceForTesting(&Online);
-        QZFontDownloadConfirmation::SetPreferredLanguageForTesting("en-US");
+        QZSetPreferredLanguagesForTesting({"en-US"});
         Controller::SetProgressTapForTesting(callbacks_.Tap());
         QCoreApplication::instance()->installEventFilter(&watch_);
     }
@@ -188,7 +190,7 @@ protected:
         EXPECT_TRUE(SpinUntil([] { return Controller::MatchingRunsInProgress() == 0; }));
         Controller::SetProgressTapForTesting({});
         QZNetworkCheck::SetFlagsSourceForTesting(nullptr);
-        QZFontDownloadConfirmation::SetPreferredLanguageForTesting(QString());
+        QZSetPreferredLanguagesForTesting({});
         glyphwell::testing::StopUsingPrivateFonts();
     }
 
@@ -436,13 +438,39 @@ TEST_F(DownloadRoadTest, RegressionARequestWithoutFontNamesOpensNoWindowAndAsksN
 
 TEST(DownloadWindow, ByteCountsUseDecimalUnitsWithPrecisionGrowingWithTheUnit) {
     EnglishTexts english;
-    EXPECT_EQ(Controller::FormattedByteCount(0).toStdString(), "0 bytes");
-    EXPECT_EQ(Controller::FormattedByteCount(999).toStdString(), "999 bytes");
-    EXPECT_EQ(Controller::FormattedByteCount(343140).toStdString(), "343 kB");
-    EXPECT_EQ(Controller::FormattedByteCount(1500000).toStdString(), "1.5 MB");
-    EXPECT_EQ(Controller::FormattedByteCount(50000000).toStdString(), "50.0 MB");
-    EXPECT_EQ(Controller::FormattedByteCount(2250000000).toStdString(), "2.25 GB");
-    EXPECT_EQ(Controller::FormattedByteCount(-5).toStdString(), "0 bytes");
+    const std::pair<qint64, const char*> cases[] = {
+        {0, "0 bytes"},        {999, "999 bytes"},      {343140, "343 kB"}, {1500000, "1.5 MB"},
+        {50000000, "50.0 MB"}, {2250000000, "2.25 GB"}, {-5, "0 bytes"},
+    };
+    for (const auto& [bytes, text] : cases)
+        EXPECT_EQ(QZFormattedByteCount(bytes).toStdString(), text) << bytes;
+}
+
+TEST(DownloadWindow, TheBarScalesTotalsBeyondItsIntRangeAndClampsTheRest) {
+    const double nan = std::numeric_limits<double>::quiet_NaN();
+    struct Case {
+        double downloaded, total;
+        int value, maximum;
+    } cases[] = {
+        {100, 200, 100, 200},
+        {0, 0, 0, 1},
+        {nan, nan, 0, 1},
+        {-5, 200, 0, 200},
+        {300, 200, 200, 200},
+        {2147483647.0, 2147483647.0, INT_MAX, INT_MAX},
+        // Above 2^31 both sizes are scaled alike: half stays half.
+        {3e9, 6e9, 1073741823, INT_MAX},
+        {4294967296.0, 4294967296.0, INT_MAX, INT_MAX},
+        {1e12, 1e15, 2147483, INT_MAX},
+    };
+    Controller controller(nullptr);
+    controller.window();
+    QProgressBar* bar = controller.progressIndicator();
+    for (const Case& c : cases) {
+        controller.setProgress(c.downloaded, c.total);
+        EXPECT_EQ(bar->value(), c.value) << c.downloaded << "/" << c.total;
+        EXPECT_EQ(bar->maximum(), c.maximum) << c.downloaded << "/" << c.total;
+    }
 }
 
 } // namespace
