@@ -120,7 +120,11 @@ void QZInstallTranslations() {
             qtFile = candidate;
     }
     InstallTranslator(qtTexts, qtFile);
-    // Set explicitly, so that a table (or its absence) does not decide the direction.
+    QZApplyLayoutDirection();
+}
+
+void QZApplyLayoutDirection() {
+    // Set explicitly, so that a table (or the lack of one) does not decide the direction.
     QGuiApplication::setLayoutDirection(QZLayoutDirectionFor(QZPreferredLanguages()));
 }
 

@@ -27,6 +27,10 @@ QString QZTranslationFileFor(const QLocale& locale);
 /// before any text is shown.
 void QZInstallTranslations();
 
+/// Lays the application's windows out in the direction of QZPreferredLanguages()'s first
+/// language (QZLayoutDirectionFor); part of QZInstallTranslations.
+void QZApplyLayoutDirection();
+
 /// The user's languages, most preferred first, as BCP 47 tags (QLocale::uiLanguages(), or the
 /// list set with QZSetPreferredLanguagesForTesting).
 QStringList QZPreferredLanguages();
