@@ -14,6 +14,7 @@
 #include <climits>
 #include <condition_variable>
 #include <cstdio>
+#include <functional>
 #include <limits>
 #include <mutex>
 #include <openssl/evp.h>
@@ -71,6 +72,13 @@ public:
     bool Holding() const {
         std::lock_guard<std::mutex> lock(mutex_);
         return holding_;
+    }
+    /// Forgets the states seen and holds nowhere.
+    void Reset() {
+        std::lock_guard<std::mutex> lock(mutex_);
+        states_.clear();
+        holdAt_ = -1;
+        released_ = false;
     }
     void Release() {
         {
@@ -280,12 +288,13 @@ TEST_F(DownloadRoadTest, AnInstalledFontIsMatchedWithoutDownloading) {
     ASSERT_TRUE(QFile::copy(kDejaVu + "DejaVuSansMono.ttf", fonts_ + "/DejaVuSansMono.ttf"));
     ASSERT_TRUE(QZReloadFontConfiguration());
     WriteCatalog({ServeFont("DejaVuSansMono.ttf", "org.test.Mono", "DejaVuSansMono")});
-    Ref mono = RequestedFont("DejaVuSansMono");
+    Ref mono = RequestedFont("DejaVuSansMono", "DejaVu Sans Mono");
 
     // Nothing to download means nothing to confirm: only a request that says not to ask gets
-    // this far.
+    // this far. Unasked, the window still shows the display name.
     EXPECT_EQ(HandleDownloadRequest(DownloadRequest({mono.get()}, 0, true).get()),
               DownloadReply(true, true));
+    EXPECT_EQ(watch_.statusWhenHidden, "Preparing to download “DejaVu Sans Mono”…");
     EXPECT_EQ(callbacks_.States(), (std::vector<uint32_t>{0, 2, 7, 1}));
     EXPECT_EQ(server_.RequestCount("/DejaVuSansMono.ttf"), 0);
     EXPECT_TRUE(DownloadFolder().isEmpty());
@@ -352,7 +361,7 @@ TEST_F(DownloadRoadTest, AFailureAnsweredContinueDownloadGoesOnToTheNextFont) {
     EXPECT_FALSE(QZIsFontInstalled("DejaVuSansMono-Bold"));
 }
 
-TEST_F(DownloadRoadTest, AFailureAnsweredCancelEndsTheDownloadWithNo) {
+TEST_F(DownloadRoadTest, AFailureAnsweredCancelOrClosedEndsTheDownloadWithNo) {
     LoopbackHTTPServer::Resource dropped;
     dropped.dropAfter = 100000;
     WriteCatalog(
@@ -360,25 +369,33 @@ TEST_F(DownloadRoadTest, AFailureAnsweredCancelEndsTheDownloadWithNo) {
          ServeFont("DejaVuSansMono.ttf", "org.test.Mono", "DejaVuSansMono")});
     Ref bold = RequestedFont("DejaVuSansMono-Bold");
     Ref mono = RequestedFont("DejaVuSansMono");
-    std::string informative;
-    UiScript script(
-        {{[] { return AlertWithText("The font “DejaVuSansMono-Bold” cannot be downloaded."); },
-          [&] {
-              informative = AlertOnScreen()->informativeText().toStdString();
-              ClickButton(AlertOnScreen(), "Cancel");
-          }}},
-        EndEveryModalRun);
+    const std::pair<const char*, std::function<void(QMessageBox*)>> answers[] = {
+        {"Cancel", [](QMessageBox* alert) { ClickButton(alert, "Cancel"); }},
+        {"close button", [](QMessageBox* alert) { alert->close(); }},
+    };
+    for (const auto& [how, answer] : answers) {
+        callbacks_.Reset();
+        std::string informative;
+        UiScript script(
+            {{[] { return AlertWithText("The font “DejaVuSansMono-Bold” cannot be downloaded."); },
+              [&, &answer = answer] {
+                  informative = AlertOnScreen()->informativeText().toStdString();
+                  answer(AlertOnScreen());
+              }}},
+            EndEveryModalRun);
 
-    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({bold.get(), mono.get()}, 0, true).get()),
-              DownloadReply(false, true));
+        EXPECT_EQ(HandleDownloadRequest(DownloadRequest({bold.get(), mono.get()}, 0, true).get()),
+                  DownloadReply(false, true))
+            << how;
 
-    EXPECT_TRUE(script.done());
-    EXPECT_EQ(informative, "The connection ended after 100000 of 334268 bytes.");
-    ASSERT_TRUE(WaitForTheMatchingToEnd());
-    EXPECT_EQ(callbacks_.States(), (std::vector<uint32_t>{0, 2, 4, 5, 8}));
-    EXPECT_EQ(server_.RequestCount("/DejaVuSansMono.ttf"), 0);
-    EXPECT_TRUE(DownloadFolder().isEmpty()) << DownloadFolder().join(", ").toStdString();
-    EXPECT_FALSE(watch_.timerRunningWhenHidden);
+        EXPECT_TRUE(script.done()) << how;
+        EXPECT_EQ(informative, "The connection ended after 100000 of 334268 bytes.");
+        ASSERT_TRUE(WaitForTheMatchingToEnd());
+        EXPECT_EQ(callbacks_.States(), (std::vector<uint32_t>{0, 2, 4, 5, 8})) << how;
+        EXPECT_EQ(server_.RequestCount("/DejaVuSansMono.ttf"), 0);
+        EXPECT_TRUE(DownloadFolder().isEmpty()) << DownloadFolder().join(", ").toStdString();
+        EXPECT_FALSE(watch_.timerRunningWhenHidden);
+    }
 }
 
 TEST_F(DownloadRoadTest, RegressionTheRequestingProcessExitEndsTheWindowsOwnRunNotTheInnermost) {
@@ -424,11 +441,15 @@ TEST_F(DownloadRoadTest, RegressionTheRequestingProcessExitEndsTheWindowsOwnRunN
     EXPECT_TRUE(DownloadFolder().isEmpty()) << DownloadFolder().join(", ").toStdString();
 }
 
-TEST_F(DownloadRoadTest, RegressionARequestWithoutFontNamesOpensNoWindowAndAsksNothing) {
+TEST_F(DownloadRoadTest, RegressionARequestWithoutFontsToHaveOpensNoWindowAndAsksNothing) {
     // Offline: a network question would show an alert.
     QZNetworkCheck::SetFlagsSourceForTesting(&Offline);
     Ref nameless = Dict({{NSFontFamilyAttribute, Str("DejaVu Sans Mono").get()}});
     EXPECT_EQ(HandleDownloadRequest(DownloadRequest({nameless.get()}, 0, true).get()),
+              DownloadReply(false, true));
+    // Neither offered by a catalog nor installed: left out before any window.
+    Ref unknown = RequestedFont("NoSuchFont-Regular");
+    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({unknown.get()}, 0, true).get()),
               DownloadReply(false, true));
     EXPECT_EQ(HandleDownloadRequest(DownloadRequest({}, 0, true).get()),
               DownloadReply(false, true));

@@ -2,9 +2,12 @@
 // a word, the offline alert's texts and buttons, its answers, and what the dispatcher makes of
 // them. The flags are injected; reading them from the routing table is tested with the desktop
 // services.
+#include <QDialog>
 #include <QDir>
 #include <QPushButton>
 #include <QTemporaryDir>
+#include <QTest>
+#include <functional>
 
 #include "UIAgent/FontDownloadWindowController.h"
 #include "UIAgent/QZFontDownloadConfirmation.h"
@@ -47,6 +50,28 @@ protected:
         }
         return false;
     }
+};
+
+/// Counts the events of one type that `watched` receives while it lives.
+class EventCounter : public QObject {
+public:
+    EventCounter(QObject* watched, QEvent::Type type, int* count)
+        : watched_(watched), type_(type), count_(count) {
+        watched_->installEventFilter(this);
+    }
+    ~EventCounter() override { watched_->removeEventFilter(this); }
+
+protected:
+    bool eventFilter(QObject*, QEvent* event) override {
+        if (event->type() == type_)
+            ++*count_;
+        return false;
+    }
+
+private:
+    QObject* watched_;
+    QEvent::Type type_;
+    int* count_;
 };
 
 /// A step that presses the offline alert's button `key`.
@@ -128,17 +153,47 @@ TEST_F(NetworkCheckTest, TheOfflineAlertIsCriticalAndItsDefaultCancelStopsTheDow
     EXPECT_FALSE(FontDownloadWindowController::continueDownloadWithNetworkReachabilityCheck());
 }
 
-TEST_F(NetworkCheckTest, ContinueDownloadAndAWithdrawnAlertGoOn) {
-    UiScript proceed({AnswerOfflineAlert("Continue Download")}, EndEveryModalRun);
-    EXPECT_TRUE(QZNetworkCheck().continueDownload());
-    EXPECT_TRUE(proceed.done());
-
-    QZNetworkCheck check;
-    UiScript withdraw({{[] { return AlertWithText(kOfflineHeadline); }, [&] { check.withdraw(); }}},
-                      EndEveryModalRun);
-    EXPECT_TRUE(check.continueDownload());
-    EXPECT_TRUE(withdraw.done());
-    EXPECT_FALSE(check.alert()->isVisible());
+TEST_F(NetworkCheckTest, OnlyTheUsersCancelOrCloseStopsAndOtherWindowsStayInactive) {
+    struct Case {
+        const char* how;
+        std::function<void(QZNetworkCheck&)> answer;
+        bool goOn;
+    } cases[] = {
+        {"Continue Download",
+         [](QZNetworkCheck&) {
+             ButtonWithText(AlertOnScreen(), QZLocalizedString("Continue Download"))->click();
+         },
+         true},
+        {"withdrawn", [](QZNetworkCheck& check) { check.withdraw(); }, true},
+        {"close button", [](QZNetworkCheck& check) { check.alert()->close(); }, false},
+        {"Escape", [](QZNetworkCheck& check) { QTest::keyClick(check.alert(), Qt::Key_Escape); },
+         false},
+    };
+    // Another window of the agent, up before the question: the question raises only itself.
+    QDialog other;
+    other.show();
+    int otherActivations = 0;
+    EventCounter counter(&other, QEvent::WindowActivate, &otherActivations);
+    for (const Case& c : cases) {
+        other.activateWindow();
+        ASSERT_TRUE(SpinUntil([&] { return other.isActiveWindow(); })) << c.how;
+        QZNetworkCheck check;
+        int activationsWhileAsked = -1;
+        UiScript script({{[] {
+                              QMessageBox* alert = AlertWithText(kOfflineHeadline);
+                              return alert && alert->isActiveWindow();
+                          },
+                          [&] {
+                              activationsWhileAsked = otherActivations;
+                              c.answer(check);
+                          }}},
+                        EndEveryModalRun);
+        otherActivations = 0;
+        EXPECT_EQ(check.continueDownload(), c.goOn) << c.how;
+        EXPECT_TRUE(script.done()) << c.how;
+        EXPECT_FALSE(check.alert()->isVisible()) << c.how;
+        EXPECT_EQ(activationsWhileAsked, 0) << c.how;
+    }
 }
 
 TEST_F(NetworkCheckTest, OfflineCancelAnswersNoWithoutAProgressWindow) {
