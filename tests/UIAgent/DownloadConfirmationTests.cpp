@@ -7,14 +7,12 @@
 #include <QPushButton>
 #include <QTemporaryDir>
 #include <QTest>
-#include <csignal>
-#include <sys/wait.h>
-#include <unistd.h>
 
 #include "UIAgent/QZFontDownloadConfirmation.h"
 #include "UIAgent/QZLocalizedString.h"
 #include "protocol/QZUIProtocol.h"
 #include "tests/UIAgent/AlertTestSupport.h"
+#include "tests/UIAgent/DownloadTestSupport.h"
 #include "tests/UIAgent/QtTestEnvironment.h"
 
 namespace {
@@ -24,26 +22,6 @@ using namespace glyphwell::testing;
 using Confirmation = QZFontDownloadConfirmation;
 
 constexpr char kHash[] = "0123456789abcdef0123456789abcdef0123456789abcdef0123456789abcdef";
-
-/// A child that waits until it is killed; reaped when this goes.
-class PausedChild {
-public:
-    PausedChild() : pid_(fork()) {
-        if (pid_ == 0) {
-            for (;;)
-                pause();
-        }
-    }
-    ~PausedChild() {
-        Kill();
-        waitpid(pid_, nullptr, 0);
-    }
-    pid_t pid() const { return pid_; }
-    void Kill() const { kill(pid_, SIGKILL); }
-
-private:
-    pid_t pid_;
-};
 
 class DownloadConfirmationTest : public ::testing::Test {
 protected:

@@ -106,44 +106,6 @@ private:
     bool released_ = false;
 };
 
-/// Watches the progress window from the event loop: how often it was shown, the bar after each
-/// change of its value, and the window when it was hidden.
-class WindowWatch : public QObject {
-public:
-    int windowsShown = 0; ///< top-level windows of any kind
-    int progressWindowsShown = 0;
-    std::vector<std::string> bar; ///< "value/maximum" after each value change
-    bool hidden = false;
-    std::string statusWhenHidden;
-    bool timerRunningWhenHidden = false;
-
-protected:
-    bool eventFilter(QObject* watched, QEvent* event) override {
-        if (!watched->isWidgetType() || !static_cast<QWidget*>(watched)->isWindow())
-            return false;
-        auto* window = static_cast<QWidget*>(watched);
-        if (event->type() == QEvent::Show) {
-            ++windowsShown;
-            if (window->objectName() == QLatin1String("FontDownloadWindow")) {
-                ++progressWindowsShown;
-                auto* progress = window->findChild<QProgressBar*>("progressIndicator");
-                connect(progress, &QProgressBar::valueChanged, this, [this, progress](int value) {
-                    bar.push_back(std::to_string(value) + "/" +
-                                  std::to_string(progress->maximum()));
-                });
-            }
-        } else if (event->type() == QEvent::Hide && !hidden &&
-                   window->objectName() == QLatin1String("FontDownloadWindow")) {
-            hidden = true;
-            statusWhenHidden =
-                window->findChild<QLabel*>("mainStatusTextField")->text().toStdString();
-            auto* timer = window->findChild<QTimer*>("refreshTimer");
-            timerRunningWhenHidden = timer && timer->isActive();
-        }
-        return false;
-    }
-};
-
 /// What the progress window shows at one moment.
 struct WindowState {
     std::string status, sizeLine, bar;
@@ -189,10 +151,8 @@ protected:
         QZNetworkCheck::SetFlagsSourceForTesting(&Online);
         QZSetPreferredLanguagesForTesting({"en-US"});
         Controller::SetProgressTapForTesting(callbacks_.Tap());
-        QCoreApplication::instance()->installEventFilter(&watch_);
     }
     void TearDown() override {
-        QCoreApplication::instance()->removeEventFilter(&watch_);
         // A matching whose window has gone ends at its next callback; wait for its thread.
         callbacks_.Release();
         EXPECT_TRUE(SpinUntil([] { return Controller::MatchingRunsInProgress() == 0; }));

@@ -32,26 +32,6 @@ bool InjectedFlags(QZNetworkReachabilityFlags* flags) {
     return gFlagsReadable;
 }
 
-/// Counts the windows shown while it lives, and the progress windows among them.
-class ShownWindows : public QObject {
-public:
-    ShownWindows() { QCoreApplication::instance()->installEventFilter(this); }
-    ~ShownWindows() override { QCoreApplication::instance()->removeEventFilter(this); }
-    int count = 0;
-    int progressWindows = 0;
-
-protected:
-    bool eventFilter(QObject* watched, QEvent* event) override {
-        if (event->type() == QEvent::Show && watched->isWidgetType() &&
-            static_cast<QWidget*>(watched)->isWindow()) {
-            ++count;
-            if (watched->objectName() == QLatin1String("FontDownloadWindow"))
-                ++progressWindows;
-        }
-        return false;
-    }
-};
-
 /// Counts the events of one type that `watched` receives while it lives.
 class EventCounter : public QObject {
 public:
@@ -118,10 +98,10 @@ TEST_F(NetworkCheckTest, OnlyReachableWithoutConnectionRequiredGoesOnWithoutAnAl
     for (const Case& c : cases) {
         gFlags = c.flags;
         gFlagsReadable = c.readable;
-        ShownWindows shown;
+        WindowWatch shown;
         UiScript script({AnswerOfflineAlert("Continue Download")}, EndEveryModalRun, 10s);
         EXPECT_TRUE(QZNetworkCheck().continueDownload());
-        EXPECT_EQ(shown.count, c.alert ? 1 : 0)
+        EXPECT_EQ(shown.windowsShown, c.alert ? 1 : 0)
             << "flags " << c.flags << " readable " << c.readable;
     }
 }
@@ -197,25 +177,25 @@ TEST_F(NetworkCheckTest, OnlyTheUsersCancelOrCloseStopsAndOtherWindowsStayInacti
 }
 
 TEST_F(NetworkCheckTest, OfflineCancelAnswersNoWithoutAProgressWindow) {
-    ShownWindows shown;
+    WindowWatch shown;
     // DejaVu Sans is installed: a download that went on would match it.
     Ref font = RequestedFont("DejaVuSans");
     UiScript script({AnswerOfflineAlert("Cancel")}, EndEveryModalRun);
     EXPECT_EQ(HandleDownloadRequest(DownloadRequest({font.get()}, 0, true).get()),
               DownloadReply(false, true));
     EXPECT_TRUE(script.done());
-    EXPECT_EQ(shown.count, 1);
-    EXPECT_EQ(shown.progressWindows, 0);
+    EXPECT_EQ(shown.windowsShown, 1);
+    EXPECT_EQ(shown.progressWindowsShown, 0);
 }
 
 TEST_F(NetworkCheckTest, OfflineContinueRunsTheDownloadWindow) {
-    ShownWindows shown;
+    WindowWatch shown;
     Ref font = RequestedFont("DejaVuSans");
     UiScript script({AnswerOfflineAlert("Continue Download")}, EndEveryModalRun);
     EXPECT_EQ(HandleDownloadRequest(DownloadRequest({font.get()}, 0, true).get()),
               DownloadReply(true, true));
     EXPECT_TRUE(script.done());
-    EXPECT_EQ(shown.progressWindows, 1);
+    EXPECT_EQ(shown.progressWindowsShown, 1);
 }
 
 TEST_F(NetworkCheckTest, TheRequestingApplicationQuittingEndsTheOfflineAlertAndNoWindowOpens) {
@@ -230,7 +210,7 @@ TEST_F(NetworkCheckTest, TheRequestingApplicationQuittingEndsTheOfflineAlertAndN
                   "sha256": "0000000000000000000000000000000000000000000000000000000000000000",
                   "fonts": [{"postScriptName": "Example-Regular"}]}]})");
     PausedChild requester;
-    ShownWindows shown;
+    WindowWatch shown;
     Ref font = RequestedFont("Example-Regular");
     UiScript script(
         {{[] { return ButtonWithText(AlertOnScreen(), QZLocalizedString("Download")); },
@@ -242,7 +222,7 @@ TEST_F(NetworkCheckTest, TheRequestingApplicationQuittingEndsTheOfflineAlertAndN
               DownloadReply(false, false));
 
     EXPECT_TRUE(script.done());
-    EXPECT_EQ(shown.progressWindows, 0);
+    EXPECT_EQ(shown.progressWindowsShown, 0);
     qunsetenv("XDG_DATA_HOME");
     qunsetenv("XDG_DATA_DIRS");
 }
