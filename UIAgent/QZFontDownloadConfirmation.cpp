@@ -32,30 +32,38 @@ QString GetNonEmptyString(CFDictionaryRef dictionary, CFStringRef key) {
     return text.isEmpty() ? QString() : text;
 }
 
-/// The name in `names` (language to name) for `languages`, by the rule of DisplayName.
-QString LocalizedName(CFDictionaryRef names, const QStringList& languages) {
+/// The name in `names` (language to name) under the longest key that is a prefix of one of
+/// `forms`; empty when none is.
+QString LongestPrefixName(CFDictionaryRef names, const QString (&forms)[2]) {
     const CFIndex count = names ? CFDictionaryGetCount(names) : 0;
-    if (count == 0)
-        return QString();
     std::vector<const void*> keys(static_cast<size_t>(count)), values(static_cast<size_t>(count));
-    CFDictionaryGetKeysAndValues(names, keys.data(), values.data());
+    if (count > 0)
+        CFDictionaryGetKeysAndValues(names, keys.data(), values.data());
+    QString best;
+    qsizetype bestLength = 0;
+    for (size_t i = 0; i < keys.size(); ++i) {
+        const QString key = QZQStringIfString(keys[i]);
+        const QString name = QZQStringIfString(values[i]);
+        if (key.isEmpty() || name.isEmpty() || key.size() <= bestLength)
+            continue;
+        // The exact key is the longest possible prefix, so it wins like any other.
+        if (forms[0].startsWith(key) || forms[1].startsWith(key)) {
+            best = name;
+            bestLength = key.size();
+        }
+    }
+    return best;
+}
+
+/// The localised name for `languages` by the rule of DisplayName: the request's names, then the
+/// catalog's, for each language in turn.
+QString LocalizedName(CFDictionaryRef requestNames, CFDictionaryRef catalogNames,
+                      const QStringList& languages) {
     for (const QString& language : languages) {
         const QString forms[] = {QZLanguageWithScript(language), language};
-        QString best;
-        qsizetype bestLength = 0;
-        for (size_t i = 0; i < keys.size(); ++i) {
-            const QString key = QZQStringIfString(keys[i]);
-            const QString name = QZQStringIfString(values[i]);
-            if (key.isEmpty() || name.isEmpty() || key.size() <= bestLength)
-                continue;
-            // The exact key is the longest possible prefix, so it wins like any other.
-            if (forms[0].startsWith(key) || forms[1].startsWith(key)) {
-                best = name;
-                bestLength = key.size();
-            }
-        }
-        if (!best.isEmpty())
-            return best;
+        for (CFDictionaryRef names : {requestNames, catalogNames})
+            if (QString name = LongestPrefixName(names, forms); !name.isEmpty())
+                return name;
     }
     return QString();
 }
@@ -260,11 +268,8 @@ QString QZFontDownloadConfirmation::DisplayName(CFDictionaryRef fontAttributes,
                                                 CFDictionaryRef catalogAttributes) {
     QString name = LocalizedName(
         QZGetTypedValue<CFDictionaryRef>(fontAttributes, NSCTFontLocalizedFamilyNameAttribute),
+        QZGetTypedValue<CFDictionaryRef>(catalogAttributes, NSCTFontLocalizedFamilyNameAttribute),
         languages);
-    if (name.isEmpty())
-        name = LocalizedName(QZGetTypedValue<CFDictionaryRef>(catalogAttributes,
-                                                              NSCTFontLocalizedFamilyNameAttribute),
-                             languages);
     if (name.isEmpty())
         name = GetNonEmptyString(fontAttributes, NSFontFamilyAttribute);
     if (name.isEmpty())

@@ -82,7 +82,8 @@ public:
     /// `catalogAttributes` (may be null) is what the catalog says of the same font: its localised
     /// and family names stand in for those the request does not give. For each language in turn
     /// (as given and with its likely script: zh-TW is also read as zh-Hant-TW), the localised name
-    /// under the longest key that is a prefix of it wins; the first language with one decides.
+    /// under the longest key that is a prefix of it wins, the request's before the catalog's; the
+    /// first language with one decides.
     static QString DisplayName(CFDictionaryRef fontAttributes, const QStringList& languages,
                                CFDictionaryRef catalogAttributes = nullptr);
     /// PostScript name to display name (DisplayName for QZPreferredLanguages()) for each element

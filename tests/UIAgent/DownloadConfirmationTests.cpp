@@ -223,9 +223,14 @@ TEST_F(DownloadConfirmationTest, TheCatalogsNamesStandInForThoseTheRequestLacks)
                   .arg(kHash)
                   .toUtf8());
     Ref bare = Font("Sans-Regular", nullptr);
-    QZSetPreferredLanguagesForTesting({"ja-JP"});
-    Confirmation japanese(Request({bare.get()}).as<CFDictionaryRef>());
+    Ref english = Font("Sans-Regular", nullptr, {{"en", "English name"}});
+    // The first language the request or the catalog has a name for decides.
+    QZSetPreferredLanguagesForTesting({"ja-JP", "en"});
+    Confirmation japanese(Request({english.get()}).as<CFDictionaryRef>());
     EXPECT_EQ(NameFor(japanese, "Sans-Regular"), "カタログ");
+    QZSetPreferredLanguagesForTesting({"fr", "en"});
+    Confirmation fallback(Request({english.get()}).as<CFDictionaryRef>());
+    EXPECT_EQ(NameFor(fallback, "Sans-Regular"), "English name");
     // The request's own family beats the catalog's; sizes read as the progress window writes them.
     QZSetPreferredLanguagesForTesting({"fr"});
     Confirmation french(Request({regular_.get()}).as<CFDictionaryRef>());
