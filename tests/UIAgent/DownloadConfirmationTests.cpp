@@ -7,6 +7,8 @@
 #include <QPushButton>
 #include <QTemporaryDir>
 #include <QTest>
+#include <functional>
+#include <tuple>
 
 #include "UIAgent/QZFontDownloadConfirmation.h"
 #include "UIAgent/QZLocalizedString.h"
@@ -88,39 +90,46 @@ protected:
     Ref regular_ = Font("Sans-Regular", "Example Sans");
 };
 
-TEST_F(DownloadConfirmationTest, DownloadAnswersYesAndReturnPressesTheDefaultSkip) {
-    Confirmation yes(Request({regular_.get()}).as<CFDictionaryRef>());
-    EXPECT_EQ(yes.buttons().size(), 2);
-    QTimer::singleShot(100ms, &yes, [&] { yes.buttonWithTag(2000)->click(); });
-    yes.showAlert();
-    EXPECT_TRUE(yes.shouldDownload());
-    EXPECT_FALSE(yes.suppressFurtherAlerts());
-
-    Confirmation no(Request({regular_.get()}).as<CFDictionaryRef>());
-    EXPECT_EQ(no.defaultButton()->text(), "Skip");
-    QTimer::singleShot(100ms, &no, [&] { QTest::keyClick(&no, Qt::Key_Return); });
-    QTimer::singleShot(5s, &no, [&] { no.withdraw(); }); // in case Return did nothing
-    no.showAlert();
-    EXPECT_FALSE(no.shouldDownload());
-    EXPECT_EQ(no.clickedButton(), no.buttonWithTag(2001));
+TEST_F(DownloadConfirmationTest, DownloadAnswersYesAndReturnOrEscapePressesTheDefaultSkip) {
+    const std::tuple<const char*, std::function<void(Confirmation&)>, int> cases[] = {
+        {"Download", [](Confirmation& alert) { alert.buttonWithTag(2000)->click(); }, 2000},
+        {"Return", [](Confirmation& alert) { QTest::keyClick(&alert, Qt::Key_Return); }, 2001},
+        {"Escape", [](Confirmation& alert) { QTest::keyClick(&alert, Qt::Key_Escape); }, 2001},
+    };
+    for (const auto& [how, answer, tag] : cases) {
+        Confirmation alert(Request({regular_.get()}).as<CFDictionaryRef>());
+        EXPECT_EQ(alert.buttons().size(), 2);
+        EXPECT_EQ(alert.defaultButton(), alert.buttonWithTag(2001));
+        UiScript script({{[&] { return alert.isVisible(); }, [&] { answer(alert); }}},
+                        [&] { alert.withdraw(); });
+        alert.showAlert();
+        EXPECT_EQ(alert.clickedButton(), alert.buttonWithTag(tag)) << how;
+        EXPECT_EQ(alert.shouldDownload(), tag == 2000) << how;
+        EXPECT_FALSE(alert.suppressFurtherAlerts());
+    }
 }
 
 TEST_F(DownloadConfirmationTest, ExitOfTheRequestingProcessWithdrawsTheAlertAndNoOtherDoes) {
     PausedChild requester, bystander;
     Confirmation confirmation(Request({regular_.get()}, requester.pid()).as<CFDictionaryRef>());
-    int terminations = 0;
+    // Watches the bystander, to know when its exit has been noticed.
+    Confirmation witness(Request({}, bystander.pid()).as<CFDictionaryRef>());
+    int terminations = 0, bystanderNoticed = 0;
     QObject::connect(&confirmation, &Confirmation::requestingApplicationTerminated,
                      [&] { ++terminations; });
+    QObject::connect(&witness, &Confirmation::requestingApplicationTerminated,
+                     [&] { ++bystanderNoticed; });
     bool upAfterBystanderExit = false;
-    QTimer::singleShot(100ms, &confirmation, [&] { bystander.Kill(); });
-    QTimer::singleShot(500ms, &confirmation, [&] {
-        upAfterBystanderExit = confirmation.isVisible();
-        requester.Kill();
-    });
-    QTimer::singleShot(10s, &confirmation,
-                       [&] { confirmation.buttonWithTag(2000)->click(); }); // failsafe
+    UiScript script({{[&] { return confirmation.isVisible(); }, [&] { bystander.Kill(); }},
+                     {[&] { return bystanderNoticed == 1; },
+                      [&] {
+                          upAfterBystanderExit = confirmation.isVisible();
+                          requester.Kill();
+                      }}},
+                    [&] { confirmation.buttonWithTag(2000)->click(); });
     confirmation.showAlert();
 
+    EXPECT_TRUE(script.done());
     EXPECT_TRUE(upAfterBystanderExit);
     EXPECT_FALSE(confirmation.shouldDownload());
     EXPECT_FALSE(confirmation.suppressFurtherAlerts());
@@ -131,17 +140,19 @@ TEST_F(DownloadConfirmationTest, RegressionProcessExitEndsItsOwnAlertNotTheNeste
     PausedChild requester;
     Confirmation outer(Request({regular_.get()}, requester.pid()).as<CFDictionaryRef>());
     Confirmation inner(Request({regular_.get()}).as<CFDictionaryRef>());
-    bool innerUp = false, outerHidden = false;
-    QTimer::singleShot(100ms, &outer, [&] { inner.showAlert(); });
-    QTimer::singleShot(300ms, &outer, [&] { requester.Kill(); });
-    QTimer::singleShot(800ms, &outer, [&] {
-        innerUp = inner.isVisible();
-        outerHidden = !outer.isVisible();
-        inner.buttonWithTag(2000)->click();
-    });
+    bool innerUp = false;
+    UiScript script({{[&] { return outer.isVisible(); },
+                      [&] { QTimer::singleShot(0, &inner, [&] { inner.showAlert(); }); }},
+                     {[&] { return inner.isVisible(); }, [&] { requester.Kill(); }},
+                     {[&] { return !outer.isVisible(); },
+                      [&] {
+                          innerUp = inner.isVisible();
+                          inner.buttonWithTag(2000)->click();
+                      }}},
+                    EndEveryModalRun);
     outer.showAlert();
+    EXPECT_TRUE(script.done());
     EXPECT_TRUE(innerUp);
-    EXPECT_TRUE(outerHidden);
     EXPECT_TRUE(inner.shouldDownload());
     EXPECT_FALSE(outer.shouldDownload());
 }
