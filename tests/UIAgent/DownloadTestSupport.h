@@ -104,8 +104,8 @@ inline QMessageBox* AlertWithText(const QString& text) {
 }
 
 /// Watches the agent's windows from the event loop while it lives: how many were shown (and how
-/// many progress windows), the progress bar after each change of its value, and the progress
-/// window when it was first hidden.
+/// many progress windows), which were activated, the progress bar after each change of its value,
+/// and the progress window when it was first hidden.
 class WindowWatch : public QObject {
 public:
     WindowWatch() { QCoreApplication::instance()->installEventFilter(this); }
@@ -116,12 +116,15 @@ public:
     bool hidden = false;
     std::string statusWhenHidden;
     bool timerRunningWhenHidden = false;
+    std::vector<QObject*> activated; ///< windows in the order they were activated
 
 protected:
     bool eventFilter(QObject* watched, QEvent* event) override {
         if (!watched->isWidgetType() || !static_cast<QWidget*>(watched)->isWindow())
             return false;
         auto* window = static_cast<QWidget*>(watched);
+        if (event->type() == QEvent::WindowActivate)
+            activated.push_back(watched);
         const bool progress = window->objectName() == QLatin1String("FontDownloadWindow");
         if (event->type() == QEvent::Show) {
             ++windowsShown;

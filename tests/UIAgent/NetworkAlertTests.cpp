@@ -7,6 +7,7 @@
 #include <QPushButton>
 #include <QTemporaryDir>
 #include <QTest>
+#include <algorithm>
 #include <functional>
 
 #include "UIAgent/FontDownloadWindowController.h"
@@ -31,28 +32,6 @@ bool InjectedFlags(QZNetworkReachabilityFlags* flags) {
     *flags = gFlagsReadable ? gFlags : 0;
     return gFlagsReadable;
 }
-
-/// Counts the events of one type that `watched` receives while it lives.
-class EventCounter : public QObject {
-public:
-    EventCounter(QObject* watched, QEvent::Type type, int* count)
-        : watched_(watched), type_(type), count_(count) {
-        watched_->installEventFilter(this);
-    }
-    ~EventCounter() override { watched_->removeEventFilter(this); }
-
-protected:
-    bool eventFilter(QObject*, QEvent* event) override {
-        if (event->type() == type_)
-            ++*count_;
-        return false;
-    }
-
-private:
-    QObject* watched_;
-    QEvent::Type type_;
-    int* count_;
-};
 
 /// A step that presses the offline alert's button `key`.
 UiScript::Step AnswerOfflineAlert(const char* key) {
@@ -152,23 +131,22 @@ TEST_F(NetworkCheckTest, OnlyTheUsersCancelOrCloseStopsAndOtherWindowsStayInacti
     // Another window of the agent, up before the question: the question raises only itself.
     QDialog other;
     other.show();
-    int otherActivations = 0;
-    EventCounter counter(&other, QEvent::WindowActivate, &otherActivations);
     for (const Case& c : cases) {
         other.activateWindow();
         ASSERT_TRUE(SpinUntil([&] { return other.isActiveWindow(); })) << c.how;
         QZNetworkCheck check;
+        WindowWatch watch;
         int activationsWhileAsked = -1;
         UiScript script({{[] {
                               QMessageBox* alert = AlertWithText(kOfflineHeadline);
                               return alert && alert->isActiveWindow();
                           },
                           [&] {
-                              activationsWhileAsked = otherActivations;
+                              activationsWhileAsked = int(std::count(
+                                  watch.activated.begin(), watch.activated.end(), &other));
                               c.answer(check);
                           }}},
                         EndEveryModalRun);
-        otherActivations = 0;
         EXPECT_EQ(check.continueDownload(), c.goOn) << c.how;
         EXPECT_TRUE(script.done()) << c.how;
         EXPECT_FALSE(check.alert()->isVisible()) << c.how;
@@ -176,26 +154,18 @@ TEST_F(NetworkCheckTest, OnlyTheUsersCancelOrCloseStopsAndOtherWindowsStayInacti
     }
 }
 
-TEST_F(NetworkCheckTest, OfflineCancelAnswersNoWithoutAProgressWindow) {
-    WindowWatch shown;
-    // DejaVu Sans is installed: a download that went on would match it.
+TEST_F(NetworkCheckTest, OfflineCancelAnswersNoAndContinueRunsTheDownloadWindow) {
+    // DejaVu Sans is installed: a download that goes on matches it.
     Ref font = RequestedFont("DejaVuSans");
-    UiScript script({AnswerOfflineAlert("Cancel")}, EndEveryModalRun);
-    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({font.get()}, 0, true).get()),
-              DownloadReply(false, true));
-    EXPECT_TRUE(script.done());
-    EXPECT_EQ(shown.windowsShown, 1);
-    EXPECT_EQ(shown.progressWindowsShown, 0);
-}
-
-TEST_F(NetworkCheckTest, OfflineContinueRunsTheDownloadWindow) {
-    WindowWatch shown;
-    Ref font = RequestedFont("DejaVuSans");
-    UiScript script({AnswerOfflineAlert("Continue Download")}, EndEveryModalRun);
-    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({font.get()}, 0, true).get()),
-              DownloadReply(true, true));
-    EXPECT_TRUE(script.done());
-    EXPECT_EQ(shown.progressWindowsShown, 1);
+    for (const bool goOn : {false, true}) {
+        WindowWatch shown;
+        UiScript script({AnswerOfflineAlert(goOn ? "Continue Download" : "Cancel")},
+                        EndEveryModalRun);
+        EXPECT_EQ(HandleDownloadRequest(DownloadRequest({font.get()}, 0, true).get()),
+                  DownloadReply(goOn, true));
+        EXPECT_TRUE(script.done());
+        EXPECT_EQ(shown.progressWindowsShown, goOn ? 1 : 0);
+    }
 }
 
 TEST_F(NetworkCheckTest, TheRequestingApplicationQuittingEndsTheOfflineAlertAndNoWindowOpens) {
