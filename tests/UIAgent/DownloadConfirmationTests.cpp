@@ -69,13 +69,6 @@ protected:
                                  names.get());
         return attributes;
     }
-    /// A request from "Example Writer" (process `pid`) for `fonts`.
-    static Ref Request(std::initializer_list<CFTypeRef> fonts, SInt32 pid = 0) {
-        Ref pidNumber = Num(kCFNumberSInt32Type, pid);
-        return Dict({{kQZUIPropertyApplicationName, Str("Example Writer").get()},
-                     {kQZUIPropertyProcessID, pidNumber.get()},
-                     {kQZUIPropertyFontProperties, Array(fonts).get()}});
-    }
     static std::string NameFor(const Confirmation& confirmation, const char* postScriptName) {
         auto name = static_cast<CFStringRef>(
             CFDictionaryGetValue(confirmation.localizedFontNamesDict(), Str(postScriptName).get()));
@@ -97,7 +90,7 @@ TEST_F(DownloadConfirmationTest, DownloadAnswersYesAndReturnOrEscapePressesTheDe
         {"Escape", [](Confirmation& alert) { QTest::keyClick(&alert, Qt::Key_Escape); }, 2001},
     };
     for (const auto& [how, answer, tag] : cases) {
-        Confirmation alert(Request({regular_.get()}).as<CFDictionaryRef>());
+        Confirmation alert(DownloadRequest({regular_.get()}).as<CFDictionaryRef>());
         EXPECT_EQ(alert.buttons().size(), 2);
         EXPECT_EQ(alert.defaultButton(), alert.buttonWithTag(2001));
         UiScript script({{[&] { return alert.isVisible(); }, [&] { answer(alert); }}},
@@ -111,9 +104,10 @@ TEST_F(DownloadConfirmationTest, DownloadAnswersYesAndReturnOrEscapePressesTheDe
 
 TEST_F(DownloadConfirmationTest, ExitOfTheRequestingProcessWithdrawsTheAlertAndNoOtherDoes) {
     PausedChild requester, bystander;
-    Confirmation confirmation(Request({regular_.get()}, requester.pid()).as<CFDictionaryRef>());
+    Confirmation confirmation(
+        DownloadRequest({regular_.get()}, requester.pid()).as<CFDictionaryRef>());
     // Watches the bystander, to know when its exit has been noticed.
-    Confirmation witness(Request({}, bystander.pid()).as<CFDictionaryRef>());
+    Confirmation witness(DownloadRequest({}, bystander.pid()).as<CFDictionaryRef>());
     int terminations = 0, bystanderNoticed = 0;
     QObject::connect(&confirmation, &Confirmation::requestingApplicationTerminated,
                      [&] { ++terminations; });
@@ -138,8 +132,8 @@ TEST_F(DownloadConfirmationTest, ExitOfTheRequestingProcessWithdrawsTheAlertAndN
 
 TEST_F(DownloadConfirmationTest, RegressionProcessExitEndsItsOwnAlertNotTheNestedOne) {
     PausedChild requester;
-    Confirmation outer(Request({regular_.get()}, requester.pid()).as<CFDictionaryRef>());
-    Confirmation inner(Request({regular_.get()}).as<CFDictionaryRef>());
+    Confirmation outer(DownloadRequest({regular_.get()}, requester.pid()).as<CFDictionaryRef>());
+    Confirmation inner(DownloadRequest({regular_.get()}).as<CFDictionaryRef>());
     bool innerUp = false;
     UiScript script({{[&] { return outer.isVisible(); },
                       [&] { QTimer::singleShot(0, &inner, [&] { inner.showAlert(); }); }},
@@ -160,7 +154,8 @@ TEST_F(DownloadConfirmationTest, RegressionProcessExitEndsItsOwnAlertNotTheNeste
 TEST_F(DownloadConfirmationTest, OneDisplayNameIsNamedAndEachAssetIsCountedOnce) {
     Ref bold = Font("Sans-Bold", "Example Sans");
     Ref italic = Font("Sans-Italic", "Example Sans");
-    Confirmation one(Request({regular_.get(), bold.get(), italic.get()}).as<CFDictionaryRef>());
+    Confirmation one(
+        DownloadRequest({regular_.get(), bold.get(), italic.get()}).as<CFDictionaryRef>());
     EXPECT_TRUE(one.valid());
     EXPECT_EQ(one.text(), "Example Writer needs to download the font “Example Sans”.");
     EXPECT_EQ(one.informativeText(),
@@ -169,7 +164,8 @@ TEST_F(DownloadConfirmationTest, OneDisplayNameIsNamedAndEachAssetIsCountedOnce)
     EXPECT_EQ(NameFor(one, "Sans-Italic"), "Example Sans");
 
     Ref otherFamily = Font("Sans-Italic", "Example Sans Italic");
-    Confirmation several(Request({regular_.get(), otherFamily.get()}).as<CFDictionaryRef>());
+    Confirmation several(
+        DownloadRequest({regular_.get(), otherFamily.get()}).as<CFDictionaryRef>());
     EXPECT_EQ(several.text(), "Example Writer needs to download fonts.");
     EXPECT_EQ(several.informativeText(),
               "The download is 3.2 MB in total. Do you want to download the fonts?");
@@ -178,8 +174,9 @@ TEST_F(DownloadConfirmationTest, OneDisplayNameIsNamedAndEachAssetIsCountedOnce)
 TEST_F(DownloadConfirmationTest, NothingToDownloadIsNotValid) {
     Ref mono = Font("Mono", "Mono");
     Ref unknown = Font("Unknown", nullptr);
-    EXPECT_FALSE(Confirmation(Request({mono.get(), unknown.get()}).as<CFDictionaryRef>()).valid());
-    EXPECT_FALSE(Confirmation(Request({}).as<CFDictionaryRef>()).valid());
+    EXPECT_FALSE(
+        Confirmation(DownloadRequest({mono.get(), unknown.get()}).as<CFDictionaryRef>()).valid());
+    EXPECT_FALSE(Confirmation(DownloadRequest({}).as<CFDictionaryRef>()).valid());
     Confirmation empty(nullptr);
     EXPECT_FALSE(empty.valid());
     EXPECT_EQ(empty.applicationName(), "The current application");
@@ -237,25 +234,25 @@ TEST_F(DownloadConfirmationTest, TheCatalogsNamesStandInForThoseTheRequestLacks)
     Ref english = Font("Sans-Regular", nullptr, {{"en", "English name"}});
     // The first language the request or the catalog has a name for decides.
     QZSetPreferredLanguagesForTesting({"ja-JP", "en"});
-    Confirmation japanese(Request({english.get()}).as<CFDictionaryRef>());
+    Confirmation japanese(DownloadRequest({english.get()}).as<CFDictionaryRef>());
     EXPECT_EQ(NameFor(japanese, "Sans-Regular"), "カタログ");
     QZSetPreferredLanguagesForTesting({"fr", "en"});
-    Confirmation fallback(Request({english.get()}).as<CFDictionaryRef>());
+    Confirmation fallback(DownloadRequest({english.get()}).as<CFDictionaryRef>());
     EXPECT_EQ(NameFor(fallback, "Sans-Regular"), "English name");
     // The request's own family beats the catalog's; sizes read as the progress window writes them.
     QZSetPreferredLanguagesForTesting({"fr"});
-    Confirmation french(Request({regular_.get()}).as<CFDictionaryRef>());
+    Confirmation french(DownloadRequest({regular_.get()}).as<CFDictionaryRef>());
     EXPECT_EQ(NameFor(french, "Sans-Regular"), "Example Sans");
     EXPECT_EQ(french.informativeText(),
               "The font “Example Sans” is 757 kB. Do you want to download it?");
-    Confirmation catalogFamily(Request({bare.get()}).as<CFDictionaryRef>());
+    Confirmation catalogFamily(DownloadRequest({bare.get()}).as<CFDictionaryRef>());
     EXPECT_EQ(NameFor(catalogFamily, "Sans-Regular"), "Catalog Sans");
 }
 
 TEST_F(DownloadConfirmationTest, AVeryLongNameIsElidedWithTheFullNameInTheTooltip) {
     const std::string longName(100, 'W');
     Ref font = Font("Sans-Regular", longName.c_str());
-    Confirmation confirmation(Request({font.get()}).as<CFDictionaryRef>());
+    Confirmation confirmation(DownloadRequest({font.get()}).as<CFDictionaryRef>());
     EXPECT_EQ(NameFor(confirmation, "Sans-Regular"), longName);
     EXPECT_FALSE(confirmation.text().contains(QString::fromStdString(longName)));
     EXPECT_TRUE(confirmation.text().contains(u'…'));

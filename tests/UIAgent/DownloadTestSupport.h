@@ -59,15 +59,10 @@ inline Ref RequestedFont(const char* postScriptName, const char* family = nullpt
 inline Ref DownloadRequest(std::initializer_list<CFTypeRef> fonts, SInt32 pid = 0,
                            bool suppress = false) {
     Ref pidNumber = Num(kCFNumberSInt32Type, pid);
-    Ref fontArray = Array(fonts);
-    if (suppress)
-        return Dict({{kQZUIPropertyApplicationName, Str("Example Writer").get()},
-                     {kQZUIPropertyProcessID, pidNumber.get()},
-                     {kQZUIPropertyFontProperties, fontArray.get()},
-                     {kQZUIPropertySuppress, kCFBooleanTrue}});
     return Dict({{kQZUIPropertyApplicationName, Str("Example Writer").get()},
                  {kQZUIPropertyProcessID, pidNumber.get()},
-                 {kQZUIPropertyFontProperties, fontArray.get()}});
+                 {kQZUIPropertyFontProperties, Array(fonts).get()},
+                 {kQZUIPropertySuppress, suppress ? kCFBooleanTrue : kCFBooleanFalse}});
 }
 
 /// Sends `request` to the dispatcher as message id 2, flattened as a client sends it; returns
