@@ -290,72 +290,79 @@ TEST_F(DownloadRoadTest, CancelDuringTheTransferStopsTheTimerLeavesNoFileAndAnsw
     EXPECT_FALSE(QZIsFontInstalled("DejaVuSansMono"));
 }
 
-TEST_F(DownloadRoadTest, AFailureAnsweredContinueDownloadGoesOnToTheNextFont) {
-    WriteCatalog({ServeFont("DejaVuSansMono-Bold.ttf", "org.test.MonoBold", "DejaVuSansMono-Bold",
-                            {}, std::string(64, '0')),
-                  ServeFont("DejaVuSansMono.ttf", "org.test.Mono", "DejaVuSansMono")});
-    Ref bold = RequestedFont("DejaVuSansMono-Bold");
-    Ref mono = RequestedFont("DejaVuSansMono");
-    std::string informative, defaultButton, escapeButton;
-    UiScript script(
-        {{[] { return AlertWithText("The font “DejaVuSansMono-Bold” cannot be downloaded."); },
-          [&] {
-              QMessageBox* alert = AlertOnScreen();
-              informative = alert->informativeText().toStdString();
-              defaultButton = alert->defaultButton()->text().toStdString();
-              escapeButton = alert->escapeButton()->text().toStdString();
-              ClickButton(alert, "Continue Download");
-          }}},
-        EndEveryModalRun);
-
-    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({bold.get(), mono.get()}, 0, true).get()),
-              DownloadReply(true, true));
-
-    EXPECT_TRUE(script.done());
-    EXPECT_EQ(informative,
-              "The downloaded file is damaged: its SHA-256 checksum is not the expected one.");
-    EXPECT_EQ(defaultButton, "Continue Download");
-    EXPECT_EQ(escapeButton, "Cancel");
-    EXPECT_EQ(callbacks_.States(), (std::vector<uint32_t>{0, 2, 4, 5, 8, 2, 4, 5, 6, 7, 1}));
-    EXPECT_EQ(DownloadFolder(), QStringList{"org.test.Mono.ttf"});
-    EXPECT_FALSE(QZIsFontInstalled("DejaVuSansMono-Bold"));
-}
-
-TEST_F(DownloadRoadTest, AFailureAnsweredCancelOrClosedEndsTheDownloadWithNo) {
-    LoopbackHTTPServer::Resource dropped;
-    dropped.dropAfter = 100000;
-    WriteCatalog(
-        {ServeFont("DejaVuSansMono-Bold.ttf", "org.test.MonoBold", "DejaVuSansMono-Bold", dropped),
-         ServeFont("DejaVuSansMono.ttf", "org.test.Mono", "DejaVuSansMono")});
-    Ref bold = RequestedFont("DejaVuSansMono-Bold");
-    Ref mono = RequestedFont("DejaVuSansMono");
-    const std::pair<const char*, std::function<void(QMessageBox*)>> answers[] = {
-        {"Cancel", [](QMessageBox* alert) { ClickButton(alert, "Cancel"); }},
-        {"close button", [](QMessageBox* alert) { alert->close(); }},
+TEST_F(DownloadRoadTest, AFailureGoesOnToTheNextFontOrEndsWithNoWhenCancelledOrClosed) {
+    const std::string damaged(64, '0');
+    struct Case {
+        const char* how;
+        bool damaged; ///< the bold file's checksum is wrong; else its connection drops
+        std::function<void(QMessageBox*)> answer;
+        bool result;
+        const char* reason;
+        std::vector<uint32_t> states;
+        QStringList folder;
+    } cases[] = {
+        {"Cancel",
+         false,
+         [](QMessageBox* alert) { ClickButton(alert, "Cancel"); },
+         false,
+         "The connection ended after 100000 of 334268 bytes.",
+         {0, 2, 4, 5, 8},
+         {}},
+        {"close button",
+         false,
+         [](QMessageBox* alert) { alert->close(); },
+         false,
+         "The connection ended after 100000 of 334268 bytes.",
+         {0, 2, 4, 5, 8},
+         {}},
+        {"Continue Download",
+         true,
+         [](QMessageBox* alert) { ClickButton(alert, "Continue Download"); },
+         true,
+         "The downloaded file is damaged: its SHA-256 checksum is not the expected one.",
+         {0, 2, 4, 5, 8, 2, 4, 5, 6, 7, 1},
+         {"org.test.Mono.ttf"}},
     };
-    for (const auto& [how, answer] : answers) {
+    Ref bold = RequestedFont("DejaVuSansMono-Bold");
+    Ref mono = RequestedFont("DejaVuSansMono");
+    for (const Case& c : cases) {
+        LoopbackHTTPServer::Resource resource;
+        resource.dropAfter = c.damaged ? std::string::npos : 100000;
+        // Another identifier for the damaged file, so that the catalog changes size and is read
+        // again.
+        WriteCatalog({ServeFont("DejaVuSansMono-Bold.ttf",
+                                c.damaged ? "org.test.DamagedBold" : "org.test.MonoBold",
+                                "DejaVuSansMono-Bold", resource, c.damaged ? damaged : ""),
+                      ServeFont("DejaVuSansMono.ttf", "org.test.Mono", "DejaVuSansMono")});
         callbacks_.Reset();
-        std::string informative;
+        std::string reason, defaultButton, escapeButton;
         UiScript script(
             {{[] { return AlertWithText("The font “DejaVuSansMono-Bold” cannot be downloaded."); },
-              [&, &answer = answer] {
-                  informative = AlertOnScreen()->informativeText().toStdString();
-                  answer(AlertOnScreen());
+              [&] {
+                  QMessageBox* alert = AlertOnScreen();
+                  reason = alert->informativeText().toStdString();
+                  defaultButton = alert->defaultButton()->text().toStdString();
+                  escapeButton = alert->escapeButton()->text().toStdString();
+                  c.answer(alert);
               }}},
             EndEveryModalRun);
 
         EXPECT_EQ(HandleDownloadRequest(DownloadRequest({bold.get(), mono.get()}, 0, true).get()),
-                  DownloadReply(false, true))
-            << how;
+                  DownloadReply(c.result, true))
+            << c.how;
 
-        EXPECT_TRUE(script.done()) << how;
-        EXPECT_EQ(informative, "The connection ended after 100000 of 334268 bytes.");
+        EXPECT_TRUE(script.done()) << c.how;
+        EXPECT_EQ(reason, c.reason);
+        EXPECT_EQ(defaultButton, "Continue Download");
+        EXPECT_EQ(escapeButton, "Cancel");
         ASSERT_TRUE(WaitForTheMatchingToEnd());
-        EXPECT_EQ(callbacks_.States(), (std::vector<uint32_t>{0, 2, 4, 5, 8})) << how;
-        EXPECT_EQ(server_.RequestCount("/DejaVuSansMono.ttf"), 0);
-        EXPECT_TRUE(DownloadFolder().isEmpty()) << DownloadFolder().join(", ").toStdString();
-        EXPECT_FALSE(watch_.timerRunningWhenHidden);
+        EXPECT_EQ(callbacks_.States(), c.states) << c.how;
+        EXPECT_EQ(DownloadFolder(), c.folder) << c.how;
     }
+    // Only the run that went on fetched the second font.
+    EXPECT_EQ(server_.RequestCount("/DejaVuSansMono.ttf"), 1);
+    EXPECT_FALSE(QZIsFontInstalled("DejaVuSansMono-Bold"));
+    EXPECT_FALSE(watch_.timerRunningWhenHidden);
 }
 
 TEST_F(DownloadRoadTest, RegressionTheRequestingProcessExitEndsTheWindowsOwnRunNotTheInnermost) {
