@@ -80,8 +80,8 @@ QString DisplayName(CFDictionaryRef names, CFDictionaryRef progress) {
 /// Fills the failure alert for `error`: its description (else its domain and code) as the
 /// headline, its failure reason as the detail, then "Continue Download" (the default) and
 /// "Cancel" (also Escape). A word too wide for the alert (a long font name) is elided, the full
-/// texts in the tooltip and accessible description.
-void SetUpErrorAlert(QMessageBox& alert, CFTypeRef error) {
+/// texts in the tooltip and accessible description. Returns the two buttons.
+std::pair<QPushButton*, QPushButton*> SetUpErrorAlert(QMessageBox& alert, CFTypeRef error) {
     const auto errorRef = QZAsKind<CFErrorRef>(error);
     TCFRetained<CFDictionaryRef> userInfo(errorRef ? CFErrorCopyUserInfo(errorRef) : nullptr,
                                           kAdopted);
@@ -112,6 +112,7 @@ void SetUpErrorAlert(QMessageBox& alert, CFTypeRef error) {
     QPushButton* cancel = alert.addButton(QZLocalizedString("Cancel"), QMessageBox::RejectRole);
     alert.setDefaultButton(proceed);
     alert.setEscapeButton(cancel);
+    return {proceed, cancel};
 }
 
 } // namespace
@@ -450,9 +451,7 @@ int FontDownloadWindowController::runErrorAlert(CFTypeRef error) {
     try {
         // A child of the window, so that it stays above it.
         QMessageBox alert(window_.get());
-        SetUpErrorAlert(alert, error);
-        QAbstractButton* proceed = alert.buttons().value(0);
-        QAbstractButton* cancel = alert.buttons().value(1);
+        const auto [proceed, cancel] = SetUpErrorAlert(alert, error);
         QZModalSession session(&alert);
         connect(&alert, &QMessageBox::buttonClicked, &alert,
                 [&session, proceed, cancel](QAbstractButton* clicked) {
