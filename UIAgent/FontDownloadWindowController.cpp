@@ -17,6 +17,7 @@
 #include <limits>
 #include <mutex>
 
+#include "UIAgent/QZDictionaryValue.h"
 #include "UIAgent/QZLocalizedString.h"
 #include "UIAgent/QZModalSession.h"
 #include "UIAgent/QZNetworkCheck.h"
@@ -30,6 +31,8 @@
 namespace {
 
 std::atomic<int> gLinksAlive{0};
+/// The widest a word of the failure alert may be, in pixels.
+constexpr int kMaxWordWidth = 320;
 
 std::mutex& TapMutex() {
     static std::mutex mutex;
@@ -41,19 +44,11 @@ FontDownloadWindowController::ProgressTap& Tap() {
     return tap;
 }
 
-/// `key`'s value in `dictionary` when it has the kind `typeID`, else null. Does not retain.
-const void* GetTypedValue(CFDictionaryRef dictionary, CFStringRef key, CFTypeID typeID) {
-    if (!dictionary)
-        return nullptr;
-    const void* value = CFDictionaryGetValue(dictionary, key);
-    return value && CFGetTypeID(value) == typeID ? value : nullptr;
-}
-
 /// A progress size: the number under `key` as a 64-bit float; 0.0 when absent.
 double SizeValue(CFDictionaryRef progress, CFStringRef key) {
     double size = 0.0;
-    if (const void* number = GetTypedValue(progress, key, CFNumberGetTypeID()))
-        CFNumberGetValue(static_cast<CFNumberRef>(number), kCFNumberFloat64Type, &size);
+    if (const auto number = QZGetTypedValue<CFNumberRef>(progress, key))
+        CFNumberGetValue(number, kCFNumberFloat64Type, &size);
     return size;
 }
 
@@ -70,21 +65,56 @@ qint64 ByteCount(double size) {
 /// The display name of the first descriptor of `progress` by the rule of
 /// fontNameFromProgressParameter.
 QString DisplayName(CFDictionaryRef names, CFDictionaryRef progress) {
-    const auto descriptors = static_cast<CFArrayRef>(
-        GetTypedValue(progress, kCTFontDescriptorMatchingDescriptors, CFArrayGetTypeID()));
+    const auto descriptors =
+        QZGetTypedValue<CFArrayRef>(progress, kCTFontDescriptorMatchingDescriptors);
     if (!descriptors || CFArrayGetCount(descriptors) == 0)
         return QString();
-    const void* first = CFArrayGetValueAtIndex(descriptors, 0);
-    if (!first || CFGetTypeID(first) != CFDictionaryGetTypeID())
-        return QString();
-    const void* postScriptName = GetTypedValue(static_cast<CFDictionaryRef>(first),
-                                               NSFontNameAttribute, CFStringGetTypeID());
-    const QString fallback = QZQStringIfString(postScriptName);
+    const auto postScriptName = QZGetTypedValue<CFStringRef>(
+        QZGetTypedElement<CFDictionaryRef>(descriptors, 0), NSFontNameAttribute);
+    const QString fallback = QZQString(postScriptName);
     if (fallback.isEmpty())
         return QString();
-    const QString name = QZQStringIfString(
-        GetTypedValue(names, static_cast<CFStringRef>(postScriptName), CFStringGetTypeID()));
+    const QString name = QZQString(QZGetTypedValue<CFStringRef>(names, postScriptName));
     return name.isEmpty() ? fallback : name;
+}
+
+/// Fills the failure alert for `error`: its description (else its domain and code) as the
+/// headline, its failure reason as the detail, then "Continue Download" (the default) and
+/// "Cancel" (also Escape). A word too wide for the alert (a long font name) is elided, the full
+/// texts in the tooltip and accessible description. Returns the two buttons.
+std::pair<QPushButton*, QPushButton*> SetUpErrorAlert(QMessageBox& alert, CFTypeRef error) {
+    const auto errorRef = QZAsKind<CFErrorRef>(error);
+    TCFRetained<CFDictionaryRef> userInfo(errorRef ? CFErrorCopyUserInfo(errorRef) : nullptr,
+                                          kAdopted);
+    QString description =
+        QZQString(QZGetTypedValue<CFStringRef>(userInfo, kCFErrorLocalizedDescriptionKey));
+    if (description.isEmpty() && errorRef)
+        description = QStringLiteral("%1 error %2.")
+                          .arg(QZQString(CFErrorGetDomain(errorRef)))
+                          .arg(CFErrorGetCode(errorRef));
+    const QString reason =
+        QZQString(QZGetTypedValue<CFStringRef>(userInfo, kCFErrorLocalizedFailureReasonKey));
+
+    alert.setWindowTitle(QZLocalizedString("QZ_DOWNLOAD_ERROR_TITLE"));
+    alert.setWindowFlag(Qt::WindowStaysOnTopHint);
+    alert.setIcon(QMessageBox::Warning);
+    alert.setTextFormat(Qt::PlainText);
+    const QFontMetrics metrics = alert.fontMetrics();
+    const QString shown = QZElideLongWords(description, metrics, kMaxWordWidth);
+    alert.setText(shown);
+    if (!reason.isEmpty())
+        alert.setInformativeText(QZElideLongWords(reason, metrics, kMaxWordWidth));
+    if (shown != description)
+        if (auto* label = alert.findChild<QLabel*>(QStringLiteral("qt_msgbox_label"))) {
+            label->setToolTip(description);
+            label->setAccessibleDescription(description);
+        }
+    QPushButton* proceed =
+        alert.addButton(QZLocalizedString("Continue Download"), QMessageBox::AcceptRole);
+    QPushButton* cancel = alert.addButton(QZLocalizedString("Cancel"), QMessageBox::RejectRole);
+    alert.setDefaultButton(proceed);
+    alert.setEscapeButton(cancel);
+    return {proceed, cancel};
 }
 
 } // namespace
@@ -176,8 +206,8 @@ bool FontDownloadWindowController::Link::Progress(QZFontDescriptorMatchingState 
 
     switch (state) {
     case kCTFontDescriptorMatchingDidFinish: {
-        TCFRetained<CFArrayRef> result(static_cast<CFArrayRef>(
-            GetTypedValue(progress, kCTFontDescriptorMatchingResult, CFArrayGetTypeID())));
+        TCFRetained<CFArrayRef> result(
+            QZGetTypedValue<CFArrayRef>(progress, kCTFontDescriptorMatchingResult));
         OnMainThread(
             [&result](FontDownloadWindowController& window) { window.matchingDidFinish(result); });
         return true;
@@ -234,7 +264,7 @@ bool FontDownloadWindowController::Link::Downloading(CFDictionaryRef progress) {
 
 bool FontDownloadWindowController::Link::Failed(CFDictionaryRef progress) {
     TCFRetained<CFTypeRef> error(
-        GetTypedValue(progress, kCTFontDescriptorMatchingError, CFErrorGetTypeID()));
+        QZGetTypedValue<CFErrorRef>(progress, kCTFontDescriptorMatchingError));
     int response = 0;
     OnMainThread(
         [&](FontDownloadWindowController& window) { response = window.runErrorAlert(error); });
@@ -371,14 +401,18 @@ QString FontDownloadWindowController::fontNameFromProgressParameter(
 void FontDownloadWindowController::setProgress(double downloaded, double total) {
     if (!ui_)
         return;
-    // QProgressBar counts in int: beyond that, both sizes are scaled down alike. A total of 0
-    // leaves the bar empty rather than turning it into a busy indicator.
+    // QProgressBar counts in int: beyond that, the bar shows the fraction done over the whole
+    // int range. A total of 0 leaves the bar empty rather than turning it into a busy indicator.
     const double maximum = std::isfinite(total) && total > 0.0 ? total : 0.0;
     double value = std::isfinite(downloaded) && downloaded > 0.0 ? downloaded : 0.0;
     value = std::min(value, maximum);
-    const double scale = maximum > double(INT_MAX) ? maximum / double(INT_MAX) : 1.0;
-    ui_->progressIndicator->setRange(0, maximum > 0.0 ? int(maximum / scale) : 1);
-    ui_->progressIndicator->setValue(int(value / scale));
+    if (maximum > double(INT_MAX)) {
+        ui_->progressIndicator->setRange(0, INT_MAX);
+        ui_->progressIndicator->setValue(int(value / maximum * double(INT_MAX)));
+        return;
+    }
+    ui_->progressIndicator->setRange(0, maximum > 0.0 ? int(maximum) : 1);
+    ui_->progressIndicator->setValue(int(value));
 }
 
 void FontDownloadWindowController::startRefreshTimer() {
@@ -398,8 +432,8 @@ void FontDownloadWindowController::startRefreshTimer() {
 void FontDownloadWindowController::periodicUpdateTimeFired() {
     if (!ui_)
         return;
-    const QString current = FormattedByteCount(ByteCount(link_->currentDownloadedSize.load()));
-    const QString total = FormattedByteCount(ByteCount(link_->totalDownloadSize.load()));
+    const QString current = QZFormattedByteCount(ByteCount(link_->currentDownloadedSize.load()));
+    const QString total = QZFormattedByteCount(ByteCount(link_->totalDownloadSize.load()));
     ui_->minorStatusTextField->setText(QZLocalizedFormat("%1$@ of %2$@", {current, total}));
 }
 
@@ -421,18 +455,6 @@ void FontDownloadWindowController::matchingDidFinish(CFArrayRef result) {
 int FontDownloadWindowController::runErrorAlert(CFTypeRef error) {
     if (ended_)
         return 0;
-    const auto errorRef = static_cast<CFErrorRef>(const_cast<void*>(error));
-    TCFRetained<CFDictionaryRef> userInfo(errorRef ? CFErrorCopyUserInfo(errorRef) : nullptr,
-                                          kAdopted);
-    QString description = QZQStringIfString(
-        GetTypedValue(userInfo, kCFErrorLocalizedDescriptionKey, CFStringGetTypeID()));
-    if (description.isEmpty() && errorRef)
-        description = QStringLiteral("%1 error %2.")
-                          .arg(QZQString(CFErrorGetDomain(errorRef)))
-                          .arg(CFErrorGetCode(errorRef));
-    const QString reason = QZQStringIfString(
-        GetTypedValue(userInfo, kCFErrorLocalizedFailureReasonKey, CFStringGetTypeID()));
-
     struct Clear {
         FontDownloadWindowController* owner;
         ~Clear() {
@@ -443,19 +465,8 @@ int FontDownloadWindowController::runErrorAlert(CFTypeRef error) {
     try {
         // A child of the window, so that it stays above it.
         QMessageBox alert(window_.get());
-        alert.setWindowFlag(Qt::WindowStaysOnTopHint);
-        alert.setIcon(QMessageBox::Warning);
-        alert.setTextFormat(Qt::PlainText);
-        alert.setText(description);
-        if (!reason.isEmpty())
-            alert.setInformativeText(reason);
-        QPushButton* proceed =
-            alert.addButton(QZLocalizedString("Continue Download"), QMessageBox::AcceptRole);
-        QPushButton* cancel = alert.addButton(QZLocalizedString("Cancel"), QMessageBox::RejectRole);
-        alert.setDefaultButton(proceed);
-        alert.setEscapeButton(cancel);
+        const auto [proceed, cancel] = SetUpErrorAlert(alert, error);
         QZModalSession session(&alert, QZModalSession::kQuestion);
-        alert.setWindowTitle(QZLocalizedString("QZ_DOWNLOAD_ERROR_TITLE"));
         connect(&alert, &QMessageBox::buttonClicked, &alert,
                 [&session, proceed, cancel](QAbstractButton* clicked) {
                     if (clicked == proceed)
@@ -466,7 +477,9 @@ int FontDownloadWindowController::runErrorAlert(CFTypeRef error) {
         Clear clear{this};
         errorAlert_ = &alert;
         errorSession_ = &session;
-        return session.Run();
+        const int response = session.Run();
+        // Closed with the window's close button: as Cancel, never as a silent go-on.
+        return response == kQZModalResponseCancel ? kCancelResponse : response;
     } catch (...) {
         // Nothing more can be asked: the matching stops at its next callback, and the window
         // stays until the user presses Cancel.
@@ -489,13 +502,6 @@ QLabel* FontDownloadWindowController::minorStatusTextField() const {
 
 QProgressBar* FontDownloadWindowController::progressIndicator() const {
     return ui_ ? ui_->progressIndicator : nullptr;
-}
-
-QString FontDownloadWindowController::FormattedByteCount(qint64 bytes) {
-    bytes = std::max<qint64>(bytes, 0);
-    // Whole kilobytes, megabytes to a tenth, larger units to a hundredth.
-    const int precision = bytes < 1000 * 1000 ? 0 : bytes < 1000 * 1000 * 1000 ? 1 : 2;
-    return QLocale().formattedDataSize(bytes, precision, QLocale::DataSizeSIFormat);
 }
 
 bool FontDownloadWindowController::continueDownloadWithNetworkReachabilityCheck() {

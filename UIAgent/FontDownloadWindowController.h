@@ -87,6 +87,9 @@ public:
     /// display-name dictionary, else its PostScript name; a null string when the dictionary names
     /// no descriptor with a PostScript name.
     QString fontNameFromProgressParameter(CFDictionaryRef progressParameter) const;
+    /// The bar in bytes (main thread, handed over by the callback). A total beyond the bar's int
+    /// range scales both down alike; a total of 0 (or NaN, or negative) leaves the bar empty.
+    void setProgress(double downloaded, double total);
     /// Refreshes the size line from the last reported sizes.
     void periodicUpdateTimeFired();
     /// The Cancel button's action, also run when the matching finishes: ends the window (run
@@ -106,10 +109,6 @@ public:
     QTimer* refreshTimer() const { return refreshTimer_; }
     /// The failure alert while it is up, else null.
     QMessageBox* errorAlert() const { return errorAlert_; }
-
-    /// A byte count as the window shows it: decimal units, the precision growing with the unit
-    /// ("0 bytes", "757 kB", "1.5 MB", "2.25 GB").
-    static QString FormattedByteCount(qint64 bytes);
 
     /// Whether the download may begin: the network check with its offline alert (QZNetworkCheck).
     static bool continueDownloadWithNetworkReachabilityCheck();
@@ -135,8 +134,6 @@ private:
     /// up, hides the window and ends its own modal run with `code`. With `cancelTransfer`, also
     /// calls the matching's cancel handler.
     void endWindow(int code, bool cancelTransfer);
-    /// Main thread, from the callback: the bar in bytes.
-    void setProgress(double downloaded, double total);
     /// Main thread, from the callback: the first size line and the refresh timer.
     void startRefreshTimer();
     /// Main thread, from the callback: stores the result and ends the window.

@@ -1,11 +1,14 @@
 #include "UIAgent/QZFontDownloadConfirmation.h"
 
+#include <QLabel>
 #include <QLocale>
 #include <QPushButton>
 #include <QSet>
+#include <algorithm>
 #include <limits>
 #include <vector>
 
+#include "UIAgent/QZDictionaryValue.h"
 #include "UIAgent/QZLocalizedString.h"
 #include "UIAgent/QZModalSession.h"
 #include "desktop/QZDesktopEntry.h"
@@ -20,48 +23,94 @@
 namespace {
 
 constexpr int kIconSize = 64;
-
-QString& PreferredLanguageOverride() {
-    static QString language;
-    return language;
-}
-
-/// The value of `key` in `dictionary` when it has the type `typeID`, else null. Does not retain.
-const void* GetTypedValue(CFDictionaryRef dictionary, CFStringRef key, CFTypeID typeID) {
-    if (!dictionary)
-        return nullptr;
-    const void* value = CFDictionaryGetValue(dictionary, key);
-    return value && CFGetTypeID(value) == typeID ? value : nullptr;
-}
+/// The widest a font name may be in the alert's texts, in pixels; a longer one is elided.
+constexpr int kMaxNameWidth = 320;
 
 /// A non-empty string value of `key`, else a null string.
 QString GetNonEmptyString(CFDictionaryRef dictionary, CFStringRef key) {
-    const QString text =
-        QZQString(static_cast<CFStringRef>(GetTypedValue(dictionary, key, CFStringGetTypeID())));
+    const QString text = QZQString(QZGetTypedValue<CFStringRef>(dictionary, key));
     return text.isEmpty() ? QString() : text;
 }
 
-/// The name in `names` (language to name) for `language`, by the rule of DisplayName.
-QString LocalizedName(CFDictionaryRef names, const QString& language) {
+/// The name in `names` (language to name) under the longest key that is a prefix of one of
+/// `forms`; empty when none is.
+QString LongestPrefixName(CFDictionaryRef names, const QString (&forms)[2]) {
     const CFIndex count = names ? CFDictionaryGetCount(names) : 0;
-    if (count == 0 || language.isEmpty())
-        return QString();
     std::vector<const void*> keys(static_cast<size_t>(count)), values(static_cast<size_t>(count));
-    CFDictionaryGetKeysAndValues(names, keys.data(), values.data());
+    if (count > 0)
+        CFDictionaryGetKeysAndValues(names, keys.data(), values.data());
     QString best;
     qsizetype bestLength = 0;
     for (size_t i = 0; i < keys.size(); ++i) {
         const QString key = QZQStringIfString(keys[i]);
         const QString name = QZQStringIfString(values[i]);
-        if (key.isEmpty() || name.isEmpty() || !language.startsWith(key))
+        if (key.isEmpty() || name.isEmpty() || key.size() <= bestLength)
             continue;
         // The exact key is the longest possible prefix, so it wins like any other.
-        if (key.size() > bestLength) {
+        if (forms[0].startsWith(key) || forms[1].startsWith(key)) {
             best = name;
             bestLength = key.size();
         }
     }
     return best;
+}
+
+/// The localised name for `languages` by the rule of DisplayName: the request's names, then the
+/// catalog's, for each language in turn.
+QString LocalizedName(CFDictionaryRef requestNames, CFDictionaryRef catalogNames,
+                      const QStringList& languages) {
+    for (const QString& language : languages) {
+        const QString forms[] = {QZLanguageWithScript(language), language};
+        for (CFDictionaryRef names : {requestNames, catalogNames})
+            if (QString name = LongestPrefixName(names, forms); !name.isEmpty())
+                return name;
+    }
+    return QString();
+}
+
+/// The catalog's attributes of the font `postScriptName` among `assets`, or null.
+CFDictionaryRef CatalogAttributes(CFArrayRef assets, CFStringRef postScriptName) {
+    const CFIndex count = assets ? CFArrayGetCount(assets) : 0;
+    for (CFIndex i = 0; i < count; ++i) {
+        const auto asset = QZGetTypedElement<CFDictionaryRef>(assets, i);
+        const auto name = QZGetTypedValue<CFStringRef>(asset, NSFontNameAttribute);
+        if (name && CFEqual(name, postScriptName))
+            return asset;
+    }
+    return nullptr;
+}
+
+/// The download size of `assets`: each asset (by "LocalID") once, with the size of its first
+/// occurrence; saturates rather than wraps. Assets without an identifier cannot be told apart,
+/// and cannot be downloaded by identity either: left out.
+uint64_t DownloadSize(CFArrayRef assets) {
+    TCFRetained<CFMutableSetRef> seen(
+        CFSetCreateMutable(kCFAllocatorDefault, 0, &kCFTypeSetCallBacks), kAdopted);
+    uint64_t total = 0;
+    const CFIndex count = assets ? CFArrayGetCount(assets) : 0;
+    for (CFIndex i = 0; i < count; ++i) {
+        const auto asset = QZGetTypedElement<CFDictionaryRef>(assets, i);
+        const void* identifier = asset ? CFDictionaryGetValue(asset, CFSTR("LocalID")) : nullptr;
+        if (!identifier || CFSetContainsValue(seen, identifier))
+            continue;
+        CFSetAddValue(seen, identifier);
+        SInt64 size = 0;
+        if (const auto number = QZGetTypedValue<CFNumberRef>(asset, CFSTR("_DownloadSize")))
+            CFNumberGetValue(number, kCFNumberSInt64Type, &size);
+        if (size > 0)
+            total +=
+                std::min<uint64_t>(uint64_t(size), std::numeric_limits<uint64_t>::max() - total);
+    }
+    return total;
+}
+
+/// Sets `tip` as the tooltip and accessible description of the alert's text labels.
+void DescribeLabels(QMessageBox& alert, const QString& tip) {
+    for (const char* name : {"qt_msgbox_label", "qt_msgbox_informativelabel"})
+        if (auto* label = alert.findChild<QLabel*>(QLatin1String(name))) {
+            label->setToolTip(tip);
+            label->setAccessibleDescription(tip);
+        }
 }
 
 } // namespace
@@ -70,24 +119,18 @@ QZFontDownloadConfirmation::QZFontDownloadConfirmation(CFDictionaryRef propertie
     : QMessageBox(parent),
       session_(std::make_unique<QZModalSession>(this, QZModalSession::kQuestion)) {
     setWindowTitle(QZLocalizedString("QZ_DOWNLOAD_CONFIRMATION_TITLE"));
-    TCFRetained<CFMutableDictionaryRef> names(
-        CFDictionaryCreateMutable(kCFAllocatorDefault, 0, &kCFTypeDictionaryKeyCallBacks,
-                                  &kCFTypeDictionaryValueCallBacks),
-        kAdopted);
-
-    const QString language = PreferredLanguage();
-    CFURLRef bundleURL =
-        static_cast<CFURLRef>(GetTypedValue(properties, kQZUIPropertyBundleURL, CFURLGetTypeID()));
+    const QStringList languages = QZPreferredLanguages();
+    const auto bundleURL = QZGetTypedValue<CFURLRef>(properties, kQZUIPropertyBundleURL);
     applicationName_ = GetNonEmptyString(properties, kQZUIPropertyApplicationName);
     if (applicationName_.isEmpty())
-        applicationName_ =
-            QZApplicationName(bundleURL, QZDesktopEntry::PosixLocaleFromLanguageTag(language));
+        applicationName_ = QZApplicationName(
+            bundleURL, QZDesktopEntry::PosixLocaleFromLanguageTag(languages.value(0)));
     if (applicationName_.isEmpty())
         applicationName_ = QZLocalizedString("QZ_CURRENT_APPLICATION");
 
     SInt32 pid = 0;
-    if (const void* number = GetTypedValue(properties, kQZUIPropertyProcessID, CFNumberGetTypeID()))
-        CFNumberGetValue(static_cast<CFNumberRef>(number), kCFNumberSInt32Type, &pid);
+    if (const auto number = QZGetTypedValue<CFNumberRef>(properties, kQZUIPropertyProcessID))
+        CFNumberGetValue(number, kCFNumberSInt32Type, &pid);
     setTargetAppPID(pid);
 
     const QIcon icon = QZApplicationIcon(bundleURL);
@@ -96,70 +139,45 @@ QZFontDownloadConfirmation::QZFontDownloadConfirmation(CFDictionaryRef propertie
     else
         setIcon(QMessageBox::Question);
 
-    // Display names, and the set of distinct ones that decides between the texts for one font
-    // and for several. A font without a PostScript name cannot be downloaded by name (the
-    // dispatcher skips it), so it takes no part.
-    CFArrayRef fonts = static_cast<CFArrayRef>(
-        GetTypedValue(properties, kQZUIPropertyFontProperties, CFArrayGetTypeID()));
-    QSet<QString> distinctNames;
-    const CFIndex fontCount = fonts ? CFArrayGetCount(fonts) : 0;
-    for (CFIndex i = 0; i < fontCount; ++i) {
-        const void* element = CFArrayGetValueAtIndex(fonts, i);
-        if (!element || CFGetTypeID(element) != CFDictionaryGetTypeID())
-            continue;
-        const auto attributes = static_cast<CFDictionaryRef>(element);
-        const void* postScriptName =
-            GetTypedValue(attributes, NSFontNameAttribute, CFStringGetTypeID());
-        if (!postScriptName || CFStringGetLength(static_cast<CFStringRef>(postScriptName)) == 0)
-            continue;
-        const QString name = DisplayName(attributes, PreferredLanguage());
-        distinctNames.insert(name);
-        TCFRetained<CFStringRef> value(QZCreateCFString(name), kAdopted);
-        CFDictionarySetValue(names, postScriptName, value);
-    }
-    const QString onlyName = distinctNames.size() == 1 ? *distinctNames.begin() : QString();
-
-    setTextFormat(Qt::PlainText);
-    if (!onlyName.isEmpty())
-        setText(QZLocalizedFormat("QZ_HEADLINE_NEEDS_TO_DOWNLOAD_FONT_NAME",
-                                  {applicationName_, onlyName}));
-    else
-        setText(QZLocalizedFormat("QZ_HEADLINE_NEEDS_TO_DOWNLOAD", {applicationName_}));
-
-    // The size: each asset once, with the size of its first occurrence. Assets without an
-    // identifier cannot be told apart, and cannot be downloaded by identity either: left out.
+    const auto fonts = QZGetTypedValue<CFArrayRef>(properties, kQZUIPropertyFontProperties);
     TCFRetained<CFArrayRef> assets(QZCopyDownloadableFontAttributesForRequests(fonts), kAdopted);
-    TCFRetained<CFMutableSetRef> seen(
-        CFSetCreateMutable(kCFAllocatorDefault, 0, &kCFTypeSetCallBacks), kAdopted);
-    const CFIndex assetCount = assets ? CFArrayGetCount(assets) : 0;
-    for (CFIndex i = 0; i < assetCount; ++i) {
-        const void* element = CFArrayGetValueAtIndex(assets, i);
-        if (!element || CFGetTypeID(element) != CFDictionaryGetTypeID())
-            continue;
-        const auto asset = static_cast<CFDictionaryRef>(element);
-        const void* identifier = CFDictionaryGetValue(asset, CFSTR("LocalID"));
-        if (!identifier || CFSetContainsValue(seen, identifier))
-            continue;
-        CFSetAddValue(seen, identifier);
-        SInt64 size = 0;
-        if (const void* number = GetTypedValue(asset, CFSTR("_DownloadSize"), CFNumberGetTypeID()))
-            CFNumberGetValue(static_cast<CFNumberRef>(number), kCFNumberSInt64Type, &size);
-        if (size <= 0)
-            continue;
-        // Saturates rather than wraps: a size beyond any download is still "too large".
-        const uint64_t room = std::numeric_limits<uint64_t>::max() - totalDownloadSize_;
-        totalDownloadSize_ += std::min<uint64_t>(uint64_t(size), room);
-    }
+    TCFRetained<CFDictionaryRef> names(CreateDisplayNames(fonts, assets), kAdopted);
+    totalDownloadSize_ = DownloadSize(assets);
 
-    const QString sizeText = QLocale().formattedDataSize(
-        qint64(
-            std::min<uint64_t>(totalDownloadSize_, uint64_t(std::numeric_limits<qint64>::max()))),
-        2, QLocale::DataSizeSIFormat);
-    if (!onlyName.isEmpty())
-        setInformativeText(QZLocalizedFormat("QZ_DETAIL_FONT_SIZE", {onlyName, sizeText}));
-    else
+    // The distinct display names decide between the texts for one font and for several: faces
+    // of one family that share a name count as one.
+    QSet<QString> distinctNames;
+    const CFIndex nameCount = CFDictionaryGetCount(names);
+    std::vector<const void*> values(static_cast<size_t>(nameCount));
+    CFDictionaryGetKeysAndValues(names, nullptr, values.data());
+    for (const void* value : values)
+        distinctNames.insert(QZQStringIfString(value));
+    SetTexts(distinctNames.size() == 1 ? *distinctNames.begin() : QString());
+    AddButtons();
+
+    valid_ = totalDownloadSize_ > 0;
+    localizedFontNamesDict_ = names;
+}
+
+void QZFontDownloadConfirmation::SetTexts(const QString& onlyName) {
+    setTextFormat(Qt::PlainText);
+    const QString sizeText = QZFormattedByteCount(qint64(
+        std::min<uint64_t>(totalDownloadSize_, uint64_t(std::numeric_limits<qint64>::max()))));
+    if (onlyName.isEmpty()) {
+        setText(QZLocalizedFormat("QZ_HEADLINE_NEEDS_TO_DOWNLOAD", {applicationName_}));
         setInformativeText(QZLocalizedFormat("QZ_DETAIL_DOWNLOAD_SIZE", {sizeText}));
+        return;
+    }
+    // A long name would widen the alert past its fixed width: the texts show it elided.
+    const QString shown = fontMetrics().elidedText(onlyName, Qt::ElideRight, kMaxNameWidth);
+    setText(
+        QZLocalizedFormat("QZ_HEADLINE_NEEDS_TO_DOWNLOAD_FONT_NAME", {applicationName_, shown}));
+    setInformativeText(QZLocalizedFormat("QZ_DETAIL_FONT_SIZE", {shown, sizeText}));
+    if (shown != onlyName)
+        DescribeLabels(*this, onlyName);
+}
 
+void QZFontDownloadConfirmation::AddButtons() {
     skipButton_ = addButton(QZLocalizedString("Skip"), QMessageBox::RejectRole);
     downloadButton_ = addButton(QZLocalizedString("Download"), QMessageBox::AcceptRole);
     setDefaultButton(static_cast<QPushButton*>(skipButton_));
@@ -171,9 +189,26 @@ QZFontDownloadConfirmation::QZFontDownloadConfirmation(CFDictionaryRef propertie
                                                          : 0)
             session_->End(tag);
     });
+}
 
-    valid_ = totalDownloadSize_ > 0;
-    localizedFontNamesDict_ = TCFRetained<CFDictionaryRef>(names);
+CFDictionaryRef QZFontDownloadConfirmation::CreateDisplayNames(CFArrayRef fonts,
+                                                               CFArrayRef assets) {
+    CFMutableDictionaryRef names = CFDictionaryCreateMutable(
+        kCFAllocatorDefault, 0, &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks);
+    const QStringList languages = QZPreferredLanguages();
+    const CFIndex count = fonts ? CFArrayGetCount(fonts) : 0;
+    for (CFIndex i = 0; i < count; ++i) {
+        const auto attributes = QZGetTypedElement<CFDictionaryRef>(fonts, i);
+        const auto postScriptName = QZGetTypedValue<CFStringRef>(attributes, NSFontNameAttribute);
+        // A font without a PostScript name cannot be downloaded by name: it takes no part.
+        if (!postScriptName || CFStringGetLength(postScriptName) == 0)
+            continue;
+        const QString name =
+            DisplayName(attributes, languages, CatalogAttributes(assets, postScriptName));
+        TCFRetained<CFStringRef> value(QZCreateCFString(name), kAdopted);
+        CFDictionarySetValue(names, postScriptName, value);
+    }
+    return names;
 }
 
 QZFontDownloadConfirmation::~QZFontDownloadConfirmation() {
@@ -230,24 +265,17 @@ QAbstractButton* QZFontDownloadConfirmation::buttonWithTag(int tag) const {
     return tag == kSkipTag ? skipButton_ : tag == kDownloadTag ? downloadButton_ : nullptr;
 }
 
-QString QZFontDownloadConfirmation::PreferredLanguage() {
-    if (!PreferredLanguageOverride().isEmpty())
-        return PreferredLanguageOverride();
-    const QStringList languages = QLocale().uiLanguages();
-    return languages.isEmpty() ? QString() : languages.first();
-}
-
-void QZFontDownloadConfirmation::SetPreferredLanguageForTesting(const QString& language) {
-    PreferredLanguageOverride() = language;
-}
-
 QString QZFontDownloadConfirmation::DisplayName(CFDictionaryRef fontAttributes,
-                                                const QString& language) {
-    const auto localized = static_cast<CFDictionaryRef>(GetTypedValue(
-        fontAttributes, NSCTFontLocalizedFamilyNameAttribute, CFDictionaryGetTypeID()));
-    QString name = LocalizedName(localized, language);
+                                                const QStringList& languages,
+                                                CFDictionaryRef catalogAttributes) {
+    QString name = LocalizedName(
+        QZGetTypedValue<CFDictionaryRef>(fontAttributes, NSCTFontLocalizedFamilyNameAttribute),
+        QZGetTypedValue<CFDictionaryRef>(catalogAttributes, NSCTFontLocalizedFamilyNameAttribute),
+        languages);
     if (name.isEmpty())
         name = GetNonEmptyString(fontAttributes, NSFontFamilyAttribute);
+    if (name.isEmpty())
+        name = GetNonEmptyString(catalogAttributes, NSFontFamilyAttribute);
     if (name.isEmpty())
         name = GetNonEmptyString(fontAttributes, NSFontNameAttribute);
     return name;

@@ -2,10 +2,11 @@
 // downloaded (message id 2). The alert names the application, the font when only one display
 // name is concerned, and the total download size; Skip (the default) or Download answer it.
 //
-// Construction also works out each requested font's display name in the user's first preferred
-// language (localizedFontNamesDict, used by the download window) and the download size, counted
-// once per downloadable asset. The confirmation is valid only when there is something to
-// download.
+// Construction also works out each requested font's display name in the user's preferred
+// languages (localizedFontNamesDict, used by the download window) and the download size, counted
+// once per downloadable asset. A display name too long for the alert's width is elided there, the
+// full name in the texts' tooltip and accessible description. The confirmation is valid only when
+// there is something to download.
 //
 // While it exists it watches the requesting application's process: when that process ends, the
 // running alert of this confirmation is withdrawn (answered no), whatever other alert may be
@@ -16,11 +17,13 @@
 
 #include <QMessageBox>
 #include <QString>
+#include <QStringList>
 #include <cstdint>
 #include <memory>
 #include <sys/types.h>
 
 #include "cfutil/TCFRetained.h"
+#include "platform/CFArray.h"
 #include "platform/CFDictionary.h"
 
 class QZModalSession;
@@ -73,22 +76,32 @@ public:
     /// The button that answers `tag`, or null.
     QAbstractButton* buttonWithTag(int tag) const;
 
-    /// The language whose names are shown: the first of QLocale::uiLanguages(), or the one set
-    /// with SetPreferredLanguageForTesting.
-    static QString PreferredLanguage();
-    /// Makes PreferredLanguage answer `language`; an empty string restores the user's.
-    static void SetPreferredLanguageForTesting(const QString& language);
-    /// The display name of the font described by `fontAttributes` in `language`: its localised
-    /// family name for `language`, else for the longest key that is a prefix of `language`
-    /// (plain, case-sensitive: zh-Hans serves zh-Hans-CN), else its family name, else its
-    /// PostScript name; empty when it has none of them.
-    static QString DisplayName(CFDictionaryRef fontAttributes, const QString& language);
+    /// The display name of the font described by `fontAttributes` (a request's font attribute
+    /// dictionary) for the user's `languages`, most preferred first: a localised family name,
+    /// else its family name, else its PostScript name; empty when it has none of them.
+    /// `catalogAttributes` (may be null) is what the catalog says of the same font: its localised
+    /// and family names stand in for those the request does not give. For each language in turn
+    /// (as given and with its likely script: zh-TW is also read as zh-Hant-TW), the localised name
+    /// under the longest key that is a prefix of it wins, the request's before the catalog's; the
+    /// first language with one decides.
+    static QString DisplayName(CFDictionaryRef fontAttributes, const QStringList& languages,
+                               CFDictionaryRef catalogAttributes = nullptr);
+    /// PostScript name to display name (DisplayName for QZPreferredLanguages()) for each element
+    /// of `fonts` (font attribute dictionaries) that has a PostScript name; `assets` (may be null)
+    /// is the catalog's answer for `fonts` (QZCopyDownloadableFontAttributesForRequests). A later
+    /// font with the same PostScript name replaces the earlier entry. Returns a new dictionary;
+    /// the caller releases it.
+    static CFDictionaryRef CreateDisplayNames(CFArrayRef fonts, CFArrayRef assets);
 
 signals:
     /// The requesting application ended while this confirmation existed.
     void requestingApplicationTerminated();
 
 private:
+    /// The headline and the detail; `onlyName` is the one display name concerned, or empty.
+    void SetTexts(const QString& onlyName);
+    /// Skip (the default) and Download, each ending the question with its tag.
+    void AddButtons();
     /// The process watch's report: withdraws the alert when `pid` is the requesting application.
     void anApplicationDidTerminate(pid_t pid);
 

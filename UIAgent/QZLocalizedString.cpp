@@ -5,10 +5,12 @@
 #include <QCoreApplication>
 #include <QFile>
 #include <QFileInfo>
+#include <QGuiApplication>
 #include <QLibraryInfo>
 #include <QLocale>
 #include <QPointer>
 #include <QTranslator>
+#include <algorithm>
 #include <vector>
 
 QString QZLocalizedString(const char* key) {
@@ -118,4 +120,66 @@ void QZInstallTranslations() {
             qtFile = candidate;
     }
     InstallTranslator(qtTexts, qtFile);
+    QZApplyLayoutDirection();
+}
+
+void QZApplyLayoutDirection() {
+    // Set explicitly, so that a table (or the lack of one) does not decide the direction.
+    QGuiApplication::setLayoutDirection(QZLayoutDirectionFor(QZPreferredLanguages()));
+}
+
+static QStringList& PreferredLanguagesOverride() {
+    static QStringList languages;
+    return languages;
+}
+
+QStringList QZPreferredLanguages() {
+    if (!PreferredLanguagesOverride().isEmpty())
+        return PreferredLanguagesOverride();
+    return QLocale().uiLanguages();
+}
+
+void QZSetPreferredLanguagesForTesting(const QStringList& languages) {
+    PreferredLanguagesOverride() = languages;
+}
+
+QString QZLanguageWithScript(const QString& tag) {
+    QStringList parts = QString(tag).replace(u'_', u'-').split(u'-');
+    // A second subtag of four letters is a script already.
+    if (parts.size() > 1 && parts[1].size() == 4)
+        return parts.join(u'-');
+    const QLocale locale(parts.join(u'-'));
+    if (locale.language() == QLocale::C || locale.script() == QLocale::AnyScript)
+        return parts.join(u'-');
+    parts.insert(1, QLocale::scriptToCode(locale.script()));
+    return parts.join(u'-');
+}
+
+Qt::LayoutDirection QZLayoutDirectionFor(const QStringList& languages) {
+    if (languages.isEmpty())
+        return Qt::LeftToRight;
+    const QLocale locale(QZLanguageWithScript(languages.first()));
+    return locale.language() == QLocale::C ? Qt::LeftToRight : locale.textDirection();
+}
+
+QString QZFormattedByteCount(qint64 bytes) {
+    bytes = std::max<qint64>(bytes, 0);
+    // Whole kilobytes, megabytes to a tenth, larger units to a hundredth.
+    const int precision = bytes < 1000 * 1000 ? 0 : bytes < 1000 * 1000 * 1000 ? 1 : 2;
+    return QLocale().formattedDataSize(bytes, precision, QLocale::DataSizeSIFormat);
+}
+
+QString QZElideLongWords(const QString& text, const QFontMetrics& metrics, int maxWidth) {
+    QString result;
+    qsizetype start = 0;
+    while (start < text.size()) {
+        qsizetype end = start;
+        const bool space = text[start].isSpace();
+        while (end < text.size() && text[end].isSpace() == space)
+            ++end;
+        const QString run = text.mid(start, end - start);
+        result += space ? run : metrics.elidedText(run, Qt::ElideRight, maxWidth);
+        start = end;
+    }
+    return result;
 }

@@ -63,7 +63,8 @@ bool QZNetworkCheck::continueDownload() {
                      });
 
     const int response = session_->Run();
-    return response != kCancelResponse;
+    // The window's close button means Cancel too; a withdrawal from outside goes on.
+    return response != kCancelResponse && response != kQZModalResponseCancel;
 }
 
 void QZNetworkCheck::withdraw() {

@@ -3,9 +3,9 @@
 // the download goes on without a word. Otherwise a critical alert says that the network is not
 // connected and offers "Cancel" (the default button) or "Continue Download".
 //
-// Only the user's Cancel stops the download: any other end of the alert, including its withdrawal
-// from outside (the requesting application quit), answers "go on", and the caller decides what
-// to make of the withdrawal.
+// Only the user stops the download, with Cancel or the window's close button: any other end of
+// the alert, including its withdrawal from outside (the requesting application quit), answers
+// "go on", and the caller decides what to make of the withdrawal.
 //
 // Main thread only.
 #pragma once
@@ -30,8 +30,8 @@ public:
     QZNetworkCheck& operator=(const QZNetworkCheck&) = delete;
 
     /// True to go on with the download: at once when the network is connected; otherwise after
-    /// the offline alert, unless the user pressed Cancel. Runs the alert modally; may be called
-    /// more than once.
+    /// the offline alert, unless the user pressed Cancel or closed it. Runs the alert modally; may
+    /// be called more than once.
     bool continueDownload();
     /// Ends this check's running offline alert with the abort response (the answer is then "go
     /// on"); nothing when no alert of this check is running.

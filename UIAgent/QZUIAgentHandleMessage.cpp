@@ -3,6 +3,7 @@
 #include <memory>
 
 #include "UIAgent/QZAutoActivationConfirmation.h"
+#include "UIAgent/QZDictionaryValue.h"
 #include "UIAgent/QZFontDownloadConfirmation.h"
 #include "UIAgent/QZRunFontDownload.h"
 #include "UIAgent/QZUIController.h"
@@ -12,16 +13,15 @@
 #include "cfutil/TCFNumber.h"
 #include "cfutil/TCFRetained.h"
 #include "cfutil/TCFTypeRef.h"
+#include "desktop/QZDownloadableFontCatalog.h"
+#include "desktop/QZFontMatching.h"
+#include "desktop/QZQtStrings.h"
 #include "platform/Log.h"
 #include "protocol/QZUIProtocol.h"
 #include "serialization/TCFFlattenContext.h"
 #include "serialization/TCFResurrectContext.h"
 
 namespace {
-
-bool IsKind(CFTypeRef value, CFTypeID kind) {
-    return value && CFGetTypeID(value) == kind;
-}
 
 /// Runs `show` (a question put to the user) with the withdrawal of the request being handled
 /// wired to `withdraw`: when the client goes away while the question is up, the question ends as
@@ -56,9 +56,8 @@ void FlattenReply(CFMutableDataRef reply, CFDictionaryRef dictionary) {
 /// the first candidate): no alert, and the answer no, with the request's array (or an empty one)
 /// passed back.
 void HandleAutoActivation(CFDictionaryRef request, CFMutableDataRef reply) {
-    CFTypeRef candidates = TCFDict(request).GetValue(kQZUIPropertyCandidateFontURLs);
-    CFArrayRef requestCandidates =
-        IsKind(candidates, CFArrayGetTypeID()) ? static_cast<CFArrayRef>(candidates) : nullptr;
+    const auto requestCandidates =
+        QZGetTypedValue<CFArrayRef>(request, kQZUIPropertyCandidateFontURLs);
 
     SInt8 activate = 0;
     SInt8 suppress = 0;
@@ -89,42 +88,79 @@ void HandleAutoActivation(CFDictionaryRef request, CFMutableDataRef reply) {
     FlattenReply(reply, answer);
 }
 
+/// Whether the font `postScriptName` can be had: installed already, or offered by the catalog.
+bool FontIsAvailable(const QZDownloadableFontCatalog& catalog, const std::string& postScriptName) {
+    for (const QZDownloadableFontAsset& asset : catalog.assets)
+        for (const QZDownloadableFont& font : asset.fonts)
+            if (font.postScriptName == postScriptName)
+                return true;
+    return QZIsFontInstalled(postScriptName);
+}
+
+/// The descriptors of `request` (QZCreateFontDescriptors) without the fonts that no catalog
+/// offers and that are not installed: asking for them could only end in a failure alert. Returns
+/// a new array; the caller releases it.
+CFArrayRef CreateAvailableFontDescriptors(CFDictionaryRef request) {
+    TCFAdopted<CFArrayRef> all(QZCreateFontDescriptors(request));
+    const std::shared_ptr<const QZDownloadableFontCatalog> catalog =
+        QZCurrentDownloadableFontCatalog();
+    TCFMutableArray available(0);
+    for (CFIndex i = 0; i < CFArrayGetCount(all); ++i) {
+        const auto descriptor = QZGetTypedElement<CFDictionaryRef>(all, i);
+        const QString name =
+            QZQString(QZGetTypedValue<CFStringRef>(descriptor, NSFontNameAttribute));
+        if (FontIsAvailable(*catalog, name.toStdString()))
+            available.Append(descriptor);
+    }
+    return available.Orphan();
+}
+
+/// What the download confirmation decided (or the request's own flag, when it says not to ask).
+struct DownloadDecision {
+    bool shouldDownload = false;
+    bool suppress = false;
+};
+
+/// Puts the download question of `confirmation` unless the request is withdrawn.
+DownloadDecision AskToDownload(QZFontDownloadConfirmation& confirmation) {
+    if (!confirmation.valid())
+        return {};
+    if (!AskUnlessWithdrawn([&] { confirmation.showAlert(); }, [&] { confirmation.withdraw(); }))
+        return {};
+    return {confirmation.shouldDownload(), confirmation.suppressFurtherAlerts()};
+}
+
 /// Message id 2.
 void HandleFontDownload(CFDictionaryRef request, CFMutableDataRef reply) {
     const bool flag = TCFTypeRef::GetBooleanValue(TCFDict(request).GetValue(kQZUIPropertySuppress));
-    bool shouldDownload = flag;
-    bool suppress = flag;
-    CFDictionaryRef localizedNames = nullptr;
+    DownloadDecision decision{flag, flag};
 
     // Lives until the reply is built: it owns the display names and watches the requesting
     // application for as long as the request is handled.
     std::unique_ptr<QZFontDownloadConfirmation> confirmation;
     if (!flag) {
         confirmation = std::make_unique<QZFontDownloadConfirmation>(request);
-        QZFontDownloadConfirmation& alert = *confirmation;
-        if (alert.valid()) {
-            if (AskUnlessWithdrawn([&] { alert.showAlert(); }, [&] { alert.withdraw(); })) {
-                shouldDownload = alert.shouldDownload();
-                suppress = alert.suppressFurtherAlerts();
-            } else {
-                shouldDownload = false;
-                suppress = false;
-            }
-            localizedNames = alert.localizedFontNamesDict();
-        } else {
-            shouldDownload = false;
-            suppress = false;
-        }
+        decision = AskToDownload(*confirmation);
     }
 
     bool result = false;
-    if (shouldDownload) {
-        TCFAdopted<CFArrayRef> descriptors(QZCreateFontDescriptors(request));
-        result = QZRunFontDownload(descriptors, localizedNames, confirmation.get()) != 0;
+    if (decision.shouldDownload) {
+        TCFAdopted<CFArrayRef> descriptors(CreateAvailableFontDescriptors(request));
+        // Unasked, the progress window still names the fonts as the confirmation would have.
+        TCFRetained<CFDictionaryRef> names;
+        if (confirmation)
+            names = TCFRetained<CFDictionaryRef>(confirmation->localizedFontNamesDict());
+        else if (CFArrayGetCount(descriptors) > 0) {
+            const auto fonts = QZGetTypedValue<CFArrayRef>(request, kQZUIPropertyFontProperties);
+            TCFRetained<CFArrayRef> assets(QZCopyDownloadableFontAttributesForRequests(fonts),
+                                           kAdopted);
+            names.Adopt(QZFontDownloadConfirmation::CreateDisplayNames(fonts, assets));
+        }
+        result = QZRunFontDownload(descriptors, names, confirmation.get()) != 0;
     }
 
     TCFNumber resultNumber(static_cast<SInt8>(result ? 1 : 0));
-    TCFNumber suppressNumber(static_cast<SInt8>(suppress ? 1 : 0));
+    TCFNumber suppressNumber(static_cast<SInt8>(decision.suppress ? 1 : 0));
     const void* keys[] = {kQZUIPropertyResult, kQZUIPropertySuppress};
     const void* values[] = {static_cast<CFNumberRef>(resultNumber),
                             static_cast<CFNumberRef>(suppressNumber)};
@@ -170,17 +206,12 @@ CFDataRef QZUIAgentHandleMessage(CFMessagePortRef, SInt32 msgid, CFDataRef data,
 
 CFArrayRef QZCreateFontDescriptors(CFDictionaryRef request) {
     TCFMutableArray descriptors(0);
-    CFTypeRef fonts = TCFDict(request).GetValue(kQZUIPropertyFontProperties);
-    if (!IsKind(fonts, CFArrayGetTypeID()))
-        return descriptors.Orphan();
-    TCFDeque<CFTypeRef> elements(static_cast<CFArrayRef>(fonts));
-    for (CFIndex i = 0; i < elements.GetCount(); ++i) {
-        CFTypeRef element = elements.At(i);
-        if (!IsKind(element, CFDictionaryGetTypeID()))
-            continue;
-        CFTypeRef name =
-            TCFDict(static_cast<CFDictionaryRef>(element)).GetValue(NSFontNameAttribute);
-        if (!IsKind(name, CFStringGetTypeID()))
+    const auto fonts = QZGetTypedValue<CFArrayRef>(request, kQZUIPropertyFontProperties);
+    const CFIndex count = fonts ? CFArrayGetCount(fonts) : 0;
+    for (CFIndex i = 0; i < count; ++i) {
+        const auto name = QZGetTypedValue<CFStringRef>(QZGetTypedElement<CFDictionaryRef>(fonts, i),
+                                                       NSFontNameAttribute);
+        if (!name)
             continue;
         const void* keys[] = {NSFontNameAttribute};
         const void* values[] = {name};

@@ -5,7 +5,9 @@
 //
 //   message id 1 (may an application use a font found on disk?): {QZUIPropertyResult,
 //     QZUIPropertySuppress, QZUIPropertyCandidateFontURLs (the request's array passed back)}
-//   message id 2 (may fonts be downloaded?): {QZUIPropertyResult, QZUIPropertySuppress}
+//   message id 2 (may fonts be downloaded?): {QZUIPropertyResult, QZUIPropertySuppress}; fonts
+//     that no catalog offers and that are not installed are left out before any window or
+//     network check, so a request for none of them is answered no at once
 //   any other id: the line "unknown msgid: %lu" and an empty reply
 //
 // Yes/no answers are numbers of type 7 (signed char) holding 1 or 0. A request that arrives

@@ -164,4 +164,95 @@
         <translation>Downloadfortschritt</translation>
     </message>
 </context>
+<context>
+    <name>QZFontService</name>
+    <message>
+        <source>The font “%1” cannot be downloaded.</source>
+        <extracomment>Download failure alert. Headline of the download failure alert. %1: the font's PostScript name.</extracomment>
+        <translation>Die Schrift „%1“ kann nicht heruntergeladen werden.</translation>
+    </message>
+    <message>
+        <source>No downloadable font has this name.</source>
+        <extracomment>Download failure alert. Reason: no catalog offers the font.</extracomment>
+        <translation>Es gibt keine herunterladbare Schrift mit diesem Namen.</translation>
+    </message>
+    <message>
+        <source>The downloaded font file does not hold this font.</source>
+        <extracomment>Download failure alert. Reason: the asset was installed but does not contain the requested font.</extracomment>
+        <translation>Die heruntergeladene Schriftdatei enthält diese Schrift nicht.</translation>
+    </message>
+</context>
+<context>
+    <name>QZFontDownloader</name>
+    <message>
+        <source>The server offers %1 bytes, but the font should have %2 bytes.</source>
+        <extracomment>Download failure alert. Reason. %1: bytes the server announces, %2: bytes expected.</extracomment>
+        <translation>Der Server bietet %1 Byte an, die Schrift sollte aber %2 Byte groß sein.</translation>
+    </message>
+    <message>
+        <source>The server sent more than the %1 bytes of the font.</source>
+        <extracomment>Download failure alert. Reason. %1: bytes expected.</extracomment>
+        <translation>Der Server hat mehr als die %1 Byte der Schrift gesendet.</translation>
+    </message>
+    <message>
+        <source>The font file cannot be written: %1</source>
+        <extracomment>Download failure alert. Reason. %1: the system's error text.</extracomment>
+        <translation>Die Schriftdatei kann nicht geschrieben werden: %1</translation>
+    </message>
+    <message>
+        <source>The server answered with the HTTP status %1.</source>
+        <extracomment>Download failure alert. Reason. %1: HTTP status code.</extracomment>
+        <translation>Der Server hat mit dem HTTP-Status %1 geantwortet.</translation>
+    </message>
+    <message>
+        <source>Fonts are downloaded only from https, http and file addresses, and redirected only to https and http ones.</source>
+        <extracomment>Download failure alert. Reason: the catalog's address or a redirection uses another scheme.</extracomment>
+        <translation>Schriften werden nur von https-, http- und file-Adressen heruntergeladen und nur an https- und http-Adressen weitergeleitet.</translation>
+    </message>
+    <message>
+        <source>The connection ended after %1 of %2 bytes.</source>
+        <extracomment>Download failure alert. Reason. %1: bytes received, %2: bytes expected.</extracomment>
+        <translation>Die Verbindung endete nach %1 von %2 Byte.</translation>
+    </message>
+    <message>
+        <source>The download failed: %1</source>
+        <extracomment>Download failure alert. Reason. %1: the transfer library's error text.</extracomment>
+        <translation>Der Download ist fehlgeschlagen: %1</translation>
+    </message>
+    <message>
+        <source>The font folder cannot be created: %1</source>
+        <extracomment>Download failure alert. Reason. %1: the system's error text.</extracomment>
+        <translation>Der Schriftordner kann nicht angelegt werden: %1</translation>
+    </message>
+    <message>
+        <source>The download holds %1 bytes, but the font should have %2 bytes.</source>
+        <extracomment>Download failure alert. Reason. %1: bytes received, %2: bytes expected.</extracomment>
+        <translation>Der Download umfasst %1 Byte, die Schrift sollte aber %2 Byte groß sein.</translation>
+    </message>
+    <message>
+        <source>The downloaded file is damaged: its SHA-256 checksum is not the expected one.</source>
+        <extracomment>Download failure alert. Reason: checksum mismatch.</extracomment>
+        <translation>Die heruntergeladene Datei ist beschädigt: Ihre SHA-256-Prüfsumme ist nicht die erwartete.</translation>
+    </message>
+    <message>
+        <source>The downloaded file is not a font.</source>
+        <extracomment>Download failure alert. Reason.</extracomment>
+        <translation>Die heruntergeladene Datei ist keine Schrift.</translation>
+    </message>
+    <message>
+        <source>The server did not answer within %1 seconds.</source>
+        <extracomment>Download failure alert. Reason. %1: seconds waited.</extracomment>
+        <translation>Der Server hat nicht innerhalb von %1 Sekunden geantwortet.</translation>
+    </message>
+    <message>
+        <source>The downloaded file does not hold the font “%1”.</source>
+        <extracomment>Download failure alert. Reason. %1: the font's PostScript name.</extracomment>
+        <translation>Die heruntergeladene Datei enthält die Schrift „%1“ nicht.</translation>
+    </message>
+    <message>
+        <source>The download was given up: the server sent less than %1 bytes per second over %2 seconds.</source>
+        <extracomment>Download failure alert. Reason. %1: bytes per second, %2: seconds measured.</extracomment>
+        <translation>Der Download wurde aufgegeben: Der Server hat über %2 Sekunden weniger als %1 Byte pro Sekunde gesendet.</translation>
+    </message>
+</context>
 </TS>

@@ -164,4 +164,95 @@
         <translation>Download progress</translation>
     </message>
 </context>
+<context>
+    <name>QZFontService</name>
+    <message>
+        <source>The font “%1” cannot be downloaded.</source>
+        <extracomment>Download failure alert. Headline of the download failure alert. %1: the font's PostScript name.</extracomment>
+        <translation>The font “%1” cannot be downloaded.</translation>
+    </message>
+    <message>
+        <source>No downloadable font has this name.</source>
+        <extracomment>Download failure alert. Reason: no catalog offers the font.</extracomment>
+        <translation>No downloadable font has this name.</translation>
+    </message>
+    <message>
+        <source>The downloaded font file does not hold this font.</source>
+        <extracomment>Download failure alert. Reason: the asset was installed but does not contain the requested font.</extracomment>
+        <translation>The downloaded font file does not hold this font.</translation>
+    </message>
+</context>
+<context>
+    <name>QZFontDownloader</name>
+    <message>
+        <source>The server offers %1 bytes, but the font should have %2 bytes.</source>
+        <extracomment>Download failure alert. Reason. %1: bytes the server announces, %2: bytes expected.</extracomment>
+        <translation>The server offers %1 bytes, but the font should have %2 bytes.</translation>
+    </message>
+    <message>
+        <source>The server sent more than the %1 bytes of the font.</source>
+        <extracomment>Download failure alert. Reason. %1: bytes expected.</extracomment>
+        <translation>The server sent more than the %1 bytes of the font.</translation>
+    </message>
+    <message>
+        <source>The font file cannot be written: %1</source>
+        <extracomment>Download failure alert. Reason. %1: the system's error text.</extracomment>
+        <translation>The font file cannot be written: %1</translation>
+    </message>
+    <message>
+        <source>The server answered with the HTTP status %1.</source>
+        <extracomment>Download failure alert. Reason. %1: HTTP status code.</extracomment>
+        <translation>The server answered with the HTTP status %1.</translation>
+    </message>
+    <message>
+        <source>Fonts are downloaded only from https, http and file addresses, and redirected only to https and http ones.</source>
+        <extracomment>Download failure alert. Reason: the catalog's address or a redirection uses another scheme.</extracomment>
+        <translation>Fonts are downloaded only from https, http and file addresses, and redirected only to https and http ones.</translation>
+    </message>
+    <message>
+        <source>The connection ended after %1 of %2 bytes.</source>
+        <extracomment>Download failure alert. Reason. %1: bytes received, %2: bytes expected.</extracomment>
+        <translation>The connection ended after %1 of %2 bytes.</translation>
+    </message>
+    <message>
+        <source>The download failed: %1</source>
+        <extracomment>Download failure alert. Reason. %1: the transfer library's error text.</extracomment>
+        <translation>The download failed: %1</translation>
+    </message>
+    <message>
+        <source>The font folder cannot be created: %1</source>
+        <extracomment>Download failure alert. Reason. %1: the system's error text.</extracomment>
+        <translation>The font folder cannot be created: %1</translation>
+    </message>
+    <message>
+        <source>The download holds %1 bytes, but the font should have %2 bytes.</source>
+        <extracomment>Download failure alert. Reason. %1: bytes received, %2: bytes expected.</extracomment>
+        <translation>The download holds %1 bytes, but the font should have %2 bytes.</translation>
+    </message>
+    <message>
+        <source>The downloaded file is damaged: its SHA-256 checksum is not the expected one.</source>
+        <extracomment>Download failure alert. Reason: checksum mismatch.</extracomment>
+        <translation>The downloaded file is damaged: its SHA-256 checksum is not the expected one.</translation>
+    </message>
+    <message>
+        <source>The downloaded file is not a font.</source>
+        <extracomment>Download failure alert. Reason.</extracomment>
+        <translation>The downloaded file is not a font.</translation>
+    </message>
+    <message>
+        <source>The server did not answer within %1 seconds.</source>
+        <extracomment>Download failure alert. Reason. %1: seconds waited.</extracomment>
+        <translation>The server did not answer within %1 seconds.</translation>
+    </message>
+    <message>
+        <source>The downloaded file does not hold the font “%1”.</source>
+        <extracomment>Download failure alert. Reason. %1: the font's PostScript name.</extracomment>
+        <translation>The downloaded file does not hold the font “%1”.</translation>
+    </message>
+    <message>
+        <source>The download was given up: the server sent less than %1 bytes per second over %2 seconds.</source>
+        <extracomment>Download failure alert. Reason. %1: bytes per second, %2: seconds measured.</extracomment>
+        <translation>The download was given up: the server sent less than %1 bytes per second over %2 seconds.</translation>
+    </message>
+</context>
 </TS>

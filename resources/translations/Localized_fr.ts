@@ -164,4 +164,95 @@
         <translation>Progression du téléchargement</translation>
     </message>
 </context>
+<context>
+    <name>QZFontService</name>
+    <message>
+        <source>The font “%1” cannot be downloaded.</source>
+        <extracomment>Download failure alert. Headline of the download failure alert. %1: the font's PostScript name.</extracomment>
+        <translation>Impossible de télécharger la police « %1 ».</translation>
+    </message>
+    <message>
+        <source>No downloadable font has this name.</source>
+        <extracomment>Download failure alert. Reason: no catalog offers the font.</extracomment>
+        <translation>Aucune police téléchargeable ne porte ce nom.</translation>
+    </message>
+    <message>
+        <source>The downloaded font file does not hold this font.</source>
+        <extracomment>Download failure alert. Reason: the asset was installed but does not contain the requested font.</extracomment>
+        <translation>Le fichier de police téléchargé ne contient pas cette police.</translation>
+    </message>
+</context>
+<context>
+    <name>QZFontDownloader</name>
+    <message>
+        <source>The server offers %1 bytes, but the font should have %2 bytes.</source>
+        <extracomment>Download failure alert. Reason. %1: bytes the server announces, %2: bytes expected.</extracomment>
+        <translation>Le serveur propose %1 octets, mais la police devrait en compter %2.</translation>
+    </message>
+    <message>
+        <source>The server sent more than the %1 bytes of the font.</source>
+        <extracomment>Download failure alert. Reason. %1: bytes expected.</extracomment>
+        <translation>Le serveur a envoyé plus que les %1 octets de la police.</translation>
+    </message>
+    <message>
+        <source>The font file cannot be written: %1</source>
+        <extracomment>Download failure alert. Reason. %1: the system's error text.</extracomment>
+        <translation>Impossible d’écrire le fichier de police : %1</translation>
+    </message>
+    <message>
+        <source>The server answered with the HTTP status %1.</source>
+        <extracomment>Download failure alert. Reason. %1: HTTP status code.</extracomment>
+        <translation>Le serveur a répondu avec le statut HTTP %1.</translation>
+    </message>
+    <message>
+        <source>Fonts are downloaded only from https, http and file addresses, and redirected only to https and http ones.</source>
+        <extracomment>Download failure alert. Reason: the catalog's address or a redirection uses another scheme.</extracomment>
+        <translation>Les polices ne sont téléchargées que depuis des adresses https, http et file, et redirigées uniquement vers des adresses https et http.</translation>
+    </message>
+    <message>
+        <source>The connection ended after %1 of %2 bytes.</source>
+        <extracomment>Download failure alert. Reason. %1: bytes received, %2: bytes expected.</extracomment>
+        <translation>La connexion s’est interrompue après %1 octets sur %2.</translation>
+    </message>
+    <message>
+        <source>The download failed: %1</source>
+        <extracomment>Download failure alert. Reason. %1: the transfer library's error text.</extracomment>
+        <translation>Le téléchargement a échoué : %1</translation>
+    </message>
+    <message>
+        <source>The font folder cannot be created: %1</source>
+        <extracomment>Download failure alert. Reason. %1: the system's error text.</extracomment>
+        <translation>Impossible de créer le dossier des polices : %1</translation>
+    </message>
+    <message>
+        <source>The download holds %1 bytes, but the font should have %2 bytes.</source>
+        <extracomment>Download failure alert. Reason. %1: bytes received, %2: bytes expected.</extracomment>
+        <translation>Le téléchargement contient %1 octets, mais la police devrait en compter %2.</translation>
+    </message>
+    <message>
+        <source>The downloaded file is damaged: its SHA-256 checksum is not the expected one.</source>
+        <extracomment>Download failure alert. Reason: checksum mismatch.</extracomment>
+        <translation>Le fichier téléchargé est endommagé : sa somme de contrôle SHA-256 n’est pas celle attendue.</translation>
+    </message>
+    <message>
+        <source>The downloaded file is not a font.</source>
+        <extracomment>Download failure alert. Reason.</extracomment>
+        <translation>Le fichier téléchargé n’est pas une police.</translation>
+    </message>
+    <message>
+        <source>The server did not answer within %1 seconds.</source>
+        <extracomment>Download failure alert. Reason. %1: seconds waited.</extracomment>
+        <translation>Le serveur n’a pas répondu dans les %1 secondes.</translation>
+    </message>
+    <message>
+        <source>The downloaded file does not hold the font “%1”.</source>
+        <extracomment>Download failure alert. Reason. %1: the font's PostScript name.</extracomment>
+        <translation>Le fichier téléchargé ne contient pas la police « %1 ».</translation>
+    </message>
+    <message>
+        <source>The download was given up: the server sent less than %1 bytes per second over %2 seconds.</source>
+        <extracomment>Download failure alert. Reason. %1: bytes per second, %2: seconds measured.</extracomment>
+        <translation>Le téléchargement a été abandonné : le serveur a envoyé moins de %1 octets par seconde pendant %2 secondes.</translation>
+    </message>
+</context>
 </TS>

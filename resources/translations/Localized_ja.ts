@@ -164,4 +164,95 @@
         <translation>ダウンロードの進行状況</translation>
     </message>
 </context>
+<context>
+    <name>QZFontService</name>
+    <message>
+        <source>The font “%1” cannot be downloaded.</source>
+        <extracomment>Download failure alert. Headline of the download failure alert. %1: the font's PostScript name.</extracomment>
+        <translation>フォント「%1」をダウンロードできません。</translation>
+    </message>
+    <message>
+        <source>No downloadable font has this name.</source>
+        <extracomment>Download failure alert. Reason: no catalog offers the font.</extracomment>
+        <translation>この名前のダウンロード可能なフォントはありません。</translation>
+    </message>
+    <message>
+        <source>The downloaded font file does not hold this font.</source>
+        <extracomment>Download failure alert. Reason: the asset was installed but does not contain the requested font.</extracomment>
+        <translation>ダウンロードしたフォントファイルにこのフォントが含まれていません。</translation>
+    </message>
+</context>
+<context>
+    <name>QZFontDownloader</name>
+    <message>
+        <source>The server offers %1 bytes, but the font should have %2 bytes.</source>
+        <extracomment>Download failure alert. Reason. %1: bytes the server announces, %2: bytes expected.</extracomment>
+        <translation>サーバが提供するのは %1 バイトですが、フォントは %2 バイトのはずです。</translation>
+    </message>
+    <message>
+        <source>The server sent more than the %1 bytes of the font.</source>
+        <extracomment>Download failure alert. Reason. %1: bytes expected.</extracomment>
+        <translation>サーバがフォントの %1 バイトを超えるデータを送信しました。</translation>
+    </message>
+    <message>
+        <source>The font file cannot be written: %1</source>
+        <extracomment>Download failure alert. Reason. %1: the system's error text.</extracomment>
+        <translation>フォントファイルを書き込めません: %1</translation>
+    </message>
+    <message>
+        <source>The server answered with the HTTP status %1.</source>
+        <extracomment>Download failure alert. Reason. %1: HTTP status code.</extracomment>
+        <translation>サーバが HTTP ステータス %1 を返しました。</translation>
+    </message>
+    <message>
+        <source>Fonts are downloaded only from https, http and file addresses, and redirected only to https and http ones.</source>
+        <extracomment>Download failure alert. Reason: the catalog's address or a redirection uses another scheme.</extracomment>
+        <translation>フォントは https、http、file のアドレスからのみダウンロードされ、リダイレクト先は https と http のアドレスに限られます。</translation>
+    </message>
+    <message>
+        <source>The connection ended after %1 of %2 bytes.</source>
+        <extracomment>Download failure alert. Reason. %1: bytes received, %2: bytes expected.</extracomment>
+        <translation>%2 バイト中 %1 バイトを受信したところで接続が切れました。</translation>
+    </message>
+    <message>
+        <source>The download failed: %1</source>
+        <extracomment>Download failure alert. Reason. %1: the transfer library's error text.</extracomment>
+        <translation>ダウンロードに失敗しました: %1</translation>
+    </message>
+    <message>
+        <source>The font folder cannot be created: %1</source>
+        <extracomment>Download failure alert. Reason. %1: the system's error text.</extracomment>
+        <translation>フォントフォルダを作成できません: %1</translation>
+    </message>
+    <message>
+        <source>The download holds %1 bytes, but the font should have %2 bytes.</source>
+        <extracomment>Download failure alert. Reason. %1: bytes received, %2: bytes expected.</extracomment>
+        <translation>ダウンロードしたデータは %1 バイトですが、フォントは %2 バイトのはずです。</translation>
+    </message>
+    <message>
+        <source>The downloaded file is damaged: its SHA-256 checksum is not the expected one.</source>
+        <extracomment>Download failure alert. Reason: checksum mismatch.</extracomment>
+        <translation>ダウンロードしたファイルは破損しています: SHA-256 チェックサムが一致しません。</translation>
+    </message>
+    <message>
+        <source>The downloaded file is not a font.</source>
+        <extracomment>Download failure alert. Reason.</extracomment>
+        <translation>ダウンロードしたファイルはフォントではありません。</translation>
+    </message>
+    <message>
+        <source>The server did not answer within %1 seconds.</source>
+        <extracomment>Download failure alert. Reason. %1: seconds waited.</extracomment>
+        <translation>サーバが %1 秒以内に応答しませんでした。</translation>
+    </message>
+    <message>
+        <source>The downloaded file does not hold the font “%1”.</source>
+        <extracomment>Download failure alert. Reason. %1: the font's PostScript name.</extracomment>
+        <translation>ダウンロードしたファイルにフォント「%1」が含まれていません。</translation>
+    </message>
+    <message>
+        <source>The download was given up: the server sent less than %1 bytes per second over %2 seconds.</source>
+        <extracomment>Download failure alert. Reason. %1: bytes per second, %2: seconds measured.</extracomment>
+        <translation>ダウンロードを中止しました: サーバの送信速度が %2 秒間にわたり毎秒 %1 バイト未満でした。</translation>
+    </message>
+</context>
 </TS>

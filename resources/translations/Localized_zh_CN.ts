@@ -164,4 +164,95 @@
         <translation>下载进度</translation>
     </message>
 </context>
+<context>
+    <name>QZFontService</name>
+    <message>
+        <source>The font “%1” cannot be downloaded.</source>
+        <extracomment>Download failure alert. Headline of the download failure alert. %1: the font's PostScript name.</extracomment>
+        <translation>无法下载字体“%1”。</translation>
+    </message>
+    <message>
+        <source>No downloadable font has this name.</source>
+        <extracomment>Download failure alert. Reason: no catalog offers the font.</extracomment>
+        <translation>没有使用此名称的可下载字体。</translation>
+    </message>
+    <message>
+        <source>The downloaded font file does not hold this font.</source>
+        <extracomment>Download failure alert. Reason: the asset was installed but does not contain the requested font.</extracomment>
+        <translation>下载的字体文件不包含此字体。</translation>
+    </message>
+</context>
+<context>
+    <name>QZFontDownloader</name>
+    <message>
+        <source>The server offers %1 bytes, but the font should have %2 bytes.</source>
+        <extracomment>Download failure alert. Reason. %1: bytes the server announces, %2: bytes expected.</extracomment>
+        <translation>服务器提供 %1 字节，但该字体应为 %2 字节。</translation>
+    </message>
+    <message>
+        <source>The server sent more than the %1 bytes of the font.</source>
+        <extracomment>Download failure alert. Reason. %1: bytes expected.</extracomment>
+        <translation>服务器发送的数据超过了字体的 %1 字节。</translation>
+    </message>
+    <message>
+        <source>The font file cannot be written: %1</source>
+        <extracomment>Download failure alert. Reason. %1: the system's error text.</extracomment>
+        <translation>无法写入字体文件：%1</translation>
+    </message>
+    <message>
+        <source>The server answered with the HTTP status %1.</source>
+        <extracomment>Download failure alert. Reason. %1: HTTP status code.</extracomment>
+        <translation>服务器返回了 HTTP 状态 %1。</translation>
+    </message>
+    <message>
+        <source>Fonts are downloaded only from https, http and file addresses, and redirected only to https and http ones.</source>
+        <extracomment>Download failure alert. Reason: the catalog's address or a redirection uses another scheme.</extracomment>
+        <translation>字体只能从 https、http 和 file 地址下载，并且只能重定向到 https 和 http 地址。</translation>
+    </message>
+    <message>
+        <source>The connection ended after %1 of %2 bytes.</source>
+        <extracomment>Download failure alert. Reason. %1: bytes received, %2: bytes expected.</extracomment>
+        <translation>连接在收到 %1 字节（共 %2 字节）后中断。</translation>
+    </message>
+    <message>
+        <source>The download failed: %1</source>
+        <extracomment>Download failure alert. Reason. %1: the transfer library's error text.</extracomment>
+        <translation>下载失败：%1</translation>
+    </message>
+    <message>
+        <source>The font folder cannot be created: %1</source>
+        <extracomment>Download failure alert. Reason. %1: the system's error text.</extracomment>
+        <translation>无法创建字体文件夹：%1</translation>
+    </message>
+    <message>
+        <source>The download holds %1 bytes, but the font should have %2 bytes.</source>
+        <extracomment>Download failure alert. Reason. %1: bytes received, %2: bytes expected.</extracomment>
+        <translation>下载的数据为 %1 字节，但该字体应为 %2 字节。</translation>
+    </message>
+    <message>
+        <source>The downloaded file is damaged: its SHA-256 checksum is not the expected one.</source>
+        <extracomment>Download failure alert. Reason: checksum mismatch.</extracomment>
+        <translation>下载的文件已损坏：其 SHA-256 校验和与预期不符。</translation>
+    </message>
+    <message>
+        <source>The downloaded file is not a font.</source>
+        <extracomment>Download failure alert. Reason.</extracomment>
+        <translation>下载的文件不是字体。</translation>
+    </message>
+    <message>
+        <source>The server did not answer within %1 seconds.</source>
+        <extracomment>Download failure alert. Reason. %1: seconds waited.</extracomment>
+        <translation>服务器未在 %1 秒内响应。</translation>
+    </message>
+    <message>
+        <source>The downloaded file does not hold the font “%1”.</source>
+        <extracomment>Download failure alert. Reason. %1: the font's PostScript name.</extracomment>
+        <translation>下载的文件不包含字体“%1”。</translation>
+    </message>
+    <message>
+        <source>The download was given up: the server sent less than %1 bytes per second over %2 seconds.</source>
+        <extracomment>Download failure alert. Reason. %1: bytes per second, %2: seconds measured.</extracomment>
+        <translation>已放弃下载：服务器在 %2 秒内的发送速度低于每秒 %1 字节。</translation>
+    </message>
+</context>
 </TS>

@@ -17,6 +17,7 @@
 #include "UIAgent/QZUIController.h"
 #include "protocol/QZUIProtocol.h"
 #include "tests/UIAgent/AgentTestSupport.h"
+#include "tests/UIAgent/DownloadTestSupport.h"
 #include "tests/UIAgent/QtTestEnvironment.h"
 #include "tests/support/LogCapture.h"
 
@@ -55,22 +56,6 @@ const std::vector<uint8_t> kOneFontURL =
 std::string Expected(std::initializer_list<std::vector<uint8_t>> pieces) {
     return ToHex(Join(pieces));
 }
-
-/// Counts the windows shown while it lives.
-class ShownWindows : public QObject {
-public:
-    ShownWindows() { QCoreApplication::instance()->installEventFilter(this); }
-    ~ShownWindows() override { QCoreApplication::instance()->removeEventFilter(this); }
-    int count = 0;
-
-protected:
-    bool eventFilter(QObject* watched, QEvent* event) override {
-        if (event->type() == QEvent::Show && watched->isWidgetType() &&
-            static_cast<QWidget*>(watched)->isWindow())
-            ++count;
-        return false;
-    }
-};
 
 /// Once an alert other than `notThis` is up, runs `action` with it (once).
 void WhenAlertAppears(QWidget* notThis, std::function<void(QMessageBox*)> action) {
@@ -146,56 +131,45 @@ TEST_F(DispatchTest, UnknownIdsAreLoggedSignWidenedAndAnsweredWithNoBytes) {
     EXPECT_EQ(timerArmed_, (std::vector<bool>{false, true, false, true, false, true}));
 }
 
-TEST_F(DispatchTest, DownloadRequestsWithoutAnythingToDownloadAreAnsweredNoWithoutAnAlert) {
-    ShownWindows shown;
-    const std::string no =
-        Expected({Hex("00 00 00 10  00 00 00 02"), kResultKey, kNo, kSuppressKey, kNo});
-    EXPECT_EQ(ToHex(Handle(2, nullptr).as<CFDataRef>()), no);
-    Ref notADictionary = Str("QZUIPropertySuppress");
-    EXPECT_EQ(ToHex(Handle(2, notADictionary.get()).as<CFDataRef>()), no);
-    Ref unknownFont = Str("NoSuchFont-Regular");
-    Ref font = Dict({{NSFontNameAttribute, unknownFont.get()}});
-    Ref fonts = Array({font.get()});
-    Ref request = Dict({{kQZUIPropertyFontProperties, fonts.get()}});
-    EXPECT_EQ(ToHex(Handle(2, request.get()).as<CFDataRef>()), no);
-    EXPECT_EQ(shown.count, 0);
-    EXPECT_EQ(counts_.back(), 0);
-}
-
-TEST_F(DispatchTest, ADownloadRequestThatSaysNotToAskShowsNoAlertAndPassesItsSuppressBack) {
-    ShownWindows shown;
-    Ref name = Str("Example-Regular");
-    Ref nameless = Dict({{NSFontFamilyAttribute, name.get()}});
-    Ref fonts = Array({nameless.get()});
-    Ref request =
-        Dict({{kQZUIPropertySuppress, kCFBooleanTrue}, {kQZUIPropertyFontProperties, fonts.get()}});
-    // No font is named, so nothing is downloaded or matched: Result 0 (the download itself is
-    // tested in DownloadWindowTests.cpp).
-    EXPECT_EQ(ToHex(Handle(2, request.get()).as<CFDataRef>()),
-              Expected({Hex("00 00 00 10  00 00 00 02"), kResultKey, kNo, kSuppressKey, kYes}));
-    // A number that answers true counts as the flag too.
-    Ref one = Num(kCFNumberSInt32Type, SInt32(1));
-    Ref numbered = Dict({{kQZUIPropertySuppress, one.get()}});
-    EXPECT_EQ(ToHex(Handle(2, numbered.get()).as<CFDataRef>()),
-              Expected({Hex("00 00 00 10  00 00 00 02"), kResultKey, kNo, kSuppressKey, kYes}));
-    EXPECT_EQ(shown.count, 0);
-}
-
-TEST_F(DispatchTest, ActivationRequestsWithoutCandidatesAreAnsweredNoWithoutAnAlert) {
-    ShownWindows shown;
+TEST_F(DispatchTest, RequestsWithNothingToAskAreAnsweredAtOnceWithoutAWindow) {
+    using glyphwell::testing::DownloadReply;
+    using glyphwell::testing::RequestedFont;
     const std::string noWithEmptyArray =
         Expected({Hex("00 00 00 10  00 00 00 03"), kResultKey, kNo, kSuppressKey, kNo,
                   kCandidatesKey, Hex("00 00 00 11  00 00 00 00")});
-    EXPECT_EQ(ToHex(Handle(1, nullptr).as<CFDataRef>()), noWithEmptyArray);
     Ref font = Str("Example-Regular");
-    Ref noCandidates = Dict({{kQZUIPropertyFontName, font.get()}});
-    EXPECT_EQ(ToHex(Handle(1, noCandidates.get()).as<CFDataRef>()), noWithEmptyArray);
+    Ref unknownFont = RequestedFont("NoSuchFont-Regular");
+    Ref nameless = Dict({{NSFontFamilyAttribute, font.get()}});
+    Ref one = Num(kCFNumberSInt32Type, SInt32(1));
     Ref empty = Array({});
-    Ref emptyCandidates = Dict({{kQZUIPropertyCandidateFontURLs, empty.get()}});
-    EXPECT_EQ(ToHex(Handle(1, emptyCandidates.get()).as<CFDataRef>()), noWithEmptyArray);
-    Ref notAnArray = Dict({{kQZUIPropertyCandidateFontURLs, font.get()}});
-    EXPECT_EQ(ToHex(Handle(1, notAnArray.get()).as<CFDataRef>()), noWithEmptyArray);
-    EXPECT_EQ(shown.count, 0);
+    struct Case {
+        SInt32 msgid;
+        Ref request;
+        std::string reply;
+    } cases[] = {
+        {2, Ref(), DownloadReply(false, false)},
+        {2, Str("QZUIPropertySuppress"), DownloadReply(false, false)},
+        // Nothing any catalog offers: no confirmation.
+        {2, Dict({{kQZUIPropertyFontProperties, Array({unknownFont.get()}).get()}}),
+         DownloadReply(false, false)},
+        // Not to be asked, with no font named (or a number that answers true as the flag):
+        // nothing is downloaded or matched, and the flag is passed back.
+        {2,
+         Dict({{kQZUIPropertySuppress, kCFBooleanTrue},
+               {kQZUIPropertyFontProperties, Array({nameless.get()}).get()}}),
+         DownloadReply(false, true)},
+        {2, Dict({{kQZUIPropertySuppress, one.get()}}), DownloadReply(false, true)},
+        // Message id 1 without candidates: no, with an empty candidate array.
+        {1, Ref(), noWithEmptyArray},
+        {1, Dict({{kQZUIPropertyFontName, font.get()}}), noWithEmptyArray},
+        {1, Dict({{kQZUIPropertyCandidateFontURLs, empty.get()}}), noWithEmptyArray},
+        {1, Dict({{kQZUIPropertyCandidateFontURLs, font.get()}}), noWithEmptyArray},
+    };
+    glyphwell::testing::WindowWatch shown;
+    for (const Case& c : cases)
+        EXPECT_EQ(ToHex(Handle(c.msgid, c.request.get()).as<CFDataRef>()), c.reply) << c.msgid;
+    EXPECT_EQ(shown.windowsShown, 0);
+    EXPECT_EQ(counts_.back(), 0);
 }
 
 TEST_F(DispatchTest, AnActivationAnswerCarriesTheChoiceTheCheckboxAndTheCandidates) {

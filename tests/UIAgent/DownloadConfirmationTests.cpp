@@ -2,17 +2,19 @@
 // answers, withdrawal when the requesting process dies, display names by preferred language, the
 // download size counted once per asset, and validity.
 #include <QDir>
+#include <QLabel>
 #include <QMessageBox>
 #include <QPushButton>
 #include <QTemporaryDir>
 #include <QTest>
-#include <csignal>
-#include <sys/wait.h>
-#include <unistd.h>
+#include <functional>
+#include <tuple>
 
 #include "UIAgent/QZFontDownloadConfirmation.h"
+#include "UIAgent/QZLocalizedString.h"
 #include "protocol/QZUIProtocol.h"
 #include "tests/UIAgent/AlertTestSupport.h"
+#include "tests/UIAgent/DownloadTestSupport.h"
 #include "tests/UIAgent/QtTestEnvironment.h"
 
 namespace {
@@ -22,26 +24,6 @@ using namespace glyphwell::testing;
 using Confirmation = QZFontDownloadConfirmation;
 
 constexpr char kHash[] = "0123456789abcdef0123456789abcdef0123456789abcdef0123456789abcdef";
-
-/// A child that waits until it is killed; reaped when this goes.
-class PausedChild {
-public:
-    PausedChild() : pid_(fork()) {
-        if (pid_ == 0) {
-            for (;;)
-                pause();
-        }
-    }
-    ~PausedChild() {
-        Kill();
-        waitpid(pid_, nullptr, 0);
-    }
-    pid_t pid() const { return pid_; }
-    void Kill() const { kill(pid_, SIGKILL); }
-
-private:
-    pid_t pid_;
-};
 
 class DownloadConfirmationTest : public ::testing::Test {
 protected:
@@ -60,10 +42,10 @@ protected:
                      "fonts": [{"postScriptName": "Mono"}]}]})")
                       .arg(kHash)
                       .toUtf8());
-        Confirmation::SetPreferredLanguageForTesting("en-US");
+        QZSetPreferredLanguagesForTesting({"en-US"});
     }
     void TearDown() override {
-        Confirmation::SetPreferredLanguageForTesting(QString());
+        QZSetPreferredLanguagesForTesting({});
         qunsetenv("XDG_DATA_HOME");
         qunsetenv("XDG_DATA_DIRS");
     }
@@ -87,13 +69,6 @@ protected:
                                  names.get());
         return attributes;
     }
-    /// A request from "Example Writer" (process `pid`) for `fonts`.
-    static Ref Request(std::initializer_list<CFTypeRef> fonts, SInt32 pid = 0) {
-        Ref pidNumber = Num(kCFNumberSInt32Type, pid);
-        return Dict({{kQZUIPropertyApplicationName, Str("Example Writer").get()},
-                     {kQZUIPropertyProcessID, pidNumber.get()},
-                     {kQZUIPropertyFontProperties, Array(fonts).get()}});
-    }
     static std::string NameFor(const Confirmation& confirmation, const char* postScriptName) {
         auto name = static_cast<CFStringRef>(
             CFDictionaryGetValue(confirmation.localizedFontNamesDict(), Str(postScriptName).get()));
@@ -108,39 +83,47 @@ protected:
     Ref regular_ = Font("Sans-Regular", "Example Sans");
 };
 
-TEST_F(DownloadConfirmationTest, DownloadAnswersYesAndReturnPressesTheDefaultSkip) {
-    Confirmation yes(Request({regular_.get()}).as<CFDictionaryRef>());
-    EXPECT_EQ(yes.buttons().size(), 2);
-    QTimer::singleShot(100ms, &yes, [&] { yes.buttonWithTag(2000)->click(); });
-    yes.showAlert();
-    EXPECT_TRUE(yes.shouldDownload());
-    EXPECT_FALSE(yes.suppressFurtherAlerts());
-
-    Confirmation no(Request({regular_.get()}).as<CFDictionaryRef>());
-    EXPECT_EQ(no.defaultButton()->text(), "Skip");
-    QTimer::singleShot(100ms, &no, [&] { QTest::keyClick(&no, Qt::Key_Return); });
-    QTimer::singleShot(5s, &no, [&] { no.withdraw(); }); // in case Return did nothing
-    no.showAlert();
-    EXPECT_FALSE(no.shouldDownload());
-    EXPECT_EQ(no.clickedButton(), no.buttonWithTag(2001));
+TEST_F(DownloadConfirmationTest, DownloadAnswersYesAndReturnOrEscapePressesTheDefaultSkip) {
+    const std::tuple<const char*, std::function<void(Confirmation&)>, int> cases[] = {
+        {"Download", [](Confirmation& alert) { alert.buttonWithTag(2000)->click(); }, 2000},
+        {"Return", [](Confirmation& alert) { QTest::keyClick(&alert, Qt::Key_Return); }, 2001},
+        {"Escape", [](Confirmation& alert) { QTest::keyClick(&alert, Qt::Key_Escape); }, 2001},
+    };
+    for (const auto& [how, answer, tag] : cases) {
+        Confirmation alert(DownloadRequest({regular_.get()}).as<CFDictionaryRef>());
+        EXPECT_EQ(alert.buttons().size(), 2);
+        EXPECT_EQ(alert.defaultButton(), alert.buttonWithTag(2001));
+        UiScript script({{[&] { return alert.isVisible(); }, [&] { answer(alert); }}},
+                        [&] { alert.withdraw(); });
+        alert.showAlert();
+        EXPECT_EQ(alert.clickedButton(), alert.buttonWithTag(tag)) << how;
+        EXPECT_EQ(alert.shouldDownload(), tag == 2000) << how;
+        EXPECT_FALSE(alert.suppressFurtherAlerts());
+    }
 }
 
 TEST_F(DownloadConfirmationTest, ExitOfTheRequestingProcessWithdrawsTheAlertAndNoOtherDoes) {
     PausedChild requester, bystander;
-    Confirmation confirmation(Request({regular_.get()}, requester.pid()).as<CFDictionaryRef>());
-    int terminations = 0;
+    Confirmation confirmation(
+        DownloadRequest({regular_.get()}, requester.pid()).as<CFDictionaryRef>());
+    // Watches the bystander, to know when its exit has been noticed.
+    Confirmation witness(DownloadRequest({}, bystander.pid()).as<CFDictionaryRef>());
+    int terminations = 0, bystanderNoticed = 0;
     QObject::connect(&confirmation, &Confirmation::requestingApplicationTerminated,
                      [&] { ++terminations; });
+    QObject::connect(&witness, &Confirmation::requestingApplicationTerminated,
+                     [&] { ++bystanderNoticed; });
     bool upAfterBystanderExit = false;
-    QTimer::singleShot(100ms, &confirmation, [&] { bystander.Kill(); });
-    QTimer::singleShot(500ms, &confirmation, [&] {
-        upAfterBystanderExit = confirmation.isVisible();
-        requester.Kill();
-    });
-    QTimer::singleShot(10s, &confirmation,
-                       [&] { confirmation.buttonWithTag(2000)->click(); }); // failsafe
+    UiScript script({{[&] { return confirmation.isVisible(); }, [&] { bystander.Kill(); }},
+                     {[&] { return bystanderNoticed == 1; },
+                      [&] {
+                          upAfterBystanderExit = confirmation.isVisible();
+                          requester.Kill();
+                      }}},
+                    [&] { confirmation.buttonWithTag(2000)->click(); });
     confirmation.showAlert();
 
+    EXPECT_TRUE(script.done());
     EXPECT_TRUE(upAfterBystanderExit);
     EXPECT_FALSE(confirmation.shouldDownload());
     EXPECT_FALSE(confirmation.suppressFurtherAlerts());
@@ -149,19 +132,21 @@ TEST_F(DownloadConfirmationTest, ExitOfTheRequestingProcessWithdrawsTheAlertAndN
 
 TEST_F(DownloadConfirmationTest, RegressionProcessExitEndsItsOwnAlertNotTheNestedOne) {
     PausedChild requester;
-    Confirmation outer(Request({regular_.get()}, requester.pid()).as<CFDictionaryRef>());
-    Confirmation inner(Request({regular_.get()}).as<CFDictionaryRef>());
-    bool innerUp = false, outerHidden = false;
-    QTimer::singleShot(100ms, &outer, [&] { inner.showAlert(); });
-    QTimer::singleShot(300ms, &outer, [&] { requester.Kill(); });
-    QTimer::singleShot(800ms, &outer, [&] {
-        innerUp = inner.isVisible();
-        outerHidden = !outer.isVisible();
-        inner.buttonWithTag(2000)->click();
-    });
+    Confirmation outer(DownloadRequest({regular_.get()}, requester.pid()).as<CFDictionaryRef>());
+    Confirmation inner(DownloadRequest({regular_.get()}).as<CFDictionaryRef>());
+    bool innerUp = false;
+    UiScript script({{[&] { return outer.isVisible(); },
+                      [&] { QTimer::singleShot(0, &inner, [&] { inner.showAlert(); }); }},
+                     {[&] { return inner.isVisible(); }, [&] { requester.Kill(); }},
+                     {[&] { return !outer.isVisible(); },
+                      [&] {
+                          innerUp = inner.isVisible();
+                          inner.buttonWithTag(2000)->click();
+                      }}},
+                    EndEveryModalRun);
     outer.showAlert();
+    EXPECT_TRUE(script.done());
     EXPECT_TRUE(innerUp);
-    EXPECT_TRUE(outerHidden);
     EXPECT_TRUE(inner.shouldDownload());
     EXPECT_FALSE(outer.shouldDownload());
 }
@@ -169,55 +154,121 @@ TEST_F(DownloadConfirmationTest, RegressionProcessExitEndsItsOwnAlertNotTheNeste
 TEST_F(DownloadConfirmationTest, OneDisplayNameIsNamedAndEachAssetIsCountedOnce) {
     Ref bold = Font("Sans-Bold", "Example Sans");
     Ref italic = Font("Sans-Italic", "Example Sans");
-    Confirmation one(Request({regular_.get(), bold.get(), italic.get()}).as<CFDictionaryRef>());
+    Confirmation one(
+        DownloadRequest({regular_.get(), bold.get(), italic.get()}).as<CFDictionaryRef>());
     EXPECT_TRUE(one.valid());
     EXPECT_EQ(one.text(), "Example Writer needs to download the font “Example Sans”.");
     EXPECT_EQ(one.informativeText(),
-              "The font “Example Sans” is 3.23 MB. Do you want to download it?");
+              "The font “Example Sans” is 3.2 MB. Do you want to download it?");
     EXPECT_EQ(CFDictionaryGetCount(one.localizedFontNamesDict()), 3);
     EXPECT_EQ(NameFor(one, "Sans-Italic"), "Example Sans");
 
     Ref otherFamily = Font("Sans-Italic", "Example Sans Italic");
-    Confirmation several(Request({regular_.get(), otherFamily.get()}).as<CFDictionaryRef>());
+    Confirmation several(
+        DownloadRequest({regular_.get(), otherFamily.get()}).as<CFDictionaryRef>());
     EXPECT_EQ(several.text(), "Example Writer needs to download fonts.");
     EXPECT_EQ(several.informativeText(),
-              "The download is 3.23 MB in total. Do you want to download the fonts?");
+              "The download is 3.2 MB in total. Do you want to download the fonts?");
 }
 
 TEST_F(DownloadConfirmationTest, NothingToDownloadIsNotValid) {
     Ref mono = Font("Mono", "Mono");
     Ref unknown = Font("Unknown", nullptr);
-    EXPECT_FALSE(Confirmation(Request({mono.get(), unknown.get()}).as<CFDictionaryRef>()).valid());
-    EXPECT_FALSE(Confirmation(Request({}).as<CFDictionaryRef>()).valid());
+    EXPECT_FALSE(
+        Confirmation(DownloadRequest({mono.get(), unknown.get()}).as<CFDictionaryRef>()).valid());
+    EXPECT_FALSE(Confirmation(DownloadRequest({}).as<CFDictionaryRef>()).valid());
     Confirmation empty(nullptr);
     EXPECT_FALSE(empty.valid());
     EXPECT_EQ(empty.applicationName(), "The current application");
     EXPECT_EQ(CFDictionaryGetCount(empty.localizedFontNamesDict()), 0);
 }
 
-TEST_F(DownloadConfirmationTest, TheLongestLanguageKeyThatPrefixesThePreferredLanguageWins) {
-    Ref font = Font("Sans-Regular", "Example Sans",
-                    {{"zh", "zh name"}, {"zh-Hans", "zh-Hans name"}, {"en", "en name"}});
-    auto attributes = font.as<CFDictionaryRef>();
-    EXPECT_EQ(Confirmation::DisplayName(attributes, "zh-Hans-CN"), "zh-Hans name");
-    EXPECT_EQ(Confirmation::DisplayName(attributes, "zh-Hans"), "zh-Hans name");
-    EXPECT_EQ(Confirmation::DisplayName(attributes, "zh-Hant-TW"), "zh name");
-    EXPECT_EQ(Confirmation::DisplayName(attributes, "en-GB"), "en name");
-
-    Ref noFrench = Font("Sans-Regular", "Example Sans", {{"en", "en name"}, {"ja", "ja name"}});
+TEST_F(DownloadConfirmationTest, TheUsersLanguagesInTurnPickTheLongestMatchingKey) {
+    using Names = std::initializer_list<std::pair<const char*, const char*>>;
+    const Names shortestFirst = {{"zh", "zh"},
+                                 {"zh-Hans", "zh-Hans"},
+                                 {"zh-Hant", "zh-Hant"},
+                                 {"en", "en"},
+                                 {"en-GB", "en-GB"}};
+    const Names longestFirst = {{"en-GB", "en-GB"},
+                                {"zh-Hant", "zh-Hant"},
+                                {"zh-Hans", "zh-Hans"},
+                                {"en", "en"},
+                                {"zh", "zh"}};
+    struct Case {
+        QStringList languages;
+        const char* expected;
+    } cases[] = {
+        {{"zh-Hans-CN"}, "zh-Hans"},
+        {{"zh-CN"}, "zh-Hans"},
+        {{"zh-TW"}, "zh-Hant"},
+        {{"zh-HK"}, "zh-Hant"},
+        {{"zh_MO"}, "zh-Hant"},
+        {{"en-GB"}, "en-GB"},
+        {{"en-US"}, "en"},
+        // No key serves the first language: the next one decides.
+        {{"fr-FR", "de", "zh-TW", "en"}, "zh-Hant"},
+        {{"fr"}, "Example Sans"},
+        {{}, "Example Sans"},
+    };
+    for (const Names* order : {&shortestFirst, &longestFirst}) {
+        Ref font = Font("Sans-Regular", "Example Sans", *order);
+        for (const Case& c : cases)
+            EXPECT_EQ(Confirmation::DisplayName(font.as<CFDictionaryRef>(), c.languages),
+                      c.expected)
+                << c.languages.join(',').toStdString()
+                << (order == &longestFirst ? " longest" : "");
+    }
     Ref noFamily = Font("Sans-Regular", nullptr, {{"en", "en name"}});
-    EXPECT_EQ(Confirmation::DisplayName(noFrench.as<CFDictionaryRef>(), "fr"), "Example Sans");
-    EXPECT_EQ(Confirmation::DisplayName(noFamily.as<CFDictionaryRef>(), "fr"), "Sans-Regular");
+    EXPECT_EQ(Confirmation::DisplayName(noFamily.as<CFDictionaryRef>(), {"fr"}), "Sans-Regular");
+}
 
-    Confirmation::SetPreferredLanguageForTesting("zh-Hans-CN");
-    Confirmation confirmation(Request({font.get()}).as<CFDictionaryRef>());
-    EXPECT_EQ(NameFor(confirmation, "Sans-Regular"), "zh-Hans name");
+TEST_F(DownloadConfirmationTest, TheCatalogsNamesStandInForThoseTheRequestLacks) {
+    WriteFile(data_.filePath("glyphwell/downloadable-fonts.json"),
+              QStringLiteral(R"({"assets": [{"LocalID": "A", "url": "https://f/A", "size": 757000,
+                 "sha256": "%1", "fonts": [{"postScriptName": "Sans-Regular",
+                 "family": "Catalog Sans", "localizedFamilyNames": {"ja": "カタログ"}}]}]})")
+                  .arg(kHash)
+                  .toUtf8());
+    Ref bare = Font("Sans-Regular", nullptr);
+    Ref english = Font("Sans-Regular", nullptr, {{"en", "English name"}});
+    // The first language the request or the catalog has a name for decides.
+    QZSetPreferredLanguagesForTesting({"ja-JP", "en"});
+    Confirmation japanese(DownloadRequest({english.get()}).as<CFDictionaryRef>());
+    EXPECT_EQ(NameFor(japanese, "Sans-Regular"), "カタログ");
+    QZSetPreferredLanguagesForTesting({"fr", "en"});
+    Confirmation fallback(DownloadRequest({english.get()}).as<CFDictionaryRef>());
+    EXPECT_EQ(NameFor(fallback, "Sans-Regular"), "English name");
+    // The request's own family beats the catalog's; sizes read as the progress window writes them.
+    QZSetPreferredLanguagesForTesting({"fr"});
+    Confirmation french(DownloadRequest({regular_.get()}).as<CFDictionaryRef>());
+    EXPECT_EQ(NameFor(french, "Sans-Regular"), "Example Sans");
+    EXPECT_EQ(french.informativeText(),
+              "The font “Example Sans” is 757 kB. Do you want to download it?");
+    Confirmation catalogFamily(DownloadRequest({bare.get()}).as<CFDictionaryRef>());
+    EXPECT_EQ(NameFor(catalogFamily, "Sans-Regular"), "Catalog Sans");
+}
+
+TEST_F(DownloadConfirmationTest, AVeryLongNameIsElidedWithTheFullNameInTheTooltip) {
+    const std::string longName(100, 'W');
+    Ref font = Font("Sans-Regular", longName.c_str());
+    Confirmation confirmation(DownloadRequest({font.get()}).as<CFDictionaryRef>());
+    EXPECT_EQ(NameFor(confirmation, "Sans-Regular"), longName);
+    EXPECT_FALSE(confirmation.text().contains(QString::fromStdString(longName)));
+    EXPECT_TRUE(confirmation.text().contains(u'…'));
+    auto* label = confirmation.findChild<QLabel*>("qt_msgbox_label");
+    ASSERT_NE(label, nullptr);
+    EXPECT_EQ(label->toolTip().toStdString(), longName);
+    EXPECT_EQ(label->accessibleDescription().toStdString(), longName);
+    confirmation.show();
+    EXPECT_LT(confirmation.width(), 800);
+    confirmation.hide();
 }
 
 TEST_F(DownloadConfirmationTest, ApplicationNameFallsBackToTheLocalizedDesktopEntry) {
     const QString entry = WriteFile(data_.filePath("writer.desktop"),
                                     "[Desktop Entry]\nName=Writer\nName[de]=Schreiber\n");
-    Confirmation::SetPreferredLanguageForTesting("de-DE");
+    QZSetPreferredLanguagesForTesting({"de-DE"});
     Confirmation confirmation(
         Dict({{kQZUIPropertyBundleURL, FileURL(entry).get()}}).as<CFDictionaryRef>());
     EXPECT_EQ(confirmation.applicationName(), "Schreiber");

@@ -1,11 +1,13 @@
-// Helpers of the download tests (the offline alert and the progress window): message id 2
-// requests and their reply bytes, a child process to stand for the requesting application, the
-// progress window on screen, and a way out of modal runs when a script stalls.
+// Helpers of the download tests (the confirmation, the offline alert and the progress window):
+// message id 2 requests and their reply bytes, a child process to stand for the requesting
+// application, a watch on the windows shown, and a way out of modal runs when a script stalls.
 #pragma once
 
 #include <QApplication>
 #include <QDialog>
+#include <QLabel>
 #include <QMessageBox>
+#include <QProgressBar>
 #include <QTimer>
 #include <csignal>
 #include <string>
@@ -57,15 +59,10 @@ inline Ref RequestedFont(const char* postScriptName, const char* family = nullpt
 inline Ref DownloadRequest(std::initializer_list<CFTypeRef> fonts, SInt32 pid = 0,
                            bool suppress = false) {
     Ref pidNumber = Num(kCFNumberSInt32Type, pid);
-    Ref fontArray = Array(fonts);
-    if (suppress)
-        return Dict({{kQZUIPropertyApplicationName, Str("Example Writer").get()},
-                     {kQZUIPropertyProcessID, pidNumber.get()},
-                     {kQZUIPropertyFontProperties, fontArray.get()},
-                     {kQZUIPropertySuppress, kCFBooleanTrue}});
     return Dict({{kQZUIPropertyApplicationName, Str("Example Writer").get()},
                  {kQZUIPropertyProcessID, pidNumber.get()},
-                 {kQZUIPropertyFontProperties, fontArray.get()}});
+                 {kQZUIPropertyFontProperties, Array(fonts).get()},
+                 {kQZUIPropertySuppress, suppress ? kCFBooleanTrue : kCFBooleanFalse}});
 }
 
 /// Sends `request` to the dispatcher as message id 2, flattened as a client sends it; returns
@@ -100,6 +97,49 @@ inline QMessageBox* AlertWithText(const QString& text) {
     QMessageBox* alert = AlertOnScreen();
     return alert && alert->isVisible() && alert->text() == text ? alert : nullptr;
 }
+
+/// Watches the agent's windows from the event loop while it lives: how many were shown (and how
+/// many progress windows), which were activated, the progress bar after each change of its value,
+/// and the progress window when it was first hidden.
+class WindowWatch : public QObject {
+public:
+    WindowWatch() { QCoreApplication::instance()->installEventFilter(this); }
+    ~WindowWatch() override { QCoreApplication::instance()->removeEventFilter(this); }
+    int windowsShown = 0;
+    int progressWindowsShown = 0;
+    std::vector<std::string> bar; ///< "value/maximum" after each value change
+    bool hidden = false;
+    std::string statusWhenHidden;
+    bool timerRunningWhenHidden = false;
+    std::vector<QObject*> activated; ///< windows in the order they were activated
+
+protected:
+    bool eventFilter(QObject* watched, QEvent* event) override {
+        if (!watched->isWidgetType() || !static_cast<QWidget*>(watched)->isWindow())
+            return false;
+        auto* window = static_cast<QWidget*>(watched);
+        if (event->type() == QEvent::WindowActivate)
+            activated.push_back(watched);
+        const bool progress = window->objectName() == QLatin1String("FontDownloadWindow");
+        if (event->type() == QEvent::Show) {
+            ++windowsShown;
+            if (!progress)
+                return false;
+            ++progressWindowsShown;
+            auto* bar = window->findChild<QProgressBar*>("progressIndicator");
+            connect(bar, &QProgressBar::valueChanged, this, [this, bar](int value) {
+                this->bar.push_back(std::to_string(value) + "/" + std::to_string(bar->maximum()));
+            });
+        } else if (event->type() == QEvent::Hide && progress && !hidden) {
+            hidden = true;
+            statusWhenHidden =
+                window->findChild<QLabel*>("mainStatusTextField")->text().toStdString();
+            auto* timer = window->findChild<QTimer*>("refreshTimer");
+            timerRunningWhenHidden = timer && timer->isActive();
+        }
+        return false;
+    }
+};
 
 /// For a script's give-up: ends the innermost modal run every 50 ms from now on, until the
 /// application goes, so that a stalled test fails instead of hanging.

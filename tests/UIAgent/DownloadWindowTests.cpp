@@ -11,8 +11,11 @@
 #include <QProgressBar>
 #include <QPushButton>
 #include <QTemporaryDir>
+#include <climits>
 #include <condition_variable>
 #include <cstdio>
+#include <functional>
+#include <limits>
 #include <mutex>
 #include <openssl/evp.h>
 
@@ -70,6 +73,13 @@ public:
         std::lock_guard<std::mutex> lock(mutex_);
         return holding_;
     }
+    /// Forgets the states seen and holds nowhere.
+    void Reset() {
+        std::lock_guard<std::mutex> lock(mutex_);
+        states_.clear();
+        holdAt_ = -1;
+        released_ = false;
+    }
     void Release() {
         {
             std::lock_guard<std::mutex> lock(mutex_);
@@ -94,44 +104,6 @@ private:
     int holdAt_ = -1;
     bool holding_ = false;
     bool released_ = false;
-};
-
-/// Watches the progress window from the event loop: how often it was shown, the bar after each
-/// change of its value, and the window when it was hidden.
-class WindowWatch : public QObject {
-public:
-    int windowsShown = 0; ///< top-level windows of any kind
-    int progressWindowsShown = 0;
-    std::vector<std::string> bar; ///< "value/maximum" after each value change
-    bool hidden = false;
-    std::string statusWhenHidden;
-    bool timerRunningWhenHidden = false;
-
-protected:
-    bool eventFilter(QObject* watched, QEvent* event) override {
-        if (!watched->isWidgetType() || !static_cast<QWidget*>(watched)->isWindow())
-            return false;
-        auto* window = static_cast<QWidget*>(watched);
-        if (event->type() == QEvent::Show) {
-            ++windowsShown;
-            if (window->objectName() == QLatin1String("FontDownloadWindow")) {
-                ++progressWindowsShown;
-                auto* progress = window->findChild<QProgressBar*>("progressIndicator");
-                connect(progress, &QProgressBar::valueChanged, this, [this, progress](int value) {
-                    bar.push_back(std::to_string(value) + "/" +
-                                  std::to_string(progress->maximum()));
-                });
-            }
-        } else if (event->type() == QEvent::Hide && !hidden &&
-                   window->objectName() == QLatin1String("FontDownloadWindow")) {
-            hidden = true;
-            statusWhenHidden =
-                window->findChild<QLabel*>("mainStatusTextField")->text().toStdString();
-            auto* timer = window->findChild<QTimer*>("refreshTimer");
-            timerRunningWhenHidden = timer && timer->isActive();
-        }
-        return false;
-    }
 };
 
 /// What the progress window shows at one moment.
@@ -177,18 +149,16 @@ protected:
         ASSERT_FALSE(QZIsFontInstalled("DejaVuSansMono"));
 
         QZNetworkCheck::SetFlagsSourceForTesting(&Online);
-        QZFontDownloadConfirmation::SetPreferredLanguageForTesting("en-US");
+        QZSetPreferredLanguagesForTesting({"en-US"});
         Controller::SetProgressTapForTesting(callbacks_.Tap());
-        QCoreApplication::instance()->installEventFilter(&watch_);
     }
     void TearDown() override {
-        QCoreApplication::instance()->removeEventFilter(&watch_);
         // A matching whose window has gone ends at its next callback; wait for its thread.
         callbacks_.Release();
         EXPECT_TRUE(SpinUntil([] { return Controller::MatchingRunsInProgress() == 0; }));
         Controller::SetProgressTapForTesting({});
         QZNetworkCheck::SetFlagsSourceForTesting(nullptr);
-        QZFontDownloadConfirmation::SetPreferredLanguageForTesting(QString());
+        QZSetPreferredLanguagesForTesting({});
         glyphwell::testing::StopUsingPrivateFonts();
     }
 
@@ -278,12 +248,13 @@ TEST_F(DownloadRoadTest, AnInstalledFontIsMatchedWithoutDownloading) {
     ASSERT_TRUE(QFile::copy(kDejaVu + "DejaVuSansMono.ttf", fonts_ + "/DejaVuSansMono.ttf"));
     ASSERT_TRUE(QZReloadFontConfiguration());
     WriteCatalog({ServeFont("DejaVuSansMono.ttf", "org.test.Mono", "DejaVuSansMono")});
-    Ref mono = RequestedFont("DejaVuSansMono");
+    Ref mono = RequestedFont("DejaVuSansMono", "DejaVu Sans Mono");
 
     // Nothing to download means nothing to confirm: only a request that says not to ask gets
-    // this far.
+    // this far. Unasked, the window still shows the display name.
     EXPECT_EQ(HandleDownloadRequest(DownloadRequest({mono.get()}, 0, true).get()),
               DownloadReply(true, true));
+    EXPECT_EQ(watch_.statusWhenHidden, "Preparing to download “DejaVu Sans Mono”…");
     EXPECT_EQ(callbacks_.States(), (std::vector<uint32_t>{0, 2, 7, 1}));
     EXPECT_EQ(server_.RequestCount("/DejaVuSansMono.ttf"), 0);
     EXPECT_TRUE(DownloadFolder().isEmpty());
@@ -319,63 +290,78 @@ TEST_F(DownloadRoadTest, CancelDuringTheTransferStopsTheTimerLeavesNoFileAndAnsw
     EXPECT_FALSE(QZIsFontInstalled("DejaVuSansMono"));
 }
 
-TEST_F(DownloadRoadTest, AFailureAnsweredContinueDownloadGoesOnToTheNextFont) {
-    WriteCatalog({ServeFont("DejaVuSansMono-Bold.ttf", "org.test.MonoBold", "DejaVuSansMono-Bold",
-                            {}, std::string(64, '0')),
-                  ServeFont("DejaVuSansMono.ttf", "org.test.Mono", "DejaVuSansMono")});
+TEST_F(DownloadRoadTest, AFailureGoesOnToTheNextFontOrEndsWithNoWhenCancelledOrClosed) {
+    const std::string damaged(64, '0');
+    struct Case {
+        const char* how;
+        bool damaged; ///< the bold file's checksum is wrong; else its connection drops
+        std::function<void(QMessageBox*)> answer;
+        bool result;
+        const char* reason;
+        std::vector<uint32_t> states;
+        QStringList folder;
+    } cases[] = {
+        {"Cancel",
+         false,
+         [](QMessageBox* alert) { ClickButton(alert, "Cancel"); },
+         false,
+         "The connection ended after 100000 of 334268 bytes.",
+         {0, 2, 4, 5, 8},
+         {}},
+        {"close button",
+         false,
+         [](QMessageBox* alert) { alert->close(); },
+         false,
+         "The connection ended after 100000 of 334268 bytes.",
+         {0, 2, 4, 5, 8},
+         {}},
+        {"Continue Download",
+         true,
+         [](QMessageBox* alert) { ClickButton(alert, "Continue Download"); },
+         true,
+         "The downloaded file is damaged: its SHA-256 checksum is not the expected one.",
+         {0, 2, 4, 5, 8, 2, 4, 5, 6, 7, 1},
+         {"org.test.Mono.ttf"}},
+    };
     Ref bold = RequestedFont("DejaVuSansMono-Bold");
     Ref mono = RequestedFont("DejaVuSansMono");
-    std::string informative, defaultButton, escapeButton;
-    UiScript script(
-        {{[] { return AlertWithText("The font “DejaVuSansMono-Bold” cannot be downloaded."); },
-          [&] {
-              QMessageBox* alert = AlertOnScreen();
-              informative = alert->informativeText().toStdString();
-              defaultButton = alert->defaultButton()->text().toStdString();
-              escapeButton = alert->escapeButton()->text().toStdString();
-              ClickButton(alert, "Continue Download");
-          }}},
-        EndEveryModalRun);
+    for (const Case& c : cases) {
+        LoopbackHTTPServer::Resource resource;
+        resource.dropAfter = c.damaged ? std::string::npos : 100000;
+        // Another identifier for the damaged file, so that the catalog changes size and is read
+        // again.
+        WriteCatalog({ServeFont("DejaVuSansMono-Bold.ttf",
+                                c.damaged ? "org.test.DamagedBold" : "org.test.MonoBold",
+                                "DejaVuSansMono-Bold", resource, c.damaged ? damaged : ""),
+                      ServeFont("DejaVuSansMono.ttf", "org.test.Mono", "DejaVuSansMono")});
+        callbacks_.Reset();
+        std::string reason, defaultButton, escapeButton;
+        UiScript script(
+            {{[] { return AlertWithText("The font “DejaVuSansMono-Bold” cannot be downloaded."); },
+              [&] {
+                  QMessageBox* alert = AlertOnScreen();
+                  reason = alert->informativeText().toStdString();
+                  defaultButton = alert->defaultButton()->text().toStdString();
+                  escapeButton = alert->escapeButton()->text().toStdString();
+                  c.answer(alert);
+              }}},
+            EndEveryModalRun);
 
-    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({bold.get(), mono.get()}, 0, true).get()),
-              DownloadReply(true, true));
+        EXPECT_EQ(HandleDownloadRequest(DownloadRequest({bold.get(), mono.get()}, 0, true).get()),
+                  DownloadReply(c.result, true))
+            << c.how;
 
-    EXPECT_TRUE(script.done());
-    EXPECT_EQ(informative,
-              "The downloaded file is damaged: its SHA-256 checksum is not the expected one.");
-    EXPECT_EQ(defaultButton, "Continue Download");
-    EXPECT_EQ(escapeButton, "Cancel");
-    EXPECT_EQ(callbacks_.States(), (std::vector<uint32_t>{0, 2, 4, 5, 8, 2, 4, 5, 6, 7, 1}));
-    EXPECT_EQ(DownloadFolder(), QStringList{"org.test.Mono.ttf"});
+        EXPECT_TRUE(script.done()) << c.how;
+        EXPECT_EQ(reason, c.reason);
+        EXPECT_EQ(defaultButton, "Continue Download");
+        EXPECT_EQ(escapeButton, "Cancel");
+        ASSERT_TRUE(WaitForTheMatchingToEnd());
+        EXPECT_EQ(callbacks_.States(), c.states) << c.how;
+        EXPECT_EQ(DownloadFolder(), c.folder) << c.how;
+    }
+    // Only the run that went on fetched the second font.
+    EXPECT_EQ(server_.RequestCount("/DejaVuSansMono.ttf"), 1);
     EXPECT_FALSE(QZIsFontInstalled("DejaVuSansMono-Bold"));
-}
-
-TEST_F(DownloadRoadTest, AFailureAnsweredCancelEndsTheDownloadWithNo) {
-    LoopbackHTTPServer::Resource dropped;
-    dropped.dropAfter = 100000;
-    WriteCatalog(
-        {ServeFont("DejaVuSansMono-Bold.ttf", "org.test.MonoBold", "DejaVuSansMono-Bold", dropped),
-         ServeFont("DejaVuSansMono.ttf", "org.test.Mono", "DejaVuSansMono")});
-    Ref bold = RequestedFont("DejaVuSansMono-Bold");
-    Ref mono = RequestedFont("DejaVuSansMono");
-    std::string informative;
-    UiScript script(
-        {{[] { return AlertWithText("The font “DejaVuSansMono-Bold” cannot be downloaded."); },
-          [&] {
-              informative = AlertOnScreen()->informativeText().toStdString();
-              ClickButton(AlertOnScreen(), "Cancel");
-          }}},
-        EndEveryModalRun);
-
-    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({bold.get(), mono.get()}, 0, true).get()),
-              DownloadReply(false, true));
-
-    EXPECT_TRUE(script.done());
-    EXPECT_EQ(informative, "The connection ended after 100000 of 334268 bytes.");
-    ASSERT_TRUE(WaitForTheMatchingToEnd());
-    EXPECT_EQ(callbacks_.States(), (std::vector<uint32_t>{0, 2, 4, 5, 8}));
-    EXPECT_EQ(server_.RequestCount("/DejaVuSansMono.ttf"), 0);
-    EXPECT_TRUE(DownloadFolder().isEmpty()) << DownloadFolder().join(", ").toStdString();
     EXPECT_FALSE(watch_.timerRunningWhenHidden);
 }
 
@@ -422,11 +408,15 @@ TEST_F(DownloadRoadTest, RegressionTheRequestingProcessExitEndsTheWindowsOwnRunN
     EXPECT_TRUE(DownloadFolder().isEmpty()) << DownloadFolder().join(", ").toStdString();
 }
 
-TEST_F(DownloadRoadTest, RegressionARequestWithoutFontNamesOpensNoWindowAndAsksNothing) {
+TEST_F(DownloadRoadTest, RegressionARequestWithoutFontsToHaveOpensNoWindowAndAsksNothing) {
     // Offline: a network question would show an alert.
     QZNetworkCheck::SetFlagsSourceForTesting(&Offline);
     Ref nameless = Dict({{NSFontFamilyAttribute, Str("DejaVu Sans Mono").get()}});
     EXPECT_EQ(HandleDownloadRequest(DownloadRequest({nameless.get()}, 0, true).get()),
+              DownloadReply(false, true));
+    // Neither offered by a catalog nor installed: left out before any window.
+    Ref unknown = RequestedFont("NoSuchFont-Regular");
+    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({unknown.get()}, 0, true).get()),
               DownloadReply(false, true));
     EXPECT_EQ(HandleDownloadRequest(DownloadRequest({}, 0, true).get()),
               DownloadReply(false, true));
@@ -436,13 +426,39 @@ TEST_F(DownloadRoadTest, RegressionARequestWithoutFontNamesOpensNoWindowAndAsksN
 
 TEST(DownloadWindow, ByteCountsUseDecimalUnitsWithPrecisionGrowingWithTheUnit) {
     EnglishTexts english;
-    EXPECT_EQ(Controller::FormattedByteCount(0).toStdString(), "0 bytes");
-    EXPECT_EQ(Controller::FormattedByteCount(999).toStdString(), "999 bytes");
-    EXPECT_EQ(Controller::FormattedByteCount(343140).toStdString(), "343 kB");
-    EXPECT_EQ(Controller::FormattedByteCount(1500000).toStdString(), "1.5 MB");
-    EXPECT_EQ(Controller::FormattedByteCount(50000000).toStdString(), "50.0 MB");
-    EXPECT_EQ(Controller::FormattedByteCount(2250000000).toStdString(), "2.25 GB");
-    EXPECT_EQ(Controller::FormattedByteCount(-5).toStdString(), "0 bytes");
+    const std::pair<qint64, const char*> cases[] = {
+        {0, "0 bytes"},        {999, "999 bytes"},      {343140, "343 kB"}, {1500000, "1.5 MB"},
+        {50000000, "50.0 MB"}, {2250000000, "2.25 GB"}, {-5, "0 bytes"},
+    };
+    for (const auto& [bytes, text] : cases)
+        EXPECT_EQ(QZFormattedByteCount(bytes).toStdString(), text) << bytes;
+}
+
+TEST(DownloadWindow, TheBarScalesTotalsBeyondItsIntRangeAndClampsTheRest) {
+    const double nan = std::numeric_limits<double>::quiet_NaN();
+    struct Case {
+        double downloaded, total;
+        int value, maximum;
+    } cases[] = {
+        {100, 200, 100, 200},
+        {0, 0, 0, 1},
+        {nan, nan, 0, 1},
+        {-5, 200, 0, 200},
+        {300, 200, 200, 200},
+        {2147483647.0, 2147483647.0, INT_MAX, INT_MAX},
+        // Above 2^31 both sizes are scaled alike: half stays half.
+        {3e9, 6e9, 1073741823, INT_MAX},
+        {4294967296.0, 4294967296.0, INT_MAX, INT_MAX},
+        {1e12, 1e15, 2147483, INT_MAX},
+    };
+    Controller controller(nullptr);
+    controller.window();
+    QProgressBar* bar = controller.progressIndicator();
+    for (const Case& c : cases) {
+        controller.setProgress(c.downloaded, c.total);
+        EXPECT_EQ(bar->value(), c.value) << c.downloaded << "/" << c.total;
+        EXPECT_EQ(bar->maximum(), c.maximum) << c.downloaded << "/" << c.total;
+    }
 }
 
 } // namespace

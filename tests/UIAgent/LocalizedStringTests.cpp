@@ -1,6 +1,7 @@
-// The "Localized" table: lookup, placeholders, the choice of language, and the five tables'
-// completeness.
+// The "Localized" table: lookup, placeholders, the choice of language and of layout direction,
+// script subtags, and the five tables' completeness.
 #include <QCoreApplication>
+#include <QDialog>
 #include <QRegularExpression>
 #include <QTranslator>
 #include <set>
@@ -63,6 +64,39 @@ const Key kKeys[] = {
     {"Help", 0},
 };
 
+// The download failure alert's texts, made by the font service in contexts of their own; their
+// placeholders are those of the source text.
+const std::pair<const char*, const char*> kFailureTexts[] = {
+    {"QZFontService", "The font “%1” cannot be downloaded."},
+    {"QZFontService", "No downloadable font has this name."},
+    {"QZFontService", "The downloaded font file does not hold this font."},
+    {"QZFontDownloader", "The server offers %1 bytes, but the font should have %2 bytes."},
+    {"QZFontDownloader", "The server sent more than the %1 bytes of the font."},
+    {"QZFontDownloader", "The font file cannot be written: %1"},
+    {"QZFontDownloader", "The server answered with the HTTP status %1."},
+    {"QZFontDownloader", "Fonts are downloaded only from https, http and file addresses, and "
+                         "redirected only to https and http ones."},
+    {"QZFontDownloader", "The connection ended after %1 of %2 bytes."},
+    {"QZFontDownloader", "The download failed: %1"},
+    {"QZFontDownloader", "The font folder cannot be created: %1"},
+    {"QZFontDownloader", "The download holds %1 bytes, but the font should have %2 bytes."},
+    {"QZFontDownloader",
+     "The downloaded file is damaged: its SHA-256 checksum is not the expected one."},
+    {"QZFontDownloader", "The downloaded file is not a font."},
+    {"QZFontDownloader", "The server did not answer within %1 seconds."},
+    {"QZFontDownloader", "The downloaded file does not hold the font “%1”."},
+    {"QZFontDownloader", "The download was given up: the server sent less than %1 bytes per "
+                         "second over %2 seconds."},
+};
+
+std::set<int> Placeholders(const QString& text) {
+    static const QRegularExpression placeholder(QStringLiteral("%(\\d)"));
+    std::set<int> numbers;
+    for (const auto& match : placeholder.globalMatch(text))
+        numbers.insert(match.captured(1).toInt());
+    return numbers;
+}
+
 TEST(LocalizedString, AKeyWithoutTranslationShowsAsItself) {
     EXPECT_EQ(QZLocalizedString("QZ_NO_SUCH_KEY"), QStringLiteral("QZ_NO_SUCH_KEY"));
     InstalledTable german(QStringLiteral("de"));
@@ -72,34 +106,92 @@ TEST(LocalizedString, AKeyWithoutTranslationShowsAsItself) {
 }
 
 TEST(LocalizedString, FormatsFillEveryPlaceholderStyleInOnePass) {
-    // Keys without a translation are their own format.
-    EXPECT_EQ(QZLocalizedFormat("%@ wants %@", {"Editor", "Serif"}), "Editor wants Serif");
-    EXPECT_EQ(QZLocalizedFormat("%2$@ before %1$@", {"one", "two"}), "two before one");
-    EXPECT_EQ(QZLocalizedFormat("%2 then %1", {"one", "two"}), "two then one");
-    EXPECT_EQ(QZLocalizedFormat("100%% of %1", {"it"}), "100% of it");
-    // An argument is inserted as it is, placeholders and all.
-    EXPECT_EQ(QZLocalizedFormat("%1 and %2", {"%2", "x"}), "%2 and x");
-    EXPECT_EQ(QZLocalizedFormat("%@ and %@", {"%@"}), "%@ and %@");
-    // A placeholder without an argument is kept; a text without placeholders is returned as is.
-    EXPECT_EQ(QZLocalizedFormat("%1 of %3", {"a", "b"}), "a of %3");
-    EXPECT_EQ(QZLocalizedFormat("Skip", {"ignored"}), "Skip");
-    EXPECT_EQ(QZLocalizedFormat("50%", {}), "50%");
+    struct Case {
+        const char* table; ///< the language whose table is installed; null: none
+        const char* format;
+        std::initializer_list<QString> arguments;
+        const char* expected;
+    } cases[] = {
+        {nullptr, "%@ wants %@", {"Editor", "Serif"}, "Editor wants Serif"},
+        {nullptr, "%2$@ before %1$@", {"one", "two"}, "two before one"},
+        {nullptr, "%2 then %1", {"one", "two"}, "two then one"},
+        {nullptr, "100%% of %1", {"it"}, "100% of it"},
+        // An argument is inserted as it is, placeholders and all.
+        {nullptr, "%1 and %2", {"%2", "x"}, "%2 and x"},
+        {nullptr, "%@ and %@", {"%@"}, "%@ and %@"},
+        // A placeholder without an argument is kept; a text without placeholders stays as is.
+        {nullptr, "%1 of %3", {"a", "b"}, "a of %3"},
+        {nullptr, "Skip", {"ignored"}, "Skip"},
+        {nullptr, "50%", {}, "50%"},
+        // Translated formats take their arguments by number.
+        {"de", "%1$@ of %2$@", {"1 MB", "2 MB"}, "1 MB von 2 MB"},
+        {"ja", "%1$@ of %2$@", {"1 MB", "2 MB"}, "2 MB 中 1 MB"},
+        {"en",
+         "QZ_HEADLINE_FONT",
+         {"Editor", "Serif"},
+         "Editor wants to use the font “Serif”, which is not installed."},
+    };
+    for (const Case& c : cases) {
+        InstalledTable table(QString::fromLatin1(c.table ? c.table : "none"));
+        EXPECT_EQ(QZLocalizedFormat(c.format, c.arguments), QString::fromUtf8(c.expected))
+            << c.format;
+    }
 }
 
 TEST(LocalizedString, TheTableFollowsTheUsersLanguageAndFallsBackToEnglish) {
-    auto file = [](const char* name) {
-        return QZTranslationFileFor(QLocale(QString::fromLatin1(name)));
+    const std::pair<const char*, const char*> cases[] = {
+        {"de_DE", "de"},    {"fr_CA", "fr"}, {"ja_JP", "ja"},
+        {"zh_CN", "zh_CN"}, {"en_GB", "en"}, {"it_IT", "en"},
     };
-    EXPECT_EQ(file("de_DE"), ":/translations/Localized_de.qm");
-    EXPECT_EQ(file("fr_CA"), ":/translations/Localized_fr.qm");
-    EXPECT_EQ(file("ja_JP"), ":/translations/Localized_ja.qm");
-    EXPECT_EQ(file("zh_CN"), ":/translations/Localized_zh_CN.qm");
-    EXPECT_EQ(file("en_GB"), ":/translations/Localized_en.qm");
-    EXPECT_EQ(file("it_IT"), ":/translations/Localized_en.qm");
+    for (const auto& [locale, table] : cases)
+        EXPECT_EQ(QZTranslationFileFor(QLocale(QString::fromLatin1(locale))),
+                  QStringLiteral(":/translations/Localized_%1.qm").arg(table))
+            << locale;
+}
+
+TEST(LocalizedString, LanguagesGainTheirLikelyScriptAndItsDirection) {
+    struct Case {
+        const char* tag;
+        const char* withScript;
+        Qt::LayoutDirection direction;
+    } cases[] = {
+        {"zh-CN", "zh-Hans-CN", Qt::LeftToRight},
+        {"zh-TW", "zh-Hant-TW", Qt::LeftToRight},
+        {"zh-HK", "zh-Hant-HK", Qt::LeftToRight},
+        {"zh_MO", "zh-Hant-MO", Qt::LeftToRight},
+        {"zh-Hant-CN", "zh-Hant-CN", Qt::LeftToRight},
+        {"ja", "ja-Jpan", Qt::LeftToRight},
+        {"ar", "ar-Arab", Qt::RightToLeft},
+        {"ar-EG", "ar-Arab-EG", Qt::RightToLeft},
+        {"he-IL", "he-Hebr-IL", Qt::RightToLeft},
+        {"fa", "fa-Arab", Qt::RightToLeft},
+        {"en-US", "en-Latn-US", Qt::LeftToRight},
+        {"x-unknown", "x-unknown", Qt::LeftToRight},
+    };
+    for (const Case& c : cases) {
+        EXPECT_EQ(QZLanguageWithScript(QString::fromLatin1(c.tag)).toStdString(), c.withScript);
+        EXPECT_EQ(QZLayoutDirectionFor({QString::fromLatin1(c.tag), "en"}), c.direction) << c.tag;
+    }
+    EXPECT_EQ(QZLayoutDirectionFor({}), Qt::LeftToRight);
+    // Only the first language counts.
+    EXPECT_EQ(QZLayoutDirectionFor({"en", "ar"}), Qt::LeftToRight);
+}
+
+TEST(LocalizedString, RightToLeftLanguagesLayWindowsOutRightToLeftWithoutATable) {
+    QZSetPreferredLanguagesForTesting({"ar-EG", "en"});
+    QZApplyLayoutDirection();
+    // A language change (a table installed) must not undo it.
+    QEvent change(QEvent::LanguageChange);
+    QCoreApplication::sendEvent(QCoreApplication::instance(), &change);
+    QDialog window;
+    EXPECT_EQ(window.layoutDirection(), Qt::RightToLeft);
+    QZSetPreferredLanguagesForTesting({"de-DE"});
+    QZApplyLayoutDirection();
+    EXPECT_EQ(QDialog().layoutDirection(), Qt::LeftToRight);
+    QZSetPreferredLanguagesForTesting({});
 }
 
 TEST(LocalizedString, EveryTableTranslatesEveryKeyWithItsPlaceholders) {
-    const QRegularExpression placeholder(QStringLiteral("%(\\d)"));
     for (const char* language : {"en", "de", "fr", "ja", "zh_CN"}) {
         InstalledTable table(QString::fromLatin1(language));
         ASSERT_TRUE(table.loaded) << language;
@@ -111,30 +203,21 @@ TEST(LocalizedString, EveryTableTranslatesEveryKeyWithItsPlaceholders) {
             if (name.rfind("QZ_", 0) == 0 && name != "QZ_AUTO_ACTIVATION_HELP_ANCHOR") {
                 EXPECT_NE(text, QString::fromLatin1(key.key)) << language << " " << key.key;
             }
-            std::set<int> numbers;
-            for (const auto& match : placeholder.globalMatch(text))
-                numbers.insert(match.captured(1).toInt());
             std::set<int> expected;
             for (int i = 1; i <= key.arguments; ++i)
                 expected.insert(i);
-            EXPECT_EQ(numbers, expected)
+            EXPECT_EQ(Placeholders(text), expected)
                 << language << " " << key.key << ": " << text.toStdString();
         }
+        for (const auto& [context, source] : kFailureTexts) {
+            const QString text = QCoreApplication::translate(context, source);
+            EXPECT_EQ(Placeholders(text), Placeholders(QString::fromUtf8(source)))
+                << language << ": " << text.toStdString();
+            if (std::string(language) != "en") {
+                EXPECT_NE(text, QString::fromUtf8(source)) << language << ": " << source;
+            }
+        }
     }
-}
-
-TEST(LocalizedString, TranslatedFormatsTakeTheirArgumentsByNumber) {
-    {
-        InstalledTable german(QStringLiteral("de"));
-        EXPECT_EQ(QZLocalizedFormat("%1$@ of %2$@", {"1 MB", "2 MB"}), "1 MB von 2 MB");
-    }
-    {
-        InstalledTable japanese(QStringLiteral("ja"));
-        EXPECT_EQ(QZLocalizedFormat("%1$@ of %2$@", {"1 MB", "2 MB"}), "2 MB 中 1 MB");
-    }
-    InstalledTable english(QStringLiteral("en"));
-    EXPECT_EQ(QZLocalizedFormat("QZ_HEADLINE_FONT", {"Editor", "Serif"}),
-              "Editor wants to use the font “Serif”, which is not installed.");
 }
 
 } // namespace

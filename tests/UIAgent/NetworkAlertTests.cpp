@@ -2,9 +2,13 @@
 // a word, the offline alert's texts and buttons, its answers, and what the dispatcher makes of
 // them. The flags are injected; reading them from the routing table is tested with the desktop
 // services.
+#include <QDialog>
 #include <QDir>
 #include <QPushButton>
 #include <QTemporaryDir>
+#include <QTest>
+#include <algorithm>
+#include <functional>
 
 #include "UIAgent/FontDownloadWindowController.h"
 #include "UIAgent/QZFontDownloadConfirmation.h"
@@ -28,26 +32,6 @@ bool InjectedFlags(QZNetworkReachabilityFlags* flags) {
     *flags = gFlagsReadable ? gFlags : 0;
     return gFlagsReadable;
 }
-
-/// Counts the windows shown while it lives, and the progress windows among them.
-class ShownWindows : public QObject {
-public:
-    ShownWindows() { QCoreApplication::instance()->installEventFilter(this); }
-    ~ShownWindows() override { QCoreApplication::instance()->removeEventFilter(this); }
-    int count = 0;
-    int progressWindows = 0;
-
-protected:
-    bool eventFilter(QObject* watched, QEvent* event) override {
-        if (event->type() == QEvent::Show && watched->isWidgetType() &&
-            static_cast<QWidget*>(watched)->isWindow()) {
-            ++count;
-            if (watched->objectName() == QLatin1String("FontDownloadWindow"))
-                ++progressWindows;
-        }
-        return false;
-    }
-};
 
 /// A step that presses the offline alert's button `key`.
 UiScript::Step AnswerOfflineAlert(const char* key) {
@@ -93,10 +77,10 @@ TEST_F(NetworkCheckTest, OnlyReachableWithoutConnectionRequiredGoesOnWithoutAnAl
     for (const Case& c : cases) {
         gFlags = c.flags;
         gFlagsReadable = c.readable;
-        ShownWindows shown;
+        WindowWatch shown;
         UiScript script({AnswerOfflineAlert("Continue Download")}, EndEveryModalRun, 10s);
         EXPECT_TRUE(QZNetworkCheck().continueDownload());
-        EXPECT_EQ(shown.count, c.alert ? 1 : 0)
+        EXPECT_EQ(shown.windowsShown, c.alert ? 1 : 0)
             << "flags " << c.flags << " readable " << c.readable;
     }
 }
@@ -128,39 +112,60 @@ TEST_F(NetworkCheckTest, TheOfflineAlertIsCriticalAndItsDefaultCancelStopsTheDow
     EXPECT_FALSE(FontDownloadWindowController::continueDownloadWithNetworkReachabilityCheck());
 }
 
-TEST_F(NetworkCheckTest, ContinueDownloadAndAWithdrawnAlertGoOn) {
-    UiScript proceed({AnswerOfflineAlert("Continue Download")}, EndEveryModalRun);
-    EXPECT_TRUE(QZNetworkCheck().continueDownload());
-    EXPECT_TRUE(proceed.done());
-
-    QZNetworkCheck check;
-    UiScript withdraw({{[] { return AlertWithText(kOfflineHeadline); }, [&] { check.withdraw(); }}},
-                      EndEveryModalRun);
-    EXPECT_TRUE(check.continueDownload());
-    EXPECT_TRUE(withdraw.done());
-    EXPECT_FALSE(check.alert()->isVisible());
+TEST_F(NetworkCheckTest, OnlyTheUsersCancelOrCloseStopsAndOtherWindowsStayInactive) {
+    struct Case {
+        const char* how;
+        std::function<void(QZNetworkCheck&)> answer;
+        bool goOn;
+    } cases[] = {
+        {"Continue Download",
+         [](QZNetworkCheck&) {
+             ButtonWithText(AlertOnScreen(), QZLocalizedString("Continue Download"))->click();
+         },
+         true},
+        {"withdrawn", [](QZNetworkCheck& check) { check.withdraw(); }, true},
+        {"close button", [](QZNetworkCheck& check) { check.alert()->close(); }, false},
+        {"Escape", [](QZNetworkCheck& check) { QTest::keyClick(check.alert(), Qt::Key_Escape); },
+         false},
+    };
+    // Another window of the agent, up before the question: the question raises only itself.
+    QDialog other;
+    other.show();
+    for (const Case& c : cases) {
+        other.activateWindow();
+        ASSERT_TRUE(SpinUntil([&] { return other.isActiveWindow(); })) << c.how;
+        QZNetworkCheck check;
+        WindowWatch watch;
+        int activationsWhileAsked = -1;
+        UiScript script({{[] {
+                              QMessageBox* alert = AlertWithText(kOfflineHeadline);
+                              return alert && alert->isActiveWindow();
+                          },
+                          [&] {
+                              activationsWhileAsked = int(std::count(
+                                  watch.activated.begin(), watch.activated.end(), &other));
+                              c.answer(check);
+                          }}},
+                        EndEveryModalRun);
+        EXPECT_EQ(check.continueDownload(), c.goOn) << c.how;
+        EXPECT_TRUE(script.done()) << c.how;
+        EXPECT_FALSE(check.alert()->isVisible()) << c.how;
+        EXPECT_EQ(activationsWhileAsked, 0) << c.how;
+    }
 }
 
-TEST_F(NetworkCheckTest, OfflineCancelAnswersNoWithoutAProgressWindow) {
-    ShownWindows shown;
-    // DejaVu Sans is installed: a download that went on would match it.
+TEST_F(NetworkCheckTest, OfflineCancelAnswersNoAndContinueRunsTheDownloadWindow) {
+    // DejaVu Sans is installed: a download that goes on matches it.
     Ref font = RequestedFont("DejaVuSans");
-    UiScript script({AnswerOfflineAlert("Cancel")}, EndEveryModalRun);
-    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({font.get()}, 0, true).get()),
-              DownloadReply(false, true));
-    EXPECT_TRUE(script.done());
-    EXPECT_EQ(shown.count, 1);
-    EXPECT_EQ(shown.progressWindows, 0);
-}
-
-TEST_F(NetworkCheckTest, OfflineContinueRunsTheDownloadWindow) {
-    ShownWindows shown;
-    Ref font = RequestedFont("DejaVuSans");
-    UiScript script({AnswerOfflineAlert("Continue Download")}, EndEveryModalRun);
-    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({font.get()}, 0, true).get()),
-              DownloadReply(true, true));
-    EXPECT_TRUE(script.done());
-    EXPECT_EQ(shown.progressWindows, 1);
+    for (const bool goOn : {false, true}) {
+        WindowWatch shown;
+        UiScript script({AnswerOfflineAlert(goOn ? "Continue Download" : "Cancel")},
+                        EndEveryModalRun);
+        EXPECT_EQ(HandleDownloadRequest(DownloadRequest({font.get()}, 0, true).get()),
+                  DownloadReply(goOn, true));
+        EXPECT_TRUE(script.done());
+        EXPECT_EQ(shown.progressWindowsShown, goOn ? 1 : 0);
+    }
 }
 
 TEST_F(NetworkCheckTest, TheRequestingApplicationQuittingEndsTheOfflineAlertAndNoWindowOpens) {
@@ -175,7 +180,7 @@ TEST_F(NetworkCheckTest, TheRequestingApplicationQuittingEndsTheOfflineAlertAndN
                   "sha256": "0000000000000000000000000000000000000000000000000000000000000000",
                   "fonts": [{"postScriptName": "Example-Regular"}]}]})");
     PausedChild requester;
-    ShownWindows shown;
+    WindowWatch shown;
     Ref font = RequestedFont("Example-Regular");
     UiScript script(
         {{[] { return ButtonWithText(AlertOnScreen(), QZLocalizedString("Download")); },
@@ -187,7 +192,7 @@ TEST_F(NetworkCheckTest, TheRequestingApplicationQuittingEndsTheOfflineAlertAndN
               DownloadReply(false, false));
 
     EXPECT_TRUE(script.done());
-    EXPECT_EQ(shown.progressWindows, 0);
+    EXPECT_EQ(shown.progressWindowsShown, 0);
     qunsetenv("XDG_DATA_HOME");
     qunsetenv("XDG_DATA_DIRS");
 }
