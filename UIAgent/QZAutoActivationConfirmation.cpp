@@ -23,6 +23,7 @@
 #include <vector>
 
 #include "UIAgent/QZAccessibility.h"
+#include "UIAgent/QZDictionaryValue.h"
 #include "UIAgent/QZLocalizedString.h"
 #include "UIAgent/QZModalSession.h"
 #include "desktop/QZDesktopEntry.h"
@@ -52,18 +53,9 @@ constexpr int kIconSize = 64;
 /// memory.
 constexpr qint64 kMaximumSampleFontFileSize = 128 << 20;
 
-/// The value of `key` in `dictionary` when it has the type `typeID`, else null. Does not retain.
-const void* GetTypedValue(CFDictionaryRef dictionary, CFStringRef key, CFTypeID typeID) {
-    if (!dictionary)
-        return nullptr;
-    const void* value = CFDictionaryGetValue(dictionary, key);
-    return value && CFGetTypeID(value) == typeID ? value : nullptr;
-}
-
 /// A non-empty string value of `key`, else a null string.
 QString GetNonEmptyString(CFDictionaryRef dictionary, CFStringRef key) {
-    const QString text =
-        QZQString(static_cast<CFStringRef>(GetTypedValue(dictionary, key, CFStringGetTypeID())));
+    const QString text = QZQString(QZGetTypedValue<CFStringRef>(dictionary, key));
     return text.isEmpty() ? QString() : text;
 }
 
@@ -128,12 +120,12 @@ struct QZAutoActivationConfirmation::Widgets : QObject {
 QZAutoActivationConfirmation::QZAutoActivationConfirmation(CFDictionaryRef properties)
     : alert_(std::make_unique<QMessageBox>()), widgets_(std::make_unique<Widgets>(this)),
       session_(std::make_unique<QZModalSession>(alert_.get(), QZModalSession::kQuestion)) {
-    candidateFonts_ = TCFRetained<CFArrayRef>(static_cast<CFArrayRef>(
-        GetTypedValue(properties, kQZUIPropertyCandidateFontURLs, CFArrayGetTypeID())));
-    request_ = TCFRetained<CFDictionaryRef>(static_cast<CFDictionaryRef>(
-        GetTypedValue(properties, kQZUIPropertyRequestDictionary, CFDictionaryGetTypeID())));
-    applicationURL_ = TCFRetained<CFURLRef>(
-        static_cast<CFURLRef>(GetTypedValue(properties, kQZUIPropertyBundleURL, CFURLGetTypeID())));
+    candidateFonts_ = TCFRetained<CFArrayRef>(
+        QZGetTypedValue<CFArrayRef>(properties, kQZUIPropertyCandidateFontURLs));
+    request_ = TCFRetained<CFDictionaryRef>(
+        QZGetTypedValue<CFDictionaryRef>(properties, kQZUIPropertyRequestDictionary));
+    applicationURL_ =
+        TCFRetained<CFURLRef>(QZGetTypedValue<CFURLRef>(properties, kQZUIPropertyBundleURL));
 
     applicationName_ = GetNonEmptyString(properties, kQZUIPropertyApplicationName);
     if (applicationName_.isEmpty())
