@@ -20,7 +20,6 @@
 #include <filesystem>
 #include <fstream>
 #include <mutex>
-#include <openssl/evp.h>
 #include <random>
 #include <spawn.h>
 #include <sys/wait.h>
@@ -28,6 +27,7 @@
 #include "desktop/QZFontDownloader.h"
 #include "desktop/QZFontMatching.h"
 #include "desktop/QZFontService.h"
+#include "desktop/QZSHA256.h"
 #include "platform/PropertyValues.h"
 #include "support/LoopbackHTTPServer.h"
 
@@ -44,19 +44,6 @@ const fs::path kDejaVu = "/usr/share/fonts/truetype/dejavu";
 std::string ReadFile(const fs::path& path) {
     std::ifstream stream(path, std::ios::binary);
     return std::string(std::istreambuf_iterator<char>(stream), {});
-}
-
-std::string SHA256Of(const std::string& bytes) {
-    unsigned char digest[EVP_MAX_MD_SIZE];
-    unsigned int length = 0;
-    EVP_Digest(bytes.data(), bytes.size(), digest, &length, EVP_sha256(), nullptr);
-    static const char digits[] = "0123456789abcdef";
-    std::string hex;
-    for (unsigned int i = 0; i < length; ++i) {
-        hex += digits[digest[i] >> 4];
-        hex += digits[digest[i] & 15];
-    }
-    return hex;
 }
 
 /// One font of the ten-font catalog.
@@ -106,7 +93,7 @@ struct Setup {
             largeBody.append(reinterpret_cast<const char*>(&word),
                              std::min(sizeof word, kLargeAssetSize - largeBody.size()));
         }
-        largeSHA256 = SHA256Of(largeBody);
+        largeSHA256 = QZSHA256Hex(largeBody);
         LoopbackHTTPServer::Resource resource;
         resource.body = largeBody;
         server.Serve("/large", resource);
@@ -256,7 +243,7 @@ void MatchTenFonts(benchmark::State& state) {
         const std::string body = ReadFile(kDejaVu / font.file);
         bytes += body.size();
         assets.push_back(setup.Asset(font.postScriptName, "/" + font.file, body.size(),
-                                     SHA256Of(body), font.postScriptName));
+                                     QZSHA256Hex(body), font.postScriptName));
         names.push_back(font.postScriptName);
     }
     setup.WriteCatalog(assets);

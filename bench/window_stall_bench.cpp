@@ -21,12 +21,12 @@
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
-#include <openssl/evp.h>
 #include <random>
 #include <time.h>
 
 #include "UIAgent/FontDownloadWindowController.h"
 #include "desktop/QZFontMatching.h"
+#include "desktop/QZSHA256.h"
 #include "platform/PropertyValues.h"
 #include "support/LoopbackHTTPServer.h"
 
@@ -46,19 +46,6 @@ const char* const kSixFonts[][2] = {
 std::string ReadFile(const fs::path& path) {
     std::ifstream stream(path, std::ios::binary);
     return std::string(std::istreambuf_iterator<char>(stream), {});
-}
-
-std::string SHA256Of(const std::string& bytes) {
-    unsigned char digest[EVP_MAX_MD_SIZE];
-    unsigned int length = 0;
-    EVP_Digest(bytes.data(), bytes.size(), digest, &length, EVP_sha256(), nullptr);
-    static const char digits[] = "0123456789abcdef";
-    std::string hex;
-    for (unsigned int i = 0; i < length; ++i) {
-        hex += digits[digest[i] >> 4];
-        hex += digits[digest[i] & 15];
-    }
-    return hex;
 }
 
 /// The CPU time of the calling thread, in nanoseconds.
@@ -160,7 +147,7 @@ struct Setup {
                       const std::string& postScriptName) {
         return "{\"LocalID\": \"" + localID + "\", \"url\": \"" + server.URL(path) +
                "\", \"size\": " + std::to_string(body.size()) + ", \"sha256\": \"" +
-               SHA256Of(body) + "\", \"fonts\": [{\"postScriptName\": \"" + postScriptName +
+               QZSHA256Hex(body) + "\", \"fonts\": [{\"postScriptName\": \"" + postScriptName +
                "\"}]}";
     }
     void WriteCatalog(const std::vector<std::string>& assets) {

@@ -12,7 +12,6 @@
 #include <filesystem>
 #include <map>
 #include <memory>
-#include <openssl/evp.h>
 #include <optional>
 #include <strings.h>
 #include <sys/stat.h>
@@ -20,6 +19,7 @@
 
 #include "desktop/QZFontFileWriter.h"
 #include "desktop/QZFontMatching.h"
+#include "desktop/QZSHA256.h"
 #include "platform/Log.h"
 #include "platform/LogEscape.h"
 
@@ -53,56 +53,6 @@ void InitializeCurlOnce() {
     std::call_once(once, [] { curl_global_init(CURL_GLOBAL_DEFAULT); });
 }
 
-std::string Hex(const unsigned char* bytes, size_t count) {
-    static const char digits[] = "0123456789abcdef";
-    std::string text;
-    text.reserve(count * 2);
-    for (size_t i = 0; i < count; ++i) {
-        text += digits[bytes[i] >> 4];
-        text += digits[bytes[i] & 15];
-    }
-    return text;
-}
-
-/// A SHA-256 computation through OpenSSL's digest interface.
-class SHA256Digest {
-public:
-    SHA256Digest() : context_(EVP_MD_CTX_new()) {
-        if (context_ && EVP_DigestInit_ex(context_, EVP_sha256(), nullptr) != 1) {
-            EVP_MD_CTX_free(context_);
-            context_ = nullptr;
-        }
-    }
-    ~SHA256Digest() { EVP_MD_CTX_free(context_); }
-    SHA256Digest(const SHA256Digest&) = delete;
-    SHA256Digest& operator=(const SHA256Digest&) = delete;
-
-    bool IsValid() const { return context_ != nullptr; }
-    void Update(const void* bytes, size_t count) {
-        if (context_ && EVP_DigestUpdate(context_, bytes, count) != 1) {
-            EVP_MD_CTX_free(context_);
-            context_ = nullptr;
-        }
-    }
-    /// The digest as 64 lower-case hexadecimal digits; empty when the computation failed.
-    std::string FinishHex() {
-        unsigned char digest[EVP_MAX_MD_SIZE];
-        unsigned int length = 0;
-        if (!context_ || EVP_DigestFinal_ex(context_, digest, &length) != 1)
-            return {};
-        return Hex(digest, length);
-    }
-
-private:
-    EVP_MD_CTX* context_;
-};
-
-std::string SHA256Hex(const std::string& bytes) {
-    SHA256Digest digest;
-    digest.Update(bytes.data(), bytes.size());
-    return digest.FinishHex();
-}
-
 /// The libcurl easy handle of one transfer, cleaned up with it.
 struct EasyHandleCleanup {
     void operator()(CURL* easy) const { curl_easy_cleanup(easy); }
@@ -118,7 +68,7 @@ QZDownloadLimits gLimits;
 struct Transfer {
     CURL* easy = nullptr;
     QZFontFileWriter* file = nullptr;
-    SHA256Digest digest;
+    QZSHA256Digest digest;
     uint64_t expectedSize = 0;
     uint64_t written = 0;
     uint64_t reported = 0;
@@ -583,7 +533,7 @@ std::string QZFontFileBaseName(const std::string& localID) {
         name = "font";
     if (changed) {
         name += '-';
-        name.append(SHA256Hex(localID), 0, 16);
+        name.append(QZSHA256Hex(localID), 0, 16);
     }
     return name;
 }

@@ -3,7 +3,6 @@
 #include <curl/curl.h>
 #include <fcntl.h>
 #include <fontconfig/fontconfig.h>
-#include <openssl/evp.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -13,6 +12,8 @@
 #include <filesystem>
 #include <fstream>
 #include <memory>
+
+#include "desktop/QZSHA256.h"
 
 namespace glyphwell::tools {
 
@@ -77,48 +78,13 @@ bool ReadFontFaces(const std::string& path, std::vector<FontFace>* faces, std::s
     return true;
 }
 
-SHA256::SHA256() : context_(EVP_MD_CTX_new()) {
-    auto* context = static_cast<EVP_MD_CTX*>(context_);
-    if (context && EVP_DigestInit_ex(context, EVP_sha256(), nullptr) != 1) {
-        EVP_MD_CTX_free(context);
-        context_ = nullptr;
-    }
-}
-
-SHA256::~SHA256() {
-    EVP_MD_CTX_free(static_cast<EVP_MD_CTX*>(context_));
-}
-
-void SHA256::Update(const void* bytes, size_t count) {
-    auto* context = static_cast<EVP_MD_CTX*>(context_);
-    if (context && EVP_DigestUpdate(context, bytes, count) != 1) {
-        EVP_MD_CTX_free(context);
-        context_ = nullptr;
-    }
-}
-
-std::string SHA256::HexDigest() {
-    unsigned char digest[EVP_MAX_MD_SIZE];
-    unsigned int length = 0;
-    auto* context = static_cast<EVP_MD_CTX*>(context_);
-    if (!context || EVP_DigestFinal_ex(context, digest, &length) != 1)
-        return {};
-    static const char digits[] = "0123456789abcdef";
-    std::string hex;
-    for (unsigned int i = 0; i < length; ++i) {
-        hex += digits[digest[i] >> 4];
-        hex += digits[digest[i] & 15];
-    }
-    return hex;
-}
-
 bool DigestFile(const std::string& path, uint64_t* size, std::string* sha256, std::string* error) {
     std::ifstream file(path, std::ios::binary);
     if (!file) {
         *error = path + ": cannot open: " + std::strerror(errno);
         return false;
     }
-    SHA256 digest;
+    QZSHA256Digest digest;
     char buffer[65536];
     *size = 0;
     while (file) {
@@ -126,7 +92,7 @@ bool DigestFile(const std::string& path, uint64_t* size, std::string* sha256, st
         digest.Update(buffer, size_t(file.gcount()));
         *size += uint64_t(file.gcount());
     }
-    *sha256 = digest.HexDigest();
+    *sha256 = digest.FinishHex();
     if (file.bad() || sha256->empty()) {
         *error = path + ": cannot read";
         return false;
@@ -183,7 +149,7 @@ namespace {
 
 /// What the transfer callbacks share.
 struct Transfer {
-    SHA256 digest;
+    QZSHA256Digest digest;
     uint64_t received = 0;
     uint64_t limit = 0;
     bool overLimit = false;
@@ -249,7 +215,7 @@ FetchResult FetchAsset(const std::string& url, uint64_t limit, const FetchProgre
     else if (status >= 400)
         result.error = "HTTP status " + std::to_string(status);
     else
-        result.sha256 = transfer.digest.HexDigest();
+        result.sha256 = transfer.digest.FinishHex();
     if (progress)
         progress(transfer.received,
                  std::chrono::duration<double>(std::chrono::steady_clock::now() - transfer.start)

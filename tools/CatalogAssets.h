@@ -24,21 +24,6 @@ struct FontFace {
 /// when fontconfig cannot read it as a font or a face has no PostScript name.
 bool ReadFontFaces(const std::string& path, std::vector<FontFace>* faces, std::string* error);
 
-/// Computes SHA-256 incrementally.
-class SHA256 {
-public:
-    SHA256();
-    ~SHA256();
-    SHA256(const SHA256&) = delete;
-    SHA256& operator=(const SHA256&) = delete;
-    void Update(const void* bytes, size_t count);
-    /// The digest as 64 lower-case hexadecimal digits; empty when the digest failed.
-    std::string HexDigest();
-
-private:
-    void* context_;
-};
-
 /// The size and SHA-256 of the file at `path`. False with a message in `*error` when it cannot
 /// be read.
 bool DigestFile(const std::string& path, uint64_t* size, std::string* sha256, std::string* error);
