@@ -165,17 +165,6 @@ TEST(DictionaryWrappers, CreatedDictionaryRetainsKeysAndValues) {
     CFRelease(value);
 }
 
-TEST(DictionaryWrappers, SetPairReplacesAndAddPairKeepsExistingValue) {
-    TCFMutableDictionary dictionary(0);
-    dictionary.SetPair(CFSTR("k"), CFSTR("one"));
-    dictionary.SetPair(CFSTR("k"), CFSTR("two"));
-    dictionary.AddPair(CFSTR("k"), CFSTR("three"));
-    dictionary.AddPair(CFSTR("other"), CFSTR("four"));
-    EXPECT_EQ(dictionary.GetCount(), 2);
-    EXPECT_TRUE(TCFSafeEqual(dictionary.GetValue(CFSTR("k")), CFSTR("two")));
-    EXPECT_TRUE(TCFSafeEqual(dictionary.GetValue(CFSTR("other")), CFSTR("four")));
-}
-
 TEST(ArrayWrappers, MutableArrayConstructors) {
     const void* values[] = {CFSTR("a"), CFSTR("b"), CFSTR("c")};
     TCFMutableArray empty(0);
@@ -201,19 +190,6 @@ TEST(ArrayWrappers, MutableArrayConstructors) {
     EXPECT_EQ(CFGetRetainCount(filled), countBefore);
     TCFMutableArray sharedNull(static_cast<CFMutableArrayRef>(nullptr));
     EXPECT_NE(sharedNull.GetMutable(), nullptr);
-}
-
-TEST(ArrayWrappers, MutableArrayAppendsInsertsAndRemoves) {
-    const void* values[] = {CFSTR("a"), CFSTR("b"), CFSTR("c")};
-    TCFArray<CFStringRef> source(values, 3, &kCFTypeArrayCallBacks);
-    TCFMutableArray array(0);
-    array.Append(CFSTR("x"));
-    array.Append(source, CFRangeMake(1, 2));
-    array.InsertValueAtIndex(0, CFSTR("y"));
-    array.RemoveValueAtIndex(1);
-    ASSERT_EQ(array.GetCount(), 3);
-    TCFDeque<CFStringRef> view(array);
-    EXPECT_EQ(Text(view.At(0)) + Text(view.At(1)) + Text(view.At(2)), "ybc");
 }
 
 TEST(ArrayWrappers, LazyArrayExistsOnlyAfterFirstAppend) {
@@ -250,35 +226,12 @@ TEST(SetWrappers, MutableSetAddsDistinctValuesAndRemoves) {
     EXPECT_NE(adopted.GetMutable(), set.GetMutable());
 }
 
-TEST(NumberWrapper, MapsSignedCharAndLongToTheirTypeCodes) {
-    TCFNumber small(SInt8(-5));
-    TCFNumber large(SInt64(1) << 40);
-    EXPECT_EQ(CFNumberGetType(small), kCFNumberCharType);
-    EXPECT_EQ(CFNumberGetType(large), kCFNumberLongType);
-    SInt64 value = 0;
-    ASSERT_TRUE(CFNumberGetValue(small, kCFNumberSInt64Type, &value));
-    EXPECT_EQ(value, -5);
-    ASSERT_TRUE(CFNumberGetValue(large, kCFNumberSInt64Type, &value));
-    EXPECT_EQ(value, SInt64(1) << 40);
-}
-
 TEST(URLWrapper, FilePathIsNeverADirectory) {
     TCFURL file(CFSTR("/tmp/folder/"), kIsFile, nullptr);
     ASSERT_NE(static_cast<CFURLRef>(file), nullptr);
     EXPECT_FALSE(CFURLHasDirectoryPath(file));
     TCFAdopted<CFStringRef> path(CFURLCopyFileSystemPath(file, kCFURLPOSIXPathStyle));
     EXPECT_EQ(Text(path), "/tmp/folder");
-}
-
-TEST(URLWrapper, RelativePathResolvesAgainstBase) {
-    TCFURL base(CFURLCreateWithString(kCFAllocatorDefault, CFSTR("file:///fonts/"), nullptr),
-                kAdopted);
-    TCFURL file(CFSTR("sub/Font.otf"), kIsFile, base);
-    TCFURL absolute(file.CopyAbsoluteURL(), kAdopted);
-    TCFURL expected(CFSTR("/fonts/sub/Font.otf"), kIsFile, nullptr);
-    EXPECT_TRUE(absolute == expected);
-    EXPECT_FALSE(absolute != expected);
-    EXPECT_TRUE(file != expected); // still relative to its base
 }
 
 TEST(UTF8Buffer, NullGivesNoTextAndEmptyGivesEmptyCString) {
