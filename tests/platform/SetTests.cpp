@@ -118,16 +118,6 @@ TEST(CFSet, NullCallbacksUsePointerIdentity) {
     EXPECT_EQ(CFGetRetainCount(five.get()), 1);
 }
 
-TEST(CFSet, ArraysAreMembersByValue) {
-    auto one = MakeInt(1), two = MakeInt(2);
-    const void* pair[] = {one.get(), two.get()};
-    auto array = Own(CFArrayCreate(nullptr, pair, 2, &kCFTypeArrayCallBacks));
-    auto equalArray = Own(CFArrayCreate(nullptr, pair, 2, &kCFTypeArrayCallBacks));
-    auto set = makeSet({array.get(), equalArray.get()});
-    EXPECT_EQ(CFSetGetCount(set.get()), 1);
-    EXPECT_TRUE(CFSetContainsValue(set.get(), equalArray.get()));
-}
-
 TEST(CFSet, LargeSetKeepsEveryMemberFindable) {
     const intptr_t count = 100000;
     std::vector<const void*> tokens;

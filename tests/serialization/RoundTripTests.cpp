@@ -21,14 +21,18 @@ public:
 
     Ref Any(int depth) {
         const int kinds = depth > 0 ? 14 : 11;
+        // Texts, numbers and data come twice as often as the other scalars.
         switch (Below(kinds)) {
         case 0:
+        case 8:
             return Text();
         case 1:
+        case 9:
             return Number();
         case 2:
             return Ref(CFRetain(Below(2) ? kCFBooleanTrue : kCFBooleanFalse));
         case 3:
+        case 10:
             return Data();
         case 4:
             return CharacterSet();
@@ -38,12 +42,6 @@ public:
             return UUID();
         case 7:
             return Error();
-        case 8:
-            return Text();
-        case 9:
-            return Number();
-        case 10:
-            return Data();
         case 11:
             return Array(depth - 1);
         case 12:
@@ -240,18 +238,6 @@ TEST(RoundTrip, WideContainersAndTextsAtTheLimits) {
         Ref string = Str(text);
         EXPECT_TRUE(CFEqual(ReadBack(FlattenedBytes(string.get())).get(), string.get()));
     }
-}
-
-TEST(RoundTrip, CharacterSetsWithEveryPlane) {
-    Ref set(CFCharacterSetCreateMutable(nullptr));
-    for (CFIndex plane = 0; plane <= 16; ++plane)
-        CFCharacterSetAddCharactersInRange(
-            const_cast<__CFCharacterSet*>(set.as<CFCharacterSetRef>()),
-            CFRangeMake(plane * 0x10000 + plane * 97, 1 + plane));
-    Ref back = ReadBack(FlattenedBytes(set.get()));
-    EXPECT_TRUE(CFEqual(back.get(), set.get()));
-    EXPECT_TRUE(
-        CFCharacterSetIsLongCharacterMember(back.as<CFCharacterSetRef>(), 0x10000 * 16 + 16 * 97));
 }
 
 TEST(RoundTrip, DeepestAcceptedNestingReadsAndReleases) {
