@@ -20,6 +20,7 @@ using glyphwell::testing::Num;
 using glyphwell::testing::Ref;
 using glyphwell::testing::Set;
 using glyphwell::testing::Str;
+using glyphwell::testing::Texts;
 
 namespace {
 
@@ -38,18 +39,6 @@ std::vector<long> Longs(CFArrayRef array) {
     for (CFIndex i = 0; i < CFArrayGetCount(array); ++i)
         values.push_back(LongOf(CFArrayGetValueAtIndex(array, i)));
     return values;
-}
-
-std::vector<std::string> Texts(CFTypeRef array) {
-    std::vector<std::string> texts;
-    for (CFIndex i = 0; i < CFArrayGetCount(static_cast<CFArrayRef>(array)); ++i) {
-        char buffer[64];
-        CFStringGetCString(
-            static_cast<CFStringRef>(CFArrayGetValueAtIndex(static_cast<CFArrayRef>(array), i)),
-            buffer, sizeof buffer, kCFStringEncodingUTF8);
-        texts.push_back(buffer);
-    }
-    return texts;
 }
 
 CFComparisonResult CompareNumbers(const void* a, const void* b, void*) {

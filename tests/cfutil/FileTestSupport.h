@@ -1,5 +1,5 @@
 // Test helpers for the file utilities: a temporary directory removed after each test, files
-// written into it, URLs and texts of values, and environment variables restored afterwards.
+// written into it, file URLs, and environment variables restored afterwards.
 #pragma once
 
 #include <cstdlib>
@@ -12,20 +12,9 @@
 
 #include "platform/PropertyValues.h"
 #include "support/ScopedEnvironment.h"
+#include "support/Values.h"
 
 namespace glyphwell::testing {
-
-/// UTF-8 text of a string value, "<null>" for null.
-inline std::string TextOf(CFTypeRef value) {
-    if (!value)
-        return "<null>";
-    CFStringRef string = CFGetTypeID(value) == CFURLGetTypeID()
-                             ? CFURLGetString(static_cast<CFURLRef>(value))
-                             : static_cast<CFStringRef>(value);
-    char buffer[4096];
-    return CFStringGetCString(string, buffer, sizeof buffer, kCFStringEncodingUTF8) ? buffer
-                                                                                    : "<?>";
-}
 
 /// A new URL of the absolute path `path` (a directory URL when `isDirectory`).
 inline CFURLRef NewFileURL(const std::string& path, bool isDirectory = false) {

@@ -15,19 +15,12 @@ using glyphwell::LogChannel;
 using glyphwell::testing::LogCapture;
 using glyphwell::testing::Ref;
 using glyphwell::testing::Str;
+using glyphwell::testing::Units;
 
 namespace {
 
 CFStringRef Unique(const std::string& bytes) {
     return TCFStringUniquer().GetUniqueString(bytes.c_str(), CFIndex(bytes.size()));
-}
-
-/// The UTF-16 units of `string`.
-std::u16string Units(CFStringRef string) {
-    std::u16string units(size_t(CFStringGetLength(string)), u'\0');
-    CFStringGetCharacters(string, CFRangeMake(0, CFIndex(units.size())),
-                          reinterpret_cast<UniChar*>(units.data()));
-    return units;
 }
 
 } // namespace

@@ -23,18 +23,12 @@ using glyphwell::testing::Ref;
 using glyphwell::testing::Str;
 using glyphwell::testing::TemporaryDirectoryTest;
 using glyphwell::testing::TextOf;
+using glyphwell::testing::Texts;
 
 namespace {
 
 Ref URL(const std::string& text) {
     return Ref(CFURLCreateWithString(nullptr, Str(text).as<CFStringRef>(), nullptr));
-}
-
-std::vector<std::string> Texts(CFArrayRef array) {
-    std::vector<std::string> texts;
-    for (CFIndex i = 0; array && i < CFArrayGetCount(array); ++i)
-        texts.push_back(TextOf(CFArrayGetValueAtIndex(array, i)));
-    return texts;
 }
 
 std::vector<std::string> ComponentPathURLs(const std::string& text) {

@@ -16,18 +16,13 @@
 #include "cfutil/TCFURL.h"
 #include "cfutil/TUTF8Buffer.h"
 #include "platform/PropertyValues.h"
+#include "support/Values.h"
 
 namespace {
 
 /// A new string with one count (not a shared constant, so its count can be watched).
 CFStringRef NewString(const char* text) {
     return CFStringCreateWithCString(kCFAllocatorDefault, text, kCFStringEncodingUTF8);
-}
-
-std::string Text(CFStringRef string) {
-    char buffer[1024];
-    return CFStringGetCString(string, buffer, sizeof buffer, kCFStringEncodingUTF8) ? buffer
-                                                                                    : "<?>";
 }
 
 // The wrappers cost one reference each (the sorted array adds its comparison and context).
@@ -231,7 +226,7 @@ TEST(URLWrapper, FilePathIsNeverADirectory) {
     ASSERT_NE(static_cast<CFURLRef>(file), nullptr);
     EXPECT_FALSE(CFURLHasDirectoryPath(file));
     TCFAdopted<CFStringRef> path(CFURLCopyFileSystemPath(file, kCFURLPOSIXPathStyle));
-    EXPECT_EQ(Text(path), "/tmp/folder");
+    EXPECT_EQ(glyphwell::testing::TextOf(path), "/tmp/folder");
 }
 
 TEST(UTF8Buffer, NullGivesNoTextAndEmptyGivesEmptyCString) {

@@ -7,10 +7,12 @@
 #include "platform/CFString.h"
 #include "tests/platform/ContainerTestSupport.h"
 #include "tests/support/LogCapture.h"
+#include "tests/support/Values.h"
 
 using glyphwell::testing::LogCapture;
 using glyphwell::testing::Own;
 using glyphwell::testing::Owned;
+using glyphwell::testing::Units;
 
 namespace {
 
@@ -23,13 +25,6 @@ Owned<CFStringRef> FromBytes(const std::string& bytes, CFStringEncoding encoding
 Owned<CFStringRef> FromUnits(const std::u16string& units) {
     return Own(CFStringCreateWithCharacters(nullptr, reinterpret_cast<const UniChar*>(units.data()),
                                             CFIndex(units.size())));
-}
-
-std::u16string Units(CFStringRef string) {
-    std::u16string units(size_t(CFStringGetLength(string)), u'\0');
-    CFStringGetCharacters(string, CFRangeMake(0, CFIndex(units.size())),
-                          reinterpret_cast<UniChar*>(units.data()));
-    return units;
 }
 
 /// The outcome of CFStringGetBytes over the whole string into a buffer of `capacity` bytes.

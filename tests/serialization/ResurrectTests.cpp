@@ -49,13 +49,6 @@ Read Dictionary(const std::vector<uint8_t>& bytes) {
     return ReadWith(bytes, [](TCFResurrectContext& c) { return c.RetrieveCFDictionary(); });
 }
 
-std::string Text(CFTypeRef string) {
-    char buffer[256] = {};
-    CFStringGetCString(static_cast<CFStringRef>(string), buffer, sizeof buffer,
-                       kCFStringEncodingUTF8);
-    return buffer;
-}
-
 } // namespace
 
 TEST(ResurrectEmptyInput, EmptyRangeReportsTypeAndTheUnexpectedTypeLine) {
@@ -78,7 +71,7 @@ TEST(ResurrectEmptyInput, NullBytesReadNothingAndLogNothing) {
 TEST(ResurrectTopLevel, ReadsTheRequestedKindOrReportsTheMismatch) {
     const auto abc = Hex("00 00 00 07 00 00 00 03 61 62 63");
     const Read string = ReadWith(abc, [](TCFResurrectContext& c) { return c.RetrieveCFString(); });
-    EXPECT_EQ(Text(string.value.get()), "abc");
+    EXPECT_EQ(TextOf(string.value.get()), "abc");
     EXPECT_TRUE(string.log.empty());
     const Read wrong = Dictionary(abc);
     EXPECT_FALSE(wrong.value);
@@ -115,7 +108,7 @@ TEST(ResurrectStrings, TextEndingTheBytesIsReadWithoutPassingTheEnd) {
     std::memcpy(bytes.get(), stream, sizeof stream);
     TCFResurrectContext context(bytes.get(), sizeof stream);
     Ref value(context.RetrieveCFString());
-    EXPECT_EQ(Text(value.get()), "end");
+    EXPECT_EQ(TextOf(value.get()), "end");
     EXPECT_FALSE(context.IsCorrupted());
 }
 
@@ -139,7 +132,7 @@ TEST(ResurrectStrings, InvalidUTF8IsANullElementWithoutCorruption) {
 
 TEST(ResurrectStrings, ByteOrderMarkIsNotPartOfTheText) {
     const Read marked = Any(Hex("00 00 00 07 00 00 00 04 EF BB BF 78"));
-    EXPECT_EQ(Text(marked.value.get()), "x");
+    EXPECT_EQ(TextOf(marked.value.get()), "x");
     const Read onlyMark = Any(Hex("00 00 00 07 00 00 00 03 EF BB BF"));
     EXPECT_EQ(onlyMark.value.get(), CFSTR(""));
     EXPECT_TRUE(marked.log.empty());
@@ -206,7 +199,7 @@ TEST(ResurrectErrors, NeedANonEmptyDomain) {
     const Read error = Any(Hex("00 00 01 04 FF FF FF FE 00 00 00 07 00 00 00 01 44"));
     ASSERT_TRUE(error.value);
     EXPECT_EQ(CFErrorGetCode(error.value.as<CFErrorRef>()), -2);
-    EXPECT_EQ(Text(CFErrorGetDomain(error.value.as<CFErrorRef>())), "D");
+    EXPECT_EQ(TextOf(CFErrorGetDomain(error.value.as<CFErrorRef>())), "D");
     const Read empty = Any(Hex("00 00 01 04 00 00 00 01 00 00 00 07 00 00 00 00"));
     EXPECT_FALSE(empty.value);
     EXPECT_TRUE(empty.log.empty());

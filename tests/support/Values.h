@@ -66,6 +66,39 @@ inline Ref Set(std::initializer_list<CFTypeRef> items) {
     return Ref(CFSetCreate(nullptr, values.data(), CFIndex(values.size()), &kCFTypeSetCallBacks));
 }
 
+/// UTF-8 text of a string value or of a URL's string, "<null>" for null.
+inline std::string TextOf(CFTypeRef value) {
+    if (!value)
+        return "<null>";
+    CFStringRef string = CFGetTypeID(value) == CFURLGetTypeID()
+                             ? CFURLGetString(static_cast<CFURLRef>(value))
+                             : static_cast<CFStringRef>(value);
+    std::string buffer(size_t(CFStringGetMaximumSizeForEncoding(CFStringGetLength(string),
+                                                                kCFStringEncodingUTF8)) +
+                           1,
+                       '\0');
+    if (!CFStringGetCString(string, buffer.data(), CFIndex(buffer.size()), kCFStringEncodingUTF8))
+        return "<?>";
+    buffer.resize(std::char_traits<char>::length(buffer.c_str()));
+    return buffer;
+}
+
+/// The texts of the elements of an array (none for null).
+inline std::vector<std::string> Texts(CFTypeRef array) {
+    std::vector<std::string> texts;
+    for (CFIndex i = 0; array && i < CFArrayGetCount(static_cast<CFArrayRef>(array)); ++i)
+        texts.push_back(TextOf(CFArrayGetValueAtIndex(static_cast<CFArrayRef>(array), i)));
+    return texts;
+}
+
+/// The UTF-16 units of a string.
+inline std::u16string Units(CFStringRef string) {
+    std::u16string units(size_t(CFStringGetLength(string)), u'\0');
+    CFStringGetCharacters(string, CFRangeMake(0, CFIndex(units.size())),
+                          reinterpret_cast<UniChar*>(units.data()));
+    return units;
+}
+
 /// Bytes from a hex text such as "00 00 00 07 61".
 inline std::vector<uint8_t> Hex(const std::string& text) {
     std::vector<uint8_t> bytes;
