@@ -4,7 +4,6 @@
 #include <clocale>
 #include <cstring>
 #include <string>
-#include <thread>
 #include <vector>
 
 #include <gtest/gtest.h>
@@ -99,20 +98,6 @@ TEST(SharedBooleanNumbers, EachCallReturnsTheSameIntegerNumberWithOneMoreCount) 
     Ref no(TCFNumber::CreateFromBoolean(false));
     EXPECT_NE(no.get(), first);
     EXPECT_FALSE(TCFTypeRef::GetBooleanValue(no.get()));
-}
-
-TEST(SharedBooleanNumbers, ConcurrentFirstCallsAllGetTheSameNumber) {
-    std::vector<CFNumberRef> numbers(8);
-    std::vector<std::thread> threads;
-    for (size_t i = 0; i < numbers.size(); ++i)
-        threads.emplace_back([&numbers, i] { numbers[i] = TCFNumber::CreateFromBoolean(i % 2); });
-    for (std::thread& thread : threads)
-        thread.join();
-    EXPECT_NE(numbers[0], numbers[1]);
-    for (size_t i = 0; i < numbers.size(); ++i) {
-        EXPECT_EQ(numbers[i], numbers[i % 2]);
-        CFRelease(numbers[i]);
-    }
 }
 
 // ---------------------------------------------------------------------------------------------
