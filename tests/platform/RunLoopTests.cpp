@@ -3,7 +3,9 @@
 
 #include <unistd.h>
 
+#include <fstream>
 #include <future>
+#include <string>
 #include <thread>
 
 #include "platform/CFMessagePort.h"
@@ -29,6 +31,15 @@ struct Pipe {
     }
     int read = -1, write = -1;
 };
+
+/// Whether thread `tid` of this process is asleep in the kernel (state S in its stat line).
+bool IsBlocked(pid_t tid) {
+    std::ifstream stat("/proc/self/task/" + std::to_string(tid) + "/stat");
+    std::string line;
+    std::getline(stat, line);
+    const size_t end = line.rfind(')'); // the command name may hold spaces and parentheses
+    return end != std::string::npos && end + 2 < line.size() && line[end + 2] == 'S';
+}
 
 } // namespace
 
@@ -87,8 +98,11 @@ TEST(PollRunLoopDriver, WakeEndsAWaitFromAnotherThread) {
     Pipe idle;
     bool called = false;
     driver.Watch(idle.read, true, false, [&](bool, bool) { called = true; });
+    // Wake once this thread is blocked in the wait, so that the wake has to end it.
+    const pid_t waiter = gettid();
     std::thread waker([&] {
-        std::this_thread::sleep_for(std::chrono::milliseconds(50));
+        while (!IsBlocked(waiter))
+            std::this_thread::yield();
         driver.Wake();
     });
     EXPECT_TRUE(driver.RunOnce(-1));
