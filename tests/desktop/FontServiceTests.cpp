@@ -647,6 +647,18 @@ TEST_F(FontDownloaderTest, ASecondRequestForTheSameAssetSharesTheFirstTransfer) 
     EXPECT_EQ(second.outcome, QZFontDownloadOutcome::Installed) << second.failureReason;
     EXPECT_EQ(second.path, first.path);
     EXPECT_EQ(lastReported, bold.size());
+
+    // Another version of the asset waits for the transfer in progress, then fetches its own.
+    const std::string serif = ReadFile(kDejaVu + "DejaVuSerif.ttf");
+    const std::string v2 = Serve("/v2", serif);
+    std::thread older([&] { first = Download(url, bold, "bold"); });
+    ASSERT_TRUE(server_.WaitForRequests("/shared", 2, kRunTimeout));
+    const QZFontDownloadResult newer = Download(v2, serif, "bold", {"DejaVuSerif"});
+    older.join();
+    EXPECT_EQ(first.outcome, QZFontDownloadOutcome::Installed) << first.failureReason;
+    ASSERT_EQ(newer.outcome, QZFontDownloadOutcome::Installed) << newer.failureReason;
+    EXPECT_EQ(server_.RequestCount("/v2"), 1);
+    EXPECT_TRUE(ReadFile(QString::fromStdString(newer.path)) == serif);
 }
 
 TEST(FontFileNames, KeepSafeLocalIDsAndMarkChangedOnesWithAHash) {
