@@ -427,8 +427,9 @@ class FontDownloaderTest : public FontServiceTest {
 protected:
     void TearDown() override {
         QZSetDownloadLimits({});
-        for (auto operation : {QZFontFileOperation::Write, QZFontFileOperation::Sync,
-                               QZFontFileOperation::Link, QZFontFileOperation::Rename})
+        for (auto operation :
+             {QZFontFileOperation::Write, QZFontFileOperation::Sync, QZFontFileOperation::Link,
+              QZFontFileOperation::Rename, QZFontFileOperation::Lock})
             QZInjectFontFileFault(operation, 0);
         FontServiceTest::TearDown();
     }
@@ -581,6 +582,17 @@ TEST_F(FontDownloaderTest, AKilledWriterLeavesNothingOnceTheNextDownloadStarts) 
         EXPECT_EQ(log.Texts().size(), kind == 'n' ? 1u : 0u);
         QFile::remove(fonts_ + "/glyphwell/mono.ttf");
     }
+}
+
+TEST_F(FontDownloaderTest, ANamedTemporaryThatCannotBeLockedIsRemovedAtOnce) {
+    // Unlocked, it would pass for a dead writer's leftover; each retry would leave one more.
+    const std::string directory = QZFontInstallDirectory();
+    ASSERT_TRUE(QDir().mkpath(QString::fromStdString(directory)));
+    QZInjectFontFileFault(QZFontFileOperation::Lock, ENOLCK);
+    QZFontFileWriter writer;
+    EXPECT_FALSE(writer.Open(directory, "unlocked", false));
+    EXPECT_EQ(errno, ENOLCK);
+    EXPECT_TRUE(DownloadFolder().isEmpty());
 }
 
 TEST_F(FontDownloaderTest, SlowAndSilentServersAreGivenUpAndCancelWorksMeanwhile) {
