@@ -172,32 +172,42 @@ int WaitFor(int descriptor, short events, const Deadline& deadline) {
     }
 }
 
-/// A connected stream socket to `path`, or -1 when nothing listens there (or the connect fails
-/// otherwise). The socket blocks; each call says whether it may wait (MSG_DONTWAIT).
-int ConnectTo(const std::string& path) {
+/// A connected stream socket to `path`, or -1 with `*error` set: ENOENT or ECONNREFUSED when
+/// nothing listens there, EAGAIN when the server's queue of connections to accept stayed full
+/// until `deadline`. The socket blocks; each call says whether it may wait (MSG_DONTWAIT).
+int ConnectTo(const std::string& path, const Deadline& deadline, int* error) {
     sockaddr_un address;
-    if (!MakeAddress(path, &address))
+    if (!MakeAddress(path, &address)) {
+        *error = ENAMETOOLONG;
         return -1;
-    const int descriptor = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    if (descriptor < 0)
-        return -1;
-    if (connect(descriptor, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
-        bool connected = false;
-        if (errno == EINTR) {
-            // The connect goes on in the background: wait for it and ask how it ended.
-            pollfd entry{descriptor, POLLOUT, 0};
-            while (poll(&entry, 1, -1) < 0 && errno == EINTR) {
-            }
-            int error = 0;
-            socklen_t size = sizeof error;
-            connected =
-                getsockopt(descriptor, SOL_SOCKET, SO_ERROR, &error, &size) == 0 && error == 0;
-        }
-        if (!connected) {
-            CloseDescriptor(descriptor);
-            return -1;
-        }
     }
+    const int descriptor = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    if (descriptor < 0) {
+        *error = errno;
+        return -1;
+    }
+    for (;;) {
+        // connect waits while the server's queue is full, for as long as the send timeout of
+        // the socket allows (zero: without limit; the shortest limit when the deadline passed).
+        const int milliseconds = deadline.RemainingMilliseconds();
+        timeval limit{};
+        if (milliseconds >= 0) {
+            limit.tv_sec = milliseconds / 1000;
+            limit.tv_usec = milliseconds == 0 ? 1 : (milliseconds % 1000) * 1000;
+        }
+        setsockopt(descriptor, SOL_SOCKET, SO_SNDTIMEO, &limit, sizeof limit);
+        if (connect(descriptor, reinterpret_cast<const sockaddr*>(&address), sizeof address) == 0 ||
+            errno == EISCONN)
+            break;
+        // An interrupted connect of a Unix socket has not begun: it is simply made again.
+        if (errno == EINTR)
+            continue;
+        *error = errno;
+        CloseDescriptor(descriptor);
+        return -1;
+    }
+    const timeval none{};
+    setsockopt(descriptor, SOL_SOCKET, SO_SNDTIMEO, &none, sizeof none);
     return descriptor;
 }
 
@@ -565,7 +575,8 @@ private:
 
     // Remote ports.
     int RemoteDescriptor();
-    int Reconnect();
+    /// A new connection replacing the kept one, or -1 with `*error` set (see ConnectTo).
+    int Reconnect(const Deadline& deadline, int* error);
     bool SendRequestFrame(const uint8_t* header, const UInt8* body, size_t bodyLength,
                           CFTimeInterval sendTimeout, int* connection, SInt32* status);
     SInt32 ReceiveReply(int connection, CFTimeInterval receiveTimeout, CFDataRef* returnData);
@@ -1171,8 +1182,8 @@ void __CFMessagePort::CloseRemoteDescriptor() {
     descriptor = -1;
 }
 
-int __CFMessagePort::Reconnect() {
-    const int connected = ConnectTo(socketPath);
+int __CFMessagePort::Reconnect(const Deadline& deadline, int* error) {
+    const int connected = ConnectTo(socketPath, deadline, error);
     std::lock_guard<std::mutex> lock(descriptorMutex);
     CloseDescriptor(descriptor);
     descriptor = -1;
@@ -1254,9 +1265,12 @@ bool __CFMessagePort::SendRequestFrame(const uint8_t* header, const UInt8* body,
     for (int attempt = 0;; ++attempt) {
         bool fresh = false;
         if (*connection < 0) {
-            *connection = Reconnect();
+            int error = 0;
+            *connection = Reconnect(sendDeadline, &error);
             if (*connection < 0) {
-                *status = valid ? kCFMessagePortTransportError : kCFMessagePortIsInvalid;
+                *status = !valid            ? kCFMessagePortIsInvalid
+                          : error == EAGAIN ? kCFMessagePortSendTimeout
+                                            : kCFMessagePortTransportError;
                 return false;
             }
             fresh = true;
@@ -1410,8 +1424,11 @@ CFMessagePortRef CFMessagePortCreateRemote(CFAllocatorRef, CFStringRef name) {
     const std::string path = glyphwell::port::SocketPathForName(text);
     if (path.empty())
         return nullptr;
-    const int connection = ConnectTo(path);
-    if (connection < 0)
+    // A server too busy to accept at once is still a server: the connection is then made by the
+    // first request, within its send timeout.
+    int error = 0;
+    const int connection = ConnectTo(path, Deadline(0), &error);
+    if (connection < 0 && error != EAGAIN)
         return nullptr;
     auto* port = new __CFMessagePort(name, text, true);
     port->socketPath = path;

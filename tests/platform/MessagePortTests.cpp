@@ -546,6 +546,32 @@ TEST_F(MessagePortTest, ReportsEachWayAServerCanFail) {
               kCFMessagePortSendTimeout);
     CFRelease(large);
 
+    // A server too busy to accept (its queue of connections is full): the port is still made at
+    // once, and a request that cannot connect in time is a send timeout.
+    ASSERT_EQ(listen(listener, 0), 0);
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    std::memcpy(address.sun_path, SocketPath().c_str(), SocketPath().size());
+    std::vector<int> queued;
+    do
+        queued.push_back(socket(AF_UNIX, SOCK_STREAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0));
+    while (queued.size() < 64 &&
+           connect(queued.back(), reinterpret_cast<sockaddr*>(&address), sizeof address) == 0);
+    ASSERT_EQ(errno, EAGAIN);
+    std::future<CFMessagePortRef> busy =
+        std::async(std::launch::async, [] { return CreateRemote(kName); });
+    const bool prompt = busy.wait_for(std::chrono::seconds(5)) == std::future_status::ready;
+    EXPECT_TRUE(prompt) << "waited for the server to accept";
+    while (!prompt && busy.wait_for(std::chrono::milliseconds(10)) != std::future_status::ready)
+        close(accept(listener, nullptr, nullptr)); // lets the waiting connect through
+    CFMessagePortRef busyRemote = busy.get();
+    ASSERT_NE(busyRemote, nullptr);
+    EXPECT_EQ(CFMessagePortSendRequest(busyRemote, 1, data, 0.1, 1, kCFRunLoopDefaultMode, &reply),
+              kCFMessagePortSendTimeout);
+    CFRelease(busyRemote);
+    for (const int descriptor : queued)
+        close(descriptor);
+
     // Nothing listens any more.
     close(listener);
     EXPECT_EQ(CFMessagePortSendRequest(remote, 1, data, 1, 1, kCFRunLoopDefaultMode, &reply),
