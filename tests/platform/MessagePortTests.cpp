@@ -449,16 +449,21 @@ TEST_F(MessagePortTest, TakesOverAStaleSocketFileButNoOtherFile) {
         EXPECT_EQ(Send(kName, 1, "x").bytes, "x@1");
     }
 
+    // In a runtime directory whose path could forge a log line, the line shows it escaped.
+    const std::string directory = runtime_.Path() + "/run\nforged";
+    ASSERT_EQ(mkdir(directory.c_str(), 0700), 0);
+    setenv("XDG_RUNTIME_DIR", directory.c_str(), 1);
     LogCapture log;
-    std::ofstream(SocketPath()) << "keep me";
+    std::ofstream(directory + "/" + kName) << "keep me";
     CFStringRef name = CreateCFString(kName);
     EXPECT_EQ(CFMessagePortCreateLocal(kCFAllocatorDefault, name, nullptr, nullptr, nullptr),
               nullptr);
     CFRelease(name);
+    setenv("XDG_RUNTIME_DIR", runtime_.Path().c_str(), 1);
     EXPECT_EQ(log.Texts(),
-              (std::vector<std::string>{"message port org.glyphwell.Test.Port: " + SocketPath() +
-                                        " exists and is not a socket"}));
-    std::ifstream kept(SocketPath());
+              (std::vector<std::string>{"message port org.glyphwell.Test.Port: " + runtime_.Path() +
+                                        "/run\\nforged/" + kName + " exists and is not a socket"}));
+    std::ifstream kept(directory + "/" + kName);
     std::string text;
     std::getline(kept, text);
     EXPECT_EQ(text, "keep me");
