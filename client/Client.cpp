@@ -11,6 +11,7 @@
 #include <time.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
 #include <filesystem>
@@ -103,6 +104,9 @@ CFDictionaryRef CreateFontAttributes(const Font& font) {
         attributes.Add(NSFontFamilyAttribute, CreateString(font.family));
     return attributes.Create();
 }
+
+/// How often a call retries connecting to an agent too busy to accept it.
+constexpr long long kBusyRetryMilliseconds = 10;
 
 /// Milliseconds of the monotonic clock.
 long long NowMilliseconds() {
@@ -281,11 +285,12 @@ int glyphwell_call::Connect(const char* portName) {
     std::memcpy(address.sun_path, path.c_str(), path.size() + 1);
     if (connect(fd, reinterpret_cast<const sockaddr*>(&address), sizeof address) == 0)
         return GLYPHWELL_IN_PROGRESS;
-    if (errno == EINPROGRESS || errno == EAGAIN) {
-        // A full listen queue: writable once the agent accepts.
+    if (errno == EINPROGRESS) {
         stage = Stage::kConnecting;
         return GLYPHWELL_IN_PROGRESS;
     }
+    // EAGAIN: the agent's queue of connections is full. A Unix socket then has no connect in
+    // progress that could end later: the caller learns it at once (TRANSPORT, errno EAGAIN).
     const int error = errno;
     Finish(error == ENOENT || error == ECONNREFUSED || error == ENOTDIR
                ? GLYPHWELL_ERROR_NOT_RUNNING
@@ -542,6 +547,20 @@ int glyphwell_request_send(glyphwell_request* request, const char* port_name, in
     glyphwell_call* call = nullptr;
     int status = glyphwell_call_start(request, port_name, &call);
     const long long deadline = timeout_ms < 0 ? -1 : NowMilliseconds() + timeout_ms;
+    // An agent too busy to accept the connection is tried again, every few milliseconds.
+    while (status == GLYPHWELL_ERROR_TRANSPORT && errno == EAGAIN) {
+        long long wait = kBusyRetryMilliseconds;
+        if (deadline >= 0) {
+            const long long left = deadline - NowMilliseconds();
+            if (left <= 0) {
+                status = GLYPHWELL_ERROR_TIMED_OUT;
+                break;
+            }
+            wait = std::min(wait, left);
+        }
+        poll(nullptr, 0, int(wait));
+        status = glyphwell_call_start(request, port_name, &call);
+    }
     while (status >= 0) {
         status = glyphwell_call_dispatch(call, reply);
         if (status != GLYPHWELL_IN_PROGRESS)

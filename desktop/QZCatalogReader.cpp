@@ -37,7 +37,9 @@ public:
                 return recent;
         if (text.empty())
             return {};
-        if (blocks_.empty() || kArenaBlockSize - used_ < text.size()) {
+        // A string longer than a block gets a block of its own, full from the start.
+        const size_t room = used_ < kArenaBlockSize ? kArenaBlockSize - used_ : 0;
+        if (blocks_.empty() || room < text.size()) {
             blocks_.push_back(std::make_unique<char[]>(std::max(kArenaBlockSize, text.size())));
             used_ = 0;
         }

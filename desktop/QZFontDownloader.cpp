@@ -456,10 +456,15 @@ QZFontDownloadResult DownloadAsOwner(const QZFontAssetDownload& asset, const std
 }
 
 /// Waits for another thread's download of the asset, reporting its progress; its outcome when it
-/// applies to this request, nothing when this request must download on its own.
+/// applies to this request, nothing when this request must download on its own (the other one
+/// was cancelled or stopped, or fetched another version of the asset into the same file).
 std::optional<QZFontDownloadResult> WaitForShared(SharedDownload& shared,
+                                                  const QZFontAssetDownload& asset,
                                                   const QZDownloadProgressFunction& progress,
                                                   QZDownloadCancellation* cancellation) {
+    // The size and checksum are set before the download is shared and never change.
+    const bool sameVersion =
+        shared.size == asset.size && strcasecmp(shared.sha256.c_str(), asset.sha256.c_str()) == 0;
     uint64_t reported = 0;
     std::unique_lock<std::mutex> lock(shared.mutex);
     for (;;) {
@@ -467,7 +472,7 @@ std::optional<QZFontDownloadResult> WaitForShared(SharedDownload& shared,
             return QZFontDownloadResult{QZFontDownloadOutcome::Cancelled, {}, {}};
         if (shared.done)
             break;
-        if (shared.received != reported) {
+        if (sameVersion && shared.received != reported) {
             reported = shared.received;
             lock.unlock();
             const bool goOn = !progress || progress(reported);
@@ -481,7 +486,7 @@ std::optional<QZFontDownloadResult> WaitForShared(SharedDownload& shared,
     }
     const QZFontDownloadResult& result = shared.result;
     if (result.outcome == QZFontDownloadOutcome::Cancelled ||
-        result.outcome == QZFontDownloadOutcome::Stopped)
+        result.outcome == QZFontDownloadOutcome::Stopped || !sameVersion)
         return std::nullopt;
     return result;
 }
@@ -579,7 +584,8 @@ QZFontDownloadResult QZDownloadFontAsset(const QZFontAssetDownload& asset,
         }
         if (owner)
             return DownloadAsOwner(asset, directory, progress, cancellation, key, *shared);
-        std::optional<QZFontDownloadResult> result = WaitForShared(*shared, progress, cancellation);
+        std::optional<QZFontDownloadResult> result =
+            WaitForShared(*shared, asset, progress, cancellation);
         if (result)
             return *result;
         // The other transfer was cancelled or stopped by its owner, or fetched another version.

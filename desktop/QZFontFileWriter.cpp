@@ -19,7 +19,7 @@ constexpr mode_t kFontFileMode = 0644;
 constexpr size_t kRandomSuffixLength = 6; ///< as mkostemp's "XXXXXX"
 constexpr int kLinkAttempts = 100;
 
-std::array<std::atomic<int>, 4> gInjectedFaults{};
+std::array<std::atomic<int>, 5> gInjectedFaults{};
 
 /// The injected error of `operation`; 0 when none.
 int InjectedFault(QZFontFileOperation operation) {
@@ -138,21 +138,36 @@ bool QZFontFileWriter::OpenUnnamed(const std::string& directory) {
 
 bool QZFontFileWriter::OpenNamed(const std::string& directory, const std::string& baseName) {
     // The leading dot keeps fontconfig from scanning a file that is still being written.
-    for (;;) {
+    for (int attempt = 0; attempt < kLinkAttempts; ++attempt) {
         std::string pattern = directory + "/." + baseName + ".XXXXXX";
         fd_ = mkostemp(pattern.data(), O_CLOEXEC);
         if (fd_ < 0)
             return false;
+        // A file that cannot be locked would be taken for a leftover: it is removed at once.
+        struct stat status {};
+        int error = InjectedFault(QZFontFileOperation::Lock);
+        if (error == 0) {
+            int locked;
+            while ((locked = flock(fd_, LOCK_EX)) != 0 && errno == EINTR) {
+            }
+            if (locked != 0 || fstat(fd_, &status) != 0)
+                error = errno;
+        }
+        if (error != 0) {
+            unlink(pattern.c_str());
+            Close();
+            return Fail(error);
+        }
         // A cleaner may have taken the new file for a leftover before the lock was held: then it
         // is gone from the directory, and another name is tried.
-        struct stat status {};
-        if (flock(fd_, LOCK_EX) == 0 && fstat(fd_, &status) == 0 && status.st_nlink > 0) {
+        if (status.st_nlink > 0) {
             path_ = pattern;
             fchmod(fd_, kFontFileMode);
             return true;
         }
         Close();
     }
+    return Fail(EAGAIN);
 }
 
 void QZFontFileWriter::Close() {

@@ -11,7 +11,7 @@
 #include <string>
 
 /// The file operations of the installer whose failure tests inject.
-enum class QZFontFileOperation { Write, Sync, Link, Rename };
+enum class QZFontFileOperation { Write, Sync, Link, Rename, Lock };
 
 /// For tests: makes every later call of `operation` by any writer fail with `error` (an errno
 /// value, e.g. ENOSPC for a full disk), until it is called again with 0. Thread-safe.

@@ -172,32 +172,42 @@ int WaitFor(int descriptor, short events, const Deadline& deadline) {
     }
 }
 
-/// A connected stream socket to `path`, or -1 when nothing listens there (or the connect fails
-/// otherwise). The socket blocks; each call says whether it may wait (MSG_DONTWAIT).
-int ConnectTo(const std::string& path) {
+/// A connected stream socket to `path`, or -1 with `*error` set: ENOENT or ECONNREFUSED when
+/// nothing listens there, EAGAIN when the server's queue of connections to accept stayed full
+/// until `deadline`. The socket blocks; each call says whether it may wait (MSG_DONTWAIT).
+int ConnectTo(const std::string& path, const Deadline& deadline, int* error) {
     sockaddr_un address;
-    if (!MakeAddress(path, &address))
+    if (!MakeAddress(path, &address)) {
+        *error = ENAMETOOLONG;
         return -1;
-    const int descriptor = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    if (descriptor < 0)
-        return -1;
-    if (connect(descriptor, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
-        bool connected = false;
-        if (errno == EINTR) {
-            // The connect goes on in the background: wait for it and ask how it ended.
-            pollfd entry{descriptor, POLLOUT, 0};
-            while (poll(&entry, 1, -1) < 0 && errno == EINTR) {
-            }
-            int error = 0;
-            socklen_t size = sizeof error;
-            connected =
-                getsockopt(descriptor, SOL_SOCKET, SO_ERROR, &error, &size) == 0 && error == 0;
-        }
-        if (!connected) {
-            CloseDescriptor(descriptor);
-            return -1;
-        }
     }
+    const int descriptor = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    if (descriptor < 0) {
+        *error = errno;
+        return -1;
+    }
+    for (;;) {
+        // connect waits while the server's queue is full, for as long as the send timeout of
+        // the socket allows (zero: without limit; the shortest limit when the deadline passed).
+        const int milliseconds = deadline.RemainingMilliseconds();
+        timeval limit{};
+        if (milliseconds >= 0) {
+            limit.tv_sec = milliseconds / 1000;
+            limit.tv_usec = milliseconds == 0 ? 1 : (milliseconds % 1000) * 1000;
+        }
+        setsockopt(descriptor, SOL_SOCKET, SO_SNDTIMEO, &limit, sizeof limit);
+        if (connect(descriptor, reinterpret_cast<const sockaddr*>(&address), sizeof address) == 0 ||
+            errno == EISCONN)
+            break;
+        // An interrupted connect of a Unix socket has not begun: it is simply made again.
+        if (errno == EINTR)
+            continue;
+        *error = errno;
+        CloseDescriptor(descriptor);
+        return -1;
+    }
+    const timeval none{};
+    setsockopt(descriptor, SOL_SOCKET, SO_SNDTIMEO, &none, sizeof none);
     return descriptor;
 }
 
@@ -378,12 +388,13 @@ bool ClearStaleSocket(const std::string& portName, const std::string& path,
     if (lstat(path.c_str(), &status) != 0) {
         if (errno == ENOENT)
             return true;
-        AppLog("message port %s: cannot check %s: %s", portName.c_str(), path.c_str(),
+        AppLog("message port %s: cannot check %s: %s", portName.c_str(), LogEscape(path).c_str(),
                ErrorText(errno).c_str());
         return false;
     }
     if (!S_ISSOCK(status.st_mode)) {
-        AppLog("message port %s: %s exists and is not a socket", portName.c_str(), path.c_str());
+        AppLog("message port %s: %s exists and is not a socket", portName.c_str(),
+               LogEscape(path).c_str());
         return false;
     }
     const int probe = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
@@ -397,13 +408,13 @@ bool ClearStaleSocket(const std::string& portName, const std::string& path,
     if (result == 0 || error == EAGAIN || error == EINPROGRESS)
         return false; // the name is taken by a running server
     if (error != ECONNREFUSED) {
-        AppLog("message port %s: cannot check %s: %s", portName.c_str(), path.c_str(),
+        AppLog("message port %s: cannot check %s: %s", portName.c_str(), LogEscape(path).c_str(),
                ErrorText(error).c_str());
         return false;
     }
     if (unlink(path.c_str()) != 0 && errno != ENOENT) {
         AppLog("message port %s: cannot remove the stale socket %s: %s", portName.c_str(),
-               path.c_str(), ErrorText(errno).c_str());
+               LogEscape(path).c_str(), ErrorText(errno).c_str());
         return false;
     }
     return true;
@@ -420,7 +431,7 @@ int BindAndListen(const std::string& portName, const std::string& path, const so
     }
     if (bind(descriptor, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
         if (errno != EADDRINUSE)
-            AppLog("message port %s: cannot bind %s: %s", portName.c_str(), path.c_str(),
+            AppLog("message port %s: cannot bind %s: %s", portName.c_str(), LogEscape(path).c_str(),
                    ErrorText(errno).c_str());
         CloseDescriptor(descriptor);
         return -1;
@@ -428,8 +439,8 @@ int BindAndListen(const std::string& portName, const std::string& path, const so
     chmod(path.c_str(), 0600);
     struct stat status;
     if (listen(descriptor, SOMAXCONN) != 0 || stat(path.c_str(), &status) != 0) {
-        AppLog("message port %s: cannot listen on %s: %s", portName.c_str(), path.c_str(),
-               ErrorText(errno).c_str());
+        AppLog("message port %s: cannot listen on %s: %s", portName.c_str(),
+               LogEscape(path).c_str(), ErrorText(errno).c_str());
         unlink(path.c_str());
         CloseDescriptor(descriptor);
         return -1;
@@ -439,7 +450,8 @@ int BindAndListen(const std::string& portName, const std::string& path, const so
     return descriptor;
 }
 
-/// Binds and listens on `path`, taking over a stale socket file. Returns the listening socket
+/// Binds and listens on `path`, taking over a stale socket file. `portName` is the name as log
+/// lines show it (escaped), as in the helpers above. Returns the listening socket
 /// and the file's identity, or -1 (after one log line unless a live server has the name).
 int BindListeningSocket(const std::string& portName, const std::string& path, dev_t* device,
                         ino_t* inode) {
@@ -491,6 +503,7 @@ struct __CFMessagePort final : CFObject {
 
     const CFStringRef name;
     const std::string nameText;
+    const std::string logName = LogEscape(nameText); ///< the name as log lines show it
     const bool remote;
     std::atomic<bool> valid{true};
 
@@ -565,7 +578,8 @@ private:
 
     // Remote ports.
     int RemoteDescriptor();
-    int Reconnect();
+    /// A new connection replacing the kept one, or -1 with `*error` set (see ConnectTo).
+    int Reconnect(const Deadline& deadline, int* error);
     bool SendRequestFrame(const uint8_t* header, const UInt8* body, size_t bodyLength,
                           CFTimeInterval sendTimeout, int* connection, SInt32* status);
     SInt32 ReceiveReply(int connection, CFTimeInterval receiveTimeout, CFDataRef* returnData);
@@ -692,12 +706,12 @@ void __CFMessagePort::OnListenEvent() {
                 CloseDescriptor(client);
                 spareDescriptor = open("/dev/null", O_RDONLY | O_CLOEXEC);
                 AppLog("message port %s: out of file descriptors; refused a connection",
-                       nameText.c_str());
+                       logName.c_str());
                 continue;
             }
             // The socket stays readable: say it once, not on every round of the loop.
             if (error != lastAcceptError)
-                AppLog("message port %s: cannot accept a connection: %s", nameText.c_str(),
+                AppLog("message port %s: cannot accept a connection: %s", logName.c_str(),
                        ErrorText(error).c_str());
             lastAcceptError = error;
             return;
@@ -706,13 +720,13 @@ void __CFMessagePort::OnListenEvent() {
         ucred credentials{};
         socklen_t size = sizeof credentials;
         if (getsockopt(client, SOL_SOCKET, SO_PEERCRED, &credentials, &size) != 0) {
-            AppLog("message port %s: cannot identify a client: %s", nameText.c_str(),
+            AppLog("message port %s: cannot identify a client: %s", logName.c_str(),
                    ErrorText(errno).c_str());
             CloseDescriptor(client);
             continue;
         }
         if (credentials.uid != geteuid()) {
-            AppLog("message port %s: refused a connection from uid %u", nameText.c_str(),
+            AppLog("message port %s: refused a connection from uid %u", logName.c_str(),
                    unsigned(credentials.uid));
             CloseDescriptor(client);
             continue;
@@ -726,7 +740,7 @@ void __CFMessagePort::Accept(int client, const ucred& credentials) {
     epoll_event event{};
     event.data.fd = client;
     if (epoll_ctl(hangUps, EPOLL_CTL_ADD, client, &event) != 0) {
-        AppLog("message port %s: cannot watch a connection: %s", nameText.c_str(),
+        AppLog("message port %s: cannot watch a connection: %s", logName.c_str(),
                ErrorText(errno).c_str());
         CloseDescriptor(client);
         return;
@@ -767,7 +781,7 @@ void __CFMessagePort::ReadAvailable(const ConnectionPtr& connection) {
             if (connection->input.Failed()) {
                 AppLog("message port %s: closed a connection whose request announced %u bytes "
                        "(the limit is %u)",
-                       nameText.c_str(), unsigned(connection->input.RefusedLength()),
+                       logName.c_str(), unsigned(connection->input.RefusedLength()),
                        unsigned(kMessagePortMaxFrame));
                 Drop(connection);
                 return;
@@ -798,7 +812,7 @@ void __CFMessagePort::EndOfStream(const ConnectionPtr& connection) {
     // unfinished can never be completed.
     if (connection->input.IsMidFrame()) {
         AppLog("message port %s: a client disconnected in the middle of a request",
-               nameText.c_str());
+               logName.c_str());
         connection->input.DropPartial();
     }
     connection->readClosed = true;
@@ -839,7 +853,7 @@ void __CFMessagePort::EnforceUnfinishedLimit() {
             return;
         AppLog("message port %s: unfinished requests held %zu bytes (the limit is %zu); closed "
                "the connection holding %zu of them",
-               nameText.c_str(), unfinishedBytes, unfinishedLimit, largest->unfinishedCounted);
+               logName.c_str(), unfinishedBytes, unfinishedLimit, largest->unfinishedCounted);
         Drop(largest);
     }
 }
@@ -873,7 +887,7 @@ void __CFMessagePort::OnStallTimer() {
     const double seconds = std::chrono::duration<double>(stallTimeout).count();
     for (const ConnectionPtr& connection : stalled) {
         AppLog("message port %s: closed a connection whose request made no progress for %g s",
-               nameText.c_str(), seconds);
+               logName.c_str(), seconds);
         Drop(connection);
     }
     if (next != Clock::time_point::max() && valid)
@@ -977,7 +991,7 @@ void __CFMessagePort::StartReply(const ConnectionPtr& connection, CFDataRef repl
     const CFIndex length = reply ? CFDataGetLength(reply) : 0;
     if (length > CFIndex(kMessagePortMaxFrame)) {
         AppLog("message port %s: a reply of %ld bytes is over the limit; closing its connection",
-               nameText.c_str(), long(length));
+               logName.c_str(), long(length));
         CFRelease(reply);
         Drop(connection);
         return;
@@ -1040,9 +1054,9 @@ void __CFMessagePort::FlushReply(const ConnectionPtr& connection) {
 
 void __CFMessagePort::ReplyFailed(const ConnectionPtr& connection, int error) {
     if (error == EPIPE || error == ECONNRESET)
-        AppLog("message port %s: a client went away in the middle of its reply", nameText.c_str());
+        AppLog("message port %s: a client went away in the middle of its reply", logName.c_str());
     else
-        AppLog("message port %s: cannot send a reply: %s; closed its connection", nameText.c_str(),
+        AppLog("message port %s: cannot send a reply: %s; closed its connection", logName.c_str(),
                ErrorText(error).c_str());
     Drop(connection);
 }
@@ -1065,10 +1079,10 @@ void __CFMessagePort::PeerGone(const ConnectionPtr& connection) {
             break;
     }
     if (connection->writing)
-        AppLog("message port %s: a client went away in the middle of its reply", nameText.c_str());
+        AppLog("message port %s: a client went away in the middle of its reply", logName.c_str());
     else if (connection->input.IsMidFrame())
         AppLog("message port %s: a client disconnected in the middle of a request",
-               nameText.c_str());
+               logName.c_str());
     Drop(connection);
 }
 
@@ -1171,8 +1185,8 @@ void __CFMessagePort::CloseRemoteDescriptor() {
     descriptor = -1;
 }
 
-int __CFMessagePort::Reconnect() {
-    const int connected = ConnectTo(socketPath);
+int __CFMessagePort::Reconnect(const Deadline& deadline, int* error) {
+    const int connected = ConnectTo(socketPath, deadline, error);
     std::lock_guard<std::mutex> lock(descriptorMutex);
     CloseDescriptor(descriptor);
     descriptor = -1;
@@ -1254,9 +1268,12 @@ bool __CFMessagePort::SendRequestFrame(const uint8_t* header, const UInt8* body,
     for (int attempt = 0;; ++attempt) {
         bool fresh = false;
         if (*connection < 0) {
-            *connection = Reconnect();
+            int error = 0;
+            *connection = Reconnect(sendDeadline, &error);
             if (*connection < 0) {
-                *status = valid ? kCFMessagePortTransportError : kCFMessagePortIsInvalid;
+                *status = !valid            ? kCFMessagePortIsInvalid
+                          : error == EAGAIN ? kCFMessagePortSendTimeout
+                                            : kCFMessagePortTransportError;
                 return false;
             }
             fresh = true;
@@ -1363,16 +1380,17 @@ CFMessagePortRef CFMessagePortCreateLocal(CFAllocatorRef, CFStringRef name,
     const std::string text = glyphwell::UTF8String(name).value_or("");
     const std::string path = glyphwell::port::SocketPathForName(text);
 
-    int listening = TakeActivationSocket(text);
+    const std::string logName = LogEscape(text); // the name as log lines show it
+    int listening = TakeActivationSocket(logName);
     bool ownsFile = false;
     dev_t device = 0;
     ino_t inode = 0;
     if (listening < 0) {
         if (path.empty()) {
-            AppLog("message port %s: no safe socket path for this name", text.c_str());
+            AppLog("message port %s: no safe socket path for this name", logName.c_str());
             return nullptr;
         }
-        listening = BindListeningSocket(text, path, &device, &inode);
+        listening = BindListeningSocket(logName, path, &device, &inode);
         if (listening < 0)
             return nullptr;
         ownsFile = true;
@@ -1385,7 +1403,7 @@ CFMessagePortRef CFMessagePortCreateLocal(CFAllocatorRef, CFStringRef name,
     port->socketDevice = device;
     port->socketInode = inode;
     if (!port->OpenLocalDescriptors()) {
-        AppLog("message port %s: cannot set up its event descriptors: %s", text.c_str(),
+        AppLog("message port %s: cannot set up its event descriptors: %s", port->logName.c_str(),
                ErrorText(errno).c_str());
         CFRelease(port); // stops listening and removes the socket file
         return nullptr;
@@ -1410,8 +1428,11 @@ CFMessagePortRef CFMessagePortCreateRemote(CFAllocatorRef, CFStringRef name) {
     const std::string path = glyphwell::port::SocketPathForName(text);
     if (path.empty())
         return nullptr;
-    const int connection = ConnectTo(path);
-    if (connection < 0)
+    // A server too busy to accept at once is still a server: the connection is then made by the
+    // first request, within its send timeout.
+    int error = 0;
+    const int connection = ConnectTo(path, Deadline(0), &error);
+    if (connection < 0 && error != EAGAIN)
         return nullptr;
     auto* port = new __CFMessagePort(name, text, true);
     port->socketPath = path;

@@ -82,7 +82,9 @@ CFTypeID CFMessagePortGetTypeID();
 CFMessagePortRef CFMessagePortCreateLocal(CFAllocatorRef allocator, CFStringRef name,
                                           CFMessagePortCallBack callout,
                                           CFMessagePortContext* context, Boolean* shouldFreeInfo);
-/// A new remote port for `name`, connected, or null when no server listens under it.
+/// A new remote port for `name`, connected, or null when no server listens under it. A server too
+/// busy to accept at once (its queue of connections is full) still gives a port: its first
+/// request connects, within that request's send timeout.
 CFMessagePortRef CFMessagePortCreateRemote(CFAllocatorRef allocator, CFStringRef name);
 /// A new run-loop source that serves the local port when added to a run loop (the port's one
 /// source, retained again when asked twice); null for a remote or invalidated port.

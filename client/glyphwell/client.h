@@ -109,14 +109,17 @@ GLYPHWELL_CLIENT_API int glyphwell_request_get_bytes(glyphwell_request* request,
  * (-1: without limit; users take their time). `port_name` is null for the agent, or another
  * port name (tests). On success stores a new reply in `*reply` (free it with
  * glyphwell_reply_free); on error `*reply` is null. GLYPHWELL_ERROR_INVALID_ARGUMENT when an
- * activation request has no candidate file or a download request has no font. */
+ * activation request has no candidate file or a download request has no font. An agent too busy
+ * to accept the connection at once is tried again until the timeout. */
 GLYPHWELL_CLIENT_API int glyphwell_request_send(glyphwell_request* request, const char* port_name,
                                                 int timeout_ms, glyphwell_reply** reply);
 
 /* Starts sending `request` without blocking. On success stores a new call in `*call`; poll its
  * descriptor (glyphwell_call_get_fd) for the events of glyphwell_call_get_events, and call
  * glyphwell_call_dispatch whenever they occur. Errors are those of glyphwell_request_send that
- * can be known at once (GLYPHWELL_ERROR_NOT_RUNNING among them); `*call` is then null. */
+ * can be known at once (GLYPHWELL_ERROR_NOT_RUNNING among them; GLYPHWELL_ERROR_TRANSPORT with
+ * errno EAGAIN when the agent is too busy to accept the connection: try again later); `*call`
+ * is then null. */
 GLYPHWELL_CLIENT_API int glyphwell_call_start(glyphwell_request* request, const char* port_name,
                                               glyphwell_call** call);
 /* The call's socket (non-blocking, close-on-exec), or -1 once it has ended. The descriptor

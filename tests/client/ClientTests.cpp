@@ -154,6 +154,33 @@ TEST_F(ClientTest, ReportsEachFailureOfTheExchange) {
     }
 }
 
+TEST_F(ClientTest, AnAgentTooBusyToAcceptFailsACallAtOnceAndASendAtItsTimeout) {
+    // A listener whose queue of connections is full: a connect cannot even begin.
+    const std::string path = glyphwell::port::SocketPathForName(kName);
+    const int listener = RawListen(path);
+    ASSERT_EQ(listen(listener, 0), 0);
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    std::memcpy(address.sun_path, path.c_str(), path.size());
+    std::vector<int> queued;
+    do
+        queued.push_back(socket(AF_UNIX, SOCK_STREAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0));
+    while (queued.size() < 64 &&
+           connect(queued.back(), reinterpret_cast<sockaddr*>(&address), sizeof address) == 0);
+    ASSERT_EQ(errno, EAGAIN);
+    Request request = DownloadRequest();
+    glyphwell_call* call = reinterpret_cast<glyphwell_call*>(1);
+    EXPECT_EQ(glyphwell_call_start(request.get(), kName, &call), GLYPHWELL_ERROR_TRANSPORT);
+    EXPECT_EQ(errno, EAGAIN);
+    EXPECT_EQ(call, nullptr);
+    glyphwell_reply* reply = nullptr;
+    EXPECT_EQ(glyphwell_request_send(request.get(), kName, 100, &reply), GLYPHWELL_ERROR_TIMED_OUT);
+    for (const int descriptor : queued)
+        close(descriptor);
+    close(listener);
+    unlink(path.c_str());
+}
+
 TEST_F(ClientTest, SendsTheFlattenedRequestAndReadsTheAnswers) {
     // An activation reply passes the candidate URLs back.
     const std::string url = "file:///fonts/A%20Font.otf";

@@ -149,6 +149,24 @@ TEST(CatalogParse, SkipsEachMalformedAssetWithOneLine) {
               }));
 }
 
+TEST(CatalogParse, StringsLongerThanAStorageBlockKeepTheirNeighboursIntact) {
+    // A long identifier and URL fill storage blocks of their own; the strings stored after them
+    // must not land past their end, whether their asset is kept or left out.
+    const std::string longID(100000, 'L');
+    const QByteArray text =
+        "{\"assets\": [" + Asset(longID.c_str(), "1", "{\"postScriptName\": \"F\"}") + ", " +
+        Asset(("X" + longID).c_str(), "-1", "{\"postScriptName\": \"F\"}") + ", " +
+        Asset("B", "2", "{\"postScriptName\": \"G\", \"family\": \"H\"}") + "]}";
+    std::vector<QZCatalogProblem> problems;
+    const auto catalog = QZReadDownloadableFontCatalog(text.toStdString(), problems);
+    ASSERT_EQ(catalog.assets.size(), 2u);
+    EXPECT_EQ(catalog.assets[0].localID, longID);
+    EXPECT_EQ(catalog.assets[0].url, "https://f/" + longID);
+    EXPECT_EQ(catalog.assets[1].localID, "B");
+    EXPECT_EQ(catalog.assets[1].fonts[0].family, "H");
+    EXPECT_EQ(problems.size(), 1u);
+}
+
 TEST(CatalogParse, TheDocumentedSampleIsAValidCatalog) {
     QFile sample(qEnvironmentVariable("GLYPHWELL_SOURCE_DIR") +
                  "/resources/catalog/downloadable-fonts.sample.json");

@@ -427,8 +427,9 @@ class FontDownloaderTest : public FontServiceTest {
 protected:
     void TearDown() override {
         QZSetDownloadLimits({});
-        for (auto operation : {QZFontFileOperation::Write, QZFontFileOperation::Sync,
-                               QZFontFileOperation::Link, QZFontFileOperation::Rename})
+        for (auto operation :
+             {QZFontFileOperation::Write, QZFontFileOperation::Sync, QZFontFileOperation::Link,
+              QZFontFileOperation::Rename, QZFontFileOperation::Lock})
             QZInjectFontFileFault(operation, 0);
         FontServiceTest::TearDown();
     }
@@ -583,6 +584,17 @@ TEST_F(FontDownloaderTest, AKilledWriterLeavesNothingOnceTheNextDownloadStarts) 
     }
 }
 
+TEST_F(FontDownloaderTest, ANamedTemporaryThatCannotBeLockedIsRemovedAtOnce) {
+    // Unlocked, it would pass for a dead writer's leftover; each retry would leave one more.
+    const std::string directory = QZFontInstallDirectory();
+    ASSERT_TRUE(QDir().mkpath(QString::fromStdString(directory)));
+    QZInjectFontFileFault(QZFontFileOperation::Lock, ENOLCK);
+    QZFontFileWriter writer;
+    EXPECT_FALSE(writer.Open(directory, "unlocked", false));
+    EXPECT_EQ(errno, ENOLCK);
+    EXPECT_TRUE(DownloadFolder().isEmpty());
+}
+
 TEST_F(FontDownloaderTest, SlowAndSilentServersAreGivenUpAndCancelWorksMeanwhile) {
     const std::string serif = ReadFile(kDejaVu + "DejaVuSerif.ttf");
     LoopbackHTTPServer::Resource silent;
@@ -647,6 +659,18 @@ TEST_F(FontDownloaderTest, ASecondRequestForTheSameAssetSharesTheFirstTransfer) 
     EXPECT_EQ(second.outcome, QZFontDownloadOutcome::Installed) << second.failureReason;
     EXPECT_EQ(second.path, first.path);
     EXPECT_EQ(lastReported, bold.size());
+
+    // Another version of the asset waits for the transfer in progress, then fetches its own.
+    const std::string serif = ReadFile(kDejaVu + "DejaVuSerif.ttf");
+    const std::string v2 = Serve("/v2", serif);
+    std::thread older([&] { first = Download(url, bold, "bold"); });
+    ASSERT_TRUE(server_.WaitForRequests("/shared", 2, kRunTimeout));
+    const QZFontDownloadResult newer = Download(v2, serif, "bold", {"DejaVuSerif"});
+    older.join();
+    EXPECT_EQ(first.outcome, QZFontDownloadOutcome::Installed) << first.failureReason;
+    ASSERT_EQ(newer.outcome, QZFontDownloadOutcome::Installed) << newer.failureReason;
+    EXPECT_EQ(server_.RequestCount("/v2"), 1);
+    EXPECT_TRUE(ReadFile(QString::fromStdString(newer.path)) == serif);
 }
 
 TEST(FontFileNames, KeepSafeLocalIDsAndMarkChangedOnesWithAHash) {

@@ -449,16 +449,21 @@ TEST_F(MessagePortTest, TakesOverAStaleSocketFileButNoOtherFile) {
         EXPECT_EQ(Send(kName, 1, "x").bytes, "x@1");
     }
 
+    // In a runtime directory whose path could forge a log line, the line shows it escaped.
+    const std::string directory = runtime_.Path() + "/run\nforged";
+    ASSERT_EQ(mkdir(directory.c_str(), 0700), 0);
+    setenv("XDG_RUNTIME_DIR", directory.c_str(), 1);
     LogCapture log;
-    std::ofstream(SocketPath()) << "keep me";
+    std::ofstream(directory + "/" + kName) << "keep me";
     CFStringRef name = CreateCFString(kName);
     EXPECT_EQ(CFMessagePortCreateLocal(kCFAllocatorDefault, name, nullptr, nullptr, nullptr),
               nullptr);
     CFRelease(name);
+    setenv("XDG_RUNTIME_DIR", runtime_.Path().c_str(), 1);
     EXPECT_EQ(log.Texts(),
-              (std::vector<std::string>{"message port org.glyphwell.Test.Port: " + SocketPath() +
-                                        " exists and is not a socket"}));
-    std::ifstream kept(SocketPath());
+              (std::vector<std::string>{"message port org.glyphwell.Test.Port: " + runtime_.Path() +
+                                        "/run\\nforged/" + kName + " exists and is not a socket"}));
+    std::ifstream kept(directory + "/" + kName);
     std::string text;
     std::getline(kept, text);
     EXPECT_EQ(text, "keep me");
@@ -545,6 +550,32 @@ TEST_F(MessagePortTest, ReportsEachWayAServerCanFail) {
     EXPECT_EQ(CFMessagePortSendRequest(remote, 1, large, 0.1, 1, kCFRunLoopDefaultMode, &reply),
               kCFMessagePortSendTimeout);
     CFRelease(large);
+
+    // A server too busy to accept (its queue of connections is full): the port is still made at
+    // once, and a request that cannot connect in time is a send timeout.
+    ASSERT_EQ(listen(listener, 0), 0);
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    std::memcpy(address.sun_path, SocketPath().c_str(), SocketPath().size());
+    std::vector<int> queued;
+    do
+        queued.push_back(socket(AF_UNIX, SOCK_STREAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0));
+    while (queued.size() < 64 &&
+           connect(queued.back(), reinterpret_cast<sockaddr*>(&address), sizeof address) == 0);
+    ASSERT_EQ(errno, EAGAIN);
+    std::future<CFMessagePortRef> busy =
+        std::async(std::launch::async, [] { return CreateRemote(kName); });
+    const bool prompt = busy.wait_for(std::chrono::seconds(5)) == std::future_status::ready;
+    EXPECT_TRUE(prompt) << "waited for the server to accept";
+    while (!prompt && busy.wait_for(std::chrono::milliseconds(10)) != std::future_status::ready)
+        close(accept(listener, nullptr, nullptr)); // lets the waiting connect through
+    CFMessagePortRef busyRemote = busy.get();
+    ASSERT_NE(busyRemote, nullptr);
+    EXPECT_EQ(CFMessagePortSendRequest(busyRemote, 1, data, 0.1, 1, kCFRunLoopDefaultMode, &reply),
+              kCFMessagePortSendTimeout);
+    CFRelease(busyRemote);
+    for (const int descriptor : queued)
+        close(descriptor);
 
     // Nothing listens any more.
     close(listener);
