@@ -16,6 +16,7 @@
 #include <cmath>
 #include <limits>
 #include <mutex>
+#include <utility>
 
 #include "UIAgent/QZDictionaryValue.h"
 #include "UIAgent/QZLocalizedString.h"
@@ -100,14 +101,16 @@ std::pair<QPushButton*, QPushButton*> SetUpErrorAlert(QMessageBox& alert, CFType
     alert.setIcon(QMessageBox::Warning);
     alert.setTextFormat(Qt::PlainText);
     const QFontMetrics metrics = alert.fontMetrics();
-    const QString shown = QZElideLongWords(description, metrics, kMaxWordWidth);
-    alert.setText(shown);
+    alert.setText(QZElideLongWords(description, metrics, kMaxWordWidth));
     if (!reason.isEmpty())
         alert.setInformativeText(QZElideLongWords(reason, metrics, kMaxWordWidth));
-    if (shown != description)
-        if (auto* label = alert.findChild<QLabel*>(QStringLiteral("qt_msgbox_label"))) {
-            label->setToolTip(description);
-            label->setAccessibleDescription(description);
+    // Each label whose text was shortened tells its full text (the reason names the font too).
+    for (const auto& [name, full] : {std::pair{"qt_msgbox_label", description},
+                                     std::pair{"qt_msgbox_informativelabel", reason}})
+        if (auto* label = alert.findChild<QLabel*>(QLatin1String(name));
+            label && label->text() != full) {
+            label->setToolTip(full);
+            label->setAccessibleDescription(full);
         }
     QPushButton* proceed =
         alert.addButton(QZLocalizedString("Continue Download"), QMessageBox::AcceptRole);
