@@ -90,9 +90,9 @@ std::pair<QPushButton*, QPushButton*> SetUpErrorAlert(QMessageBox& alert, CFType
     QString description =
         QZQString(QZGetTypedValue<CFStringRef>(userInfo, kCFErrorLocalizedDescriptionKey));
     if (description.isEmpty() && errorRef)
-        description = QStringLiteral("%1 error %2.")
-                          .arg(QZQString(CFErrorGetDomain(errorRef)))
-                          .arg(CFErrorGetCode(errorRef));
+        description =
+            QZLocalizedFormat("QZ_ERROR_DOMAIN_CODE", {QZQString(CFErrorGetDomain(errorRef)),
+                                                       QString::number(CFErrorGetCode(errorRef))});
     const QString reason =
         QZQString(QZGetTypedValue<CFStringRef>(userInfo, kCFErrorLocalizedFailureReasonKey));
 
