@@ -390,9 +390,18 @@ void FontDownloadWindowController::endWindow(int code, bool cancelTransfer) {
 }
 
 void FontDownloadWindowController::setMainStatus(const QString& status) {
-    if (!ui_ || ui_->mainStatusTextField->text() == status)
+    if (!ui_)
         return;
-    ui_->mainStatusTextField->setText(status);
+    QLabel* label = ui_->mainStatusTextField;
+    // A long font name is elided, so that it stays inside the fixed-size window; the label still
+    // tells the full text.
+    const QString shown = QZElideLongWords(status, label->fontMetrics(), kMaxWordWidth);
+    const QString full = shown == status ? QString() : status;
+    if (label->text() == shown && label->toolTip() == full)
+        return;
+    label->setText(shown);
+    label->setToolTip(full);
+    label->setAccessibleDescription(full);
     emit mainStatusChanged(status);
 }
 

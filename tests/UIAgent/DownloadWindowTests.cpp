@@ -409,7 +409,7 @@ TEST_F(DownloadRoadTest, RegressionTheRequestingProcessExitEndsTheWindowsOwnRunN
     EXPECT_TRUE(DownloadFolder().isEmpty()) << DownloadFolder().join(", ").toStdString();
 }
 
-TEST_F(DownloadRoadTest, TheErrorAlertElidesALongFontNameAndTellsEachFullText) {
+TEST_F(DownloadRoadTest, TheErrorAlertAndTheProgressWindowElideALongFontNameAndTellTheFullTexts) {
     // A file that does not hold the font: the name is in the headline and in the reason.
     const std::string name = "Long" + std::string(200, 'X');
     WriteCatalog({ServeFont("DejaVuSansMono.ttf", "org.test.Long", name)});
@@ -421,8 +421,10 @@ TEST_F(DownloadRoadTest, TheErrorAlertElidesALongFontNameAndTellsEachFullText) {
           [&] {
               QMessageBox* alert = AlertOnScreen();
               title = alert->windowTitle();
-              for (QLabel* label : alert->findChildren<QLabel*>())
-                  labels[label->objectName().toStdString()] = {label->text(), label->toolTip()};
+              for (QWidget* window :
+                   {static_cast<QWidget*>(alert), static_cast<QWidget*>(ProgressWindowOnScreen())})
+                  for (QLabel* label : window->findChildren<QLabel*>())
+                      labels[label->objectName().toStdString()] = {label->text(), label->toolTip()};
               ClickButton(alert, "Cancel");
           }}},
         EndEveryModalRun);
@@ -430,7 +432,8 @@ TEST_F(DownloadRoadTest, TheErrorAlertElidesALongFontNameAndTellsEachFullText) {
               DownloadReply(false, true));
     EXPECT_TRUE(script.done());
     EXPECT_EQ(title, "Font Download Failed");
-    for (const char* labelName : {"qt_msgbox_label", "qt_msgbox_informativelabel"}) {
+    for (const char* labelName :
+         {"qt_msgbox_label", "qt_msgbox_informativelabel", "mainStatusTextField"}) {
         SCOPED_TRACE(labelName);
         const auto& [text, tip] = labels[labelName];
         EXPECT_FALSE(text.contains(QString::fromStdString(name)));
