@@ -16,6 +16,7 @@
 #include <cmath>
 #include <limits>
 #include <mutex>
+#include <utility>
 
 #include "UIAgent/QZDictionaryValue.h"
 #include "UIAgent/QZLocalizedString.h"
@@ -89,9 +90,9 @@ std::pair<QPushButton*, QPushButton*> SetUpErrorAlert(QMessageBox& alert, CFType
     QString description =
         QZQString(QZGetTypedValue<CFStringRef>(userInfo, kCFErrorLocalizedDescriptionKey));
     if (description.isEmpty() && errorRef)
-        description = QStringLiteral("%1 error %2.")
-                          .arg(QZQString(CFErrorGetDomain(errorRef)))
-                          .arg(CFErrorGetCode(errorRef));
+        description =
+            QZLocalizedFormat("QZ_ERROR_DOMAIN_CODE", {QZQString(CFErrorGetDomain(errorRef)),
+                                                       QString::number(CFErrorGetCode(errorRef))});
     const QString reason =
         QZQString(QZGetTypedValue<CFStringRef>(userInfo, kCFErrorLocalizedFailureReasonKey));
 
@@ -100,14 +101,16 @@ std::pair<QPushButton*, QPushButton*> SetUpErrorAlert(QMessageBox& alert, CFType
     alert.setIcon(QMessageBox::Warning);
     alert.setTextFormat(Qt::PlainText);
     const QFontMetrics metrics = alert.fontMetrics();
-    const QString shown = QZElideLongWords(description, metrics, kMaxWordWidth);
-    alert.setText(shown);
+    alert.setText(QZElideLongWords(description, metrics, kMaxWordWidth));
     if (!reason.isEmpty())
         alert.setInformativeText(QZElideLongWords(reason, metrics, kMaxWordWidth));
-    if (shown != description)
-        if (auto* label = alert.findChild<QLabel*>(QStringLiteral("qt_msgbox_label"))) {
-            label->setToolTip(description);
-            label->setAccessibleDescription(description);
+    // Each label whose text was shortened tells its full text (the reason names the font too).
+    for (const auto& [name, full] : {std::pair{"qt_msgbox_label", description},
+                                     std::pair{"qt_msgbox_informativelabel", reason}})
+        if (auto* label = alert.findChild<QLabel*>(QLatin1String(name));
+            label && label->text() != full) {
+            label->setToolTip(full);
+            label->setAccessibleDescription(full);
         }
     QPushButton* proceed =
         alert.addButton(QZLocalizedString("Continue Download"), QMessageBox::AcceptRole);
@@ -387,9 +390,18 @@ void FontDownloadWindowController::endWindow(int code, bool cancelTransfer) {
 }
 
 void FontDownloadWindowController::setMainStatus(const QString& status) {
-    if (!ui_ || ui_->mainStatusTextField->text() == status)
+    if (!ui_)
         return;
-    ui_->mainStatusTextField->setText(status);
+    QLabel* label = ui_->mainStatusTextField;
+    // A long font name is elided, so that it stays inside the fixed-size window; the label still
+    // tells the full text.
+    const QString shown = QZElideLongWords(status, label->fontMetrics(), kMaxWordWidth);
+    const QString full = shown == status ? QString() : status;
+    if (label->text() == shown && label->toolTip() == full)
+        return;
+    label->setText(shown);
+    label->setToolTip(full);
+    label->setAccessibleDescription(full);
     emit mainStatusChanged(status);
 }
 

@@ -7,6 +7,7 @@
 #include <QEvent>
 #include <QFileInfo>
 #include <QFontDatabase>
+#include <QFontMetrics>
 #include <QGridLayout>
 #include <QLabel>
 #include <QMessageBox>
@@ -49,6 +50,8 @@ constexpr char kCountdownKey[] = "This question closes without an answer in %@."
 /// Seconds left at which the countdown is announced to screen readers.
 constexpr qint64 kAnnouncedSeconds[] = {60, 30, 10};
 constexpr int kIconSize = 64;
+/// The widest a word (a long font or application name) may be in the alert, in pixels.
+constexpr int kMaxWordWidth = 320;
 /// Font files beyond this size are not loaded for the sample: it is a courtesy, not worth the
 /// memory.
 constexpr qint64 kMaximumSampleFontFileSize = 128 << 20;
@@ -184,16 +187,29 @@ void QZAutoActivationConfirmation::setupAlert() {
 
     // Names come from outside: never read them as markup.
     alert->setTextFormat(Qt::PlainText);
-    if (!volumeName_.isEmpty())
-        alert->setText(QZLocalizedFormat("QZ_HEADLINE_FONT_VOLUME",
-                                         {applicationName_, fontName_, volumeName_}));
-    else
-        alert->setText(QZLocalizedFormat("QZ_HEADLINE_FONT", {applicationName_, fontName_}));
+    const QString headline =
+        volumeName_.isEmpty() ? QZLocalizedFormat("QZ_HEADLINE_FONT", {applicationName_, fontName_})
+                              : QZLocalizedFormat("QZ_HEADLINE_FONT_VOLUME",
+                                                  {applicationName_, fontName_, volumeName_});
+    // A long name would widen the alert: its texts show it elided, and tell it in full.
+    const QFontMetrics metrics = alert->fontMetrics();
+    alert->setText(QZElideLongWords(headline, metrics, kMaxWordWidth));
+    if (auto* label = alert->findChild<QLabel*>(QStringLiteral("qt_msgbox_label"));
+        label && label->text() != headline) {
+        label->setToolTip(headline);
+        label->setAccessibleDescription(headline);
+    }
     alert->setInformativeText(QZLocalizedString("QZ_DETAIL_FONT_NOT_INSTALLED"));
 
     addAnswerButtons();
-    alert->setCheckBox(
-        new QCheckBox(QZLocalizedFormat("QZ_DO_NOT_WARN_APPLICATION", {applicationName_})));
+    const QString checkBoxText =
+        QZLocalizedFormat("QZ_DO_NOT_WARN_APPLICATION", {applicationName_});
+    auto* checkBox = new QCheckBox(QZElideLongWords(checkBoxText, metrics, kMaxWordWidth));
+    if (checkBox->text() != checkBoxText) {
+        checkBox->setToolTip(checkBoxText);
+        checkBox->setAccessibleDescription(checkBoxText);
+    }
+    alert->setCheckBox(checkBox);
     // A screen reader's toggle reaches the box without any key or mouse input.
     QObject::connect(alert->checkBox(), &QCheckBox::toggled, widgets_.get(),
                      [this] { restartTimeout(); });
@@ -265,9 +281,12 @@ void QZAutoActivationConfirmation::addFontSample() {
     widgets_->sampleFontId = id;
     QFont face(families.contains(fontName_) ? fontName_ : families.first());
     face.setPointSizeF(alert_->font().pointSizeF() * 1.6);
-    widgets_->sample = new QLabel(fontName_, alert_.get());
+    widgets_->sample = new QLabel(
+        QFontMetrics(face).elidedText(fontName_, Qt::ElideRight, kMaxWordWidth), alert_.get());
     widgets_->sample->setTextFormat(Qt::PlainText);
     widgets_->sample->setFont(face);
+    if (widgets_->sample->text() != fontName_)
+        widgets_->sample->setToolTip(fontName_);
     widgets_->sample->setAccessibleName(fontName_);
 }
 

@@ -6,6 +6,7 @@
 #include <QSet>
 #include <algorithm>
 #include <limits>
+#include <utility>
 #include <vector>
 
 #include "UIAgent/QZDictionaryValue.h"
@@ -23,7 +24,8 @@
 namespace {
 
 constexpr int kIconSize = 64;
-/// The widest a font name may be in the alert's texts, in pixels; a longer one is elided.
+/// The widest a word (a font or application name) may be in the alert's texts, in pixels; a
+/// longer one is elided.
 constexpr int kMaxNameWidth = 320;
 
 /// A non-empty string value of `key`, else a null string.
@@ -104,12 +106,19 @@ uint64_t DownloadSize(CFArrayRef assets) {
     return total;
 }
 
-/// Sets `tip` as the tooltip and accessible description of the alert's text labels.
-void DescribeLabels(QMessageBox& alert, const QString& tip) {
-    for (const char* name : {"qt_msgbox_label", "qt_msgbox_informativelabel"})
-        if (auto* label = alert.findChild<QLabel*>(QLatin1String(name))) {
-            label->setToolTip(tip);
-            label->setAccessibleDescription(tip);
+/// Shows `text` and `detail` with every word wider than kMaxNameWidth elided (a long font or
+/// application name would widen the alert past its fixed width); a label whose text was shortened
+/// tells its full text as tooltip and accessible description.
+void SetElidedTexts(QMessageBox& alert, const QString& text, const QString& detail) {
+    const QFontMetrics metrics = alert.fontMetrics();
+    alert.setText(QZElideLongWords(text, metrics, kMaxNameWidth));
+    alert.setInformativeText(QZElideLongWords(detail, metrics, kMaxNameWidth));
+    for (const auto& [name, full] :
+         {std::pair{"qt_msgbox_label", text}, std::pair{"qt_msgbox_informativelabel", detail}})
+        if (auto* label = alert.findChild<QLabel*>(QLatin1String(name));
+            label && label->text() != full) {
+            label->setToolTip(full);
+            label->setAccessibleDescription(full);
         }
 }
 
@@ -163,18 +172,15 @@ void QZFontDownloadConfirmation::SetTexts(const QString& onlyName) {
     setTextFormat(Qt::PlainText);
     const QString sizeText = QZFormattedByteCount(qint64(
         std::min<uint64_t>(totalDownloadSize_, uint64_t(std::numeric_limits<qint64>::max()))));
-    if (onlyName.isEmpty()) {
-        setText(QZLocalizedFormat("QZ_HEADLINE_NEEDS_TO_DOWNLOAD", {applicationName_}));
-        setInformativeText(QZLocalizedFormat("QZ_DETAIL_DOWNLOAD_SIZE", {sizeText}));
-        return;
-    }
-    // A long name would widen the alert past its fixed width: the texts show it elided.
-    const QString shown = fontMetrics().elidedText(onlyName, Qt::ElideRight, kMaxNameWidth);
-    setText(
-        QZLocalizedFormat("QZ_HEADLINE_NEEDS_TO_DOWNLOAD_FONT_NAME", {applicationName_, shown}));
-    setInformativeText(QZLocalizedFormat("QZ_DETAIL_FONT_SIZE", {shown, sizeText}));
-    if (shown != onlyName)
-        DescribeLabels(*this, onlyName);
+    if (onlyName.isEmpty())
+        SetElidedTexts(*this,
+                       QZLocalizedFormat("QZ_HEADLINE_NEEDS_TO_DOWNLOAD", {applicationName_}),
+                       QZLocalizedFormat("QZ_DETAIL_DOWNLOAD_SIZE", {sizeText}));
+    else
+        SetElidedTexts(*this,
+                       QZLocalizedFormat("QZ_HEADLINE_NEEDS_TO_DOWNLOAD_FONT_NAME",
+                                         {applicationName_, onlyName}),
+                       QZLocalizedFormat("QZ_DETAIL_FONT_SIZE", {onlyName, sizeText}));
 }
 
 void QZFontDownloadConfirmation::AddButtons() {

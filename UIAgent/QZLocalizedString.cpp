@@ -9,6 +9,7 @@
 #include <QLibraryInfo>
 #include <QLocale>
 #include <QPointer>
+#include <QTextBoundaryFinder>
 #include <QTranslator>
 #include <algorithm>
 #include <vector>
@@ -170,15 +171,24 @@ QString QZFormattedByteCount(qint64 bytes) {
 }
 
 QString QZElideLongWords(const QString& text, const QFontMetrics& metrics, int maxWidth) {
+    // The pieces are those between line-break opportunities, which a label wraps at: spaces in
+    // most scripts, but also between the characters of Chinese and Japanese, whose sentences
+    // have no spaces and must not be cut as one long word.
     QString result;
+    QTextBoundaryFinder breaks(QTextBoundaryFinder::Line, text);
     qsizetype start = 0;
     while (start < text.size()) {
-        qsizetype end = start;
-        const bool space = text[start].isSpace();
-        while (end < text.size() && text[end].isSpace() == space)
-            ++end;
-        const QString run = text.mid(start, end - start);
-        result += space ? run : metrics.elidedText(run, Qt::ElideRight, maxWidth);
+        qsizetype end = breaks.toNextBoundary();
+        if (end <= start)
+            end = text.size();
+        qsizetype wordEnd = end;
+        while (wordEnd > start && text[wordEnd - 1].isSpace())
+            --wordEnd;
+        const QString word = text.mid(start, wordEnd - start);
+        result += metrics.horizontalAdvance(word) > maxWidth
+                      ? metrics.elidedText(word, Qt::ElideRight, maxWidth)
+                      : word;
+        result += text.mid(wordEnd, end - wordEnd);
         start = end;
     }
     return result;

@@ -49,6 +49,8 @@ Qt::LayoutDirection QZLayoutDirectionFor(const QStringList& languages);
 /// unit ("0 bytes", "757 kB", "1.5 MB", "2.25 GB"); negative counts as 0.
 QString QZFormattedByteCount(qint64 bytes);
 
-/// `text` with every run of non-space characters wider than `maxWidth` pixels in `metrics`
-/// elided at its end ("…"), so that one long name cannot widen a window; the rest as it is.
+/// `text` with every piece that a label cannot wrap (the text between two line-break
+/// opportunities: a word, or one character of Chinese or Japanese) wider than `maxWidth` pixels
+/// in `metrics` elided at its end ("…"), so that one long name cannot widen a window; the rest
+/// as it is.
 QString QZElideLongWords(const QString& text, const QFontMetrics& metrics, int maxWidth);

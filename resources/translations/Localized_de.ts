@@ -159,6 +159,11 @@
         <translation>Schriftdownload fehlgeschlagen</translation>
     </message>
     <message>
+        <source>QZ_ERROR_DOMAIN_CODE</source>
+        <extracomment>Headline of the download failure alert when the failure has no description: %1 is the error domain, %2 the error code.</extracomment>
+        <translation>Fehler %2 in %1.</translation>
+    </message>
+    <message>
         <source>QZ_DOWNLOAD_PROGRESS_NAME</source>
         <extracomment>Accessible name of the download window's progress bar.</extracomment>
         <translation>Downloadfortschritt</translation>

@@ -159,6 +159,11 @@
         <translation>字体下载失败</translation>
     </message>
     <message>
+        <source>QZ_ERROR_DOMAIN_CODE</source>
+        <extracomment>Headline of the download failure alert when the failure has no description: %1 is the error domain, %2 the error code.</extracomment>
+        <translation>%1 错误 %2。</translation>
+    </message>
+    <message>
         <source>QZ_DOWNLOAD_PROGRESS_NAME</source>
         <extracomment>Accessible name of the download window's progress bar.</extracomment>
         <translation>下载进度</translation>

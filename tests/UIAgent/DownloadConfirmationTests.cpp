@@ -249,20 +249,31 @@ TEST_F(DownloadConfirmationTest, TheCatalogsNamesStandInForThoseTheRequestLacks)
     EXPECT_EQ(NameFor(catalogFamily, "Sans-Regular"), "Catalog Sans");
 }
 
-TEST_F(DownloadConfirmationTest, AVeryLongNameIsElidedWithTheFullNameInTheTooltip) {
-    const std::string longName(100, 'W');
-    Ref font = Font("Sans-Regular", longName.c_str());
-    Confirmation confirmation(DownloadRequest({font.get()}).as<CFDictionaryRef>());
-    EXPECT_EQ(NameFor(confirmation, "Sans-Regular"), longName);
-    EXPECT_FALSE(confirmation.text().contains(QString::fromStdString(longName)));
-    EXPECT_TRUE(confirmation.text().contains(u'…'));
-    auto* label = confirmation.findChild<QLabel*>("qt_msgbox_label");
-    ASSERT_NE(label, nullptr);
-    EXPECT_EQ(label->toolTip().toStdString(), longName);
-    EXPECT_EQ(label->accessibleDescription().toStdString(), longName);
-    confirmation.show();
-    EXPECT_LT(confirmation.width(), 800);
-    confirmation.hide();
+TEST_F(DownloadConfirmationTest, VeryLongNamesAreElidedWithTheFullTextsInTheTooltips) {
+    const std::string longName(100, 'W'), longApplication = "Writer" + std::string(200, 'X');
+    const std::pair<std::string, std::string> cases[] = {{longName, "Example Writer"},
+                                                         {"Example Sans", longApplication}};
+    for (const auto& [fontName, application] : cases) {
+        SCOPED_TRACE(application);
+        Ref font = Font("Sans-Regular", fontName.c_str());
+        Ref pid = Num(kCFNumberSInt32Type, 0);
+        Ref request = Dict({{kQZUIPropertyApplicationName, Str(application).get()},
+                            {kQZUIPropertyProcessID, pid.get()},
+                            {kQZUIPropertyFontProperties, Array({font.get()}).get()}});
+        Confirmation confirmation(request.as<CFDictionaryRef>());
+        EXPECT_EQ(NameFor(confirmation, "Sans-Regular"), fontName);
+        const QString longPart =
+            QString::fromStdString(fontName == longName ? longName : longApplication);
+        EXPECT_FALSE(confirmation.text().contains(longPart));
+        EXPECT_TRUE(confirmation.text().contains(u'…'));
+        auto* label = confirmation.findChild<QLabel*>("qt_msgbox_label");
+        ASSERT_NE(label, nullptr);
+        EXPECT_TRUE(label->toolTip().contains(longPart));
+        EXPECT_EQ(label->accessibleDescription(), label->toolTip());
+        confirmation.show();
+        EXPECT_LT(confirmation.width(), 800);
+        confirmation.hide();
+    }
 }
 
 TEST_F(DownloadConfirmationTest, ApplicationNameFallsBackToTheLocalizedDesktopEntry) {

@@ -16,6 +16,7 @@
 #include <cstdio>
 #include <functional>
 #include <limits>
+#include <map>
 #include <mutex>
 #include <openssl/evp.h>
 
@@ -406,6 +407,39 @@ TEST_F(DownloadRoadTest, RegressionTheRequestingProcessExitEndsTheWindowsOwnRunN
     ASSERT_TRUE(WaitForTheMatchingToEnd());
     EXPECT_EQ(callbacks_.States(), (std::vector<uint32_t>{0, 2, 4, 5}));
     EXPECT_TRUE(DownloadFolder().isEmpty()) << DownloadFolder().join(", ").toStdString();
+}
+
+TEST_F(DownloadRoadTest, TheErrorAlertAndTheProgressWindowElideALongFontNameAndTellTheFullTexts) {
+    // A file that does not hold the font: the name is in the headline and in the reason.
+    const std::string name = "Long" + std::string(200, 'X');
+    WriteCatalog({ServeFont("DejaVuSansMono.ttf", "org.test.Long", name)});
+    Ref font = RequestedFont(name.c_str());
+    std::map<std::string, std::pair<QString, QString>> labels; // object name: text, tooltip
+    QString title;
+    UiScript script(
+        {{[] { return AlertOnScreen() && AlertOnScreen()->isVisible(); },
+          [&] {
+              QMessageBox* alert = AlertOnScreen();
+              title = alert->windowTitle();
+              for (QWidget* window :
+                   {static_cast<QWidget*>(alert), static_cast<QWidget*>(ProgressWindowOnScreen())})
+                  for (QLabel* label : window->findChildren<QLabel*>())
+                      labels[label->objectName().toStdString()] = {label->text(), label->toolTip()};
+              ClickButton(alert, "Cancel");
+          }}},
+        EndEveryModalRun);
+    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({font.get()}, 0, true).get()),
+              DownloadReply(false, true));
+    EXPECT_TRUE(script.done());
+    EXPECT_EQ(title, "Font Download Failed");
+    for (const char* labelName :
+         {"qt_msgbox_label", "qt_msgbox_informativelabel", "mainStatusTextField"}) {
+        SCOPED_TRACE(labelName);
+        const auto& [text, tip] = labels[labelName];
+        EXPECT_FALSE(text.contains(QString::fromStdString(name)));
+        EXPECT_TRUE(tip.contains(QString::fromStdString(name))) << tip.toStdString();
+    }
+    ASSERT_TRUE(WaitForTheMatchingToEnd());
 }
 
 TEST_F(DownloadRoadTest, RegressionARequestWithoutFontsToHaveOpensNoWindowAndAsksNothing) {

@@ -1,7 +1,9 @@
 // The "Localized" table: lookup, placeholders, the choice of language and of layout direction,
 // script subtags, and the five tables' completeness.
+#include <QApplication>
 #include <QCoreApplication>
 #include <QDialog>
+#include <QFontMetrics>
 #include <QRegularExpression>
 #include <QTranslator>
 #include <set>
@@ -55,6 +57,12 @@ const Key kKeys[] = {
     {"QZ_DOWNLOADING_FONT", 1},
     {"QZ_DOWNLOADING_FONTS", 0},
     {"QZ_DOWNLOAD_WINDOW_TITLE", 0},
+    {"QZ_DOWNLOAD_PROGRESS_NAME", 0},
+    {"QZ_AUTO_ACTIVATION_TITLE", 0},
+    {"QZ_DOWNLOAD_CONFIRMATION_TITLE", 0},
+    {"QZ_NETWORK_ALERT_TITLE", 0},
+    {"QZ_DOWNLOAD_ERROR_TITLE", 0},
+    {"QZ_ERROR_DOMAIN_CODE", 2},
     {"%1$@ of %2$@", 2},
     {"Continue Download", 0},
     {"Cancel", 0},
@@ -189,6 +197,31 @@ TEST(LocalizedString, RightToLeftLanguagesLayWindowsOutRightToLeftWithoutATable)
     QZApplyLayoutDirection();
     EXPECT_EQ(QDialog().layoutDirection(), Qt::LeftToRight);
     QZSetPreferredLanguagesForTesting({});
+}
+
+TEST(LocalizedString, ElidesOnlyPiecesTooLongToWrapInEveryScript) {
+    const QFontMetrics metrics(QApplication::font());
+    const QString sentence = QString::fromUtf8("フォントをダウンロードする必要があります。");
+    const int maxWidth = metrics.horizontalAdvance(sentence) / 2;
+    const QString longName(4 * sentence.size(), u'W');
+    struct Case {
+        QString text;
+        bool elided;
+        QString kept; ///< what stays around the elided name
+    } cases[] = {
+        // A sentence without spaces wraps between its characters: nothing is too long.
+        {sentence, false, sentence},
+        {QString::fromUtf8("フォント「") + longName + QString::fromUtf8("」をダウンロード"), true,
+         QString::fromUtf8("をダウンロード")},
+        {"Download " + longName + " now", true, " now"},
+        {"Download Example Sans now", false, "Download Example Sans now"},
+    };
+    for (const Case& c : cases) {
+        const QString shown = QZElideLongWords(c.text, metrics, maxWidth);
+        EXPECT_EQ(shown == c.text, !c.elided) << shown.toStdString();
+        EXPECT_TRUE(shown.contains(c.kept)) << shown.toStdString();
+        EXPECT_EQ(shown.contains(u'…'), c.elided) << shown.toStdString();
+    }
 }
 
 TEST(LocalizedString, EveryTableTranslatesEveryKeyWithItsPlaceholders) {

@@ -273,3 +273,23 @@ TEST(AutoActivationAccessibility, TabGoesThroughTheTextsTheCheckboxThenTheButton
 }
 
 } // namespace
+
+TEST(AutoActivationAlert, LongNamesAreElidedWithTheFullTextsToldAndDoNotWidenIt) {
+    EnglishTexts english;
+    const QString font(200, u'W'), application = QStringLiteral("Writer") + QString(200, u'X');
+    Ref request = Dict({{kQZUIPropertyApplicationName, Str(application.toUtf8().data()).get()},
+                        {kQZUIPropertyFontName, Str(font.toUtf8().data()).get()}});
+    QZAutoActivationConfirmation confirmation(request.as<CFDictionaryRef>());
+    QMessageBox* alert = confirmation.alert();
+    EXPECT_FALSE(alert->text().contains(font) || alert->text().contains(application));
+    auto* headline = alert->findChild<QLabel*>(QStringLiteral("qt_msgbox_label"));
+    ASSERT_TRUE(headline);
+    for (const QString& full : {headline->toolTip(), headline->accessibleDescription()})
+        EXPECT_TRUE(full.contains(font) && full.contains(application)) << full.toStdString();
+    QCheckBox* box = confirmation.suppressionCheckBox();
+    EXPECT_FALSE(box->text().contains(application));
+    EXPECT_TRUE(box->toolTip().contains(application));
+    alert->show();
+    EXPECT_LT(alert->width(), 800);
+    alert->hide();
+}
