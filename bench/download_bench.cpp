@@ -141,8 +141,8 @@ Setup& TheSetup() {
 
 void DownloadWithOurDownloader(benchmark::State& state) {
     Setup& setup = TheSetup();
-    const QZFontAssetDownload asset{"large", setup.server.URL("/large"), setup.largeBody.size(),
-                                    setup.largeSHA256};
+    const QZFontAssetDownload asset{
+        "large", setup.server.URL("/large"), setup.largeBody.size(), setup.largeSHA256, {}};
     for (auto _ : state) {
         const QZFontDownloadResult result =
             QZDownloadFontAsset(asset, QZFontInstallDirectory(), {}, nullptr);
