@@ -15,8 +15,10 @@
 #include <cerrno>
 #include <cstring>
 #include <filesystem>
+#include <memory>
 #include <new>
 #include <optional>
+#include <stdexcept>
 #include <string>
 #include <utility>
 #include <vector>
@@ -70,10 +72,12 @@ class DictionaryBuilder {
 public:
     /// Adds `value` (a new reference, adopted; null is skipped) under `key`.
     void Add(CFStringRef key, CFTypeRef value) {
-        if (!value)
+        // Adopted first, so that an allocation failure below releases it.
+        TCFRetained<CFTypeRef> owned(value, kAdopted);
+        if (!owned)
             return;
         keys_.emplace_back(key);
-        values_.emplace_back(value, kAdopted);
+        values_.push_back(std::move(owned));
     }
     /// A new immutable dictionary of the pairs added.
     CFDictionaryRef Create() const {
@@ -155,8 +159,10 @@ CFDictionaryRef glyphwell_request::CreateDictionary() const {
             request.Add(kQZUIPropertyRequestDictionary, CreateFontAttributes(fonts.front()));
         }
         std::vector<TCFRetained<CFTypeRef>> urls;
-        for (const std::string& path : candidatePaths)
-            urls.emplace_back(CreateFileURL(path), kAdopted);
+        for (const std::string& path : candidatePaths) {
+            TCFRetained<CFTypeRef> url(CreateFileURL(path), kAdopted);
+            urls.push_back(std::move(url));
+        }
         request.Add(kQZUIPropertyCandidateFontURLs, CreateArray(std::move(urls)));
         return request.Create();
     }
@@ -164,8 +170,10 @@ CFDictionaryRef glyphwell_request::CreateDictionary() const {
     request.Add(kQZUIPropertyProcessID,
                 CFNumberCreate(kCFAllocatorDefault, kCFNumberIntType, &pid));
     std::vector<TCFRetained<CFTypeRef>> properties;
-    for (const Font& font : fonts)
-        properties.emplace_back(CreateFontAttributes(font), kAdopted);
+    for (const Font& font : fonts) {
+        TCFRetained<CFTypeRef> attributes(CreateFontAttributes(font), kAdopted);
+        properties.push_back(std::move(attributes));
+    }
     request.Add(kQZUIPropertyFontProperties, CreateArray(std::move(properties)));
     if (suppress)
         request.Add(kQZUIPropertySuppress, CFRetain(kCFBooleanTrue));
@@ -371,6 +379,18 @@ int glyphwell_call::Read(glyphwell_reply** reply) {
     }
 }
 
+/// Runs `body`, turning an allocation failure into GLYPHWELL_ERROR_NO_MEMORY, so that no C++
+/// exception crosses the C interface.
+template <class Body> int WithoutExceptions(Body&& body) noexcept {
+    try {
+        return body();
+    } catch (const std::bad_alloc&) {
+        return GLYPHWELL_ERROR_NO_MEMORY;
+    } catch (const std::length_error&) {
+        return GLYPHWELL_ERROR_NO_MEMORY;
+    }
+}
+
 extern "C" {
 
 const char* glyphwell_status_text(int status) {
@@ -412,23 +432,27 @@ void glyphwell_request_free(glyphwell_request* request) {
 }
 
 int glyphwell_request_set_application_name(glyphwell_request* request, const char* name) {
-    if (!request || !name || !IsUTF8(name))
-        return GLYPHWELL_ERROR_INVALID_ARGUMENT;
-    request->applicationName = name;
-    request->bytes.clear();
-    return GLYPHWELL_OK;
+    return WithoutExceptions([&]() -> int {
+        if (!request || !name || !IsUTF8(name))
+            return GLYPHWELL_ERROR_INVALID_ARGUMENT;
+        request->applicationName = name;
+        request->bytes.clear();
+        return GLYPHWELL_OK;
+    });
 }
 
 int glyphwell_request_set_bundle_path(glyphwell_request* request, const char* path) {
-    if (!request || !path || !*path)
-        return GLYPHWELL_ERROR_INVALID_ARGUMENT;
-    std::string absolute = AbsolutePath(path);
-    TCFAdopted<CFURLRef> url(absolute.empty() ? nullptr : CreateFileURL(absolute));
-    if (!url)
-        return GLYPHWELL_ERROR_INVALID_ARGUMENT;
-    request->bundlePath = std::move(absolute);
-    request->bytes.clear();
-    return GLYPHWELL_OK;
+    return WithoutExceptions([&]() -> int {
+        if (!request || !path || !*path)
+            return GLYPHWELL_ERROR_INVALID_ARGUMENT;
+        std::string absolute = AbsolutePath(path);
+        TCFAdopted<CFURLRef> url(absolute.empty() ? nullptr : CreateFileURL(absolute));
+        if (!url)
+            return GLYPHWELL_ERROR_INVALID_ARGUMENT;
+        request->bundlePath = std::move(absolute);
+        request->bytes.clear();
+        return GLYPHWELL_OK;
+    });
 }
 
 int glyphwell_request_set_process_id(glyphwell_request* request, int32_t pid) {
@@ -440,27 +464,31 @@ int glyphwell_request_set_process_id(glyphwell_request* request, int32_t pid) {
 }
 
 int glyphwell_request_add_candidate_file(glyphwell_request* request, const char* path) {
-    if (!request || request->question != GLYPHWELL_ASK_ACTIVATION || !path || !*path)
-        return GLYPHWELL_ERROR_INVALID_ARGUMENT;
-    std::string absolute = AbsolutePath(path);
-    TCFAdopted<CFURLRef> url(absolute.empty() ? nullptr : CreateFileURL(absolute));
-    if (!url)
-        return GLYPHWELL_ERROR_INVALID_ARGUMENT;
-    request->candidatePaths.push_back(std::move(absolute));
-    request->bytes.clear();
-    return GLYPHWELL_OK;
+    return WithoutExceptions([&]() -> int {
+        if (!request || request->question != GLYPHWELL_ASK_ACTIVATION || !path || !*path)
+            return GLYPHWELL_ERROR_INVALID_ARGUMENT;
+        std::string absolute = AbsolutePath(path);
+        TCFAdopted<CFURLRef> url(absolute.empty() ? nullptr : CreateFileURL(absolute));
+        if (!url)
+            return GLYPHWELL_ERROR_INVALID_ARGUMENT;
+        request->candidatePaths.push_back(std::move(absolute));
+        request->bytes.clear();
+        return GLYPHWELL_OK;
+    });
 }
 
 int glyphwell_request_add_font(glyphwell_request* request, const char* postscript_name,
                                const char* family) {
-    if (!request || !postscript_name || !*postscript_name || !IsUTF8(postscript_name) ||
-        (family && !IsUTF8(family)))
-        return GLYPHWELL_ERROR_INVALID_ARGUMENT;
-    if (request->question == GLYPHWELL_ASK_ACTIVATION && !request->fonts.empty())
-        return GLYPHWELL_ERROR_INVALID_ARGUMENT;
-    request->fonts.push_back(Font{postscript_name, family ? family : ""});
-    request->bytes.clear();
-    return GLYPHWELL_OK;
+    return WithoutExceptions([&]() -> int {
+        if (!request || !postscript_name || !*postscript_name || !IsUTF8(postscript_name) ||
+            (family && !IsUTF8(family)))
+            return GLYPHWELL_ERROR_INVALID_ARGUMENT;
+        if (request->question == GLYPHWELL_ASK_ACTIVATION && !request->fonts.empty())
+            return GLYPHWELL_ERROR_INVALID_ARGUMENT;
+        request->fonts.push_back(Font{postscript_name, family ? family : ""});
+        request->bytes.clear();
+        return GLYPHWELL_OK;
+    });
 }
 
 int glyphwell_request_set_suppress(glyphwell_request* request, int suppress) {
@@ -472,34 +500,38 @@ int glyphwell_request_set_suppress(glyphwell_request* request, int suppress) {
 }
 
 int glyphwell_request_get_bytes(glyphwell_request* request, const void** bytes, size_t* length) {
-    if (!request || !bytes || !length || !request->Flatten())
-        return GLYPHWELL_ERROR_INVALID_ARGUMENT;
-    *bytes = request->bytes.data();
-    *length = request->bytes.size();
-    return GLYPHWELL_OK;
+    return WithoutExceptions([&]() -> int {
+        if (!request || !bytes || !length || !request->Flatten())
+            return GLYPHWELL_ERROR_INVALID_ARGUMENT;
+        *bytes = request->bytes.data();
+        *length = request->bytes.size();
+        return GLYPHWELL_OK;
+    });
 }
 
 int glyphwell_call_start(glyphwell_request* request, const char* port_name, glyphwell_call** call) {
     if (call)
         *call = nullptr;
-    if (!request || !call || !request->Flatten())
-        return GLYPHWELL_ERROR_INVALID_ARGUMENT;
-    auto* made = new (std::nothrow) glyphwell_call;
-    if (!made)
-        return GLYPHWELL_ERROR_NO_MEMORY;
-    made->question = request->question;
-    PutBigEndian32(&made->output, uint32_t(request->question));
-    PutBigEndian32(&made->output, uint32_t(request->bytes.size()));
-    made->output += request->bytes;
-    const int status = made->Connect(port_name);
-    if (status < 0) {
-        const int error = errno;
-        delete made;
-        errno = error;
-        return status;
-    }
-    *call = made;
-    return GLYPHWELL_OK;
+    return WithoutExceptions([&]() -> int {
+        if (!request || !call || !request->Flatten())
+            return GLYPHWELL_ERROR_INVALID_ARGUMENT;
+        std::unique_ptr<glyphwell_call> made(new (std::nothrow) glyphwell_call);
+        if (!made)
+            return GLYPHWELL_ERROR_NO_MEMORY;
+        made->question = request->question;
+        PutBigEndian32(&made->output, uint32_t(request->question));
+        PutBigEndian32(&made->output, uint32_t(request->bytes.size()));
+        made->output += request->bytes;
+        const int status = made->Connect(port_name);
+        if (status < 0) {
+            const int error = errno;
+            made.reset();
+            errno = error;
+            return status;
+        }
+        *call = made.release();
+        return GLYPHWELL_OK;
+    });
 }
 
 int glyphwell_call_get_fd(const glyphwell_call* call) {
@@ -521,17 +553,19 @@ short glyphwell_call_get_events(const glyphwell_call* call) {
 }
 
 int glyphwell_call_dispatch(glyphwell_call* call, glyphwell_reply** reply) {
-    if (!call || !reply)
-        return GLYPHWELL_ERROR_INVALID_ARGUMENT;
-    *reply = nullptr;
-    if (call->stage == glyphwell_call::Stage::kDone)
-        return call->outcome;
-    if (call->stage != glyphwell_call::Stage::kReading) {
-        const int status = call->Write();
-        if (status != GLYPHWELL_IN_PROGRESS || call->stage != glyphwell_call::Stage::kReading)
-            return status;
-    }
-    return call->Read(reply);
+    return WithoutExceptions([&]() -> int {
+        if (!call || !reply)
+            return GLYPHWELL_ERROR_INVALID_ARGUMENT;
+        *reply = nullptr;
+        if (call->stage == glyphwell_call::Stage::kDone)
+            return call->outcome;
+        if (call->stage != glyphwell_call::Stage::kReading) {
+            const int status = call->Write();
+            if (status != GLYPHWELL_IN_PROGRESS || call->stage != glyphwell_call::Stage::kReading)
+                return status;
+        }
+        return call->Read(reply);
+    });
 }
 
 void glyphwell_call_free(glyphwell_call* call) {
