@@ -5,7 +5,6 @@
 #include <QTimer>
 #include <QWidget>
 #include <QWindow>
-#include <cstdlib>
 
 #include "platform/Log.h"
 
@@ -31,8 +30,10 @@ QString QZTakeActivationToken() {
     QString token = qEnvironmentVariable("XDG_ACTIVATION_TOKEN");
     if (token.isEmpty())
         token = qEnvironmentVariable("DESKTOP_STARTUP_ID");
-    unsetenv("XDG_ACTIVATION_TOKEN");
-    unsetenv("DESKTOP_STARTUP_ID");
+    // The environment is changed only when it holds a token: transfer threads read it too.
+    for (const char* name : {"XDG_ACTIVATION_TOKEN", "DESKTOP_STARTUP_ID"})
+        if (qEnvironmentVariableIsSet(name))
+            qunsetenv(name);
     return token.isEmpty() ? QString() : token;
 }
 
@@ -46,11 +47,13 @@ void QZBringToFront(QWidget* window) {
     }
     // Qt's Wayland plugin hands XDG_ACTIVATION_TOKEN to the compositor with the activation
     // request and asks for a token of its own when there is none. A token under the older name
-    // is moved to the name the plugin reads; whatever the plugin leaves is removed afterwards.
-    if (const QString token = QZTakeActivationToken(); !token.isEmpty())
+    // is moved to the name the plugin reads, and removed once the request is made.
+    const QString token = QZTakeActivationToken();
+    if (!token.isEmpty())
         qputenv("XDG_ACTIVATION_TOKEN", token.toUtf8());
     window->activateWindow();
-    unsetenv("XDG_ACTIVATION_TOKEN");
+    if (!token.isEmpty())
+        qunsetenv("XDG_ACTIVATION_TOKEN");
 
     QPointer<QWidget> watched(window);
     QTimer::singleShot(kQZActivationPatience, window, [watched] {
