@@ -34,10 +34,12 @@
 #include "platform/CFMessagePort.h"
 #include "platform/CFRunLoop.h"
 #include "platform/CFString.h"
+#include "support/PortTestSupport.h"
 
 namespace {
 
 using Clock = std::chrono::steady_clock;
+using glyphwell::testing::RawConnect;
 
 struct Options {
     int clients = 20;
@@ -176,27 +178,13 @@ void RunClient(const Options& options, const std::atomic<bool>& stop, ClientResu
     CFRelease(remote);
 }
 
-/// A raw connection to `path`, or -1.
-int Connect(const std::string& path) {
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    std::memcpy(address.sun_path, path.data(), std::min(path.size(), sizeof address.sun_path - 1));
-    const int descriptor = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    if (descriptor >= 0 &&
-        connect(descriptor, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
-        close(descriptor);
-        return -1;
-    }
-    return descriptor;
-}
-
 /// Queues 5,000 empty requests on a new connection and hangs up, once a second until `stop`.
 void RunFlooder(const std::string& path, const std::atomic<bool>& stop) {
     std::string frames;
     for (int i = 0; i < 5000; ++i)
         frames.append("\x00\x00\x03\xE8\x00\x00\x00\x00", 8);
     while (!stop.load(std::memory_order_relaxed)) {
-        const int descriptor = Connect(path);
+        const int descriptor = RawConnect(path);
         if (descriptor < 0)
             continue;
         size_t done = 0;
@@ -266,7 +254,7 @@ int main(int argc, char** argv) {
     const std::string path = glyphwell::port::SocketPathForName("org.glyphwell.Bench.Load");
     // Silent connections that stay open: raw sockets, never written to.
     for (int i = 0; i < options.idle; ++i)
-        if (const int descriptor = Connect(path); descriptor >= 0)
+        if (const int descriptor = RawConnect(path); descriptor >= 0)
             idle.push_back(descriptor);
 
     const auto [startKiB, startDescriptors] = SampleProcess(server);

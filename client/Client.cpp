@@ -67,6 +67,15 @@ CFURLRef CreateFileURL(const std::string& path) {
                                                    CFIndex(path.size()), directory);
 }
 
+/// `path` (non-empty) made absolute, when a file URL can be made of it; empty otherwise.
+std::string FileURLPath(const char* path) {
+    if (!path || !*path)
+        return {};
+    std::string absolute = AbsolutePath(path);
+    TCFAdopted<CFURLRef> url(absolute.empty() ? nullptr : CreateFileURL(absolute));
+    return url ? absolute : std::string();
+}
+
 /// Builds dictionaries from key/value pairs, each value adopted.
 class DictionaryBuilder {
 public:
@@ -443,11 +452,8 @@ int glyphwell_request_set_application_name(glyphwell_request* request, const cha
 
 int glyphwell_request_set_bundle_path(glyphwell_request* request, const char* path) {
     return WithoutExceptions([&]() -> int {
-        if (!request || !path || !*path)
-            return GLYPHWELL_ERROR_INVALID_ARGUMENT;
-        std::string absolute = AbsolutePath(path);
-        TCFAdopted<CFURLRef> url(absolute.empty() ? nullptr : CreateFileURL(absolute));
-        if (!url)
+        std::string absolute = FileURLPath(path);
+        if (!request || absolute.empty())
             return GLYPHWELL_ERROR_INVALID_ARGUMENT;
         request->bundlePath = std::move(absolute);
         request->bytes.clear();
@@ -465,11 +471,8 @@ int glyphwell_request_set_process_id(glyphwell_request* request, int32_t pid) {
 
 int glyphwell_request_add_candidate_file(glyphwell_request* request, const char* path) {
     return WithoutExceptions([&]() -> int {
-        if (!request || request->question != GLYPHWELL_ASK_ACTIVATION || !path || !*path)
-            return GLYPHWELL_ERROR_INVALID_ARGUMENT;
-        std::string absolute = AbsolutePath(path);
-        TCFAdopted<CFURLRef> url(absolute.empty() ? nullptr : CreateFileURL(absolute));
-        if (!url)
+        std::string absolute = FileURLPath(path);
+        if (!request || request->question != GLYPHWELL_ASK_ACTIVATION || absolute.empty())
             return GLYPHWELL_ERROR_INVALID_ARGUMENT;
         request->candidatePaths.push_back(std::move(absolute));
         request->bytes.clear();

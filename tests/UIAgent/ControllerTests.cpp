@@ -5,11 +5,8 @@
 #include <QEvent>
 #include <chrono>
 #include <csignal>
-#include <cstdio>
 #include <memory>
 #include <string>
-#include <sys/socket.h>
-#include <sys/un.h>
 #include <thread>
 #include <unistd.h>
 
@@ -20,6 +17,7 @@
 #include "tests/UIAgent/AgentTestSupport.h"
 #include "tests/UIAgent/QtTestEnvironment.h"
 #include "tests/support/LogCapture.h"
+#include "tests/support/PortTestSupport.h"
 
 namespace {
 
@@ -196,13 +194,9 @@ TEST_F(ControllerTest, ARequestStillBeingReceivedKeepsTheAgentFromItsIdleExit) {
     controller_->applicationWillFinishLaunching();
     SendUnknownRequest();
     // A client that has sent the first bytes of a frame and is still sending.
-    const int client = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    const int client =
+        glyphwell::testing::RawConnect(glyphwell::port::SocketPathForName(QZ_UI_AGENT_PORT_NAME));
     ASSERT_GE(client, 0);
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    const std::string path = glyphwell::port::SocketPathForName(QZ_UI_AGENT_PORT_NAME);
-    std::snprintf(address.sun_path, sizeof address.sun_path, "%s", path.c_str());
-    ASSERT_EQ(connect(client, reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
     const unsigned char head[] = {0, 0, 0, 3, 0, 0};
     ASSERT_EQ(write(client, head, sizeof head), ssize_t(sizeof head));
     SpinUntil([] { return false; }, 3 * kShortIdleDelay);

@@ -4,46 +4,12 @@
 // LeakSanitizer).
 #include <gtest/gtest.h>
 
-#include <cstdlib>
-#include <new>
-
 #include "glyphwell/client.h"
+#include "support/FailingAllocator.h"
 
 namespace {
 
-/// Allocations left before the one that fails on this thread; negative: none fails.
-thread_local long gAllocationsBeforeFailure = -1;
-
-} // namespace
-
-void* operator new(std::size_t size) {
-    if (gAllocationsBeforeFailure == 0) {
-        gAllocationsBeforeFailure = -1;
-        throw std::bad_alloc();
-    }
-    if (gAllocationsBeforeFailure > 0)
-        --gAllocationsBeforeFailure;
-    if (void* memory = std::malloc(size ? size : 1))
-        return memory;
-    throw std::bad_alloc();
-}
-void* operator new(std::size_t size, const std::nothrow_t&) noexcept {
-    if (gAllocationsBeforeFailure == 0) {
-        gAllocationsBeforeFailure = -1;
-        return nullptr;
-    }
-    if (gAllocationsBeforeFailure > 0)
-        --gAllocationsBeforeFailure;
-    return std::malloc(size ? size : 1);
-}
-void operator delete(void* memory) noexcept {
-    std::free(memory);
-}
-void operator delete(void* memory, std::size_t) noexcept {
-    std::free(memory);
-}
-
-namespace {
+using glyphwell::testing::gAllocationsBeforeFailure;
 
 /// Builds, flattens and starts one download request against a port nobody serves; the status of
 /// the first call that does not succeed, or GLYPHWELL_OK.

@@ -3,40 +3,14 @@
 // LeakSanitizer).
 #include <gtest/gtest.h>
 
-#include <cstdlib>
-#include <new>
 #include <string>
 #include <vector>
 
 #include "serialization/TCFResurrectContext.h"
+#include "support/FailingAllocator.h"
 #include "support/FlattenedBytes.h"
 #include "support/LogCapture.h"
 #include "support/Values.h"
-
-namespace {
-
-/// Allocations left before the one that fails on this thread; negative: none fails.
-thread_local long gAllocationsBeforeFailure = -1;
-
-} // namespace
-
-void* operator new(std::size_t size) {
-    if (gAllocationsBeforeFailure == 0) {
-        gAllocationsBeforeFailure = -1;
-        throw std::bad_alloc();
-    }
-    if (gAllocationsBeforeFailure > 0)
-        --gAllocationsBeforeFailure;
-    if (void* memory = std::malloc(size ? size : 1))
-        return memory;
-    throw std::bad_alloc();
-}
-void operator delete(void* memory) noexcept {
-    std::free(memory);
-}
-void operator delete(void* memory, std::size_t) noexcept {
-    std::free(memory);
-}
 
 namespace {
 

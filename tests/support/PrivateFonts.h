@@ -7,10 +7,10 @@
 #include <QFile>
 #include <QString>
 #include <cstdio>
-#include <openssl/evp.h>
 #include <string>
 
 #include "desktop/QZFontMatching.h"
+#include "support/SHA256.h"
 
 namespace glyphwell::testing {
 
@@ -22,20 +22,6 @@ inline std::string ReadFile(const QString& path) {
         return {};
     const QByteArray bytes = file.readAll();
     return std::string(bytes.constData(), size_t(bytes.size()));
-}
-
-/// SHA-256 in hexadecimal, computed here with OpenSSL rather than by the code under test.
-inline std::string SHA256Of(const std::string& bytes) {
-    unsigned char digest[EVP_MAX_MD_SIZE];
-    unsigned int length = 0;
-    EVP_Digest(bytes.data(), bytes.size(), digest, &length, EVP_sha256(), nullptr);
-    std::string hex;
-    for (unsigned int i = 0; i < length; ++i) {
-        char pair[3];
-        std::snprintf(pair, sizeof pair, "%02x", digest[i]);
-        hex += pair;
-    }
-    return hex;
 }
 
 /// Points the XDG directories and fontconfig at `root`: the user font directory is

@@ -3,7 +3,6 @@
 // libraries.
 #ifdef GLYPHWELL_CATALOG_TOOL
 #include <gtest/gtest.h>
-#include <openssl/evp.h>
 
 #include <filesystem>
 #include <fstream>
@@ -11,12 +10,14 @@
 #include <sstream>
 
 #include "support/LoopbackHTTPServer.h"
+#include "support/SHA256.h"
 #include "tools/Commands.h"
 
 namespace {
 
 namespace fs = std::filesystem;
 using Json = nlohmann::ordered_json;
+using glyphwell::testing::SHA256Of;
 
 const std::string kDejaVu = "/usr/share/fonts/truetype/dejavu/";
 const std::string kCollection = "/usr/share/fonts/truetype/wqy/wqy-microhei.ttc";
@@ -30,20 +31,6 @@ struct Result {
 std::string Contents(const std::string& path) {
     std::ifstream file(path, std::ios::binary);
     return std::string(std::istreambuf_iterator<char>(file), std::istreambuf_iterator<char>());
-}
-
-/// SHA-256 in hexadecimal, computed here rather than by the code under test.
-std::string SHA256Of(const std::string& bytes) {
-    unsigned char digest[EVP_MAX_MD_SIZE];
-    unsigned int length = 0;
-    EVP_Digest(bytes.data(), bytes.size(), digest, &length, EVP_sha256(), nullptr);
-    std::string hex;
-    for (unsigned int i = 0; i < length; ++i) {
-        char pair[3];
-        std::snprintf(pair, sizeof pair, "%02x", digest[i]);
-        hex += pair;
-    }
-    return hex;
 }
 
 class CatalogCommandTest : public ::testing::Test {

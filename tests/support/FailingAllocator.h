@@ -1,0 +1,43 @@
+// Allocation failure on demand: replaces the global operator new and delete of a test program so
+// that the Nth allocation of the calling thread fails (std::bad_alloc, or null for the nothrow
+// form). Include it in exactly ONE file of a test program: it defines the replacements.
+#pragma once
+
+#include <cstdlib>
+#include <new>
+
+namespace glyphwell::testing {
+
+/// Allocations left on this thread before the one that fails; negative: none fails. Set back to
+/// -1 when the failure has happened, so a test can tell whether it did.
+inline thread_local long gAllocationsBeforeFailure = -1;
+
+/// True when the next allocation of this thread is to fail (and arms no further failure).
+inline bool AllocationFailsNow() {
+    if (gAllocationsBeforeFailure == 0) {
+        gAllocationsBeforeFailure = -1;
+        return true;
+    }
+    if (gAllocationsBeforeFailure > 0)
+        --gAllocationsBeforeFailure;
+    return false;
+}
+
+} // namespace glyphwell::testing
+
+void* operator new(std::size_t size) {
+    if (glyphwell::testing::AllocationFailsNow())
+        throw std::bad_alloc();
+    if (void* memory = std::malloc(size ? size : 1))
+        return memory;
+    throw std::bad_alloc();
+}
+void* operator new(std::size_t size, const std::nothrow_t&) noexcept {
+    return glyphwell::testing::AllocationFailsNow() ? nullptr : std::malloc(size ? size : 1);
+}
+void operator delete(void* memory) noexcept {
+    std::free(memory);
+}
+void operator delete(void* memory, std::size_t) noexcept {
+    std::free(memory);
+}
