@@ -81,7 +81,7 @@ bool ReadFontFaces(const std::string& path, std::vector<FontFace>* faces, std::s
 bool DigestFile(const std::string& path, uint64_t* size, std::string* sha256, std::string* error) {
     std::ifstream file(path, std::ios::binary);
     if (!file) {
-        *error = path + ": cannot open: " + std::strerror(errno);
+        *error = "cannot open " + path + ": " + std::strerror(errno);
         return false;
     }
     QZSHA256Digest digest;

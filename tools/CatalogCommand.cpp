@@ -15,6 +15,7 @@
 #include "platform/Log.h"
 #include "platform/LogEscape.h"
 #include "tools/CatalogAssets.h"
+#include "tools/ToolInput.h"
 
 namespace glyphwell::tools {
 
@@ -46,23 +47,9 @@ std::string DefaultCatalogPath(bool mustExist) {
     return paths.isEmpty() ? std::string() : paths.front().toStdString();
 }
 
-/// Reads a whole file of at most kMaximumCatalogSize bytes; false with a message.
+/// Reads a whole catalog file of at most kMaximumCatalogSize bytes; false with a message.
 bool ReadCatalogFile(const std::string& path, std::string* text, std::string* error) {
-    std::ifstream file(path, std::ios::binary);
-    if (!file) {
-        *error = path + ": cannot open: " + std::strerror(errno);
-        return false;
-    }
-    text->assign(std::istreambuf_iterator<char>(file), std::istreambuf_iterator<char>());
-    if (file.bad()) {
-        *error = path + ": cannot read";
-        return false;
-    }
-    if (text->size() > kMaximumCatalogSize) {
-        *error = path + ": larger than " + std::to_string(kMaximumCatalogSize) + " bytes";
-        return false;
-    }
-    return true;
+    return ReadFile(path, text, error, kMaximumCatalogSize);
 }
 
 /// Parses with the agent's reader; every line it logs is a problem.

@@ -1,5 +1,8 @@
 #include "tools/ToolInput.h"
 
+#include <algorithm>
+#include <cerrno>
+#include <cstring>
 #include <fstream>
 #include <istream>
 #include <iterator>
@@ -30,22 +33,35 @@ std::string Position(const std::string& text, size_t offset) {
 
 } // namespace
 
+bool ReadFile(const std::string& path, std::string* text, std::string* error, size_t maximumSize) {
+    std::ifstream file(path, std::ios::binary);
+    if (!file) {
+        *error = "cannot open " + path + ": " + std::strerror(errno);
+        return false;
+    }
+    text->clear();
+    char buffer[65536];
+    while (file && text->size() <= maximumSize) {
+        file.read(buffer, std::streamsize(std::min(sizeof buffer, maximumSize - text->size() + 1)));
+        text->append(buffer, size_t(file.gcount()));
+    }
+    if (file.bad()) {
+        *error = "cannot read " + path;
+        return false;
+    }
+    if (text->size() > maximumSize) {
+        *error = path + ": larger than " + std::to_string(maximumSize) + " bytes";
+        return false;
+    }
+    return true;
+}
+
 bool ReadInput(const std::string& path, std::istream& in, std::string* text, std::string* error) {
     if (path.empty() || path == "-") {
         text->assign(std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>());
         return true;
     }
-    std::ifstream file(path, std::ios::binary);
-    if (!file) {
-        *error = "cannot open " + path;
-        return false;
-    }
-    text->assign(std::istreambuf_iterator<char>(file), std::istreambuf_iterator<char>());
-    if (file.bad()) {
-        *error = "cannot read " + path;
-        return false;
-    }
-    return true;
+    return ReadFile(path, text, error);
 }
 
 std::string InputName(const std::string& path) {

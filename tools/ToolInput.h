@@ -2,6 +2,7 @@
 // parsed with the place of a syntax error, and a value flattened to request bytes.
 #pragma once
 
+#include <cstdint>
 #include <iosfwd>
 #include <nlohmann/json.hpp>
 #include <string>
@@ -9,6 +10,12 @@
 #include "platform/PropertyValues.h"
 
 namespace glyphwell::tools {
+
+/// Reads the whole file `path` into `*text`. False with a message in `*error` naming the file and
+/// the reason when it cannot be opened or read, or when it holds more than `maximumSize` bytes
+/// (then at most `maximumSize` + 1 bytes were read).
+bool ReadFile(const std::string& path, std::string* text, std::string* error,
+              size_t maximumSize = SIZE_MAX);
 
 /// Reads the whole input named by `path` ("-" or empty: `in`). False with a message in `*error`
 /// when the file cannot be opened or read.
