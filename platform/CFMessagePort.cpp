@@ -24,6 +24,8 @@
 #include <deque>
 #include <map>
 #include <mutex>
+#include <unordered_map>
+#include <unordered_set>
 #include <vector>
 
 #include "platform/CFData.h"
@@ -57,6 +59,9 @@ constexpr size_t kReadAheadLimit = 1u << 20;
 constexpr std::chrono::milliseconds kDefaultStallTimeout{30000};
 /// The most bytes that unfinished requests may hold across all connections of a port.
 constexpr size_t kDefaultUnfinishedLimit = size_t(128) << 20;
+/// The most connections one client process may hold open at once: a quarter of the usual 1024
+/// descriptors, so that a client that leaks connections cannot use up the agent's.
+constexpr size_t kDefaultConnectionsPerProcess = 256;
 
 using Clock = std::chrono::steady_clock;
 
@@ -509,11 +514,12 @@ struct __CFMessagePort final : CFObject {
 
     // Local ports: used on the run loop's thread only.
     int listenDescriptor = -1;
-    int spareDescriptor = -1; ///< given up to accept and refuse a client when out of descriptors
-    int serveSignal = -1;     ///< eventfd: readable while connections wait for their turn
-    int stallTimer = -1;      ///< timerfd: the next check for stalled unfinished requests
-    int hangUps = -1;         ///< epoll set of every connection: readable when a client hangs up
-    int lastAcceptError = 0;  ///< the accept failure already logged, until an accept succeeds
+    int spareDescriptor = -1;  ///< given up to accept and refuse a client when out of descriptors
+    int serveSignal = -1;      ///< eventfd: readable while connections wait for their turn
+    int stallTimer = -1;       ///< timerfd: the next check for stalled unfinished requests
+    int hangUps = -1;          ///< epoll set of every connection: readable when a client hangs up
+    int lastAcceptError = 0;   ///< the accept failure already logged, until an accept succeeds
+    bool acceptPaused = false; ///< out of descriptors without a spare: not watching for clients
     bool ownsSocketFile = false;
     std::string socketPath;
     dev_t socketDevice = 0;
@@ -523,6 +529,9 @@ struct __CFMessagePort final : CFObject {
     RunLoopDriver* driver = nullptr;
     __CFRunLoopSource* source = nullptr; ///< not retained: the source retains the port
     std::map<int, ConnectionPtr> connections;
+    std::unordered_map<pid_t, size_t> connectionsOfProcess; ///< open connections per client
+    std::unordered_set<pid_t> refusedProcesses; ///< at their limit and told so in the log
+    size_t connectionsPerProcessLimit = kDefaultConnectionsPerProcess;
     std::deque<std::weak_ptr<Connection>> serveQueue; ///< connections with a frame, in turn
     std::vector<uint8_t> readBuffer;
     size_t unfinishedBytes = 0; ///< bytes of unfinished frames over all connections
@@ -552,6 +561,9 @@ private:
     void RemoveSocketFile();
     void UpdateWatch(const ConnectionPtr& connection);
     void OnListenEvent();
+    bool AcceptWhenOutOfDescriptors();
+    bool AdmitProcess(pid_t process);
+    void ResumeAccepting();
     void Accept(int client, const ucred& credentials);
     void OnConnectionEvent(const std::weak_ptr<Connection>& weak, bool readable, bool writable);
     void ReadAvailable(const ConnectionPtr& connection);
@@ -655,6 +667,7 @@ void __CFMessagePort::Schedule(RunLoopDriver* newDriver) {
     if (!valid || remote || !newDriver)
         return;
     driver = newDriver;
+    acceptPaused = false;
     driver->Watch(listenDescriptor, true, false, [this](bool, bool) { OnListenEvent(); });
     driver->Watch(serveSignal, true, false, [this](bool, bool) { OnServeSignal(); });
     driver->Watch(stallTimer, true, false, [this](bool, bool) { OnStallTimer(); });
@@ -691,23 +704,18 @@ void __CFMessagePort::UpdateWatch(const ConnectionPtr& connection) {
 void __CFMessagePort::OnListenEvent() {
     PortHold hold(this);
     for (int accepted = 0; accepted < kAcceptsPerEvent && valid; ++accepted) {
-        int client = accept4(listenDescriptor, nullptr, nullptr, SOCK_NONBLOCK | SOCK_CLOEXEC);
+        int client = glyphwell::port::AcceptConnection()(listenDescriptor, nullptr, nullptr,
+                                                         SOCK_NONBLOCK | SOCK_CLOEXEC);
         if (client < 0) {
             const int error = errno;
             if (error == EINTR || error == ECONNABORTED)
                 continue;
             if (error == EAGAIN || error == EWOULDBLOCK)
                 return;
-            if ((error == EMFILE || error == ENFILE) && spareDescriptor >= 0) {
-                // Out of descriptors: the waiting client would keep the socket readable and the
-                // loop spinning. Free the spare one to accept and refuse it.
-                CloseDescriptor(spareDescriptor);
-                client = accept4(listenDescriptor, nullptr, nullptr, SOCK_CLOEXEC);
-                CloseDescriptor(client);
-                spareDescriptor = open("/dev/null", O_RDONLY | O_CLOEXEC);
-                AppLog("message port %s: out of file descriptors; refused a connection",
-                       logName.c_str());
-                continue;
+            if (error == EMFILE || error == ENFILE) {
+                if (AcceptWhenOutOfDescriptors())
+                    continue;
+                return;
             }
             // The socket stays readable: say it once, not on every round of the loop.
             if (error != lastAcceptError)
@@ -731,8 +739,54 @@ void __CFMessagePort::OnListenEvent() {
             CloseDescriptor(client);
             continue;
         }
+        if (!AdmitProcess(credentials.pid)) {
+            CloseDescriptor(client);
+            continue;
+        }
         Accept(client, credentials);
     }
+}
+
+bool __CFMessagePort::AcceptWhenOutOfDescriptors() {
+    // The waiting client keeps the socket readable and the loop spinning: free the spare
+    // descriptor to accept and refuse it.
+    if (spareDescriptor >= 0) {
+        CloseDescriptor(spareDescriptor);
+        const int refused =
+            glyphwell::port::AcceptConnection()(listenDescriptor, nullptr, nullptr, SOCK_CLOEXEC);
+        spareDescriptor = open("/dev/null", O_RDONLY | O_CLOEXEC);
+        if (refused >= 0) {
+            CloseDescriptor(refused);
+            AppLog("message port %s: out of file descriptors; refused a connection",
+                   logName.c_str());
+            return true;
+        }
+    }
+    // Nothing to refuse with: stop watching the socket until a connection closes.
+    if (driver)
+        driver->Unwatch(listenDescriptor);
+    acceptPaused = true;
+    AppLog("message port %s: out of file descriptors; accepting again when a connection closes",
+           logName.c_str());
+    return false;
+}
+
+bool __CFMessagePort::AdmitProcess(pid_t process) {
+    const auto held = connectionsOfProcess.find(process);
+    if (held == connectionsOfProcess.end() || held->second < connectionsPerProcessLimit)
+        return true;
+    if (refusedProcesses.insert(process).second)
+        AppLog("message port %s: refused a connection from process %d, which holds %zu already",
+               logName.c_str(), int(process), held->second);
+    return false;
+}
+
+void __CFMessagePort::ResumeAccepting() {
+    acceptPaused = false;
+    if (spareDescriptor < 0)
+        spareDescriptor = open("/dev/null", O_RDONLY | O_CLOEXEC);
+    if (driver)
+        driver->Watch(listenDescriptor, true, false, [this](bool, bool) { OnListenEvent(); });
 }
 
 void __CFMessagePort::Accept(int client, const ucred& credentials) {
@@ -749,6 +803,7 @@ void __CFMessagePort::Accept(int client, const ucred& credentials) {
     connection->descriptor = client;
     connection->processID = credentials.pid;
     connections[client] = connection;
+    ++connectionsOfProcess[credentials.pid];
     UpdateWatch(connection);
 }
 
@@ -1103,6 +1158,13 @@ void __CFMessagePort::CloseConnection(ConnectionPtr connection) {
     connections.erase(connection->descriptor);
     CloseDescriptor(connection->descriptor);
     connection->descriptor = -1;
+    if (const auto held = connectionsOfProcess.find(connection->processID);
+        held != connectionsOfProcess.end() && --held->second == 0) {
+        connectionsOfProcess.erase(held);
+        refusedProcesses.erase(connection->processID);
+    }
+    if (acceptPaused && valid)
+        ResumeAccepting();
     CountUnfinished(connection);
     if (connection->reply)
         CFRelease(connection->reply);
@@ -1576,6 +1638,11 @@ void SetStallTimeout(CFMessagePortRef local, std::chrono::milliseconds timeout) 
 void SetUnfinishedRequestLimit(CFMessagePortRef local, size_t bytes) {
     if (__CFMessagePort* port = AsLocalPort(local))
         port->unfinishedLimit = bytes;
+}
+
+void SetConnectionLimitPerProcess(CFMessagePortRef local, size_t connections) {
+    if (__CFMessagePort* port = AsLocalPort(local))
+        port->connectionsPerProcessLimit = std::max<size_t>(connections, 1);
 }
 
 bool IsReceivingRequest(CFMessagePortRef local) {

@@ -140,6 +140,10 @@ void SetStallTimeout(CFMessagePortRef local, std::chrono::milliseconds timeout);
 /// The most bytes that unfinished requests of a local port may hold over all its connections
 /// (128 MiB unless set). Run-loop thread only.
 void SetUnfinishedRequestLimit(CFMessagePortRef local, size_t bytes);
+/// The most connections one client process may hold open on a local port (256 unless set; at
+/// least 1). A connection beyond it is closed at once, with one log line per process until all
+/// its connections have closed. Run-loop thread only.
+void SetConnectionLimitPerProcess(CFMessagePortRef local, size_t connections);
 /// True while a local port is receiving work: a connection holds part of a request, or whole
 /// requests not yet handled. False for an invalidated port. Run-loop thread only.
 bool IsReceivingRequest(CFMessagePortRef local);

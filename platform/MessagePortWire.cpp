@@ -177,6 +177,7 @@ void FrameAssembler::Clear() {
 namespace {
 
 std::atomic<ReplySendFunction> replySendFunction{nullptr};
+std::atomic<AcceptFunction> acceptFunction{nullptr};
 
 } // namespace
 
@@ -187,6 +188,15 @@ void SetReplySendFunctionForTesting(ReplySendFunction function) {
 ReplySendFunction ReplySend() {
     ReplySendFunction function = replySendFunction;
     return function ? function : &sendmsg;
+}
+
+void SetAcceptFunctionForTesting(AcceptFunction function) {
+    acceptFunction = function;
+}
+
+AcceptFunction AcceptConnection() {
+    AcceptFunction function = acceptFunction;
+    return function ? function : &accept4;
 }
 
 } // namespace glyphwell::port

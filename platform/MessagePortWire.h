@@ -131,4 +131,10 @@ using ReplySendFunction = ssize_t (*)(int descriptor, const msghdr* message, int
 void SetReplySendFunctionForTesting(ReplySendFunction function);
 ReplySendFunction ReplySend();
 
+/// How local ports accept connections: accept4(2) unless a test installs a hook (null restores
+/// it). The hook is process-wide and must be installed while no port accepts.
+using AcceptFunction = int (*)(int descriptor, sockaddr* address, socklen_t* length, int flags);
+void SetAcceptFunctionForTesting(AcceptFunction function);
+AcceptFunction AcceptConnection();
+
 } // namespace glyphwell::port

@@ -971,3 +971,96 @@ TEST_F(MessagePortTest, AReplyWriteThatFailsClosesOnlyThatConnection) {
         EXPECT_EQ(log.Texts(), (std::vector<std::string>{test.line}));
     }
 }
+
+TEST_F(MessagePortTest, RefusesConnectionsOfAProcessBeyondItsLimitWithOneLogLine) {
+    LogCapture log;
+    LocalPort local(kName, EchoWithMsgid);
+    ASSERT_NE(local.Port(), nullptr);
+    glyphwell::port::SetConnectionLimitPerProcess(local.Port(), 2);
+    int clients[4];
+    for (int& client : clients)
+        ASSERT_GE(client = RawConnect(SocketPath()), 0);
+    ASSERT_TRUE(local.RunUntil([&] { return HasBytes(clients[2]) && HasBytes(clients[3]); }));
+    EXPECT_TRUE(RawSeesClose(clients[2]));
+    EXPECT_TRUE(RawSeesClose(clients[3]));
+    EXPECT_EQ(log.Texts(), (std::vector<std::string>{
+                               "message port org.glyphwell.Test.Port: refused a connection from "
+                               "process " +
+                               std::to_string(getpid()) + ", which holds 2 already"}));
+    // The admitted ones are served, and a closed one makes room for a new one.
+    ASSERT_TRUE(RawWrite(clients[1], RequestFrame(5, "b")));
+    ASSERT_TRUE(local.RunUntil([&] { return HasBytes(clients[1]); }));
+    EXPECT_EQ(RawRead(clients[1], 7), std::string("\x00\x00\x00\x03"
+                                                  "b@5",
+                                                  7));
+    close(clients[0]);
+    close(clients[2]);
+    close(clients[3]);
+    ASSERT_TRUE(local.RunUntil([&] { return !glyphwell::port::IsReceivingRequest(local.Port()); }));
+    const int next = RawConnect(SocketPath());
+    ASSERT_TRUE(RawWrite(next, RequestFrame(6, "c")));
+    ASSERT_TRUE(local.RunUntil([&] { return HasBytes(next); }));
+    EXPECT_EQ(RawRead(next, 7), std::string("\x00\x00\x00\x03"
+                                            "c@6",
+                                            7));
+    EXPECT_EQ(log.Texts().size(), 1u);
+    close(next);
+    close(clients[1]);
+}
+
+namespace {
+
+std::atomic<int> failingAccepts{0};
+
+/// Fails the next `failingAccepts` calls as a process out of descriptors would.
+int AcceptOrRunOut(int descriptor, sockaddr* address, socklen_t* length, int flags) {
+    if (failingAccepts > 0) {
+        --failingAccepts;
+        errno = EMFILE;
+        return -1;
+    }
+    return accept4(descriptor, address, length, flags);
+}
+
+} // namespace
+
+TEST_F(MessagePortTest, OutOfDescriptorsRefusesAClientOrWaitsForAConnectionToClose) {
+    LogCapture log;
+    LocalPort local(kName, EchoWithMsgid);
+    ASSERT_NE(local.Port(), nullptr);
+    const int first = RawConnect(SocketPath());
+    ASSERT_TRUE(RawWrite(first, RequestFrame(1, "a")));
+    ASSERT_TRUE(local.RunUntil([&] { return HasBytes(first); }));
+    ASSERT_EQ(RawRead(first, 7).size(), 7u);
+    glyphwell::port::SetAcceptFunctionForTesting(AcceptOrRunOut);
+
+    // With its spare descriptor the port accepts the client only to refuse it.
+    failingAccepts = 1;
+    const int refused = RawConnect(SocketPath());
+    ASSERT_TRUE(local.RunUntil([&] { return HasBytes(refused); }));
+    EXPECT_TRUE(RawSeesClose(refused));
+    close(refused);
+
+    // When even that fails, the port stops accepting until a connection closes, then serves the
+    // client that waited.
+    failingAccepts = 2;
+    const int waiting = RawConnect(SocketPath());
+    ASSERT_TRUE(RawWrite(waiting, RequestFrame(7, "d")));
+    ASSERT_TRUE(local.RunUntil([&] { return log.Texts().size() == 2; }));
+    const auto until = std::chrono::steady_clock::now() + std::chrono::milliseconds(300);
+    local.RunUntil([&] { return HasBytes(waiting) || std::chrono::steady_clock::now() > until; });
+    EXPECT_FALSE(HasBytes(waiting));
+    close(first);
+    ASSERT_TRUE(local.RunUntil([&] { return HasBytes(waiting); }));
+    glyphwell::port::SetAcceptFunctionForTesting(nullptr);
+    EXPECT_EQ(RawRead(waiting, 7), std::string("\x00\x00\x00\x03"
+                                               "d@7",
+                                               7));
+    EXPECT_EQ(log.Texts(),
+              (std::vector<std::string>{
+                  "message port org.glyphwell.Test.Port: out of file descriptors; refused a "
+                  "connection",
+                  "message port org.glyphwell.Test.Port: out of file descriptors; accepting again "
+                  "when a connection closes"}));
+    close(waiting);
+}
