@@ -10,8 +10,7 @@
 
 #include "UIAgent/QZAutoActivationConfirmation.h"
 #include "protocol/QZUIProtocol.h"
-#include "tests/UIAgent/AlertTestSupport.h"
-#include "tests/UIAgent/QtTestEnvironment.h"
+#include "tests/UIAgent/AgentTestSupport.h"
 #include "tests/support/PrivateSessionBus.h"
 
 namespace {

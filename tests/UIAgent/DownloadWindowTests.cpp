@@ -6,28 +6,18 @@
 // at one state, so that the window is looked at, cancelled or withdrawn mid-transfer at a known
 // point.
 #include <QDir>
-#include <QFile>
-#include <QLabel>
-#include <QProgressBar>
 #include <QPushButton>
 #include <QTemporaryDir>
 #include <climits>
 #include <condition_variable>
-#include <cstdio>
-#include <functional>
 #include <limits>
 #include <map>
 #include <mutex>
-#include <openssl/evp.h>
 
 #include "UIAgent/FontDownloadWindowController.h"
-#include "UIAgent/QZFontDownloadConfirmation.h"
-#include "UIAgent/QZLocalizedString.h"
 #include "UIAgent/QZNetworkCheck.h"
 #include "desktop/QZFontMatching.h"
-#include "tests/UIAgent/AlertTestSupport.h"
-#include "tests/UIAgent/DownloadTestSupport.h"
-#include "tests/UIAgent/QtTestEnvironment.h"
+#include "tests/UIAgent/AgentTestSupport.h"
 #include "tests/support/LoopbackHTTPServer.h"
 #include "tests/support/PrivateFonts.h"
 
@@ -128,18 +118,6 @@ WindowState Look(QDialog* window) {
     return state;
 }
 
-void ClickButton(QMessageBox* alert, const char* key) {
-    QAbstractButton* button = ButtonWithText(alert, QZLocalizedString(key));
-    ASSERT_NE(button, nullptr) << key;
-    button->click();
-}
-
-/// A step that answers the download confirmation with Download.
-UiScript::Step AgreeToDownload() {
-    return {[] { return ButtonWithText(AlertOnScreen(), QZLocalizedString("Download")); },
-            [] { ClickButton(AlertOnScreen(), "Download"); }};
-}
-
 class DownloadRoadTest : public ::testing::Test {
 protected:
     void SetUp() override {
@@ -210,7 +188,7 @@ TEST_F(DownloadRoadTest, AnAgreedDownloadIsInstalledMatchedAndAnsweredYes) {
     Ref mono = RequestedFont("DejaVuSansMono", "DejaVu Sans Mono");
     callbacks_.HoldAt(kCTFontDescriptorMatchingDownloading);
     WindowState whileDownloading;
-    UiScript script({AgreeToDownload(),
+    UiScript script({PressWhenUp("Download"),
                      {[this] { return callbacks_.Holding(); },
                       [&] {
                           whileDownloading = Look(ProgressWindowOnScreen());
@@ -218,8 +196,7 @@ TEST_F(DownloadRoadTest, AnAgreedDownloadIsInstalledMatchedAndAnsweredYes) {
                       }}},
                     EndEveryModalRun);
 
-    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({mono.get()}).get()),
-              DownloadReply(true, false));
+    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({mono.get()}).get()), Reply(true, false));
 
     EXPECT_TRUE(script.done());
     EXPECT_EQ(callbacks_.States(), (std::vector<uint32_t>{0, 2, 4, 5, 6, 7, 1}));
@@ -254,7 +231,7 @@ TEST_F(DownloadRoadTest, AnInstalledFontIsMatchedWithoutDownloading) {
     // Nothing to download means nothing to confirm: only a request that says not to ask gets
     // this far. Unasked, the window still shows the display name.
     EXPECT_EQ(HandleDownloadRequest(DownloadRequest({mono.get()}, 0, true).get()),
-              DownloadReply(true, true));
+              Reply(true, true));
     EXPECT_EQ(watch_.statusWhenHidden, "Preparing to download “DejaVu Sans Mono”…");
     EXPECT_EQ(callbacks_.States(), (std::vector<uint32_t>{0, 2, 7, 1}));
     EXPECT_EQ(server_.RequestCount("/DejaVuSansMono.ttf"), 0);
@@ -266,7 +243,7 @@ TEST_F(DownloadRoadTest, CancelDuringTheTransferStopsTheTimerLeavesNoFileAndAnsw
     Ref mono = RequestedFont("DejaVuSansMono", "DejaVu Sans Mono");
     callbacks_.HoldAt(kCTFontDescriptorMatchingDownloading);
     bool timerRunningAfterCancel = true;
-    UiScript script({AgreeToDownload(),
+    UiScript script({PressWhenUp("Download"),
                      {[this] { return callbacks_.Holding(); },
                       [&] {
                           QDialog* window = ProgressWindowOnScreen();
@@ -277,8 +254,7 @@ TEST_F(DownloadRoadTest, CancelDuringTheTransferStopsTheTimerLeavesNoFileAndAnsw
                       }}},
                     EndEveryModalRun);
 
-    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({mono.get()}).get()),
-              DownloadReply(false, false));
+    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({mono.get()}).get()), Reply(false, false));
 
     EXPECT_TRUE(script.done());
     EXPECT_FALSE(timerRunningAfterCancel);
@@ -349,7 +325,7 @@ TEST_F(DownloadRoadTest, AFailureGoesOnToTheNextFontOrEndsWithNoWhenCancelledOrC
             EndEveryModalRun);
 
         EXPECT_EQ(HandleDownloadRequest(DownloadRequest({bold.get(), mono.get()}, 0, true).get()),
-                  DownloadReply(c.result, true))
+                  Reply(c.result, true))
             << c.how;
 
         EXPECT_TRUE(script.done()) << c.how;
@@ -376,7 +352,7 @@ TEST_F(DownloadRoadTest, RegressionTheRequestingProcessExitEndsTheWindowsOwnRunN
     QPointer<QMessageBox> other;
     QZModalSession* otherSession = nullptr;
     bool otherUpWhenWindowWent = false;
-    UiScript script({AgreeToDownload(),
+    UiScript script({PressWhenUp("Download"),
                      {[this] { return callbacks_.Holding() && ProgressWindowOnScreen(); },
                       [&] {
                           QTimer::singleShot(0, [&] {
@@ -399,7 +375,7 @@ TEST_F(DownloadRoadTest, RegressionTheRequestingProcessExitEndsTheWindowsOwnRunN
                     EndEveryModalRun);
 
     EXPECT_EQ(HandleDownloadRequest(DownloadRequest({mono.get()}, requester.pid()).get()),
-              DownloadReply(false, false));
+              Reply(false, false));
 
     EXPECT_TRUE(script.done());
     EXPECT_TRUE(otherUpWhenWindowWent);
@@ -429,7 +405,7 @@ TEST_F(DownloadRoadTest, TheErrorAlertAndTheProgressWindowElideALongFontNameAndT
           }}},
         EndEveryModalRun);
     EXPECT_EQ(HandleDownloadRequest(DownloadRequest({font.get()}, 0, true).get()),
-              DownloadReply(false, true));
+              Reply(false, true));
     EXPECT_TRUE(script.done());
     EXPECT_EQ(title, "Font Download Failed");
     for (const char* labelName :
@@ -447,13 +423,12 @@ TEST_F(DownloadRoadTest, RegressionARequestWithoutFontsToHaveOpensNoWindowAndAsk
     QZNetworkCheck::SetFlagsSourceForTesting(&Offline);
     Ref nameless = Dict({{NSFontFamilyAttribute, Str("DejaVu Sans Mono").get()}});
     EXPECT_EQ(HandleDownloadRequest(DownloadRequest({nameless.get()}, 0, true).get()),
-              DownloadReply(false, true));
+              Reply(false, true));
     // Neither offered by a catalog nor installed: left out before any window.
     Ref unknown = RequestedFont("NoSuchFont-Regular");
     EXPECT_EQ(HandleDownloadRequest(DownloadRequest({unknown.get()}, 0, true).get()),
-              DownloadReply(false, true));
-    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({}, 0, true).get()),
-              DownloadReply(false, true));
+              Reply(false, true));
+    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({}, 0, true).get()), Reply(false, true));
     EXPECT_EQ(watch_.windowsShown, 0);
     EXPECT_TRUE(callbacks_.States().empty());
 }

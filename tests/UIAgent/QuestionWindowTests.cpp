@@ -19,8 +19,7 @@
 #include "UIAgent/QZNetworkCheck.h"
 #include "UIAgent/QZWindowActivation.h"
 #include "protocol/QZUIProtocol.h"
-#include "tests/UIAgent/AlertTestSupport.h"
-#include "tests/UIAgent/QtTestEnvironment.h"
+#include "tests/UIAgent/AgentTestSupport.h"
 
 namespace {
 
