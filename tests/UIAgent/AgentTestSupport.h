@@ -121,22 +121,33 @@ private:
     CFDataRef reply_ = nullptr;
 };
 
-/// The English "Localized" table and an American English locale while it lives.
+/// The embedded "Localized" table of `language` installed while it lives.
+class InstalledTable {
+public:
+    explicit InstalledTable(const QString& language) {
+        loaded = translator_.load(QStringLiteral(":/translations/Localized_%1.qm").arg(language));
+        if (loaded)
+            QCoreApplication::installTranslator(&translator_);
+    }
+    ~InstalledTable() { QCoreApplication::removeTranslator(&translator_); }
+    bool loaded = false;
+
+private:
+    QTranslator translator_;
+};
+
+/// The English table and an American English locale while it lives.
 class EnglishTexts {
 public:
-    EnglishTexts() : previousLocale_(QLocale()) {
+    EnglishTexts() {
+        EXPECT_TRUE(table_.loaded);
         QLocale::setDefault(QLocale(QLocale::English, QLocale::UnitedStates));
-        EXPECT_TRUE(translator_.load(QStringLiteral(":/translations/Localized_en.qm")));
-        QCoreApplication::installTranslator(&translator_);
     }
-    ~EnglishTexts() {
-        QCoreApplication::removeTranslator(&translator_);
-        QLocale::setDefault(previousLocale_);
-    }
+    ~EnglishTexts() { QLocale::setDefault(previousLocale_); }
 
 private:
     QLocale previousLocale_;
-    QTranslator translator_;
+    InstalledTable table_{QStringLiteral("en")};
 };
 
 /// Steps carried out from the event loop, in order: each one's action runs once its condition

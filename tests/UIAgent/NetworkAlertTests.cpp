@@ -72,39 +72,14 @@ TEST_F(NetworkCheckTest, OnlyReachableWithoutConnectionRequiredGoesOnWithoutAnAl
     }
 }
 
-TEST_F(NetworkCheckTest, TheOfflineAlertIsCriticalAndItsDefaultCancelStopsTheDownload) {
-    QString informative, defaultButton, escapeButton;
-    QMessageBox::Icon icon = QMessageBox::NoIcon;
-    QZNetworkCheck check;
-    UiScript script({{[] { return AlertWithText(kOfflineHeadline); },
-                      [&] {
-                          QMessageBox* alert = check.alert();
-                          ASSERT_EQ(alert, AlertOnScreen());
-                          informative = alert->informativeText();
-                          icon = alert->icon();
-                          defaultButton = alert->defaultButton()->text();
-                          escapeButton = alert->escapeButton()->text();
-                          alert->defaultButton()->click();
-                      }}},
-                    EndEveryModalRun);
-    EXPECT_FALSE(check.continueDownload());
-    EXPECT_TRUE(script.done());
-    EXPECT_EQ(informative,
-              "You are not connected to the Internet. Do you want to cancel downloading?");
-    EXPECT_EQ(icon, QMessageBox::Critical);
-    EXPECT_EQ(defaultButton, "Cancel");
-    EXPECT_EQ(escapeButton, "Cancel");
-    // The class operation of the download window asks the same question.
-    UiScript again({AnswerOfflineAlert("Cancel")}, EndEveryModalRun);
-    EXPECT_FALSE(FontDownloadWindowController::continueDownloadWithNetworkReachabilityCheck());
-}
-
-TEST_F(NetworkCheckTest, OnlyTheUsersCancelOrCloseStopsAndOtherWindowsStayInactive) {
+TEST_F(NetworkCheckTest, TheCriticalOfflineAlertStopsOnlyOnCancelOrCloseAndRaisesOnlyItself) {
     struct Case {
         const char* how;
         std::function<void(QZNetworkCheck&)> answer;
         bool goOn;
     } cases[] = {
+        {"default button", [](QZNetworkCheck& check) { check.alert()->defaultButton()->click(); },
+         false},
         {"Continue Download",
          [](QZNetworkCheck& check) { ClickButton(check.alert(), "Continue Download"); }, true},
         {"withdrawn", [](QZNetworkCheck& check) { check.withdraw(); }, true},
@@ -122,11 +97,19 @@ TEST_F(NetworkCheckTest, OnlyTheUsersCancelOrCloseStopsAndOtherWindowsStayInacti
         QZNetworkCheck check;
         WindowWatch watch;
         int activationsWhileAsked = -1;
+        std::string look;
         UiScript script({{[] {
                               QMessageBox* alert = AlertWithText(kOfflineHeadline);
                               return alert && alert->isActiveWindow();
                           },
                           [&] {
+                              QMessageBox* alert = check.alert();
+                              ASSERT_EQ(alert, AlertOnScreen());
+                              look = (alert->informativeText() + " | default " +
+                                      alert->defaultButton()->text() + " | escape " +
+                                      alert->escapeButton()->text())
+                                         .toStdString();
+                              EXPECT_EQ(alert->icon(), QMessageBox::Critical);
                               activationsWhileAsked = int(std::count(
                                   watch.activated.begin(), watch.activated.end(), &other));
                               c.answer(check);
@@ -134,9 +117,14 @@ TEST_F(NetworkCheckTest, OnlyTheUsersCancelOrCloseStopsAndOtherWindowsStayInacti
                         EndEveryModalRun);
         EXPECT_EQ(check.continueDownload(), c.goOn);
         EXPECT_TRUE(script.done());
+        EXPECT_EQ(look, "You are not connected to the Internet. Do you want to cancel "
+                        "downloading? | default Cancel | escape Cancel");
         EXPECT_FALSE(check.alert()->isVisible());
         EXPECT_EQ(activationsWhileAsked, 0);
     }
+    // The class operation of the download window asks the same question.
+    UiScript again({AnswerOfflineAlert("Cancel")}, EndEveryModalRun);
+    EXPECT_FALSE(FontDownloadWindowController::continueDownloadWithNetworkReachabilityCheck());
 }
 
 TEST_F(NetworkCheckTest, OfflineCancelAnswersNoAndContinueRunsTheDownloadWindow) {

@@ -34,30 +34,6 @@ struct GuardDuration {
     ~GuardDuration() { QZInputGuard::SetDurationForTesting(-1ms); }
 };
 
-QWidget* KeyTarget(QWidget* window) {
-    return window->focusWidget() ? window->focusWidget() : window;
-}
-
-enum class Input { kReturn, kRepeatedReturn, kClickDefault };
-
-void Send(QWidget* window, QAbstractButton* defaultButton, Input input) {
-    switch (input) {
-    case Input::kReturn:
-        QTest::keyClick(KeyTarget(window), Qt::Key_Return);
-        break;
-    case Input::kRepeatedReturn:
-        // What a key held down since before the window appeared delivers.
-        for (QEvent::Type type : {QEvent::KeyPress, QEvent::KeyRelease}) {
-            QKeyEvent event(type, Qt::Key_Return, Qt::NoModifier, QStringLiteral("\r"), true);
-            QApplication::sendEvent(KeyTarget(window), &event);
-        }
-        break;
-    case Input::kClickDefault:
-        QTest::mouseClick(defaultButton, Qt::LeftButton);
-        break;
-    }
-}
-
 TEST(InputGuard, DropsButtonInputForASecondAfterEachShowingAndAutoRepeatAlways) {
     GuardDuration guard(1000ms);
     QMessageBox box;
@@ -70,15 +46,25 @@ TEST(InputGuard, DropsButtonInputForASecondAfterEachShowingAndAutoRepeatAlways) 
         answer = clicked == allow ? 1 : 2;
         session.End(answer);
     });
+    auto keyTarget = [&] { return box.focusWidget() ? box.focusWidget() : &box; };
     struct Row {
         int atMs;
-        Input input;
+        std::function<void()> input;
         bool answers;
     };
-    const Row rows[] = {{100, Input::kReturn, false},
-                        {150, Input::kClickDefault, false},
-                        {1200, Input::kRepeatedReturn, false},
-                        {1250, Input::kReturn, true}};
+    const Row rows[] = {{100, [&] { QTest::keyClick(keyTarget(), Qt::Key_Return); }, false},
+                        {150, [&] { QTest::mouseClick(allow, Qt::LeftButton); }, false},
+                        // What a key held down since before the window appeared delivers.
+                        {1200,
+                         [&] {
+                             for (QEvent::Type type : {QEvent::KeyPress, QEvent::KeyRelease}) {
+                                 QKeyEvent event(type, Qt::Key_Return, Qt::NoModifier,
+                                                 QStringLiteral("\r"), true);
+                                 QApplication::sendEvent(keyTarget(), &event);
+                             }
+                         },
+                         false},
+                        {1250, [&] { QTest::keyClick(keyTarget(), Qt::Key_Return); }, true}};
     // Twice: the guard starts again when the question is shown again.
     for (int showing = 1; showing <= 2; ++showing) {
         answer = 0;
@@ -95,7 +81,7 @@ TEST(InputGuard, DropsButtonInputForASecondAfterEachShowingAndAutoRepeatAlways) 
                                  SCOPED_TRACE(::testing::Message() << "showing " << showing << ", "
                                                                    << row.atMs << " ms");
                                  EXPECT_EQ(allow->isEnabled(), row.atMs > 1000);
-                                 Send(&box, allow, row.input);
+                                 row.input();
                                  EXPECT_EQ(answer != 0, row.answers);
                              }});
         UiScript script(std::move(steps), [&] { session.End(kQZModalResponseStop); });
@@ -235,7 +221,11 @@ TEST(AutoActivationAccessibility, CountdownIsAStatusAnnouncedAtMarksAndActionsRe
          {[&] { return confirmation.helpWindow() && confirmation.helpWindow()->isVisible(); },
           [&] {
               EXPECT_GT(confirmation.remainingTime(), beforeAction - 1000ms);
+              // The bundled page at its anchor, and the question stays.
               QTextBrowser* help = confirmation.helpWindow();
+              EXPECT_TRUE(confirmation.alert()->isVisible());
+              EXPECT_EQ(help->source(), QUrl("qrc:/help/index.html#auto-activation"));
+              EXPECT_TRUE(help->toHtml().contains("name=\"auto-activation\""));
               EXPECT_EQ(help->windowType(), Qt::Dialog);
               EXPECT_EQ(help->minimumSize(), help->maximumSize());
               EXPECT_EQ(QAccessible::queryAccessibleInterface(help)->role(), QAccessible::Document);
