@@ -162,42 +162,38 @@ TEST_F(ControllerTest, TheAgentTerminatesTheIdleDelayAfterItsLastReply) {
     EXPECT_EQ(counts_, (std::vector<qint64>{1, 0, 1, 0}));
 }
 
-TEST_F(ControllerTest, SigtermWithNoRequestPendingTerminatesAtOnce) {
-    controller_->applicationWillFinishLaunching();
-    QZTerminationRequests requests;
-    QObject::connect(&requests, &QZTerminationRequests::terminationRequested, controller_.get(),
-                     &QZUIController::terminate);
-    raise(SIGTERM);
-    ASSERT_TRUE(SpinUntil([&] { return terminations_ > 0; }, 2s));
-    EXPECT_FALSE(CFMessagePortIsValid(controller_->messagePort()));
-}
-
-TEST_F(ControllerTest, SigtermOrQuitWhileARequestIsPendingTerminatesWhenTheCountReturnsToZero) {
-    for (const bool signal : {true, false}) {
-        SCOPED_TRACE(signal ? "SIGTERM" : "the application's quit event");
+TEST_F(ControllerTest, SigtermOrQuitTerminatesAtOnceOrWhenThePendingRequestsAreDone) {
+    const std::pair<bool, bool> cases[] = {{true, false}, {true, true}, {false, true}};
+    for (const auto& [signal, pending] : cases) {
+        SCOPED_TRACE(std::string(signal ? "SIGTERM" : "the application's quit event") +
+                     (pending ? " while a request is pending" : ""));
         controller_.reset();
         NewController();
         controller_->applicationWillFinishLaunching();
         QZTerminationRequests requests;
         QObject::connect(&requests, &QZTerminationRequests::terminationRequested, controller_.get(),
                          &QZUIController::terminate);
-        controller_->setAlertCount(1);
+        if (pending)
+            controller_->setAlertCount(1);
         if (signal) {
             raise(SIGTERM);
         } else {
             QEvent quit(QEvent::Quit);
             QCoreApplication::sendEvent(QCoreApplication::instance(), &quit);
         }
-        ASSERT_TRUE(SpinUntil([&] { return controller_->isTerminationDeferred(); }, 2s));
-        controller_->setAlertCount(2);
-        controller_->setAlertCount(1);
-        SpinUntil([] { return false; }, 100ms);
-        EXPECT_EQ(terminations_, 0);
-        EXPECT_TRUE(CFMessagePortIsValid(controller_->messagePort()));
-        const qint64 idleAt = clock_.elapsed();
-        controller_->setAlertCount(0);
-        EXPECT_EQ(terminations_, 0); // not inside the request that brought the count to 0
-        ASSERT_TRUE(SpinUntil([&] { return terminations_ > 0; }, 1s));
+        qint64 idleAt = clock_.elapsed();
+        if (pending) {
+            ASSERT_TRUE(SpinUntil([&] { return controller_->isTerminationDeferred(); }, 2s));
+            controller_->setAlertCount(2);
+            controller_->setAlertCount(1);
+            SpinUntil([] { return false; }, 100ms);
+            EXPECT_EQ(terminations_, 0);
+            EXPECT_TRUE(CFMessagePortIsValid(controller_->messagePort()));
+            idleAt = clock_.elapsed();
+            controller_->setAlertCount(0);
+            EXPECT_EQ(terminations_, 0); // not inside the request that brought the count to 0
+        }
+        ASSERT_TRUE(SpinUntil([&] { return terminations_ > 0; }, 2s));
         EXPECT_LT(terminatedAt_ - idleAt, 300); // without waiting for the idle delay
         EXPECT_FALSE(CFMessagePortIsValid(controller_->messagePort()));
     }
