@@ -193,25 +193,6 @@ TEST_F(DownloadConfirmationTest, TheCatalogsNamesStandInForThoseTheRequestLacks)
               "The font “Example Sans” is 757 kB. Do you want to download it?");
 }
 
-TEST_F(DownloadConfirmationTest, VeryLongNamesAreElidedWithTheFullTextsInTheTooltips) {
-    const QString font(100, u'W'), application = "Writer" + QString(200, u'X');
-    Ref request =
-        Dict({{kQZUIPropertyApplicationName, Str(application.toStdString()).get()},
-              {kQZUIPropertyFontProperties,
-               Array({RequestedFont("Sans-Regular", font.toUtf8().constData()).get()}).get()}});
-    Confirmation confirmation(request.as<CFDictionaryRef>());
-    EXPECT_EQ(NameFor(confirmation, "Sans-Regular"), font.toStdString());
-    EXPECT_FALSE(confirmation.text().contains(font) || confirmation.text().contains(application));
-    EXPECT_TRUE(confirmation.text().contains(u'…'));
-    auto* label = confirmation.findChild<QLabel*>("qt_msgbox_label");
-    ASSERT_NE(label, nullptr);
-    EXPECT_TRUE(label->toolTip().contains(font) && label->toolTip().contains(application));
-    EXPECT_EQ(label->accessibleDescription(), label->toolTip());
-    confirmation.show();
-    EXPECT_LT(confirmation.width(), 800);
-    confirmation.hide();
-}
-
 TEST_F(DownloadConfirmationTest, ApplicationNameFallsBackToTheLocalizedDesktopEntry) {
     const QString entry = WriteFile(data_.FilePath("writer.desktop"),
                                     "[Desktop Entry]\nName=Writer\nName[de]=Schreiber\n");

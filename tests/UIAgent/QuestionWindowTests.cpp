@@ -261,24 +261,34 @@ TEST(AutoActivationAccessibility, TabGoesThroughTheTextsTheCheckboxThenTheButton
         << order.join(" | ").toStdString();
 }
 
-} // namespace
-
-TEST(AutoActivationAlert, LongNamesAreElidedWithTheFullTextsToldAndDoNotWidenIt) {
+TEST(QuestionWindows, LongNamesAreElidedWithTheFullTextsToldAndDoNotWidenThem) {
     EnglishTexts english;
-    const QString font(200, u'W'), application = QStringLiteral("Writer") + QString(200, u'X');
-    Ref request = Dict({{kQZUIPropertyApplicationName, Str(application.toUtf8().data()).get()},
-                        {kQZUIPropertyFontName, Str(font.toUtf8().data()).get()}});
-    QZAutoActivationConfirmation confirmation(request.as<CFDictionaryRef>());
-    QMessageBox* alert = confirmation.alert();
-    EXPECT_FALSE(alert->text().contains(font) || alert->text().contains(application));
-    auto* headline = alert->findChild<QLabel*>(QStringLiteral("qt_msgbox_label"));
-    ASSERT_TRUE(headline);
-    for (const QString& full : {headline->toolTip(), headline->accessibleDescription()})
-        EXPECT_TRUE(full.contains(font) && full.contains(application)) << full.toStdString();
-    QCheckBox* box = confirmation.suppressionCheckBox();
+    PrivateDataHome data;
+    data.WriteCatalog(R"({"assets": [{"LocalID": "A", "url": "https://f/A", "size": 1000,
+        "sha256": "%1", "fonts": [{"postScriptName": "Sans-Regular"}]}]})");
+    const QString font(100, u'W'), application = "Writer" + QString(200, u'X');
+    Ref fonts = Array({RequestedFont("Sans-Regular", font.toUtf8().constData()).get()});
+    Ref request = Dict({{kQZUIPropertyApplicationName, Str(application.toStdString()).get()},
+                        {kQZUIPropertyFontName, Str(font.toStdString()).get()},
+                        {kQZUIPropertyFontProperties, fonts.get()}});
+    QZAutoActivationConfirmation activation(request.as<CFDictionaryRef>());
+    QZFontDownloadConfirmation download(request.as<CFDictionaryRef>());
+    for (QMessageBox* alert : {activation.alert(), static_cast<QMessageBox*>(&download)}) {
+        SCOPED_TRACE(alert->windowTitle().toStdString());
+        EXPECT_FALSE(alert->text().contains(font) || alert->text().contains(application));
+        EXPECT_TRUE(alert->text().contains(u'…'));
+        auto* headline = alert->findChild<QLabel*>(QStringLiteral("qt_msgbox_label"));
+        ASSERT_TRUE(headline);
+        EXPECT_TRUE(headline->toolTip().contains(font) &&
+                    headline->toolTip().contains(application));
+        EXPECT_EQ(headline->accessibleDescription(), headline->toolTip());
+        alert->show();
+        EXPECT_LT(alert->width(), 800);
+        alert->hide();
+    }
+    QCheckBox* box = activation.suppressionCheckBox();
     EXPECT_FALSE(box->text().contains(application));
     EXPECT_TRUE(box->toolTip().contains(application));
-    alert->show();
-    EXPECT_LT(alert->width(), 800);
-    alert->hide();
 }
+
+} // namespace
