@@ -1,72 +1,67 @@
-// Helpers of the agent core's tests: a private socket directory, the agent's run-loop driver,
-// flattened requests, expected bytes, and the alert on screen.
+// Helpers of the agent's tests: a private socket directory with the agent's run-loop driver,
+// requests flattened as clients send them and the exact bytes of the replies, a client on another
+// thread, the English texts, a script of UI steps run while a modal alert blocks the test, a child
+// process standing for the requesting application, and a watch on the windows shown.
 #pragma once
 
 #include <QAbstractButton>
 #include <QApplication>
+#include <QDialog>
+#include <QDir>
+#include <QFile>
+#include <QLabel>
+#include <QLocale>
 #include <QMessageBox>
-#include <QWidget>
-#include <cstdlib>
-#include <filesystem>
+#include <QProgressBar>
+#include <QPushButton>
+#include <QTemporaryDir>
+#include <QTimer>
+#include <QTranslator>
+#include <atomic>
+#include <csignal>
+#include <functional>
+#include <optional>
 #include <string>
+#include <sys/wait.h>
+#include <thread>
+#include <unistd.h>
 #include <vector>
 
+#include "UIAgent/QZLocalizedString.h"
+#include "UIAgent/QZModalSession.h"
 #include "UIAgent/QZQtRunLoopDriver.h"
-#include "serialization/TCFFlattenContext.h"
+#include "UIAgent/QZUIAgentHandleMessage.h"
+#include "protocol/QZUIProtocol.h"
+#include "tests/UIAgent/QtTestEnvironment.h"
+#include "tests/support/FlattenedBytes.h"
+#include "tests/support/PortTestSupport.h"
+#include "tests/support/ScopedEnvironment.h"
 #include "tests/support/Values.h"
 
 namespace glyphwell::testing {
 
-/// Points XDG_RUNTIME_DIR at a fresh private directory while it lives, so that the agent's port
-/// never meets a real agent or another test; installs the agent's run-loop driver.
+/// A private XDG_RUNTIME_DIR (the agent's port never meets a real agent or another test) and the
+/// agent's run-loop driver, while it lives.
 class AgentPortEnvironment {
 public:
-    AgentPortEnvironment() {
-        char pattern[] = "/tmp/glyphwell-agent-test-XXXXXX";
-        directory_ = mkdtemp(pattern) ? pattern : "";
-        const char* previous = getenv("XDG_RUNTIME_DIR");
-        hadPrevious_ = previous != nullptr;
-        if (previous)
-            previous_ = previous;
-        setenv("XDG_RUNTIME_DIR", directory_.c_str(), 1);
-        SetRunLoopDriver(&driver_);
-    }
-    ~AgentPortEnvironment() {
-        SetRunLoopDriver(nullptr);
-        if (hadPrevious_)
-            setenv("XDG_RUNTIME_DIR", previous_.c_str(), 1);
-        else
-            unsetenv("XDG_RUNTIME_DIR");
-        std::error_code ignored;
-        if (!directory_.empty())
-            std::filesystem::remove_all(directory_, ignored);
-    }
-    AgentPortEnvironment(const AgentPortEnvironment&) = delete;
-    AgentPortEnvironment& operator=(const AgentPortEnvironment&) = delete;
+    AgentPortEnvironment() { SetRunLoopDriver(&driver_); }
+    ~AgentPortEnvironment() { SetRunLoopDriver(nullptr); }
 
 private:
-    std::string directory_;
-    std::string previous_;
-    bool hadPrevious_ = false;
+    TemporaryRuntimeDirectory directory_;
     QZQtRunLoopDriver driver_;
 };
 
 /// The flattened bytes of `value`, as a request carries them.
 inline Ref Flattened(CFTypeRef value) {
-    CFMutableDataRef data = CFDataCreateMutable(nullptr, 0);
-    {
-        TCFFlattenContext context(data, false);
-        context.Flatten(value);
-    }
-    return Ref(data);
+    const std::vector<uint8_t> bytes = FlattenedBytes(value);
+    return Ref(CFDataCreate(nullptr, bytes.data(), CFIndex(bytes.size())));
 }
 
-/// The ASCII bytes of `text`, to write expected byte strings readably.
 inline std::vector<uint8_t> Ascii(const std::string& text) {
-    return std::vector<uint8_t>(text.begin(), text.end());
+    return {text.begin(), text.end()};
 }
 
-/// Concatenates byte pieces.
 inline std::vector<uint8_t> Join(std::initializer_list<std::vector<uint8_t>> pieces) {
     std::vector<uint8_t> all;
     for (const auto& piece : pieces)
@@ -74,19 +69,307 @@ inline std::vector<uint8_t> Join(std::initializer_list<std::vector<uint8_t>> pie
     return all;
 }
 
+/// A reply in hex, as the clients read it: {Result, Suppress} as numbers of type 7 (signed char,
+/// one byte); with `candidates` (the array's bytes), the message id 1 reply that also holds them.
+inline std::string Reply(bool result, bool suppress,
+                         std::optional<std::vector<uint8_t>> candidates = {}) {
+    auto flag = [](bool on) {
+        return Hex(on ? "00 00 00 16  00 00 00 07  00 00 00 01  01"
+                      : "00 00 00 16  00 00 00 07  00 00 00 01  00");
+    };
+    std::vector<uint8_t> bytes =
+        Join({Hex(candidates ? "00 00 00 10  00 00 00 03" : "00 00 00 10  00 00 00 02"),
+              Hex("00 00 00 07  00 00 00 12"), Ascii("QZUIPropertyResult"), flag(result),
+              Hex("00 00 00 07  00 00 00 14"), Ascii("QZUIPropertySuppress"), flag(suppress)});
+    if (candidates)
+        bytes = Join({bytes, Hex("00 00 00 07  00 00 00 1D"),
+                      Ascii("QZUIPropertyCandidateFontURLs"), *candidates});
+    return ToHex(bytes);
+}
+
+/// Sends `request` (flattened; null: no bytes) as message `msgid` through the agent's socket from
+/// a thread of its own; the destructor joins it.
+class SocketClient {
+public:
+    SocketClient(SInt32 msgid, CFTypeRef request, CFTimeInterval receiveTimeout = 5)
+        : bytes_(request ? Flattened(request) : Ref()) {
+        thread_ = std::thread([this, msgid, receiveTimeout] {
+            CFMessagePortRef remote = CFMessagePortCreateRemote(nullptr, kQZUIAgentPortName);
+            if (remote) {
+                status_ = CFMessagePortSendRequest(remote, msgid, bytes_.as<CFDataRef>(), 5,
+                                                   receiveTimeout, kCFRunLoopDefaultMode, &reply_);
+                CFMessagePortInvalidate(remote);
+                CFRelease(remote);
+            }
+            done_ = true;
+        });
+    }
+    ~SocketClient() {
+        thread_.join();
+        if (reply_)
+            CFRelease(reply_);
+    }
+    bool Done() const { return done_; }
+    SInt32 Status() const { return status_; }
+    CFDataRef Reply() const { return reply_; }
+
+private:
+    Ref bytes_;
+    std::thread thread_;
+    std::atomic<bool> done_{false};
+    SInt32 status_ = 1;
+    CFDataRef reply_ = nullptr;
+};
+
+/// The embedded "Localized" table of `language` installed while it lives.
+class InstalledTable {
+public:
+    explicit InstalledTable(const QString& language) {
+        loaded = translator_.load(QStringLiteral(":/translations/Localized_%1.qm").arg(language));
+        if (loaded)
+            QCoreApplication::installTranslator(&translator_);
+    }
+    ~InstalledTable() { QCoreApplication::removeTranslator(&translator_); }
+    bool loaded = false;
+
+private:
+    QTranslator translator_;
+};
+
+/// The English table and an American English locale while it lives.
+class EnglishTexts {
+public:
+    EnglishTexts() {
+        EXPECT_TRUE(table_.loaded);
+        QLocale::setDefault(QLocale(QLocale::English, QLocale::UnitedStates));
+    }
+    ~EnglishTexts() { QLocale::setDefault(previousLocale_); }
+
+private:
+    QLocale previousLocale_;
+    InstalledTable table_{QStringLiteral("en")};
+};
+
+/// Steps carried out from the event loop, in order: each one's action runs once its condition
+/// holds (polled every 10 ms). Meant to answer an alert while its modal run blocks the test.
+/// When the steps are not all done after `patience`, `giveUp` runs (to end the alert) and the
+/// test fails.
+class UiScript {
+public:
+    struct Step {
+        std::function<bool()> when;
+        std::function<void()> action;
+    };
+
+    UiScript(std::vector<Step> steps, std::function<void()> giveUp,
+             std::chrono::milliseconds patience = std::chrono::seconds(20))
+        : steps_(std::move(steps)) {
+        QObject::connect(&poll_, &QTimer::timeout, [this] {
+            if (next_ < steps_.size() && steps_[next_].when())
+                steps_[next_++].action();
+        });
+        poll_.start(10);
+        failsafe_.setSingleShot(true);
+        QObject::connect(&failsafe_, &QTimer::timeout, [this, giveUp] {
+            ADD_FAILURE() << "the script stalled at step " << next_;
+            giveUp();
+        });
+        failsafe_.start(patience);
+    }
+    bool done() const { return next_ == steps_.size(); }
+
+private:
+    std::vector<Step> steps_;
+    size_t next_ = 0;
+    QTimer poll_;
+    QTimer failsafe_;
+};
+
+/// For a script's give-up: ends the innermost modal run every 50 ms from now on, until the
+/// application goes, so that a stalled test fails instead of hanging.
+inline void EndEveryModalRun() {
+    auto* timer = new QTimer(QCoreApplication::instance());
+    QObject::connect(timer, &QTimer::timeout, [] {
+        if (QZModalSession* session = QZModalSession::Innermost())
+            session->End(kQZModalResponseAbort);
+    });
+    timer->start(50);
+}
+
 /// The alert that is up and innermost, or null.
 inline QMessageBox* AlertOnScreen() {
     return qobject_cast<QMessageBox*>(QApplication::activeModalWidget());
 }
 
-/// The button of `alert` whose text is `text`, or null.
-inline QAbstractButton* ButtonWithText(QMessageBox* alert, const QString& text) {
-    if (!alert)
-        return nullptr;
-    for (QAbstractButton* button : alert->buttons())
-        if (button->text() == text)
+/// The alert up and innermost whose headline is `text`, else null.
+inline QMessageBox* AlertWithText(const QString& text) {
+    QMessageBox* alert = AlertOnScreen();
+    return alert && alert->isVisible() && alert->text() == text ? alert : nullptr;
+}
+
+/// The button of `alert` whose text is the table's text for `key`, or null.
+inline QAbstractButton* ButtonWithText(QMessageBox* alert, const char* key) {
+    for (QAbstractButton* button : alert ? alert->buttons() : QList<QAbstractButton*>())
+        if (button->text() == QZLocalizedString(key))
             return button;
     return nullptr;
 }
+
+inline void ClickButton(QMessageBox* alert, const char* key) {
+    QAbstractButton* button = ButtonWithText(alert, key);
+    ASSERT_NE(button, nullptr) << key;
+    button->click();
+}
+
+/// A step that presses the button `key` of the innermost alert once it has one.
+inline UiScript::Step PressWhenUp(const char* key) {
+    return {[key] { return ButtonWithText(AlertOnScreen(), key) != nullptr; },
+            [key] { ClickButton(AlertOnScreen(), key); }};
+}
+
+/// A file URL for `path`.
+inline Ref FileURL(const QString& path) {
+    return Ref(CFURLCreateWithFileSystemPath(nullptr, Str(path.toStdString()).as<CFStringRef>(),
+                                             kCFURLPOSIXPathStyle, false));
+}
+
+/// Creates the file `path` with `contents`; returns the path.
+inline QString WriteFile(const QString& path, const QByteArray& contents = QByteArray()) {
+    QFile file(path);
+    EXPECT_TRUE(file.open(QIODevice::WriteOnly)) << path.toStdString();
+    file.write(contents);
+    return path;
+}
+
+/// A temporary data home (XDG_DATA_HOME, and no other data directory) while it lives, where the
+/// downloadable-font catalog is written.
+class PrivateDataHome {
+public:
+    PrivateDataHome() {
+        environment_.Set("XDG_DATA_HOME", directory_.path().toUtf8().constData());
+        environment_.Set("XDG_DATA_DIRS", directory_.filePath("none").toUtf8().constData());
+        QDir().mkpath(directory_.filePath("glyphwell"));
+    }
+    QString FilePath(const QString& name) const { return directory_.filePath(name); }
+    /// Writes the catalog; every "%1" in `json` stands for a SHA-256 of 64 zeros.
+    void WriteCatalog(const QString& json) {
+        WriteFile(FilePath("glyphwell/downloadable-fonts.json"),
+                  QString(json).replace("%1", QString(64, u'0')).toUtf8());
+    }
+
+private:
+    QTemporaryDir directory_;
+    ScopedEnvironment environment_;
+};
+
+/// A child process that waits until it is killed; killed and reaped when this goes.
+class PausedChild {
+public:
+    PausedChild() : pid_(fork()) {
+        if (pid_ == 0)
+            for (;;)
+                pause();
+    }
+    ~PausedChild() {
+        Kill();
+        waitpid(pid_, nullptr, 0);
+    }
+    pid_t pid() const { return pid_; }
+    void Kill() const { kill(pid_, SIGKILL); }
+
+private:
+    pid_t pid_;
+};
+
+/// One requested font: its PostScript name, and its family and the family's names by language
+/// when given.
+inline Ref
+RequestedFont(const char* postScriptName, const char* family = nullptr,
+              std::initializer_list<std::pair<const char*, const char*>> localized = {}) {
+    auto newDictionary = [] {
+        return Ref(CFDictionaryCreateMutable(nullptr, 0, &kCFTypeDictionaryKeyCallBacks,
+                                             &kCFTypeDictionaryValueCallBacks));
+    };
+    auto set = [](const Ref& dictionary, CFTypeRef key, const Ref& value) {
+        CFDictionarySetValue((CFMutableDictionaryRef)dictionary.get(), key, value.get());
+    };
+    Ref attributes = newDictionary(), names = newDictionary();
+    set(attributes, NSFontNameAttribute, Str(postScriptName));
+    if (family)
+        set(attributes, NSFontFamilyAttribute, Str(family));
+    for (const auto& [language, name] : localized)
+        set(names, Str(language).get(), Str(name));
+    if (localized.size())
+        set(attributes, NSCTFontLocalizedFamilyNameAttribute, names);
+    return attributes;
+}
+
+/// A message id 2 request from "Example Writer" (process `pid`) for `fonts`; with `suppress`,
+/// the request says not to ask.
+inline Ref DownloadRequest(std::initializer_list<CFTypeRef> fonts, SInt32 pid = 0,
+                           bool suppress = false) {
+    return Dict({{kQZUIPropertyApplicationName, Str("Example Writer").get()},
+                 {kQZUIPropertyProcessID, Num(kCFNumberSInt32Type, pid).get()},
+                 {kQZUIPropertyFontProperties, Array(fonts).get()},
+                 {kQZUIPropertySuppress, suppress ? kCFBooleanTrue : kCFBooleanFalse}});
+}
+
+/// Sends `request` to the dispatcher as message id 2, flattened as a client sends it; returns
+/// the reply bytes in hex.
+inline std::string HandleDownloadRequest(CFTypeRef request) {
+    Ref reply(QZUIAgentHandleMessage(nullptr, 2, Flattened(request).as<CFDataRef>(), nullptr));
+    return ToHex(reply.as<CFDataRef>());
+}
+
+/// The progress window while it is shown, else null.
+inline QDialog* ProgressWindowOnScreen() {
+    for (QWidget* widget : QApplication::topLevelWidgets())
+        if (widget->objectName() == QLatin1String("FontDownloadWindow") && widget->isVisible())
+            return qobject_cast<QDialog*>(widget);
+    return nullptr;
+}
+
+/// Watches the agent's windows from the event loop while it lives: how many were shown (and how
+/// many progress windows), which were activated, the progress bar after each change of its value,
+/// and the progress window when it was first hidden.
+class WindowWatch : public QObject {
+public:
+    WindowWatch() { QCoreApplication::instance()->installEventFilter(this); }
+    ~WindowWatch() override { QCoreApplication::instance()->removeEventFilter(this); }
+    int windowsShown = 0;
+    int progressWindowsShown = 0;
+    std::vector<std::string> bar; ///< "value/maximum" after each value change
+    bool hidden = false;
+    std::string statusWhenHidden;
+    bool timerRunningWhenHidden = false;
+    std::vector<QObject*> activated; ///< windows in the order they were activated
+
+protected:
+    bool eventFilter(QObject* watched, QEvent* event) override {
+        if (!watched->isWidgetType() || !static_cast<QWidget*>(watched)->isWindow())
+            return false;
+        auto* window = static_cast<QWidget*>(watched);
+        if (event->type() == QEvent::WindowActivate)
+            activated.push_back(watched);
+        const bool progress = window->objectName() == QLatin1String("FontDownloadWindow");
+        if (event->type() == QEvent::Show) {
+            ++windowsShown;
+            if (!progress)
+                return false;
+            ++progressWindowsShown;
+            auto* bar = window->findChild<QProgressBar*>("progressIndicator");
+            connect(bar, &QProgressBar::valueChanged, this, [this, bar](int value) {
+                this->bar.push_back(std::to_string(value) + "/" + std::to_string(bar->maximum()));
+            });
+        } else if (event->type() == QEvent::Hide && progress && !hidden) {
+            hidden = true;
+            statusWhenHidden =
+                window->findChild<QLabel*>("mainStatusTextField")->text().toStdString();
+            auto* timer = window->findChild<QTimer*>("refreshTimer");
+            timerRunningWhenHidden = timer && timer->isActive();
+        }
+        return false;
+    }
+};
 
 } // namespace glyphwell::testing

@@ -10,8 +10,7 @@
 
 #include "UIAgent/QZAutoActivationConfirmation.h"
 #include "protocol/QZUIProtocol.h"
-#include "tests/UIAgent/AlertTestSupport.h"
-#include "tests/UIAgent/QtTestEnvironment.h"
+#include "tests/UIAgent/AgentTestSupport.h"
 #include "tests/support/PrivateSessionBus.h"
 
 namespace {
@@ -42,6 +41,7 @@ protected:
 
 TEST_F(AutoActivationTest, SetsUpTextsButtonsInOrderAndTheCheckbox) {
     Confirmation confirmation(Request().as<CFDictionaryRef>());
+    EXPECT_TRUE(confirmation.volumeName().isNull()); // the font is on the root volume
     EXPECT_EQ(confirmation.alert()->text(),
               "Example Writer wants to use the font “Example Sans”, which is not installed.");
     const std::vector<std::pair<int, QString>> buttons{
@@ -54,7 +54,7 @@ TEST_F(AutoActivationTest, SetsUpTextsButtonsInOrderAndTheCheckbox) {
     EXPECT_EQ(confirmation.suppressionCheckBox()->text(), "Don’t ask again for Example Writer");
 }
 
-TEST_F(AutoActivationTest, ShowInFileManagerTwiceThenAllowRevealsTwiceAndActivates) {
+TEST_F(AutoActivationTest, ShowInFileManagerRevealsEachTimeAndTheTickedCheckboxSuppresses) {
     PrivateSessionBus bus;
     ASSERT_FALSE(bus.address().isEmpty()) << "dbus-daemon did not start";
     FileManagerStandIn fileManager(bus.address());
@@ -68,13 +68,17 @@ TEST_F(AutoActivationTest, ShowInFileManagerTwiceThenAllowRevealsTwiceAndActivat
     auto received = [&](size_t count) {
         return [&, count] { return fileManager.calls().size() == count; };
     };
-    UiScript script({Click(confirmation, 2002), Click(confirmation, 2002, received(2)),
-                     Click(confirmation, 2000, received(4))},
-                    [&] { confirmation.withdraw(); });
+    UiScript script(
+        {Click(confirmation, 2002),
+         Click(confirmation, 2002, received(2)),
+         {received(4),
+          [&] { QTest::mouseClick(confirmation.suppressionCheckBox(), Qt::LeftButton); }},
+         Click(confirmation, 2001)},
+        [&] { confirmation.withdraw(); });
     confirmation.showAlert();
 
-    EXPECT_TRUE(confirmation.shouldActivate());
-    EXPECT_FALSE(confirmation.suppressFurtherAlerts());
+    EXPECT_FALSE(confirmation.shouldActivate());
+    EXPECT_TRUE(confirmation.suppressFurtherAlerts());
     const auto& calls = fileManager.calls();
     ASSERT_EQ(calls.size(), 4u);
     for (size_t i : {0u, 2u}) {
@@ -85,18 +89,6 @@ TEST_F(AutoActivationTest, ShowInFileManagerTwiceThenAllowRevealsTwiceAndActivat
                                                                          "/B%20Bold.otf"}));
     }
     EXPECT_TRUE(CFEqual(confirmation.candidateFonts(), candidates.get()));
-}
-
-TEST_F(AutoActivationTest, TickedCheckboxAndDisallowSuppressWithoutActivating) {
-    Confirmation confirmation(Request().as<CFDictionaryRef>());
-    UiScript script(
-        {{[&] { return confirmation.alert()->isVisible(); },
-          [&] { QTest::mouseClick(confirmation.suppressionCheckBox(), Qt::LeftButton); }},
-         Click(confirmation, 2001)},
-        [&] { confirmation.withdraw(); });
-    confirmation.showAlert();
-    EXPECT_FALSE(confirmation.shouldActivate());
-    EXPECT_TRUE(confirmation.suppressFurtherAlerts());
 }
 
 TEST_F(AutoActivationTest, InputRestartsTheTimeoutWhichAnswersNoWithTheCheckboxAsItIs) {
@@ -118,6 +110,7 @@ TEST_F(AutoActivationTest, RegressionTimeoutOfAnAnsweredAlertNeverEndsALaterOne)
     PrivateSessionBus bus; // the reveal goes to a bus of our own
     Confirmation first(Request().as<CFDictionaryRef>());
     first.setTimeout(300ms);
+    // Shown again after the reveal, the alert still answers with its button.
     UiScript script({Click(first, 2002), Click(first, 2000)}, [&] { first.withdraw(); });
     first.showAlert();
     ASSERT_TRUE(first.shouldActivate());
@@ -137,16 +130,21 @@ TEST_F(AutoActivationTest, WithdrawEndsItsOwnAlertEvenBelowANestedOne) {
     Confirmation inner(Request().as<CFDictionaryRef>());
     std::vector<std::string> returned;
     bool innerUp = false, outerHidden = false;
-    QTimer::singleShot(100ms, outer.alert(), [&] {
-        inner.showAlert();
-        returned.push_back("inner");
-    });
-    QTimer::singleShot(300ms, outer.alert(), [&] {
-        outer.withdraw();
-        outerHidden = !outer.alert()->isVisible();
-        innerUp = inner.alert()->isVisible();
-        inner.buttonWithTag(2000)->click();
-    });
+    UiScript script({{[&] { return outer.alert()->isVisible(); },
+                      [&] {
+                          QTimer::singleShot(0, outer.alert(), [&] {
+                              inner.showAlert();
+                              returned.push_back("inner");
+                          });
+                      }},
+                     {[&] { return inner.alert()->isVisible(); },
+                      [&] {
+                          outer.withdraw();
+                          outerHidden = !outer.alert()->isVisible();
+                          innerUp = inner.alert()->isVisible();
+                          inner.buttonWithTag(2000)->click();
+                      }}},
+                    EndEveryModalRun);
     outer.showAlert();
     returned.push_back("outer");
 
@@ -155,27 +153,6 @@ TEST_F(AutoActivationTest, WithdrawEndsItsOwnAlertEvenBelowANestedOne) {
     EXPECT_TRUE(innerUp);
     EXPECT_TRUE(inner.shouldActivate());
     EXPECT_FALSE(outer.shouldActivate());
-}
-
-TEST_F(AutoActivationTest, HelpOpensTheBundledPageAtTheAnchorAndKeepsTheQuestion) {
-    Confirmation confirmation(Request().as<CFDictionaryRef>());
-    bool alertStayed = false;
-    UiScript script(
-        {{[&] { return confirmation.alert()->isVisible(); },
-          [&] { confirmation.helpButton()->click(); }},
-         {[&] { return confirmation.helpWindow() && confirmation.helpWindow()->isVisible(); },
-          [&] {
-              alertStayed = confirmation.alert()->isVisible();
-              confirmation.buttonWithTag(2000)->click();
-          }}},
-        [&] { confirmation.withdraw(); });
-    confirmation.showAlert();
-
-    EXPECT_TRUE(alertStayed);
-    EXPECT_TRUE(confirmation.shouldActivate());
-    ASSERT_TRUE(confirmation.helpWindow());
-    EXPECT_EQ(confirmation.helpWindow()->source(), QUrl("qrc:/help/index.html#auto-activation"));
-    EXPECT_TRUE(confirmation.helpWindow()->toHtml().contains("name=\"auto-activation\""));
 }
 
 TEST_F(AutoActivationTest, NamesFallBackToTheBundleThenTheCandidateFile) {
@@ -205,14 +182,7 @@ dev_t DeviceOf(const QString& path) {
     return stat(path.toUtf8().constData(), &status) == 0 ? status.st_dev : dev_t(-1);
 }
 
-TEST_F(AutoActivationTest, NamesTheVolumeOnlyWhenTheFontIsOffTheRootVolume) {
-    if (DeviceOf(directory_.path()) != DeviceOf("/"))
-        GTEST_SKIP() << "the temporary directory is not on the root file system here";
-    Confirmation onRoot(Request().as<CFDictionaryRef>());
-    EXPECT_TRUE(onRoot.volumeName().isNull());
-    EXPECT_EQ(onRoot.alert()->text(),
-              "Example Writer wants to use the font “Example Sans”, which is not installed.");
-
+TEST_F(AutoActivationTest, NamesTheVolumeWhenTheFontIsOffTheRootVolume) {
     QTemporaryDir elsewhere(QStringLiteral("/dev/shm/glyphwell-test-XXXXXX"));
     if (!elsewhere.isValid() || DeviceOf(elsewhere.path()) == DeviceOf("/"))
         GTEST_SKIP() << "/dev/shm is not a file system of its own here";

@@ -1,86 +1,39 @@
 // The font download confirmation, driven by its real buttons on the offscreen platform: the
 // answers, withdrawal when the requesting process dies, display names by preferred language, the
 // download size counted once per asset, and validity.
-#include <QDir>
-#include <QLabel>
-#include <QMessageBox>
-#include <QPushButton>
-#include <QTemporaryDir>
 #include <QTest>
-#include <functional>
-#include <tuple>
 
 #include "UIAgent/QZFontDownloadConfirmation.h"
-#include "UIAgent/QZLocalizedString.h"
-#include "protocol/QZUIProtocol.h"
-#include "tests/UIAgent/AlertTestSupport.h"
-#include "tests/UIAgent/DownloadTestSupport.h"
-#include "tests/UIAgent/QtTestEnvironment.h"
+#include "tests/UIAgent/AgentTestSupport.h"
 
 namespace {
 
-using namespace std::chrono_literals;
 using namespace glyphwell::testing;
 using Confirmation = QZFontDownloadConfirmation;
-
-constexpr char kHash[] = "0123456789abcdef0123456789abcdef0123456789abcdef0123456789abcdef";
 
 class DownloadConfirmationTest : public ::testing::Test {
 protected:
     void SetUp() override {
-        qputenv("XDG_DATA_HOME", data_.path().toUtf8());
-        qputenv("XDG_DATA_DIRS", data_.filePath("none").toUtf8());
         // Sans-Regular and Sans-Bold share asset A; Sans-Italic is in B; Mono in C.
-        QDir().mkpath(data_.filePath("glyphwell"));
-        WriteFile(data_.filePath("glyphwell/downloadable-fonts.json"),
-                  QStringLiteral(R"({"assets": [
-                    {"LocalID": "A", "url": "https://f/A", "size": 1234567, "sha256": "%1",
-                     "fonts": [{"postScriptName": "Sans-Regular"}, {"postScriptName": "Sans-Bold"}]},
-                    {"LocalID": "B", "url": "https://f/B", "size": 2000000, "sha256": "%1",
-                     "fonts": [{"postScriptName": "Sans-Italic"}]},
-                    {"LocalID": "C", "url": "https://f/C", "size": 0, "sha256": "%1",
-                     "fonts": [{"postScriptName": "Mono"}]}]})")
-                      .arg(kHash)
-                      .toUtf8());
+        data_.WriteCatalog(R"({"assets": [
+            {"LocalID": "A", "url": "https://f/A", "size": 1234567, "sha256": "%1",
+             "fonts": [{"postScriptName": "Sans-Regular"}, {"postScriptName": "Sans-Bold"}]},
+            {"LocalID": "B", "url": "https://f/B", "size": 2000000, "sha256": "%1",
+             "fonts": [{"postScriptName": "Sans-Italic"}]},
+            {"LocalID": "C", "url": "https://f/C", "size": 0, "sha256": "%1",
+             "fonts": [{"postScriptName": "Mono"}]}]})");
         QZSetPreferredLanguagesForTesting({"en-US"});
     }
-    void TearDown() override {
-        QZSetPreferredLanguagesForTesting({});
-        qunsetenv("XDG_DATA_HOME");
-        qunsetenv("XDG_DATA_DIRS");
-    }
+    void TearDown() override { QZSetPreferredLanguagesForTesting({}); }
 
-    /// Font attributes: PostScript name, family (may be null), localised family names.
-    static Ref Font(const char* postScriptName, const char* family,
-                    std::initializer_list<std::pair<const char*, const char*>> localized = {}) {
-        Ref names(CFDictionaryCreateMutable(nullptr, 0, &kCFTypeDictionaryKeyCallBacks,
-                                            &kCFTypeDictionaryValueCallBacks));
-        for (const auto& [language, name] : localized)
-            CFDictionarySetValue((CFMutableDictionaryRef)names.get(), Str(language).get(),
-                                 Str(name).get());
-        Ref attributes(CFDictionaryCreateMutable(nullptr, 0, &kCFTypeDictionaryKeyCallBacks,
-                                                 &kCFTypeDictionaryValueCallBacks));
-        auto mutableAttributes = (CFMutableDictionaryRef)attributes.get();
-        CFDictionarySetValue(mutableAttributes, NSFontNameAttribute, Str(postScriptName).get());
-        if (family)
-            CFDictionarySetValue(mutableAttributes, NSFontFamilyAttribute, Str(family).get());
-        if (localized.size())
-            CFDictionarySetValue(mutableAttributes, NSCTFontLocalizedFamilyNameAttribute,
-                                 names.get());
-        return attributes;
-    }
     static std::string NameFor(const Confirmation& confirmation, const char* postScriptName) {
-        auto name = static_cast<CFStringRef>(
+        return TextOf(
             CFDictionaryGetValue(confirmation.localizedFontNamesDict(), Str(postScriptName).get()));
-        char buffer[128] = {};
-        return name && CFStringGetCString(name, buffer, sizeof buffer, kCFStringEncodingUTF8)
-                   ? buffer
-                   : "(none)";
     }
 
     EnglishTexts english_;
-    QTemporaryDir data_;
-    Ref regular_ = Font("Sans-Regular", "Example Sans");
+    PrivateDataHome data_;
+    Ref regular_ = RequestedFont("Sans-Regular", "Example Sans");
 };
 
 TEST_F(DownloadConfirmationTest, DownloadAnswersYesAndReturnOrEscapePressesTheDefaultSkip) {
@@ -90,53 +43,37 @@ TEST_F(DownloadConfirmationTest, DownloadAnswersYesAndReturnOrEscapePressesTheDe
         {"Escape", [](Confirmation& alert) { QTest::keyClick(&alert, Qt::Key_Escape); }, 2001},
     };
     for (const auto& [how, answer, tag] : cases) {
+        SCOPED_TRACE(how);
         Confirmation alert(DownloadRequest({regular_.get()}).as<CFDictionaryRef>());
         EXPECT_EQ(alert.buttons().size(), 2);
         EXPECT_EQ(alert.defaultButton(), alert.buttonWithTag(2001));
         UiScript script({{[&] { return alert.isVisible(); }, [&] { answer(alert); }}},
                         [&] { alert.withdraw(); });
         alert.showAlert();
-        EXPECT_EQ(alert.clickedButton(), alert.buttonWithTag(tag)) << how;
-        EXPECT_EQ(alert.shouldDownload(), tag == 2000) << how;
+        EXPECT_EQ(alert.clickedButton(), alert.buttonWithTag(tag));
+        EXPECT_EQ(alert.shouldDownload(), tag == 2000);
         EXPECT_FALSE(alert.suppressFurtherAlerts());
     }
 }
 
-TEST_F(DownloadConfirmationTest, ExitOfTheRequestingProcessWithdrawsTheAlertAndNoOtherDoes) {
+TEST_F(DownloadConfirmationTest, RegressionOnlyTheRequestersExitEndsItsAlertEvenBelowANestedOne) {
     PausedChild requester, bystander;
-    Confirmation confirmation(
-        DownloadRequest({regular_.get()}, requester.pid()).as<CFDictionaryRef>());
+    Confirmation outer(DownloadRequest({regular_.get()}, requester.pid()).as<CFDictionaryRef>());
+    Confirmation inner(DownloadRequest({regular_.get()}).as<CFDictionaryRef>());
     // Watches the bystander, to know when its exit has been noticed.
     Confirmation witness(DownloadRequest({}, bystander.pid()).as<CFDictionaryRef>());
     int terminations = 0, bystanderNoticed = 0;
-    QObject::connect(&confirmation, &Confirmation::requestingApplicationTerminated,
+    QObject::connect(&outer, &Confirmation::requestingApplicationTerminated,
                      [&] { ++terminations; });
     QObject::connect(&witness, &Confirmation::requestingApplicationTerminated,
                      [&] { ++bystanderNoticed; });
-    bool upAfterBystanderExit = false;
-    UiScript script({{[&] { return confirmation.isVisible(); }, [&] { bystander.Kill(); }},
+    bool upAfterBystanderExit = false, innerUp = false;
+    UiScript script({{[&] { return outer.isVisible(); }, [&] { bystander.Kill(); }},
                      {[&] { return bystanderNoticed == 1; },
                       [&] {
-                          upAfterBystanderExit = confirmation.isVisible();
-                          requester.Kill();
-                      }}},
-                    [&] { confirmation.buttonWithTag(2000)->click(); });
-    confirmation.showAlert();
-
-    EXPECT_TRUE(script.done());
-    EXPECT_TRUE(upAfterBystanderExit);
-    EXPECT_FALSE(confirmation.shouldDownload());
-    EXPECT_FALSE(confirmation.suppressFurtherAlerts());
-    EXPECT_EQ(terminations, 1);
-}
-
-TEST_F(DownloadConfirmationTest, RegressionProcessExitEndsItsOwnAlertNotTheNestedOne) {
-    PausedChild requester;
-    Confirmation outer(DownloadRequest({regular_.get()}, requester.pid()).as<CFDictionaryRef>());
-    Confirmation inner(DownloadRequest({regular_.get()}).as<CFDictionaryRef>());
-    bool innerUp = false;
-    UiScript script({{[&] { return outer.isVisible(); },
-                      [&] { QTimer::singleShot(0, &inner, [&] { inner.showAlert(); }); }},
+                          upAfterBystanderExit = outer.isVisible();
+                          QTimer::singleShot(0, &inner, [&] { inner.showAlert(); });
+                      }},
                      {[&] { return inner.isVisible(); }, [&] { requester.Kill(); }},
                      {[&] { return !outer.isVisible(); },
                       [&] {
@@ -145,15 +82,19 @@ TEST_F(DownloadConfirmationTest, RegressionProcessExitEndsItsOwnAlertNotTheNeste
                       }}},
                     EndEveryModalRun);
     outer.showAlert();
+
     EXPECT_TRUE(script.done());
+    EXPECT_TRUE(upAfterBystanderExit);
     EXPECT_TRUE(innerUp);
     EXPECT_TRUE(inner.shouldDownload());
     EXPECT_FALSE(outer.shouldDownload());
+    EXPECT_FALSE(outer.suppressFurtherAlerts());
+    EXPECT_EQ(terminations, 1);
 }
 
 TEST_F(DownloadConfirmationTest, OneDisplayNameIsNamedAndEachAssetIsCountedOnce) {
-    Ref bold = Font("Sans-Bold", "Example Sans");
-    Ref italic = Font("Sans-Italic", "Example Sans");
+    Ref bold = RequestedFont("Sans-Bold", "Example Sans");
+    Ref italic = RequestedFont("Sans-Italic", "Example Sans");
     Confirmation one(
         DownloadRequest({regular_.get(), bold.get(), italic.get()}).as<CFDictionaryRef>());
     EXPECT_TRUE(one.valid());
@@ -163,7 +104,7 @@ TEST_F(DownloadConfirmationTest, OneDisplayNameIsNamedAndEachAssetIsCountedOnce)
     EXPECT_EQ(CFDictionaryGetCount(one.localizedFontNamesDict()), 3);
     EXPECT_EQ(NameFor(one, "Sans-Italic"), "Example Sans");
 
-    Ref otherFamily = Font("Sans-Italic", "Example Sans Italic");
+    Ref otherFamily = RequestedFont("Sans-Italic", "Example Sans Italic");
     Confirmation several(
         DownloadRequest({regular_.get(), otherFamily.get()}).as<CFDictionaryRef>());
     EXPECT_EQ(several.text(), "Example Writer needs to download fonts.");
@@ -172,8 +113,8 @@ TEST_F(DownloadConfirmationTest, OneDisplayNameIsNamedAndEachAssetIsCountedOnce)
 }
 
 TEST_F(DownloadConfirmationTest, NothingToDownloadIsNotValid) {
-    Ref mono = Font("Mono", "Mono");
-    Ref unknown = Font("Unknown", nullptr);
+    Ref mono = RequestedFont("Mono", "Mono");
+    Ref unknown = RequestedFont("Unknown");
     EXPECT_FALSE(
         Confirmation(DownloadRequest({mono.get(), unknown.get()}).as<CFDictionaryRef>()).valid());
     EXPECT_FALSE(Confirmation(DownloadRequest({}).as<CFDictionaryRef>()).valid());
@@ -212,72 +153,48 @@ TEST_F(DownloadConfirmationTest, TheUsersLanguagesInTurnPickTheLongestMatchingKe
         {{}, "Example Sans"},
     };
     for (const Names* order : {&shortestFirst, &longestFirst}) {
-        Ref font = Font("Sans-Regular", "Example Sans", *order);
+        Ref font = RequestedFont("Sans-Regular", "Example Sans", *order);
         for (const Case& c : cases)
             EXPECT_EQ(Confirmation::DisplayName(font.as<CFDictionaryRef>(), c.languages),
                       c.expected)
                 << c.languages.join(',').toStdString()
                 << (order == &longestFirst ? " longest" : "");
     }
-    Ref noFamily = Font("Sans-Regular", nullptr, {{"en", "en name"}});
+    Ref noFamily = RequestedFont("Sans-Regular", nullptr, {{"en", "en name"}});
     EXPECT_EQ(Confirmation::DisplayName(noFamily.as<CFDictionaryRef>(), {"fr"}), "Sans-Regular");
 }
 
 TEST_F(DownloadConfirmationTest, TheCatalogsNamesStandInForThoseTheRequestLacks) {
-    WriteFile(data_.filePath("glyphwell/downloadable-fonts.json"),
-              QStringLiteral(R"({"assets": [{"LocalID": "A", "url": "https://f/A", "size": 757000,
-                 "sha256": "%1", "fonts": [{"postScriptName": "Sans-Regular",
-                 "family": "Catalog Sans", "localizedFamilyNames": {"ja": "カタログ"}}]}]})")
-                  .arg(kHash)
-                  .toUtf8());
-    Ref bare = Font("Sans-Regular", nullptr);
-    Ref english = Font("Sans-Regular", nullptr, {{"en", "English name"}});
-    // The first language the request or the catalog has a name for decides.
-    QZSetPreferredLanguagesForTesting({"ja-JP", "en"});
-    Confirmation japanese(DownloadRequest({english.get()}).as<CFDictionaryRef>());
-    EXPECT_EQ(NameFor(japanese, "Sans-Regular"), "カタログ");
-    QZSetPreferredLanguagesForTesting({"fr", "en"});
-    Confirmation fallback(DownloadRequest({english.get()}).as<CFDictionaryRef>());
-    EXPECT_EQ(NameFor(fallback, "Sans-Regular"), "English name");
-    // The request's own family beats the catalog's; sizes read as the progress window writes them.
-    QZSetPreferredLanguagesForTesting({"fr"});
+    data_.WriteCatalog(R"({"assets": [{"LocalID": "A", "url": "https://f/A", "size": 757000,
+        "sha256": "%1", "fonts": [{"postScriptName": "Sans-Regular", "family": "Catalog Sans",
+        "localizedFamilyNames": {"ja": "カタログ"}}]}]})");
+    Ref bare = RequestedFont("Sans-Regular");
+    Ref english = RequestedFont("Sans-Regular", nullptr, {{"en", "English name"}});
+    struct Case {
+        QStringList languages;
+        CFTypeRef font;
+        const char* name;
+    } cases[] = {
+        // The first language the request or the catalog has a name for decides.
+        {{"ja-JP", "en"}, english.get(), "カタログ"},
+        {{"fr", "en"}, english.get(), "English name"},
+        // The request's own family beats the catalog's.
+        {{"fr"}, regular_.get(), "Example Sans"},
+        {{"fr"}, bare.get(), "Catalog Sans"},
+    };
+    for (const Case& c : cases) {
+        QZSetPreferredLanguagesForTesting(c.languages);
+        Confirmation confirmation(DownloadRequest({c.font}).as<CFDictionaryRef>());
+        EXPECT_EQ(NameFor(confirmation, "Sans-Regular"), c.name);
+    }
+    // Sizes read as the progress window writes them.
     Confirmation french(DownloadRequest({regular_.get()}).as<CFDictionaryRef>());
-    EXPECT_EQ(NameFor(french, "Sans-Regular"), "Example Sans");
     EXPECT_EQ(french.informativeText(),
               "The font “Example Sans” is 757 kB. Do you want to download it?");
-    Confirmation catalogFamily(DownloadRequest({bare.get()}).as<CFDictionaryRef>());
-    EXPECT_EQ(NameFor(catalogFamily, "Sans-Regular"), "Catalog Sans");
-}
-
-TEST_F(DownloadConfirmationTest, VeryLongNamesAreElidedWithTheFullTextsInTheTooltips) {
-    const std::string longName(100, 'W'), longApplication = "Writer" + std::string(200, 'X');
-    const std::pair<std::string, std::string> cases[] = {{longName, "Example Writer"},
-                                                         {"Example Sans", longApplication}};
-    for (const auto& [fontName, application] : cases) {
-        SCOPED_TRACE(application);
-        Ref font = Font("Sans-Regular", fontName.c_str());
-        Ref pid = Num(kCFNumberSInt32Type, 0);
-        Ref request = Dict({{kQZUIPropertyApplicationName, Str(application).get()},
-                            {kQZUIPropertyProcessID, pid.get()},
-                            {kQZUIPropertyFontProperties, Array({font.get()}).get()}});
-        Confirmation confirmation(request.as<CFDictionaryRef>());
-        EXPECT_EQ(NameFor(confirmation, "Sans-Regular"), fontName);
-        const QString longPart =
-            QString::fromStdString(fontName == longName ? longName : longApplication);
-        EXPECT_FALSE(confirmation.text().contains(longPart));
-        EXPECT_TRUE(confirmation.text().contains(u'…'));
-        auto* label = confirmation.findChild<QLabel*>("qt_msgbox_label");
-        ASSERT_NE(label, nullptr);
-        EXPECT_TRUE(label->toolTip().contains(longPart));
-        EXPECT_EQ(label->accessibleDescription(), label->toolTip());
-        confirmation.show();
-        EXPECT_LT(confirmation.width(), 800);
-        confirmation.hide();
-    }
 }
 
 TEST_F(DownloadConfirmationTest, ApplicationNameFallsBackToTheLocalizedDesktopEntry) {
-    const QString entry = WriteFile(data_.filePath("writer.desktop"),
+    const QString entry = WriteFile(data_.FilePath("writer.desktop"),
                                     "[Desktop Entry]\nName=Writer\nName[de]=Schreiber\n");
     QZSetPreferredLanguagesForTesting({"de-DE"});
     Confirmation confirmation(

@@ -5,29 +5,18 @@
 // before the test. A tap on the matching's callbacks records the states and can hold the worker
 // at one state, so that the window is looked at, cancelled or withdrawn mid-transfer at a known
 // point.
-#include <QDir>
-#include <QFile>
-#include <QLabel>
-#include <QProgressBar>
-#include <QPushButton>
-#include <QTemporaryDir>
+#include <QPointer>
 #include <climits>
 #include <condition_variable>
-#include <cstdio>
-#include <functional>
+#include <cstring>
 #include <limits>
 #include <map>
 #include <mutex>
-#include <openssl/evp.h>
 
 #include "UIAgent/FontDownloadWindowController.h"
-#include "UIAgent/QZFontDownloadConfirmation.h"
-#include "UIAgent/QZLocalizedString.h"
 #include "UIAgent/QZNetworkCheck.h"
 #include "desktop/QZFontMatching.h"
-#include "tests/UIAgent/AlertTestSupport.h"
-#include "tests/UIAgent/DownloadTestSupport.h"
-#include "tests/UIAgent/QtTestEnvironment.h"
+#include "tests/UIAgent/AgentTestSupport.h"
 #include "tests/support/LoopbackHTTPServer.h"
 #include "tests/support/PrivateFonts.h"
 
@@ -38,16 +27,6 @@ using namespace glyphwell::testing;
 using Controller = FontDownloadWindowController;
 
 // DejaVuSansMono.ttf has 343140 bytes, DejaVuSansMono-Bold.ttf 334268.
-
-bool Online(QZNetworkReachabilityFlags* flags) {
-    *flags = kQZNetworkReachabilityFlagsReachable;
-    return true;
-}
-
-bool Offline(QZNetworkReachabilityFlags* flags) {
-    *flags = 0;
-    return true;
-}
 
 /// The matching's callbacks as the tap sees them (worker thread), and a gate that holds the
 /// worker at the first callback of one state until the test lets it go.
@@ -65,21 +44,16 @@ public:
             holding_ = false;
         };
     }
-    /// Holds the worker at the first callback of `state`.
-    void HoldAt(QZFontDescriptorMatchingState state) {
+    /// Forgets the states seen; holds the worker at the first callback of `holdAt` (-1: nowhere).
+    void Restart(int holdAt = -1) {
         std::lock_guard<std::mutex> lock(mutex_);
-        holdAt_ = int(state);
+        states_.clear();
+        holdAt_ = holdAt;
+        released_ = false;
     }
     bool Holding() const {
         std::lock_guard<std::mutex> lock(mutex_);
         return holding_;
-    }
-    /// Forgets the states seen and holds nowhere.
-    void Reset() {
-        std::lock_guard<std::mutex> lock(mutex_);
-        states_.clear();
-        holdAt_ = -1;
-        released_ = false;
     }
     void Release() {
         {
@@ -107,37 +81,16 @@ private:
     bool released_ = false;
 };
 
-/// What the progress window shows at one moment.
-struct WindowState {
-    std::string status, sizeLine, bar;
-    bool timerRunning = false;
-    bool staysOnTop = false;
-};
-
-WindowState Look(QDialog* window) {
-    WindowState state;
+/// What the progress window shows: "status | size line | value/maximum | timer | on top".
+std::string Look(QDialog* window) {
     if (!window)
-        return state;
-    state.status = window->findChild<QLabel*>("mainStatusTextField")->text().toStdString();
-    state.sizeLine = window->findChild<QLabel*>("minorStatusTextField")->text().toStdString();
-    auto* progress = window->findChild<QProgressBar*>("progressIndicator");
-    state.bar = std::to_string(progress->value()) + "/" + std::to_string(progress->maximum());
-    auto* timer = window->findChild<QTimer*>("refreshTimer");
-    state.timerRunning = timer && timer->isActive();
-    state.staysOnTop = window->windowFlags().testFlag(Qt::WindowStaysOnTopHint);
-    return state;
-}
-
-void ClickButton(QMessageBox* alert, const char* key) {
-    QAbstractButton* button = ButtonWithText(alert, QZLocalizedString(key));
-    ASSERT_NE(button, nullptr) << key;
-    button->click();
-}
-
-/// A step that answers the download confirmation with Download.
-UiScript::Step AgreeToDownload() {
-    return {[] { return ButtonWithText(AlertOnScreen(), QZLocalizedString("Download")); },
-            [] { ClickButton(AlertOnScreen(), "Download"); }};
+        return "no window";
+    auto* bar = window->findChild<QProgressBar*>("progressIndicator");
+    return window->findChild<QLabel*>("mainStatusTextField")->text().toStdString() + " | " +
+           window->findChild<QLabel*>("minorStatusTextField")->text().toStdString() + " | " +
+           std::to_string(bar->value()) + "/" + std::to_string(bar->maximum()) +
+           (window->findChild<QTimer*>("refreshTimer")->isActive() ? " | timer" : " | no timer") +
+           (window->windowFlags().testFlag(Qt::WindowStaysOnTopHint) ? " | on top" : "");
 }
 
 class DownloadRoadTest : public ::testing::Test {
@@ -145,22 +98,24 @@ protected:
     void SetUp() override {
         ASSERT_TRUE(root_.isValid());
         ASSERT_TRUE(server_.IsListening());
-        fonts_ = glyphwell::testing::UsePrivateFonts(root_.path());
+        fonts_ = UsePrivateFonts(root_.path());
         ASSERT_FALSE(fonts_.isEmpty());
         ASSERT_FALSE(QZIsFontInstalled("DejaVuSansMono"));
-
-        QZNetworkCheck::SetFlagsSourceForTesting(&Online);
+        QZNetworkCheck::SetFlagsSourceForTesting([](QZNetworkReachabilityFlags* flags) {
+            *flags = kQZNetworkReachabilityFlagsReachable;
+            return true;
+        });
         QZSetPreferredLanguagesForTesting({"en-US"});
         Controller::SetProgressTapForTesting(callbacks_.Tap());
     }
     void TearDown() override {
         // A matching whose window has gone ends at its next callback; wait for its thread.
         callbacks_.Release();
-        EXPECT_TRUE(SpinUntil([] { return Controller::MatchingRunsInProgress() == 0; }));
+        EXPECT_TRUE(WaitForTheMatchingToEnd());
         Controller::SetProgressTapForTesting({});
         QZNetworkCheck::SetFlagsSourceForTesting(nullptr);
         QZSetPreferredLanguagesForTesting({});
-        glyphwell::testing::StopUsingPrivateFonts();
+        StopUsingPrivateFonts();
     }
 
     /// Serves the DejaVu file `file` at "/<file>" with `resource`'s delivery settings and
@@ -182,17 +137,18 @@ protected:
         std::string text = "{\"assets\": [";
         for (size_t i = 0; i < assets.size(); ++i)
             text += (i ? ", " : "") + assets[i];
-        text += "]}";
         QDir().mkpath(root_.path() + "/data/glyphwell");
         WriteFile(root_.path() + "/data/glyphwell/downloadable-fonts.json",
-                  QByteArray(text.data(), qsizetype(text.size())));
+                  QByteArray::fromStdString(text + "]}"));
+    }
+    void ServeMono() {
+        WriteCatalog({ServeFont("DejaVuSansMono.ttf", "org.test.Mono", "DejaVuSansMono")});
     }
     /// Every entry of the download folder, hidden ones included.
     QStringList DownloadFolder() const {
         return QDir(fonts_ + "/glyphwell")
             .entryList(QDir::Files | QDir::Hidden | QDir::NoDotAndDotDot, QDir::Name);
     }
-    /// Waits until the matching's thread is done.
     static bool WaitForTheMatchingToEnd() {
         return SpinUntil([] { return Controller::MatchingRunsInProgress() == 0; });
     }
@@ -203,122 +159,96 @@ protected:
     LoopbackHTTPServer server_;
     Callbacks callbacks_;
     WindowWatch watch_;
+    Ref mono_ = RequestedFont("DejaVuSansMono", "DejaVu Sans Mono");
 };
 
-TEST_F(DownloadRoadTest, AnAgreedDownloadIsInstalledMatchedAndAnsweredYes) {
-    WriteCatalog({ServeFont("DejaVuSansMono.ttf", "org.test.Mono", "DejaVuSansMono")});
-    Ref mono = RequestedFont("DejaVuSansMono", "DejaVu Sans Mono");
-    callbacks_.HoldAt(kCTFontDescriptorMatchingDownloading);
-    WindowState whileDownloading;
-    UiScript script({AgreeToDownload(),
-                     {[this] { return callbacks_.Holding(); },
-                      [&] {
-                          whileDownloading = Look(ProgressWindowOnScreen());
-                          callbacks_.Release();
-                      }}},
-                    EndEveryModalRun);
+TEST_F(DownloadRoadTest, AnAgreedDownloadIsInstalledAndAnsweredYesCancelStopsAndLeavesNothing) {
+    ServeMono();
+    struct Case {
+        bool cancel; ///< Cancel in the progress window while the transfer is held
+        std::vector<uint32_t> states;
+        QStringList folder;
+    } cases[] = {
+        // The callback held at the first bytes answers stop: nothing comes after it.
+        {true, {0, 2, 4, 5}, {}},
+        {false, {0, 2, 4, 5, 6, 7, 1}, {"org.test.Mono.ttf"}},
+    };
+    for (const Case& c : cases) {
+        SCOPED_TRACE(c.cancel ? "cancelled" : "agreed");
+        callbacks_.Restart(kCTFontDescriptorMatchingDownloading);
+        WindowWatch watch;
+        std::string whileDownloading, afterCancel;
+        UiScript script({PressWhenUp("Download"),
+                         {[this] { return callbacks_.Holding(); },
+                          [&] {
+                              QDialog* window = ProgressWindowOnScreen();
+                              whileDownloading = Look(window);
+                              if (c.cancel) {
+                                  window->findChild<QPushButton*>("cancelButton")->click();
+                                  afterCancel = Look(window);
+                              }
+                              callbacks_.Release();
+                          }}},
+                        EndEveryModalRun);
 
-    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({mono.get()}).get()),
-              DownloadReply(true, false));
-
-    EXPECT_TRUE(script.done());
-    EXPECT_EQ(callbacks_.States(), (std::vector<uint32_t>{0, 2, 4, 5, 6, 7, 1}));
-    // Once the total is known: the bar in bytes and the first size line at once.
-    EXPECT_EQ(whileDownloading.status, "Downloading “DejaVu Sans Mono”…");
-    EXPECT_EQ(whileDownloading.sizeLine, "0 bytes of 343 kB");
-    EXPECT_EQ(whileDownloading.bar, "0/343140");
-    EXPECT_TRUE(whileDownloading.timerRunning);
-    EXPECT_TRUE(whileDownloading.staysOnTop);
-    // The bar then follows the bytes up to the whole file.
-    ASSERT_FALSE(watch_.bar.empty());
-    EXPECT_EQ(watch_.bar.back(), "343140/343140");
-    for (const std::string& value : watch_.bar)
-        EXPECT_TRUE(value.size() > 7 && value.compare(value.size() - 7, 7, "/343140") == 0)
-            << value;
-    EXPECT_TRUE(watch_.hidden);
-    EXPECT_FALSE(watch_.timerRunningWhenHidden);
-    EXPECT_EQ(watch_.progressWindowsShown, 1);
-
-    EXPECT_EQ(DownloadFolder(), QStringList{"org.test.Mono.ttf"});
+        EXPECT_EQ(HandleDownloadRequest(DownloadRequest({mono_.get()}).get()),
+                  Reply(!c.cancel, false));
+        EXPECT_TRUE(script.done());
+        // Once the total is known: the bar in bytes and the first size line at once.
+        EXPECT_EQ(
+            whileDownloading,
+            "Downloading “DejaVu Sans Mono”… | 0 bytes of 343 kB | 0/343140 | timer | on top");
+        EXPECT_TRUE(!c.cancel || afterCancel.find("| timer") == std::string::npos) << afterCancel;
+        EXPECT_TRUE(watch.hidden);
+        EXPECT_FALSE(watch.timerRunningWhenHidden);
+        EXPECT_EQ(watch.progressWindowsShown, 1);
+        ASSERT_TRUE(WaitForTheMatchingToEnd());
+        EXPECT_EQ(callbacks_.States(), c.states);
+        EXPECT_EQ(DownloadFolder(), c.folder);
+        EXPECT_EQ(QZIsFontInstalled("DejaVuSansMono"), !c.cancel);
+        if (c.cancel)
+            continue;
+        // The bar follows the bytes up to the whole file.
+        ASSERT_FALSE(watch.bar.empty());
+        EXPECT_EQ(watch.bar.back(), "343140/343140");
+        for (const std::string& value : watch.bar)
+            EXPECT_TRUE(value.size() > 7 && value.compare(value.size() - 7, 7, "/343140") == 0)
+                << value;
+    }
+    EXPECT_EQ(server_.RequestCount("/DejaVuSansMono.ttf"), 2);
     EXPECT_TRUE(ReadFile(fonts_ + "/glyphwell/org.test.Mono.ttf") ==
                 ReadFile(kDejaVu + "DejaVuSansMono.ttf"));
-    EXPECT_TRUE(QZIsFontInstalled("DejaVuSansMono"));
 }
 
 TEST_F(DownloadRoadTest, AnInstalledFontIsMatchedWithoutDownloading) {
     ASSERT_TRUE(QFile::copy(kDejaVu + "DejaVuSansMono.ttf", fonts_ + "/DejaVuSansMono.ttf"));
     ASSERT_TRUE(QZReloadFontConfiguration());
-    WriteCatalog({ServeFont("DejaVuSansMono.ttf", "org.test.Mono", "DejaVuSansMono")});
-    Ref mono = RequestedFont("DejaVuSansMono", "DejaVu Sans Mono");
-
+    ServeMono();
     // Nothing to download means nothing to confirm: only a request that says not to ask gets
     // this far. Unasked, the window still shows the display name.
-    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({mono.get()}, 0, true).get()),
-              DownloadReply(true, true));
+    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({mono_.get()}, 0, true).get()),
+              Reply(true, true));
     EXPECT_EQ(watch_.statusWhenHidden, "Preparing to download “DejaVu Sans Mono”…");
     EXPECT_EQ(callbacks_.States(), (std::vector<uint32_t>{0, 2, 7, 1}));
     EXPECT_EQ(server_.RequestCount("/DejaVuSansMono.ttf"), 0);
     EXPECT_TRUE(DownloadFolder().isEmpty());
 }
 
-TEST_F(DownloadRoadTest, CancelDuringTheTransferStopsTheTimerLeavesNoFileAndAnswersNo) {
-    WriteCatalog({ServeFont("DejaVuSansMono.ttf", "org.test.Mono", "DejaVuSansMono")});
-    Ref mono = RequestedFont("DejaVuSansMono", "DejaVu Sans Mono");
-    callbacks_.HoldAt(kCTFontDescriptorMatchingDownloading);
-    bool timerRunningAfterCancel = true;
-    UiScript script({AgreeToDownload(),
-                     {[this] { return callbacks_.Holding(); },
-                      [&] {
-                          QDialog* window = ProgressWindowOnScreen();
-                          ASSERT_NE(window, nullptr);
-                          window->findChild<QPushButton*>("cancelButton")->click();
-                          timerRunningAfterCancel = Look(window).timerRunning;
-                          callbacks_.Release();
-                      }}},
-                    EndEveryModalRun);
-
-    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({mono.get()}).get()),
-              DownloadReply(false, false));
-
-    EXPECT_TRUE(script.done());
-    EXPECT_FALSE(timerRunningAfterCancel);
-    EXPECT_FALSE(watch_.timerRunningWhenHidden);
-    ASSERT_TRUE(WaitForTheMatchingToEnd());
-    // The callback held at the first bytes answered stop: nothing came after it.
-    EXPECT_EQ(callbacks_.States(), (std::vector<uint32_t>{0, 2, 4, 5}));
-    EXPECT_EQ(server_.RequestCount("/DejaVuSansMono.ttf"), 1);
-    EXPECT_TRUE(DownloadFolder().isEmpty()) << DownloadFolder().join(", ").toStdString();
-    EXPECT_FALSE(QZIsFontInstalled("DejaVuSansMono"));
-}
-
 TEST_F(DownloadRoadTest, AFailureGoesOnToTheNextFontOrEndsWithNoWhenCancelledOrClosed) {
-    const std::string damaged(64, '0');
     struct Case {
-        const char* how;
-        bool damaged; ///< the bold file's checksum is wrong; else its connection drops
-        std::function<void(QMessageBox*)> answer;
-        bool result;
+        const char* button; ///< the error alert's button pressed; null: its close button
+        bool damaged;       ///< the bold file's checksum is wrong; else its connection drops
         const char* reason;
         std::vector<uint32_t> states;
         QStringList folder;
     } cases[] = {
         {"Cancel",
          false,
-         [](QMessageBox* alert) { ClickButton(alert, "Cancel"); },
-         false,
          "The connection ended after 100000 of 334268 bytes.",
          {0, 2, 4, 5, 8},
          {}},
-        {"close button",
-         false,
-         [](QMessageBox* alert) { alert->close(); },
-         false,
-         "The connection ended after 100000 of 334268 bytes.",
-         {0, 2, 4, 5, 8},
-         {}},
+        {nullptr, false, "The connection ended after 100000 of 334268 bytes.", {0, 2, 4, 5, 8}, {}},
         {"Continue Download",
-         true,
-         [](QMessageBox* alert) { ClickButton(alert, "Continue Download"); },
          true,
          "The downloaded file is damaged: its SHA-256 checksum is not the expected one.",
          {0, 2, 4, 5, 8, 2, 4, 5, 6, 7, 1},
@@ -327,15 +257,17 @@ TEST_F(DownloadRoadTest, AFailureGoesOnToTheNextFontOrEndsWithNoWhenCancelledOrC
     Ref bold = RequestedFont("DejaVuSansMono-Bold");
     Ref mono = RequestedFont("DejaVuSansMono");
     for (const Case& c : cases) {
+        SCOPED_TRACE(c.button ? c.button : "close button");
         LoopbackHTTPServer::Resource resource;
         resource.dropAfter = c.damaged ? std::string::npos : 100000;
         // Another identifier for the damaged file, so that the catalog changes size and is read
         // again.
-        WriteCatalog({ServeFont("DejaVuSansMono-Bold.ttf",
-                                c.damaged ? "org.test.DamagedBold" : "org.test.MonoBold",
-                                "DejaVuSansMono-Bold", resource, c.damaged ? damaged : ""),
-                      ServeFont("DejaVuSansMono.ttf", "org.test.Mono", "DejaVuSansMono")});
-        callbacks_.Reset();
+        WriteCatalog(
+            {ServeFont("DejaVuSansMono-Bold.ttf",
+                       c.damaged ? "org.test.DamagedBold" : "org.test.MonoBold",
+                       "DejaVuSansMono-Bold", resource, c.damaged ? std::string(64, '0') : ""),
+             ServeFont("DejaVuSansMono.ttf", "org.test.Mono", "DejaVuSansMono")});
+        callbacks_.Restart();
         std::string reason, defaultButton, escapeButton;
         UiScript script(
             {{[] { return AlertWithText("The font “DejaVuSansMono-Bold” cannot be downloaded."); },
@@ -344,21 +276,19 @@ TEST_F(DownloadRoadTest, AFailureGoesOnToTheNextFontOrEndsWithNoWhenCancelledOrC
                   reason = alert->informativeText().toStdString();
                   defaultButton = alert->defaultButton()->text().toStdString();
                   escapeButton = alert->escapeButton()->text().toStdString();
-                  c.answer(alert);
+                  c.button ? ClickButton(alert, c.button) : void(alert->close());
               }}},
             EndEveryModalRun);
 
         EXPECT_EQ(HandleDownloadRequest(DownloadRequest({bold.get(), mono.get()}, 0, true).get()),
-                  DownloadReply(c.result, true))
-            << c.how;
-
-        EXPECT_TRUE(script.done()) << c.how;
+                  Reply(c.button && !strcmp(c.button, "Continue Download"), true));
+        EXPECT_TRUE(script.done());
         EXPECT_EQ(reason, c.reason);
         EXPECT_EQ(defaultButton, "Continue Download");
         EXPECT_EQ(escapeButton, "Cancel");
         ASSERT_TRUE(WaitForTheMatchingToEnd());
-        EXPECT_EQ(callbacks_.States(), c.states) << c.how;
-        EXPECT_EQ(DownloadFolder(), c.folder) << c.how;
+        EXPECT_EQ(callbacks_.States(), c.states);
+        EXPECT_EQ(DownloadFolder(), c.folder);
     }
     // Only the run that went on fetched the second font.
     EXPECT_EQ(server_.RequestCount("/DejaVuSansMono.ttf"), 1);
@@ -367,16 +297,14 @@ TEST_F(DownloadRoadTest, AFailureGoesOnToTheNextFontOrEndsWithNoWhenCancelledOrC
 }
 
 TEST_F(DownloadRoadTest, RegressionTheRequestingProcessExitEndsTheWindowsOwnRunNotTheInnermost) {
-    WriteCatalog({ServeFont("DejaVuSansMono.ttf", "org.test.Mono", "DejaVuSansMono")});
-    Ref mono = RequestedFont("DejaVuSansMono", "DejaVu Sans Mono");
+    ServeMono();
     PausedChild requester;
-    callbacks_.HoldAt(kCTFontDescriptorMatchingDownloading);
-
+    callbacks_.Restart(kCTFontDescriptorMatchingDownloading);
     // Another question comes up above the progress window while the download runs.
     QPointer<QMessageBox> other;
     QZModalSession* otherSession = nullptr;
     bool otherUpWhenWindowWent = false;
-    UiScript script({AgreeToDownload(),
+    UiScript script({PressWhenUp("Download"),
                      {[this] { return callbacks_.Holding() && ProgressWindowOnScreen(); },
                       [&] {
                           QTimer::singleShot(0, [&] {
@@ -398,62 +326,60 @@ TEST_F(DownloadRoadTest, RegressionTheRequestingProcessExitEndsTheWindowsOwnRunN
                       }}},
                     EndEveryModalRun);
 
-    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({mono.get()}, requester.pid()).get()),
-              DownloadReply(false, false));
-
+    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({mono_.get()}, requester.pid()).get()),
+              Reply(false, false));
     EXPECT_TRUE(script.done());
     EXPECT_TRUE(otherUpWhenWindowWent);
     EXPECT_FALSE(watch_.timerRunningWhenHidden);
     ASSERT_TRUE(WaitForTheMatchingToEnd());
     EXPECT_EQ(callbacks_.States(), (std::vector<uint32_t>{0, 2, 4, 5}));
-    EXPECT_TRUE(DownloadFolder().isEmpty()) << DownloadFolder().join(", ").toStdString();
+    EXPECT_TRUE(DownloadFolder().isEmpty());
 }
 
 TEST_F(DownloadRoadTest, TheErrorAlertAndTheProgressWindowElideALongFontNameAndTellTheFullTexts) {
     // A file that does not hold the font: the name is in the headline and in the reason.
-    const std::string name = "Long" + std::string(200, 'X');
-    WriteCatalog({ServeFont("DejaVuSansMono.ttf", "org.test.Long", name)});
-    Ref font = RequestedFont(name.c_str());
-    std::map<std::string, std::pair<QString, QString>> labels; // object name: text, tooltip
+    const QString name = "Long" + QString(200, u'X');
+    WriteCatalog({ServeFont("DejaVuSansMono.ttf", "org.test.Long", name.toStdString())});
+    Ref font = RequestedFont(name.toUtf8().constData());
+    std::map<std::string, QLabel*> labels; // by object name
     QString title;
     UiScript script(
         {{[] { return AlertOnScreen() && AlertOnScreen()->isVisible(); },
           [&] {
-              QMessageBox* alert = AlertOnScreen();
-              title = alert->windowTitle();
+              title = AlertOnScreen()->windowTitle();
               for (QWidget* window :
-                   {static_cast<QWidget*>(alert), static_cast<QWidget*>(ProgressWindowOnScreen())})
+                   std::initializer_list<QWidget*>{AlertOnScreen(), ProgressWindowOnScreen()})
                   for (QLabel* label : window->findChildren<QLabel*>())
-                      labels[label->objectName().toStdString()] = {label->text(), label->toolTip()};
-              ClickButton(alert, "Cancel");
+                      labels[label->objectName().toStdString()] = label;
+              for (const char* labelName :
+                   {"qt_msgbox_label", "qt_msgbox_informativelabel", "mainStatusTextField"}) {
+                  SCOPED_TRACE(labelName);
+                  ASSERT_TRUE(labels[labelName]);
+                  EXPECT_FALSE(labels[labelName]->text().contains(name));
+                  EXPECT_TRUE(labels[labelName]->toolTip().contains(name));
+              }
+              ClickButton(AlertOnScreen(), "Cancel");
           }}},
         EndEveryModalRun);
     EXPECT_EQ(HandleDownloadRequest(DownloadRequest({font.get()}, 0, true).get()),
-              DownloadReply(false, true));
+              Reply(false, true));
     EXPECT_TRUE(script.done());
     EXPECT_EQ(title, "Font Download Failed");
-    for (const char* labelName :
-         {"qt_msgbox_label", "qt_msgbox_informativelabel", "mainStatusTextField"}) {
-        SCOPED_TRACE(labelName);
-        const auto& [text, tip] = labels[labelName];
-        EXPECT_FALSE(text.contains(QString::fromStdString(name)));
-        EXPECT_TRUE(tip.contains(QString::fromStdString(name))) << tip.toStdString();
-    }
-    ASSERT_TRUE(WaitForTheMatchingToEnd());
 }
 
 TEST_F(DownloadRoadTest, RegressionARequestWithoutFontsToHaveOpensNoWindowAndAsksNothing) {
     // Offline: a network question would show an alert.
-    QZNetworkCheck::SetFlagsSourceForTesting(&Offline);
+    QZNetworkCheck::SetFlagsSourceForTesting([](QZNetworkReachabilityFlags* flags) {
+        *flags = 0;
+        return true;
+    });
     Ref nameless = Dict({{NSFontFamilyAttribute, Str("DejaVu Sans Mono").get()}});
-    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({nameless.get()}, 0, true).get()),
-              DownloadReply(false, true));
     // Neither offered by a catalog nor installed: left out before any window.
     Ref unknown = RequestedFont("NoSuchFont-Regular");
-    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({unknown.get()}, 0, true).get()),
-              DownloadReply(false, true));
-    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({}, 0, true).get()),
-              DownloadReply(false, true));
+    for (CFTypeRef font : {nameless.get(), unknown.get()})
+        EXPECT_EQ(HandleDownloadRequest(DownloadRequest({font}, 0, true).get()),
+                  Reply(false, true));
+    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({}, 0, true).get()), Reply(false, true));
     EXPECT_EQ(watch_.windowsShown, 0);
     EXPECT_TRUE(callbacks_.States().empty());
 }

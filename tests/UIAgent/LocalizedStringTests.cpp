@@ -1,100 +1,57 @@
 // The "Localized" table: lookup, placeholders, the choice of language and of layout direction,
 // script subtags, and the five tables' completeness.
-#include <QApplication>
-#include <QCoreApplication>
-#include <QDialog>
 #include <QFontMetrics>
 #include <QRegularExpression>
-#include <QTranslator>
 #include <set>
 
-#include "UIAgent/QZLocalizedString.h"
-#include "tests/UIAgent/QtTestEnvironment.h"
+#include "tests/UIAgent/AgentTestSupport.h"
 
 namespace {
 
-/// Installs the embedded table of `language` while it lives.
-class InstalledTable {
-public:
-    explicit InstalledTable(const QString& language) {
-        loaded = translator_.load(QStringLiteral(":/translations/Localized_%1.qm").arg(language));
-        if (loaded)
-            QCoreApplication::installTranslator(&translator_);
-    }
-    ~InstalledTable() { QCoreApplication::removeTranslator(&translator_); }
-    bool loaded = false;
-
-private:
-    QTranslator translator_;
-};
-
-struct Key {
-    const char* key;
-    int arguments;
-};
+using glyphwell::testing::InstalledTable;
 
 // Every key the alerts, the download window and the network check show (the countdown and the
-// help window's title are the alert's own additions), with the number of arguments of its
-// format.
-const Key kKeys[] = {
-    {"QZ_HEADLINE_FONT", 2},
-    {"QZ_HEADLINE_FONT_VOLUME", 3},
-    {"QZ_DETAIL_FONT_NOT_INSTALLED", 0},
-    {"QZ_BUTTON_ALLOW", 0},
-    {"QZ_BUTTON_DISALLOW", 0},
-    {"QZ_BUTTON_SHOW_IN_FINDER", 0},
-    {"QZ_DO_NOT_WARN_APPLICATION", 1},
-    {"QZ_AUTO_ACTIVATION_HELP_ANCHOR", 0},
-    {"QZ_CURRENT_APPLICATION", 0},
-    {"QZ_HEADLINE_NEEDS_TO_DOWNLOAD_FONT_NAME", 2},
-    {"QZ_HEADLINE_NEEDS_TO_DOWNLOAD", 1},
-    {"QZ_DETAIL_FONT_SIZE", 2},
-    {"QZ_DETAIL_DOWNLOAD_SIZE", 1},
-    {"Skip", 0},
-    {"Download", 0},
-    {"QZ_PREPARING_TO_DOWNLOAD", 0},
-    {"QZ_PREPARING_TO_DOWNLOAD_FONT", 1},
-    {"QZ_DOWNLOADING_FONT", 1},
-    {"QZ_DOWNLOADING_FONTS", 0},
-    {"QZ_DOWNLOAD_WINDOW_TITLE", 0},
-    {"QZ_DOWNLOAD_PROGRESS_NAME", 0},
-    {"QZ_AUTO_ACTIVATION_TITLE", 0},
-    {"QZ_DOWNLOAD_CONFIRMATION_TITLE", 0},
-    {"QZ_NETWORK_ALERT_TITLE", 0},
-    {"QZ_DOWNLOAD_ERROR_TITLE", 0},
-    {"QZ_ERROR_DOMAIN_CODE", 2},
-    {"%1$@ of %2$@", 2},
-    {"Continue Download", 0},
-    {"Cancel", 0},
-    {"Network is not connected.", 0},
-    {"You are not connected to the Internet. Do you want to cancel downloading?", 0},
-    {"This question closes without an answer in %@.", 1},
-    {"Help", 0},
+// help window's title are the alert's own additions), by the number of arguments of its format.
+const std::pair<int, std::vector<const char*>> kKeys[] = {
+    {0,
+     {"QZ_DETAIL_FONT_NOT_INSTALLED", "QZ_BUTTON_ALLOW", "QZ_BUTTON_DISALLOW",
+      "QZ_BUTTON_SHOW_IN_FINDER", "QZ_AUTO_ACTIVATION_HELP_ANCHOR", "QZ_CURRENT_APPLICATION",
+      "Skip", "Download", "QZ_PREPARING_TO_DOWNLOAD", "QZ_DOWNLOADING_FONTS"}},
+    {0,
+     {"QZ_DOWNLOAD_WINDOW_TITLE", "QZ_DOWNLOAD_PROGRESS_NAME", "QZ_AUTO_ACTIVATION_TITLE",
+      "QZ_DOWNLOAD_CONFIRMATION_TITLE", "QZ_NETWORK_ALERT_TITLE", "QZ_DOWNLOAD_ERROR_TITLE",
+      "Continue Download", "Cancel", "Network is not connected.", "Help"}},
+    {0, {"You are not connected to the Internet. Do you want to cancel downloading?"}},
+    {1,
+     {"QZ_DO_NOT_WARN_APPLICATION", "QZ_HEADLINE_NEEDS_TO_DOWNLOAD", "QZ_DETAIL_DOWNLOAD_SIZE",
+      "QZ_PREPARING_TO_DOWNLOAD_FONT", "QZ_DOWNLOADING_FONT",
+      "This question closes without an answer in %@."}},
+    {2,
+     {"QZ_HEADLINE_FONT", "QZ_HEADLINE_NEEDS_TO_DOWNLOAD_FONT_NAME", "QZ_DETAIL_FONT_SIZE",
+      "QZ_ERROR_DOMAIN_CODE", "%1$@ of %2$@"}},
+    {3, {"QZ_HEADLINE_FONT_VOLUME"}},
 };
 
 // The download failure alert's texts, made by the font service in contexts of their own; their
 // placeholders are those of the source text.
-const std::pair<const char*, const char*> kFailureTexts[] = {
-    {"QZFontService", "The font “%1” cannot be downloaded."},
-    {"QZFontService", "No downloadable font has this name."},
-    {"QZFontService", "The downloaded font file does not hold this font."},
-    {"QZFontDownloader", "The server offers %1 bytes, but the font should have %2 bytes."},
-    {"QZFontDownloader", "The server sent more than the %1 bytes of the font."},
-    {"QZFontDownloader", "The font file cannot be written: %1"},
-    {"QZFontDownloader", "The server answered with the HTTP status %1."},
-    {"QZFontDownloader", "Fonts are downloaded only from https, http and file addresses, and "
-                         "redirected only to https and http ones."},
-    {"QZFontDownloader", "The connection ended after %1 of %2 bytes."},
-    {"QZFontDownloader", "The download failed: %1"},
-    {"QZFontDownloader", "The font folder cannot be created: %1"},
-    {"QZFontDownloader", "The download holds %1 bytes, but the font should have %2 bytes."},
+const std::pair<const char*, std::vector<const char*>> kFailureTexts[] = {
+    {"QZFontService",
+     {"The font “%1” cannot be downloaded.", "No downloadable font has this name.",
+      "The downloaded font file does not hold this font."}},
     {"QZFontDownloader",
-     "The downloaded file is damaged: its SHA-256 checksum is not the expected one."},
-    {"QZFontDownloader", "The downloaded file is not a font."},
-    {"QZFontDownloader", "The server did not answer within %1 seconds."},
-    {"QZFontDownloader", "The downloaded file does not hold the font “%1”."},
-    {"QZFontDownloader", "The download was given up: the server sent less than %1 bytes per "
-                         "second over %2 seconds."},
+     {"The server offers %1 bytes, but the font should have %2 bytes.",
+      "The server sent more than the %1 bytes of the font.", "The font file cannot be written: %1",
+      "The server answered with the HTTP status %1.",
+      "Fonts are downloaded only from https, http and file addresses, and redirected only to "
+      "https and http ones.",
+      "The connection ended after %1 of %2 bytes.", "The download failed: %1",
+      "The font folder cannot be created: %1",
+      "The download holds %1 bytes, but the font should have %2 bytes.",
+      "The downloaded file is damaged: its SHA-256 checksum is not the expected one.",
+      "The downloaded file is not a font.", "The server did not answer within %1 seconds.",
+      "The downloaded file does not hold the font “%1”.",
+      "The download was given up: the server sent less than %1 bytes per second over %2 "
+      "seconds."}},
 };
 
 std::set<int> Placeholders(const QString& text) {
@@ -105,15 +62,7 @@ std::set<int> Placeholders(const QString& text) {
     return numbers;
 }
 
-TEST(LocalizedString, AKeyWithoutTranslationShowsAsItself) {
-    EXPECT_EQ(QZLocalizedString("QZ_NO_SUCH_KEY"), QStringLiteral("QZ_NO_SUCH_KEY"));
-    InstalledTable german(QStringLiteral("de"));
-    ASSERT_TRUE(german.loaded);
-    EXPECT_EQ(QZLocalizedString("QZ_NO_SUCH_KEY"), QStringLiteral("QZ_NO_SUCH_KEY"));
-    EXPECT_EQ(QZLocalizedString("Skip"), QStringLiteral("Überspringen"));
-}
-
-TEST(LocalizedString, FormatsFillEveryPlaceholderStyleInOnePass) {
+TEST(LocalizedString, KeysWithoutTranslationShowAsThemselvesAndFormatsFillEveryPlaceholder) {
     struct Case {
         const char* table; ///< the language whose table is installed; null: none
         const char* format;
@@ -131,6 +80,10 @@ TEST(LocalizedString, FormatsFillEveryPlaceholderStyleInOnePass) {
         {nullptr, "%1 of %3", {"a", "b"}, "a of %3"},
         {nullptr, "Skip", {"ignored"}, "Skip"},
         {nullptr, "50%", {}, "50%"},
+        // A key that no table holds shows as itself.
+        {nullptr, "QZ_NO_SUCH_KEY", {}, "QZ_NO_SUCH_KEY"},
+        {"de", "QZ_NO_SUCH_KEY", {}, "QZ_NO_SUCH_KEY"},
+        {"de", "Skip", {}, "Überspringen"},
         // Translated formats take their arguments by number.
         {"de", "%1$@ of %2$@", {"1 MB", "2 MB"}, "1 MB von 2 MB"},
         {"ja", "%1$@ of %2$@", {"1 MB", "2 MB"}, "2 MB 中 1 MB"},
@@ -141,6 +94,7 @@ TEST(LocalizedString, FormatsFillEveryPlaceholderStyleInOnePass) {
     };
     for (const Case& c : cases) {
         InstalledTable table(QString::fromLatin1(c.table ? c.table : "none"));
+        ASSERT_EQ(table.loaded, c.table != nullptr) << c.format;
         EXPECT_EQ(QZLocalizedFormat(c.format, c.arguments), QString::fromUtf8(c.expected))
             << c.format;
     }
@@ -226,30 +180,34 @@ TEST(LocalizedString, ElidesOnlyPiecesTooLongToWrapInEveryScript) {
 
 TEST(LocalizedString, EveryTableTranslatesEveryKeyWithItsPlaceholders) {
     for (const char* language : {"en", "de", "fr", "ja", "zh_CN"}) {
+        SCOPED_TRACE(language);
         InstalledTable table(QString::fromLatin1(language));
-        ASSERT_TRUE(table.loaded) << language;
-        for (const Key& key : kKeys) {
-            const QString text = QZLocalizedString(key.key);
-            EXPECT_FALSE(text.isEmpty()) << language << " " << key.key;
-            // Every QZ_ key has a text of its own (the help anchor is no text: it names a place).
-            const std::string name = key.key;
-            if (name.rfind("QZ_", 0) == 0 && name != "QZ_AUTO_ACTIVATION_HELP_ANCHOR") {
-                EXPECT_NE(text, QString::fromLatin1(key.key)) << language << " " << key.key;
-            }
+        ASSERT_TRUE(table.loaded);
+        for (const auto& [arguments, keys] : kKeys) {
             std::set<int> expected;
-            for (int i = 1; i <= key.arguments; ++i)
+            for (int i = 1; i <= arguments; ++i)
                 expected.insert(i);
-            EXPECT_EQ(Placeholders(text), expected)
-                << language << " " << key.key << ": " << text.toStdString();
-        }
-        for (const auto& [context, source] : kFailureTexts) {
-            const QString text = QCoreApplication::translate(context, source);
-            EXPECT_EQ(Placeholders(text), Placeholders(QString::fromUtf8(source)))
-                << language << ": " << text.toStdString();
-            if (std::string(language) != "en") {
-                EXPECT_NE(text, QString::fromUtf8(source)) << language << ": " << source;
+            for (const char* key : keys) {
+                const QString text = QZLocalizedString(key);
+                EXPECT_FALSE(text.isEmpty()) << key;
+                EXPECT_EQ(Placeholders(text), expected) << key << ": " << text.toStdString();
+                // Every QZ_ key has a text of its own (the help anchor is no text: it names a
+                // place).
+                const std::string name = key;
+                if (name.rfind("QZ_", 0) == 0 && name != "QZ_AUTO_ACTIVATION_HELP_ANCHOR") {
+                    EXPECT_NE(text, QString::fromLatin1(key)) << key;
+                }
             }
         }
+        for (const auto& [context, sources] : kFailureTexts)
+            for (const char* source : sources) {
+                const QString text = QCoreApplication::translate(context, source);
+                EXPECT_EQ(Placeholders(text), Placeholders(QString::fromUtf8(source)))
+                    << text.toStdString();
+                if (std::string(language) != "en") {
+                    EXPECT_NE(text, QString::fromUtf8(source)) << source;
+                }
+            }
     }
 }
 

@@ -45,34 +45,16 @@ TEST(ModalSession, EndOutsideARunDoesNothingAndASessionRunsAgain) {
     EXPECT_EQ(session.Run(), kQZModalResponseStop);
 }
 
-TEST(ModalSession, InnerSessionsReturnFirst) {
+TEST(ModalSession, InnerSessionsReturnFirstAndEndingAnOuterOneHidesItAtOnce) {
     QWidget outerWindow, innerWindow;
     QZModalSession outer(&outerWindow), inner(&innerWindow);
     std::vector<std::string> order;
     int depthInside = 0;
+    bool outerHiddenAtOnce = false, innerStillUp = false;
     QTimer::singleShot(0, [&] {
         QTimer::singleShot(0, [&] {
             depthInside = QZModalSession::Depth();
             EXPECT_EQ(QZModalSession::Innermost(), &inner);
-            inner.End(2000);
-        });
-        order.push_back("inner " + std::to_string(inner.Run()));
-        EXPECT_EQ(QZModalSession::Innermost(), &outer);
-        outer.End(2001);
-    });
-    order.push_back("outer " + std::to_string(outer.Run()));
-    EXPECT_EQ(depthInside, 2);
-    EXPECT_EQ(order, (std::vector<std::string>{"inner 2000", "outer 2001"}));
-}
-
-TEST(ModalSession, EndingAnOuterSessionHidesItAtOnceAndReturnsAfterTheInnerOne) {
-    QWidget outerWindow, innerWindow;
-    QZModalSession outer(&outerWindow), inner(&innerWindow);
-    std::vector<std::string> order;
-    bool outerHiddenAtOnce = false;
-    bool innerStillUp = false;
-    QTimer::singleShot(0, [&] {
-        QTimer::singleShot(0, [&] {
             // A timeout of the outer question fires while the inner one is up.
             outer.End(kQZModalResponseAbort);
             outerHiddenAtOnce = !outerWindow.isVisible();
@@ -83,8 +65,10 @@ TEST(ModalSession, EndingAnOuterSessionHidesItAtOnceAndReturnsAfterTheInnerOne) 
             });
         });
         order.push_back("inner " + std::to_string(inner.Run()));
+        EXPECT_EQ(QZModalSession::Innermost(), &outer);
     });
     order.push_back("outer " + std::to_string(outer.Run()));
+    EXPECT_EQ(depthInside, 2);
     EXPECT_TRUE(outerHiddenAtOnce);
     EXPECT_TRUE(innerStillUp);
     EXPECT_EQ(order, (std::vector<std::string>{"inner answered", "inner 2000", "outer -1001"}));

@@ -2,21 +2,12 @@
 // a word, the offline alert's texts and buttons, its answers, and what the dispatcher makes of
 // them. The flags are injected; reading them from the routing table is tested with the desktop
 // services.
-#include <QDialog>
-#include <QDir>
-#include <QPushButton>
-#include <QTemporaryDir>
 #include <QTest>
 #include <algorithm>
-#include <functional>
 
 #include "UIAgent/FontDownloadWindowController.h"
-#include "UIAgent/QZFontDownloadConfirmation.h"
-#include "UIAgent/QZLocalizedString.h"
 #include "UIAgent/QZNetworkCheck.h"
-#include "tests/UIAgent/AlertTestSupport.h"
-#include "tests/UIAgent/DownloadTestSupport.h"
-#include "tests/UIAgent/QtTestEnvironment.h"
+#include "tests/UIAgent/AgentTestSupport.h"
 
 namespace {
 
@@ -36,11 +27,7 @@ bool InjectedFlags(QZNetworkReachabilityFlags* flags) {
 /// A step that presses the offline alert's button `key`.
 UiScript::Step AnswerOfflineAlert(const char* key) {
     return {[] { return AlertWithText(kOfflineHeadline); },
-            [key] {
-                QAbstractButton* button = ButtonWithText(AlertOnScreen(), QZLocalizedString(key));
-                ASSERT_NE(button, nullptr) << key;
-                button->click();
-            }};
+            [key] { ClickButton(AlertOnScreen(), key); }};
 }
 
 class NetworkCheckTest : public ::testing::Test {
@@ -85,44 +72,16 @@ TEST_F(NetworkCheckTest, OnlyReachableWithoutConnectionRequiredGoesOnWithoutAnAl
     }
 }
 
-TEST_F(NetworkCheckTest, TheOfflineAlertIsCriticalAndItsDefaultCancelStopsTheDownload) {
-    QString informative, defaultButton, escapeButton;
-    QMessageBox::Icon icon = QMessageBox::NoIcon;
-    QZNetworkCheck check;
-    UiScript script({{[] { return AlertWithText(kOfflineHeadline); },
-                      [&] {
-                          QMessageBox* alert = check.alert();
-                          ASSERT_EQ(alert, AlertOnScreen());
-                          informative = alert->informativeText();
-                          icon = alert->icon();
-                          defaultButton = alert->defaultButton()->text();
-                          escapeButton = alert->escapeButton()->text();
-                          alert->defaultButton()->click();
-                      }}},
-                    EndEveryModalRun);
-    EXPECT_FALSE(check.continueDownload());
-    EXPECT_TRUE(script.done());
-    EXPECT_EQ(informative,
-              "You are not connected to the Internet. Do you want to cancel downloading?");
-    EXPECT_EQ(icon, QMessageBox::Critical);
-    EXPECT_EQ(defaultButton, "Cancel");
-    EXPECT_EQ(escapeButton, "Cancel");
-    // The class operation of the download window asks the same question.
-    UiScript again({AnswerOfflineAlert("Cancel")}, EndEveryModalRun);
-    EXPECT_FALSE(FontDownloadWindowController::continueDownloadWithNetworkReachabilityCheck());
-}
-
-TEST_F(NetworkCheckTest, OnlyTheUsersCancelOrCloseStopsAndOtherWindowsStayInactive) {
+TEST_F(NetworkCheckTest, TheCriticalOfflineAlertStopsOnlyOnCancelOrCloseAndRaisesOnlyItself) {
     struct Case {
         const char* how;
         std::function<void(QZNetworkCheck&)> answer;
         bool goOn;
     } cases[] = {
+        {"default button", [](QZNetworkCheck& check) { check.alert()->defaultButton()->click(); },
+         false},
         {"Continue Download",
-         [](QZNetworkCheck&) {
-             ButtonWithText(AlertOnScreen(), QZLocalizedString("Continue Download"))->click();
-         },
-         true},
+         [](QZNetworkCheck& check) { ClickButton(check.alert(), "Continue Download"); }, true},
         {"withdrawn", [](QZNetworkCheck& check) { check.withdraw(); }, true},
         {"close button", [](QZNetworkCheck& check) { check.alert()->close(); }, false},
         {"Escape", [](QZNetworkCheck& check) { QTest::keyClick(check.alert(), Qt::Key_Escape); },
@@ -132,26 +91,40 @@ TEST_F(NetworkCheckTest, OnlyTheUsersCancelOrCloseStopsAndOtherWindowsStayInacti
     QDialog other;
     other.show();
     for (const Case& c : cases) {
+        SCOPED_TRACE(c.how);
         other.activateWindow();
-        ASSERT_TRUE(SpinUntil([&] { return other.isActiveWindow(); })) << c.how;
+        ASSERT_TRUE(SpinUntil([&] { return other.isActiveWindow(); }));
         QZNetworkCheck check;
         WindowWatch watch;
         int activationsWhileAsked = -1;
+        std::string look;
         UiScript script({{[] {
                               QMessageBox* alert = AlertWithText(kOfflineHeadline);
                               return alert && alert->isActiveWindow();
                           },
                           [&] {
+                              QMessageBox* alert = check.alert();
+                              ASSERT_EQ(alert, AlertOnScreen());
+                              look = (alert->informativeText() + " | default " +
+                                      alert->defaultButton()->text() + " | escape " +
+                                      alert->escapeButton()->text())
+                                         .toStdString();
+                              EXPECT_EQ(alert->icon(), QMessageBox::Critical);
                               activationsWhileAsked = int(std::count(
                                   watch.activated.begin(), watch.activated.end(), &other));
                               c.answer(check);
                           }}},
                         EndEveryModalRun);
-        EXPECT_EQ(check.continueDownload(), c.goOn) << c.how;
-        EXPECT_TRUE(script.done()) << c.how;
-        EXPECT_FALSE(check.alert()->isVisible()) << c.how;
-        EXPECT_EQ(activationsWhileAsked, 0) << c.how;
+        EXPECT_EQ(check.continueDownload(), c.goOn);
+        EXPECT_TRUE(script.done());
+        EXPECT_EQ(look, "You are not connected to the Internet. Do you want to cancel "
+                        "downloading? | default Cancel | escape Cancel");
+        EXPECT_FALSE(check.alert()->isVisible());
+        EXPECT_EQ(activationsWhileAsked, 0);
     }
+    // The class operation of the download window asks the same question.
+    UiScript again({AnswerOfflineAlert("Cancel")}, EndEveryModalRun);
+    EXPECT_FALSE(FontDownloadWindowController::continueDownloadWithNetworkReachabilityCheck());
 }
 
 TEST_F(NetworkCheckTest, OfflineCancelAnswersNoAndContinueRunsTheDownloadWindow) {
@@ -162,7 +135,7 @@ TEST_F(NetworkCheckTest, OfflineCancelAnswersNoAndContinueRunsTheDownloadWindow)
         UiScript script({AnswerOfflineAlert(goOn ? "Continue Download" : "Cancel")},
                         EndEveryModalRun);
         EXPECT_EQ(HandleDownloadRequest(DownloadRequest({font.get()}, 0, true).get()),
-                  DownloadReply(goOn, true));
+                  Reply(goOn, true));
         EXPECT_TRUE(script.done());
         EXPECT_EQ(shown.progressWindowsShown, goOn ? 1 : 0);
     }
@@ -170,31 +143,19 @@ TEST_F(NetworkCheckTest, OfflineCancelAnswersNoAndContinueRunsTheDownloadWindow)
 
 TEST_F(NetworkCheckTest, TheRequestingApplicationQuittingEndsTheOfflineAlertAndNoWindowOpens) {
     // A font that can be downloaded, so that the confirmation asks.
-    QTemporaryDir data;
-    ASSERT_TRUE(data.isValid());
-    qputenv("XDG_DATA_HOME", data.path().toUtf8());
-    qputenv("XDG_DATA_DIRS", data.filePath("none").toUtf8());
-    QDir().mkpath(data.filePath("glyphwell"));
-    WriteFile(data.filePath("glyphwell/downloadable-fonts.json"),
-              R"({"assets": [{"LocalID": "A", "url": "https://fonts.example/A", "size": 5000,
-                  "sha256": "0000000000000000000000000000000000000000000000000000000000000000",
-                  "fonts": [{"postScriptName": "Example-Regular"}]}]})");
+    PrivateDataHome data;
+    data.WriteCatalog(R"({"assets": [{"LocalID": "A", "url": "https://fonts.example/A",
+        "size": 5000, "sha256": "%1", "fonts": [{"postScriptName": "Example-Regular"}]}]})");
     PausedChild requester;
     WindowWatch shown;
     Ref font = RequestedFont("Example-Regular");
-    UiScript script(
-        {{[] { return ButtonWithText(AlertOnScreen(), QZLocalizedString("Download")); },
-          [] { ButtonWithText(AlertOnScreen(), QZLocalizedString("Download"))->click(); }},
-         {[] { return AlertWithText(kOfflineHeadline); }, [&] { requester.Kill(); }}},
-        EndEveryModalRun);
-
+    UiScript script({PressWhenUp("Download"),
+                     {[] { return AlertWithText(kOfflineHeadline); }, [&] { requester.Kill(); }}},
+                    EndEveryModalRun);
     EXPECT_EQ(HandleDownloadRequest(DownloadRequest({font.get()}, requester.pid()).get()),
-              DownloadReply(false, false));
-
+              Reply(false, false));
     EXPECT_TRUE(script.done());
     EXPECT_EQ(shown.progressWindowsShown, 0);
-    qunsetenv("XDG_DATA_HOME");
-    qunsetenv("XDG_DATA_DIRS");
 }
 
 } // namespace

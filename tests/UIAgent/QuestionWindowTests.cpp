@@ -19,8 +19,7 @@
 #include "UIAgent/QZNetworkCheck.h"
 #include "UIAgent/QZWindowActivation.h"
 #include "protocol/QZUIProtocol.h"
-#include "tests/UIAgent/AlertTestSupport.h"
-#include "tests/UIAgent/QtTestEnvironment.h"
+#include "tests/UIAgent/AgentTestSupport.h"
 
 namespace {
 
@@ -35,30 +34,6 @@ struct GuardDuration {
     ~GuardDuration() { QZInputGuard::SetDurationForTesting(-1ms); }
 };
 
-QWidget* KeyTarget(QWidget* window) {
-    return window->focusWidget() ? window->focusWidget() : window;
-}
-
-enum class Input { kReturn, kRepeatedReturn, kClickDefault };
-
-void Send(QWidget* window, QAbstractButton* defaultButton, Input input) {
-    switch (input) {
-    case Input::kReturn:
-        QTest::keyClick(KeyTarget(window), Qt::Key_Return);
-        break;
-    case Input::kRepeatedReturn:
-        // What a key held down since before the window appeared delivers.
-        for (QEvent::Type type : {QEvent::KeyPress, QEvent::KeyRelease}) {
-            QKeyEvent event(type, Qt::Key_Return, Qt::NoModifier, QStringLiteral("\r"), true);
-            QApplication::sendEvent(KeyTarget(window), &event);
-        }
-        break;
-    case Input::kClickDefault:
-        QTest::mouseClick(defaultButton, Qt::LeftButton);
-        break;
-    }
-}
-
 TEST(InputGuard, DropsButtonInputForASecondAfterEachShowingAndAutoRepeatAlways) {
     GuardDuration guard(1000ms);
     QMessageBox box;
@@ -71,15 +46,25 @@ TEST(InputGuard, DropsButtonInputForASecondAfterEachShowingAndAutoRepeatAlways) 
         answer = clicked == allow ? 1 : 2;
         session.End(answer);
     });
+    auto keyTarget = [&] { return box.focusWidget() ? box.focusWidget() : &box; };
     struct Row {
         int atMs;
-        Input input;
+        std::function<void()> input;
         bool answers;
     };
-    const Row rows[] = {{100, Input::kReturn, false},
-                        {150, Input::kClickDefault, false},
-                        {1200, Input::kRepeatedReturn, false},
-                        {1250, Input::kReturn, true}};
+    const Row rows[] = {{100, [&] { QTest::keyClick(keyTarget(), Qt::Key_Return); }, false},
+                        {150, [&] { QTest::mouseClick(allow, Qt::LeftButton); }, false},
+                        // What a key held down since before the window appeared delivers.
+                        {1200,
+                         [&] {
+                             for (QEvent::Type type : {QEvent::KeyPress, QEvent::KeyRelease}) {
+                                 QKeyEvent event(type, Qt::Key_Return, Qt::NoModifier,
+                                                 QStringLiteral("\r"), true);
+                                 QApplication::sendEvent(keyTarget(), &event);
+                             }
+                         },
+                         false},
+                        {1250, [&] { QTest::keyClick(keyTarget(), Qt::Key_Return); }, true}};
     // Twice: the guard starts again when the question is shown again.
     for (int showing = 1; showing <= 2; ++showing) {
         answer = 0;
@@ -96,7 +81,7 @@ TEST(InputGuard, DropsButtonInputForASecondAfterEachShowingAndAutoRepeatAlways) 
                                  SCOPED_TRACE(::testing::Message() << "showing " << showing << ", "
                                                                    << row.atMs << " ms");
                                  EXPECT_EQ(allow->isEnabled(), row.atMs > 1000);
-                                 Send(&box, allow, row.input);
+                                 row.input();
                                  EXPECT_EQ(answer != 0, row.answers);
                              }});
         UiScript script(std::move(steps), [&] { session.End(kQZModalResponseStop); });
@@ -236,7 +221,11 @@ TEST(AutoActivationAccessibility, CountdownIsAStatusAnnouncedAtMarksAndActionsRe
          {[&] { return confirmation.helpWindow() && confirmation.helpWindow()->isVisible(); },
           [&] {
               EXPECT_GT(confirmation.remainingTime(), beforeAction - 1000ms);
+              // The bundled page at its anchor, and the question stays.
               QTextBrowser* help = confirmation.helpWindow();
+              EXPECT_TRUE(confirmation.alert()->isVisible());
+              EXPECT_EQ(help->source(), QUrl("qrc:/help/index.html#auto-activation"));
+              EXPECT_TRUE(help->toHtml().contains("name=\"auto-activation\""));
               EXPECT_EQ(help->windowType(), Qt::Dialog);
               EXPECT_EQ(help->minimumSize(), help->maximumSize());
               EXPECT_EQ(QAccessible::queryAccessibleInterface(help)->role(), QAccessible::Document);
@@ -272,24 +261,34 @@ TEST(AutoActivationAccessibility, TabGoesThroughTheTextsTheCheckboxThenTheButton
         << order.join(" | ").toStdString();
 }
 
-} // namespace
-
-TEST(AutoActivationAlert, LongNamesAreElidedWithTheFullTextsToldAndDoNotWidenIt) {
+TEST(QuestionWindows, LongNamesAreElidedWithTheFullTextsToldAndDoNotWidenThem) {
     EnglishTexts english;
-    const QString font(200, u'W'), application = QStringLiteral("Writer") + QString(200, u'X');
-    Ref request = Dict({{kQZUIPropertyApplicationName, Str(application.toUtf8().data()).get()},
-                        {kQZUIPropertyFontName, Str(font.toUtf8().data()).get()}});
-    QZAutoActivationConfirmation confirmation(request.as<CFDictionaryRef>());
-    QMessageBox* alert = confirmation.alert();
-    EXPECT_FALSE(alert->text().contains(font) || alert->text().contains(application));
-    auto* headline = alert->findChild<QLabel*>(QStringLiteral("qt_msgbox_label"));
-    ASSERT_TRUE(headline);
-    for (const QString& full : {headline->toolTip(), headline->accessibleDescription()})
-        EXPECT_TRUE(full.contains(font) && full.contains(application)) << full.toStdString();
-    QCheckBox* box = confirmation.suppressionCheckBox();
+    PrivateDataHome data;
+    data.WriteCatalog(R"({"assets": [{"LocalID": "A", "url": "https://f/A", "size": 1000,
+        "sha256": "%1", "fonts": [{"postScriptName": "Sans-Regular"}]}]})");
+    const QString font(100, u'W'), application = "Writer" + QString(200, u'X');
+    Ref fonts = Array({RequestedFont("Sans-Regular", font.toUtf8().constData()).get()});
+    Ref request = Dict({{kQZUIPropertyApplicationName, Str(application.toStdString()).get()},
+                        {kQZUIPropertyFontName, Str(font.toStdString()).get()},
+                        {kQZUIPropertyFontProperties, fonts.get()}});
+    QZAutoActivationConfirmation activation(request.as<CFDictionaryRef>());
+    QZFontDownloadConfirmation download(request.as<CFDictionaryRef>());
+    for (QMessageBox* alert : {activation.alert(), static_cast<QMessageBox*>(&download)}) {
+        SCOPED_TRACE(alert->windowTitle().toStdString());
+        EXPECT_FALSE(alert->text().contains(font) || alert->text().contains(application));
+        EXPECT_TRUE(alert->text().contains(u'…'));
+        auto* headline = alert->findChild<QLabel*>(QStringLiteral("qt_msgbox_label"));
+        ASSERT_TRUE(headline);
+        EXPECT_TRUE(headline->toolTip().contains(font) &&
+                    headline->toolTip().contains(application));
+        EXPECT_EQ(headline->accessibleDescription(), headline->toolTip());
+        alert->show();
+        EXPECT_LT(alert->width(), 800);
+        alert->hide();
+    }
+    QCheckBox* box = activation.suppressionCheckBox();
     EXPECT_FALSE(box->text().contains(application));
     EXPECT_TRUE(box->toolTip().contains(application));
-    alert->show();
-    EXPECT_LT(alert->width(), 800);
-    alert->hide();
 }
+
+} // namespace

@@ -1,24 +1,22 @@
 #!/usr/bin/python3
-"""End-to-end: the agent driven through the real accessibility bus, as a screen reader user
-would, under a private X server and a private session bus (the bus launcher activated through
-it). The alert of each question is found by its role and read (no text a bare translation key);
-its checkbox is toggled and a button pressed through the bus, each once it is enabled (the alerts
-ignore presses for a moment after showing). The countdown must be a status region that names
-the time left, and the help a document. Allow with "don't ask again" replies Result 1, Suppress
-1; Download opens the progress window, whose Cancel, pressed through the bus while the transfer
-is held, replies Result 0. Skipped (77) without Xvfb, dbus-run-session, at-spi2-core or pyatspi.
+"""End-to-end: the agent driven through the real accessibility bus, as a screen reader user would,
+under a private X server and a private session bus. The alert of each question is found by its
+role and read (no text a bare translation key); its checkbox is toggled and a button pressed
+through the bus, each once it is enabled (the input guard). The countdown must be a status region
+naming the time left, the help a document. Allow with "don't ask again" replies Result 1,
+Suppress 1; Download opens the progress window, whose Cancel, pressed while the transfer is held,
+replies Result 0. Skipped (77) without Xvfb, dbus-run-session, at-spi2-core or pyatspi.
 
 usage: accessibility.py AGENT GLYPHWELL"""
 import importlib.util
 import os
 import re
-import shutil
 import sys
 
 sys.dont_write_bytecode = True  # no cache files in the source tree
 sys.path.insert(0, os.path.dirname(os.path.abspath(__file__)))
-from e2e_support import (CANDIDATE_FONT, DOWNLOAD_NAME, Failure, Run, check_running,  # noqa: E402
-                         main, skip, wait_for)
+from e2e_support import (CANDIDATE_FONT, DOWNLOAD_NAME, Run, check,  # noqa: E402
+                         check_running, main, require, skip, start_xvfb, wait_for)
 
 PRIVATE_BUS = "GLYPHWELL_E2E_PRIVATE_BUS"
 
@@ -69,9 +67,8 @@ class Tree:
             names = [(node.getRole(), node.name) for node in nodes]
         except self.gone:
             return None
-        for role, name in names:
-            if name.startswith("QZ_"):
-                raise Failure(f"no table covers the text {name}")
+        keys = [name for _, name in names if name.startswith("QZ_")]
+        check(not keys, f"no table covers the texts {keys}")
         return [name for role, name in names if role == self.atspi.ROLE_LABEL]
 
     def act(self, node, action):
@@ -81,8 +78,7 @@ class Tree:
             for state in (self.atspi.STATE_ENABLED, self.atspi.STATE_SENSITIVE)), timeout=10)
         actions = node.queryAction()
         names = [actions.getName(i) for i in range(actions.nActions)]
-        if action not in names:
-            raise Failure(f"{node.name!r} offers {names}, not {action}")
+        check(action in names, f"{node.name!r} offers {names}, not {action}")
         actions.doAction(names.index(action))
 
 
@@ -90,21 +86,10 @@ def test(agent, tool):
     import pyatspi
 
     with Run("accessibility") as run:
-        display_read, display_write = os.pipe()
-        run.start("xvfb", ["Xvfb", "-displayfd", str(display_write), "-screen", "0",
-                           "1024x768x24", "-nolisten", "tcp"], pass_fds=(display_write,))
-        os.close(display_write)
-        with os.fdopen(display_read) as display:
-            number = display.readline().strip()
-        if not number:
-            raise Failure("Xvfb did not start")
-
         # Asking for the desktop starts the accessibility bus before the agent looks for it.
         pyatspi.Registry.getDesktop(0)
-        env = dict(run.env, DISPLAY=f":{number}", QT_QPA_PLATFORM="xcb",
-                   QT_LINUX_ACCESSIBILITY_ALWAYS_ON="1")
-        env.pop("WAYLAND_DISPLAY", None)
-        agent_process = run.start_agent(agent, env)
+        agent_process = run.start_agent(agent, DISPLAY=start_xvfb(run), QT_QPA_PLATFORM="xcb",
+                                        WAYLAND_DISPLAY=None, QT_LINUX_ACCESSIBILITY_ALWAYS_ON="1")
         server = run.serve_download_font()
         tree = Tree(pyatspi, agent_process.pid)
         alerts = (pyatspi.ROLE_ALERT,)
@@ -116,16 +101,14 @@ def test(agent, tool):
         alert = wait_for("the activation alert", lambda: tree.window(alerts))
         words = wait_for("the alert's texts", lambda: tree.texts(alert))
         print(f"activation alert says: {words}")
-        if not any("Demo Editor" in text and "DejaVu Serif" in text for text in words):
-            raise Failure("no text of the alert names the application and the font")
+        check(any("Demo Editor" in text and "DejaVu Serif" in text for text in words),
+              "no text of the alert names the application and the font")
         check_box = tree.find(pyatspi.ROLE_CHECK_BOX, within=alert)
-        if not check_box:
-            raise Failure("the alert has no checkbox")
+        check(check_box, "the alert has no checkbox")
         countdown = tree.find(pyatspi.ROLE_STATUS_BAR, within=alert)
-        if not countdown:
-            raise Failure("the alert's countdown is not exposed as a status region")
-        if not re.search(r"\b[0-2]:[0-5]\d\b", countdown.name):
-            raise Failure(f"the countdown says {countdown.name!r}, not the time left")
+        check(countdown, "the alert's countdown is not exposed as a status region")
+        check(re.search(r"\b[0-2]:[0-5]\d\b", countdown.name),
+              f"the countdown says {countdown.name!r}, not the time left")
         tree.act(check_box, "Toggle")
         wait_for("the checkbox to be checked",
                  lambda: check_box.getState().contains(pyatspi.STATE_CHECKED), timeout=10)
@@ -133,11 +116,10 @@ def test(agent, tool):
         documents = (pyatspi.ROLE_DOCUMENT_FRAME, pyatspi.ROLE_DOCUMENT_TEXT,
                      pyatspi.ROLE_DOCUMENT_WEB)
         document = wait_for("the help document", lambda: tree.window(documents))
-        if document.queryText().characterCount == 0:
-            raise Failure("the help document has no text to read")
+        check(document.queryText().characterCount, "the help document has no text to read")
         tree.act(tree.button("Allow", alert), "Press")
-        if run.reply(client, "activation") != (1, 1):
-            raise Failure("Allow with \"don't ask again\" did not reply Result 1, Suppress 1")
+        check(run.reply(client, "activation") == (1, 1),
+              "Allow with \"don't ask again\" did not reply Result 1, Suppress 1")
 
         # Message id 2: Download pressed; then Cancel in the progress window, the transfer held.
         client = run.ask(tool, "download", "ask-download", "--font",
@@ -157,36 +139,26 @@ def test(agent, tool):
         window = wait_for("the progress window", progress_window)
         wait_for("the font request", server.started.is_set)
         bar = tree.find(pyatspi.ROLE_PROGRESS_BAR, within=window)
-        if not bar.name or bar.name.startswith("QZ_"):
-            raise Failure(f"the progress bar is named {bar.name!r}")
+        check(bar.name and not bar.name.startswith("QZ_"),
+              f"the progress bar is named {bar.name!r}")
         tree.act(tree.button("Cancel", window), "Press")
-        if run.reply(client, "download")[0] != 0:
-            raise Failure("Cancel in the progress window did not reply Result 0")
+        check(run.reply(client, "download")[0] == 0,
+              "Cancel in the progress window did not reply Result 0")
         left = [name for _, _, files in os.walk(run.path("home")) for name in files]
-        if left:
-            raise Failure(f"the cancelled download left {left} behind")
+        check(not left, f"the cancelled download left {left} behind")
         check_running(agent_process)
 
 
-def requirements():
-    """Skips unless everything the test needs is here."""
-    for program in ("Xvfb", "dbus-run-session"):
-        if not shutil.which(program):
-            skip(f"{program} is not installed")
-    if not any(os.path.exists(os.path.join(folder, "at-spi-bus-launcher"))
-               for folder in ("/usr/libexec", "/usr/lib/at-spi2-core")):
-        skip("at-spi2-core is not installed")
-    if importlib.util.find_spec("pyatspi") is None:
-        skip("python3-pyatspi is not installed")
-
-
 if __name__ == "__main__":
-    if len(sys.argv) != 3:
-        sys.exit(__doc__.splitlines()[-1])
-    if os.environ.get(PRIVATE_BUS) != "1":
-        requirements()
+    if os.environ.get(PRIVATE_BUS) != "1" and len(sys.argv) == 3:
+        require("Xvfb", "dbus-run-session")
+        if not any(os.path.exists(os.path.join(folder, "at-spi-bus-launcher"))
+                   for folder in ("/usr/libexec", "/usr/lib/at-spi2-core")):
+            skip("at-spi2-core is not installed")
+        if importlib.util.find_spec("pyatspi") is None:
+            skip("python3-pyatspi is not installed")
         # A private session bus (and so a private accessibility bus) for this run alone.
         os.environ[PRIVATE_BUS] = "1"
         os.execvp("dbus-run-session", ["dbus-run-session", "--", sys.executable,
                                        os.path.abspath(__file__), *sys.argv[1:]])
-    main(lambda: test(*sys.argv[1:]))
+    main(test, __doc__)

@@ -1,6 +1,6 @@
 """Shared pieces of the agent's end-to-end runs: a private work directory whose processes are
-always stopped, waits on conditions with deadlines, a loopback font server that holds its
-transfer until the test releases it, a one-font catalog with a private font setup, and the agent
+always stopped, waits on conditions with deadlines, a loopback font server that holds its transfer
+until the test releases it, a catalog with a private font setup, a private X server, and the agent
 and the glyphwell tool started in that setup."""
 import hashlib
 import http.server
@@ -13,7 +13,6 @@ import tempfile
 import threading
 import time
 
-SKIP = 77
 PORT_NAME = "org.glyphwell.Glyphwell.GlyphwellUIAgent"
 # A font on disk offered to message id 1, and the font that message id 2 downloads. The system's
 # copy of the latter is hidden from the agent by its private fontconfig configuration.
@@ -22,39 +21,55 @@ DOWNLOAD_FONT = "/usr/share/fonts/truetype/dejavu/DejaVuSerif-Bold.ttf"
 DOWNLOAD_NAME = "DejaVuSerif-Bold"
 # A font that the catalog offers from a file that the server does not have: its download fails.
 MISSING_NAME = "GlyphwellMissing-Regular"
+# The two questions as the glyphwell tool puts them: may an application use a font found on disk,
+# may it download a font.
+QUESTIONS = [
+    ("activation", ["ask-activation", "--candidate", CANDIDATE_FONT, "--app", "Demo"]),
+    ("download", ["ask-download", "--font", f"{DOWNLOAD_NAME}:DejaVu Serif", "--app", "Demo"]),
+]
 
 
 class Failure(Exception):
     pass
 
 
+def check(condition, failure):
+    """Fails with the text `failure` unless `condition` holds."""
+    if not condition:
+        raise Failure(failure)
+
+
+def require(*programs):
+    """Skips unless every one of `programs` is installed."""
+    for program in programs:
+        if not shutil.which(program):
+            skip(f"{program} is not installed (scripts/install-deps installs it)")
+
+
 def skip(reason):
     print(f"SKIP: {reason}")
-    sys.exit(SKIP)
+    sys.exit(77)
 
 
 def wait_for(what, predicate, timeout=30.0):
     """Polls `predicate` until it returns a true value, which is returned; fails after `timeout`."""
     deadline = time.monotonic() + timeout
-    while True:
-        value = predicate()
-        if value:
-            return value
+    while not (value := predicate()):
         if time.monotonic() > deadline:
             raise Failure(f"timed out after {timeout:.0f} s waiting for {what}")
         time.sleep(0.05)
+    return value
 
 
 class FontServer:
-    """Serves one file from 127.0.0.1: the first 16 KiB at once, the rest only once `release()`
-    is called (or after 60 s), so that the progress window stays up as long as the test needs."""
+    """Serves one file from 127.0.0.1: the first 16 KiB at once, the rest only once `released` is
+    set (or after 60 s), so that the progress window stays up as long as the test needs."""
 
     def __init__(self, path):
         with open(path, "rb") as f:
             body = f.read()
         self.name = os.path.basename(path)
-        self.started = threading.Event()
-        self.released = threading.Event()
+        self.started, self.released = threading.Event(), threading.Event()
         server = self
 
         class Handler(http.server.BaseHTTPRequestHandler):
@@ -80,12 +95,8 @@ class FontServer:
 
         self.httpd = http.server.ThreadingHTTPServer(("127.0.0.1", 0), Handler)
         self.httpd.daemon_threads = True
-        self.thread = threading.Thread(target=self.httpd.serve_forever, daemon=True)
-        self.thread.start()
+        threading.Thread(target=self.httpd.serve_forever, daemon=True).start()
         self.url = f"http://127.0.0.1:{self.httpd.server_address[1]}/{self.name}"
-
-    def release(self):
-        self.released.set()
 
     def close(self):
         self.released.set()
@@ -104,30 +115,21 @@ class Run:
         os.makedirs(self.runtime, mode=0o700)
         for folder in ("home", "cache", "config", "data/glyphwell"):
             os.makedirs(self.path(folder))
-        self.processes = []
-        self.server = None
+        self.processes, self.server = [], None
         self.env = dict(os.environ)
         for variable in ("http_proxy", "HTTP_PROXY", "all_proxy", "ALL_PROXY"):
             self.env.pop(variable, None)
         self.env.update(
-            XDG_RUNTIME_DIR=self.runtime,
-            XDG_DATA_HOME=self.path("home"),
-            XDG_CACHE_HOME=self.path("cache"),
-            XDG_CONFIG_HOME=self.path("config"),
+            XDG_RUNTIME_DIR=self.runtime, XDG_DATA_HOME=self.path("home"),
+            XDG_CACHE_HOME=self.path("cache"), XDG_CONFIG_HOME=self.path("config"),
             XDG_DATA_DIRS=self.path("data") + ":/usr/local/share:/usr/share",
-            FONTCONFIG_FILE=self.path("fonts.conf"),
-            LANGUAGE="en",
-            LC_ALL="C.UTF-8",
-            no_proxy="127.0.0.1",
-        )
+            FONTCONFIG_FILE=self.path("fonts.conf"), LANGUAGE="en", LC_ALL="C.UTF-8",
+            no_proxy="127.0.0.1")
         with open(self.path("fonts.conf"), "w") as f:
-            f.write(
-                '<?xml version="1.0"?>\n<!DOCTYPE fontconfig SYSTEM "fonts.dtd">\n<fontconfig>\n'
-                '  <include ignore_missing="yes">/etc/fonts/fonts.conf</include>\n'
-                f"  <selectfont><rejectfont><glob>{DOWNLOAD_FONT}</glob></rejectfont>"
-                "</selectfont>\n"
-                "</fontconfig>\n"
-            )
+            f.write('<?xml version="1.0"?>\n<!DOCTYPE fontconfig SYSTEM "fonts.dtd">\n'
+                    '<fontconfig><include ignore_missing="yes">/etc/fonts/fonts.conf</include>\n'
+                    f"<selectfont><rejectfont><glob>{DOWNLOAD_FONT}</glob></rejectfont>"
+                    "</selectfont></fontconfig>\n")
 
     def path(self, *parts):
         return os.path.join(self.dir, *parts)
@@ -165,26 +167,21 @@ class Run:
         self.server = FontServer(DOWNLOAD_FONT)
         with open(DOWNLOAD_FONT, "rb") as f:
             data = f.read()
-        asset = {
-            "LocalID": "org.glyphwell.e2e.DejaVuSerifBold",
-            "url": self.server.url,
-            "size": len(data),
-            "sha256": hashlib.sha256(data).hexdigest(),
-            "fonts": [{"postScriptName": DOWNLOAD_NAME, "family": "DejaVu Serif"}],
-        }
-        missing = {
-            "LocalID": "org.glyphwell.e2e.Missing",
-            "url": self.server.url.replace(self.server.name, "missing.ttf"),
-            "size": 1000,
-            "sha256": "0" * 64,
-            "fonts": [{"postScriptName": MISSING_NAME, "family": "Glyphwell Missing"}],
-        }
+        assets = [("DejaVuSerifBold", self.server.url, len(data), hashlib.sha256(data).hexdigest(),
+                   DOWNLOAD_NAME, "DejaVu Serif"),
+                  ("Missing", self.server.url.replace(self.server.name, "missing.ttf"), 1000,
+                   "0" * 64, MISSING_NAME, "Glyphwell Missing")]
         with open(self.path("data/glyphwell/downloadable-fonts.json"), "w") as f:
-            json.dump({"assets": [asset, missing]}, f)
+            json.dump({"assets": [
+                {"LocalID": f"org.glyphwell.e2e.{local_id}", "url": url, "size": size,
+                 "sha256": sha256, "fonts": [{"postScriptName": name, "family": family}]}
+                for local_id, url, size, sha256, name, family in assets]}, f)
         return self.server
 
-    def start_agent(self, agent, env):
-        """Starts the agent (its log: agent.log) and waits until it serves its socket."""
+    def start_agent(self, agent, **variables):
+        """Starts the agent with `variables` changed in its environment (None: removed), its log
+        in agent.log, and waits until it serves its socket."""
+        env = {name: value for name, value in dict(self.env, **variables).items() if value}
         process = self.start("agent", [agent], env=env)
         socket = os.path.join(self.runtime, PORT_NAME)
 
@@ -201,10 +198,8 @@ class Run:
         NAME.reply, its errors to NAME.err."""
         with open(self.path(name + ".reply"), "wb") as out, \
                 open(self.path(name + ".err"), "wb") as err:
-            process = subprocess.Popen(
-                [tool, *arguments, "--compact", "--timeout", "60"],
-                env=self.env, stdout=out, stderr=err,
-            )
+            process = subprocess.Popen([tool, *arguments, "--compact", "--timeout", "60"],
+                                       env=self.env, stdout=out, stderr=err)
         self.processes.append(process)
         return process
 
@@ -214,19 +209,17 @@ class Run:
             status = process.wait(timeout)
         except subprocess.TimeoutExpired:
             raise Failure(f"no reply to the {name} request within {timeout} s")
-        if status != 0:
-            raise Failure(f"the {name} request failed ({status}): {self.read(name + '.err')}")
+        check(status == 0, f"the {name} request failed ({status}): {self.read(name + '.err')}")
         text = self.read(name + ".reply")
         print(f"{name} reply: {text.strip()}")
-        value = json.loads(text)
-        return tuple(value.get(key, {}).get("$number") for key in
-                     ("QZUIPropertyResult", "QZUIPropertySuppress"))
+        return tuple(json.loads(text).get(key, {}).get("$number")
+                     for key in ("QZUIPropertyResult", "QZUIPropertySuppress"))
 
 
 def check_running(process):
     """Fails when the agent ended (it must outlive its replies by 10 s)."""
-    if process.poll() is not None:
-        raise Failure(f"the agent ended with status {process.returncode} after its replies")
+    check(process.poll() is None,
+          f"the agent ended with status {process.returncode} after its replies")
 
 
 def stop(process, grace=3.0):
@@ -240,10 +233,27 @@ def stop(process, grace=3.0):
             process.wait()
 
 
-def main(body):
-    """Runs `body()`, printing PASS, or FAIL with the reason (exit status 1)."""
+def start_xvfb(run):
+    """Starts a private X server (its log: xvfb.log) and returns its display, once it accepts
+    connections: Xvfb picks a free display and writes its number then."""
+    display_read, display_write = os.pipe()
+    run.start("xvfb", ["Xvfb", "-displayfd", str(display_write), "-screen", "0", "1024x768x24",
+                       "-nolisten", "tcp"], pass_fds=(display_write,))
+    os.close(display_write)
+    with os.fdopen(display_read) as display:
+        number = display.readline().strip()
+    if not number:
+        raise Failure("Xvfb did not start")
+    return f":{number}"
+
+
+def main(test, usage):
+    """Runs `test(AGENT, GLYPHWELL)` from the command line, printing PASS, or FAIL with the reason
+    (exit status 1); `usage` (the script's doc) ends with its usage line."""
+    if len(sys.argv) != 3:
+        sys.exit(usage.splitlines()[-1])
     try:
-        body()
+        test(*sys.argv[1:])
     except Failure as failure:
         print(f"FAIL: {failure}", file=sys.stderr)
         sys.exit(1)

@@ -8,26 +8,19 @@ set -uo pipefail
 
 agent=${1:?usage: socket-activation.sh AGENT GLYPHWELL}
 tool=${2:?usage: socket-activation.sh AGENT GLYPHWELL}
-port_name=org.glyphwell.Glyphwell.GlyphwellUIAgent
 
-if ! command -v systemd-socket-activate >/dev/null; then
-    echo "SKIP: systemd-socket-activate is not installed"
-    exit 77
-fi
+command -v systemd-socket-activate >/dev/null ||
+    { echo "SKIP: systemd-socket-activate is not installed" && exit 77; }
 
 runtime=$(mktemp -d /tmp/glyphwell-e2e-XXXXXX)
 chmod 700 "$runtime"
 activator_pid=""
-cleanup() {
+cleanup() { # the activator execs the agent in place, so one pid covers both: TERM, 3 s, KILL
     if [ -n "$activator_pid" ]; then
-        # The activator execs the agent in its own process, so one pid covers both.
-        kill "$activator_pid" 2>/dev/null || true
-        for _ in $(seq 30); do
-            kill -0 "$activator_pid" 2>/dev/null || break
-            sleep 0.1
-        done
-        kill -KILL "$activator_pid" 2>/dev/null || true
-        wait "$activator_pid" 2>/dev/null || true
+        kill "$activator_pid" 2>/dev/null
+        timeout 3 tail --pid="$activator_pid" -f /dev/null
+        kill -KILL "$activator_pid" 2>/dev/null
+        wait "$activator_pid" 2>/dev/null
     fi
     rm -rf "$runtime"
 }
@@ -36,41 +29,26 @@ trap 'exit 2' INT TERM
 
 fail() {
     echo "FAIL: $*" >&2
-    if [ -s "$runtime/agent.log" ]; then
-        echo "--- agent log:" >&2
-        cat "$runtime/agent.log" >&2
-    fi
+    [ -s "$runtime/agent.log" ] && { echo "--- agent log:" && cat "$runtime/agent.log"; } >&2
     exit 1
 }
 
-# The agent's own process, found by its executable: systemd-socket-activate forks it on the first
-# connection (without --accept it execs it in place, so the activator's pid becomes the agent).
+# True while the activator's process is the agent (it execs the agent on the first connection).
 agent_running() {
-    [ -n "$activator_pid" ] || return 1
-    local exe
-    exe=$(readlink "/proc/$activator_pid/exe" 2>/dev/null) || return 1
-    [ "$exe" = "$(readlink -f "$agent")" ]
+    [ "$(readlink "/proc/$activator_pid/exe" 2>/dev/null)" = "$(readlink -f "$agent")" ]
 }
 
-export XDG_RUNTIME_DIR="$runtime"
-export QT_QPA_PLATFORM=offscreen
-socket="$runtime/$port_name"
-
+export XDG_RUNTIME_DIR="$runtime" QT_QPA_PLATFORM=offscreen
+socket="$runtime/org.glyphwell.Glyphwell.GlyphwellUIAgent"
 systemd-socket-activate -l "$socket" -E XDG_RUNTIME_DIR -E QT_QPA_PLATFORM -E HOME -E PATH \
-    -E ASAN_OPTIONS -E UBSAN_OPTIONS -E LSAN_OPTIONS \
-    "$agent" >"$runtime/agent.log" 2>&1 &
+    -E ASAN_OPTIONS -E UBSAN_OPTIONS -E LSAN_OPTIONS "$agent" >"$runtime/agent.log" 2>&1 &
 activator_pid=$!
 
-for _ in $(seq 100); do
-    [ -S "$socket" ] && break
-    sleep 0.05
-done
+for _ in $(seq 100); do [ -S "$socket" ] && break || sleep 0.05; done
 [ -S "$socket" ] || fail "systemd-socket-activate did not create $socket"
-
+# Nothing may start the agent but a connection: give it half a second to show itself wrongly.
 sleep 0.5
-if agent_running; then
-    fail "the agent runs before any request"
-fi
+agent_running && fail "the agent runs before any request"
 kill -0 "$activator_pid" 2>/dev/null || fail "systemd-socket-activate exited early"
 
 reply=$(timeout 20 "$tool" send --msgid 3 --empty --timeout 15 2>"$runtime/tool.err")
@@ -80,16 +58,10 @@ replied_at=$(date +%s.%N)
 [ -z "$reply" ] || fail "expected an empty reply, got: $reply"
 agent_running || fail "the agent is not running after the first request"
 
-# Poll until the agent has gone; the idle exit comes 10 s after the last reply.
-gone_at=""
-for _ in $(seq 200); do # 20 s
-    if ! agent_running; then
-        gone_at=$(date +%s.%N)
-        break
-    fi
-    sleep 0.1
-done
-[ -n "$gone_at" ] || fail "the agent still runs 20 s after its reply"
+# The idle exit comes 10 s after the last reply; give up after 20 s.
+for _ in $(seq 200); do agent_running && sleep 0.1 || break; done
+agent_running && fail "the agent still runs 20 s after its reply"
+gone_at=$(date +%s.%N)
 wait "$activator_pid"
 exit_status=$?
 activator_pid=""

@@ -1,23 +1,21 @@
 #!/usr/bin/python3
-"""End-to-end: the agent on a headless Wayland compositor started here (weston's headless
-backend, a socket of its own, no X display). The client side of the protocol (WAYLAND_DEBUG)
-must show each window mapped as an xdg toplevel with a title of its own (not the program's name
-nor an untranslated key), the agent's application id and a fixed size (minimum == maximum), a
-buffer attached. Both questions are answered by withdrawal: their client is killed, the alert
-goes away, and the next request is served. A download that asks nothing shows the progress
-window, and its reply says Result 1 once the held transfer is released; a font whose file is
-missing brings the download error alert, withdrawn in turn. Skipped (77) without weston.
+"""End-to-end: the agent on a private headless weston (no X display). The client side of the
+protocol (WAYLAND_DEBUG) must show each window mapped as an xdg toplevel with a title of its own
+(not the program's name nor an untranslated key), the agent's application id, a fixed size and a
+buffer. Both questions are withdrawn (their client killed): the alert goes, the next request is
+served. A download that asks nothing shows the progress window and replies Result 1 once the held
+transfer is released; a font whose file is missing brings the error alert, withdrawn in turn.
+Skipped (77) without weston.
 
 usage: wayland-windows.py AGENT GLYPHWELL"""
 import os
 import re
-import shutil
 import sys
 
 sys.dont_write_bytecode = True  # no cache files in the source tree
 sys.path.insert(0, os.path.dirname(os.path.abspath(__file__)))
-from e2e_support import (CANDIDATE_FONT, DOWNLOAD_NAME, MISSING_NAME, Failure, Run,  # noqa: E402
-                         check_running, main, skip, stop, wait_for)
+from e2e_support import (DOWNLOAD_NAME, MISSING_NAME, QUESTIONS, Run, check,  # noqa: E402
+                         check_running, main, require, stop, wait_for)
 
 REQUEST = re.compile(r"-> (\w+)@(\d+)\.(\w+)\((.*)\)\s*$")
 NEW_ID = re.compile(r"new id (\w+)@(\d+)")
@@ -29,7 +27,7 @@ class ProtocolLog:
     attached to its surface while it lived, and whether it was destroyed."""
 
     def __init__(self, path):
-        self.path, self.offset, self.partial = path, 0, b""
+        self.path, self.lines_read = path, 0
         self.shell_surfaces = {}  # xdg_surface id -> wl_surface id
         self.live = {}  # xdg_toplevel id -> its record
         self.on_surface = {}  # wl_surface id -> the record of the toplevel living on it
@@ -37,16 +35,13 @@ class ProtocolLog:
 
     def update(self):
         """Reads the lines added since the last call; returns every toplevel so far."""
-        with open(self.path, "rb") as log:
-            log.seek(self.offset)
-            data = log.read()
-        self.offset += len(data)
-        lines = (self.partial + data).split(b"\n")
-        self.partial = lines.pop()
-        for line in lines:
-            match = REQUEST.search(line.decode("utf-8", "replace"))
+        with open(self.path, encoding="utf-8", errors="replace") as log:
+            lines = log.read().split("\n")[:-1]  # the last piece may be a partial line
+        for line in lines[self.lines_read:]:
+            match = REQUEST.search(line)
             if match:
                 self.request(*match.groups())
+        self.lines_read = len(lines)
         return self.toplevels
 
     def request(self, interface, object_id, request, arguments):
@@ -70,27 +65,24 @@ class ProtocolLog:
                 record["destroyed"] = True
                 del self.live[object_id]
                 self.on_surface.pop(record["surface"], None)
-        elif interface == "wl_surface" and request == "attach" and object_id in self.on_surface:
-            if not arguments.startswith("nil"):
-                self.on_surface[object_id]["mapped"] = True
+        elif interface == "wl_surface" and request == "attach" and object_id in self.on_surface \
+                and not arguments.startswith("nil"):
+            self.on_surface[object_id]["mapped"] = True
 
 
 def check_window(record, kind, title=None):
     """Fails unless the toplevel has its own title (`title` when given; Qt may append the
     application's display name after a dash), the agent's application id and a fixed size."""
     print(f"{kind}: {record}")
-    if not record["mapped"]:
-        raise Failure(f"the {kind} was never given a buffer")
+    check(record["mapped"], f"the {kind} was never given a buffer")
     own = (record["title"] or "").split(" \u2014 ")[0]
-    if own in ("", "GlyphwellUIAgent", "Glyphwell") or own.startswith("QZ_") or \
-            (title and own != title):
-        raise Failure(f"the {kind} is titled {record['title']!r}, not with a title of its own"
-                      + (f" ({title!r})" if title else ""))
-    if record["app_id"] != "org.glyphwell.Glyphwell.GlyphwellUIAgent":
-        raise Failure(f"the {kind} has the application id {record['app_id']!r}")
-    if not record["min"] or 0 in record["min"] or record["min"] != record["max"]:
-        raise Failure(f"the {kind} has no fixed size: minimum {record['min']}, "
-                      f"maximum {record['max']}")
+    check(own not in ("", "GlyphwellUIAgent", "Glyphwell") and not own.startswith("QZ_") and
+          (not title or own == title), f"the {kind} is titled {record['title']!r}, not with a "
+          "title of its own" + (f" ({title!r})" if title else ""))
+    check(record["app_id"] == "org.glyphwell.Glyphwell.GlyphwellUIAgent",
+          f"the {kind} has the application id {record['app_id']!r}")
+    check(record["min"] and 0 not in record["min"] and record["min"] == record["max"],
+          f"the {kind} has no fixed size: minimum {record['min']}, maximum {record['max']}")
 
 
 def has_default_route():
@@ -99,20 +91,16 @@ def has_default_route():
 
 
 def test(agent, tool):
-    weston = shutil.which("weston")
-    if not weston:
-        skip("weston is not installed (scripts/install-deps installs it)")
+    require("weston")
     with Run("wayland") as run:
         socket_name = f"glyphwell-e2e-{os.getpid()}"
-        run.start("weston", [weston, "--backend=headless-backend.so", f"--socket={socket_name}",
+        run.start("weston", ["weston", "--backend=headless-backend.so", f"--socket={socket_name}",
                              "--idle-time=0", "--use-pixman", "--no-config",
                              "--width=1024", "--height=768"])
         wait_for("weston's socket", lambda: os.path.exists(os.path.join(run.runtime, socket_name)))
 
-        env = dict(run.env, QT_QPA_PLATFORM="wayland", WAYLAND_DISPLAY=socket_name,
-                   WAYLAND_DEBUG="client")
-        env.pop("DISPLAY", None)
-        agent_process = run.start_agent(agent, env)
+        agent_process = run.start_agent(agent, QT_QPA_PLATFORM="wayland", DISPLAY=None,
+                                        WAYLAND_DISPLAY=socket_name, WAYLAND_DEBUG="client")
         server = run.serve_download_font()
 
         log = ProtocolLog(run.path("agent.log"))
@@ -125,13 +113,8 @@ def test(agent, tool):
             return wait_for(f"window {seen + 1} to map", ready)
 
         # The two questions, each withdrawn by killing its client once the alert is mapped.
-        questions = [
-            ("activation", ["ask-activation", "--candidate", CANDIDATE_FONT, "--app", "Demo"]),
-            ("download", ["ask-download", "--font", f"{DOWNLOAD_NAME}:DejaVu Serif",
-                          "--app", "Demo"]),
-        ]
         seen = 0
-        for name, arguments in questions:
+        for name, arguments in QUESTIONS:
             client = run.ask(tool, name, *arguments)
             check_window(next_toplevel(seen)[seen], f"{name} alert")
             stop(client)
@@ -148,10 +131,9 @@ def test(agent, tool):
         wait_for("the font request", server.started.is_set)
         found = next_toplevel(seen)
         check_window(found[-1], "progress window", "Font Download")
-        server.release()
+        server.released.set()
         result, _ = run.reply(client, "progress")
-        if result != 1:
-            raise Failure(f"the download's Result is {result}, not 1")
+        check(result == 1, f"the download's Result is {result}, not 1")
 
         # A font that fails: after its progress window, the error alert, withdrawn.
         client = run.ask(tool, "failure", "ask-download", "--font", MISSING_NAME, "--suppress",
@@ -164,6 +146,4 @@ def test(agent, tool):
 
 
 if __name__ == "__main__":
-    if len(sys.argv) != 3:
-        sys.exit(__doc__.splitlines()[-1])
-    main(lambda: test(*sys.argv[1:]))
+    main(test, __doc__)
