@@ -88,7 +88,6 @@ struct QZAutoActivationConfirmation::Widgets : QObject {
     QTextBrowser* helpWindow = nullptr;
     int sampleFontId = -1;
     qint64 countdownSeconds = -1; ///< the count last shown; -1 before the first
-    qint64 announcedSeconds = -1; ///< the count the status region's name says; -1 before the first
     QTimer timeout;
     QTimer tick;
 
@@ -384,17 +383,14 @@ void QZAutoActivationConfirmation::updateCountdown() {
         label->setText(text);
 
     // The visible text changes every second; what a screen reader hears (the status region's
-    // name) changes only as the count passes a mark, and when a restart of the timeout (each key
-    // press or mouse move) makes it differ from what was last told.
+    // name) changes only as the count passes a mark, and when the timeout was restarted.
     const qint64 previous = std::exchange(widgets_->countdownSeconds, seconds);
     const bool passedMark =
         std::any_of(std::begin(kAnnouncedSeconds), std::end(kAnnouncedSeconds), [&](qint64 mark) {
             return previous >= 0 && seconds <= mark && mark < previous;
         });
-    const bool restarted = previous < 0 || seconds > previous;
-    if (!passedMark && !(restarted && seconds != widgets_->announcedSeconds))
+    if (!passedMark && previous >= 0 && seconds <= previous)
         return;
-    widgets_->announcedSeconds = seconds;
     label->setAccessibleName(text);
     label->setAccessibleDescription(text);
     if (passedMark) {
