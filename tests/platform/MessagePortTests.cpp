@@ -8,7 +8,6 @@
 
 #include <algorithm>
 #include <chrono>
-#include <condition_variable>
 #include <filesystem>
 #include <fstream>
 #include <future>
@@ -143,52 +142,18 @@ bool WaitFor(const std::function<bool()>& condition) {
     return condition();
 }
 
-/// Handler threads wait here until the test lets them through: Wait(n) returns once Open() has
-/// been called n times, or after 10 s.
-class Gate {
-public:
-    void Open() {
-        std::lock_guard<std::mutex> lock(mutex_);
-        ++opened_;
-        changed_.notify_all();
-    }
-    void Wait(int n) {
-        std::unique_lock<std::mutex> lock(mutex_);
-        changed_.wait_for(lock, std::chrono::seconds(10), [&] { return opened_ >= n; });
-    }
-
-private:
-    std::mutex mutex_;
-    std::condition_variable changed_;
-    int opened_ = 0;
-};
-
 /// Saves descriptor 3 (where systemd passes the first socket) and restores it when it ends.
-class PassedDescriptor {
-public:
-    PassedDescriptor() : saved_(fcntl(3, F_GETFD) >= 0 ? fcntl(3, F_DUPFD_CLOEXEC, 10) : -1) {}
-    ~PassedDescriptor() {
-        if (saved_ >= 0) {
-            dup2(saved_, 3);
-            close(saved_);
-        } else {
-            close(3);
-        }
-    }
-    PassedDescriptor(const PassedDescriptor&) = delete;
-    PassedDescriptor& operator=(const PassedDescriptor&) = delete;
-
+struct PassedDescriptor {
+    PassedDescriptor() : saved(fcntl(3, F_GETFD) >= 0 ? fcntl(3, F_DUPFD_CLOEXEC, 10) : -1) {}
+    ~PassedDescriptor() { saved >= 0 ? (dup2(saved, 3), close(saved)) : close(3); }
     /// Moves `descriptor` to 3.
-    static bool Install(int descriptor) {
-        if (descriptor == 3)
-            return true;
-        const bool moved = dup2(descriptor, 3) == 3;
-        close(descriptor);
+    bool Install(int descriptor) {
+        const bool moved = descriptor == 3 || dup2(descriptor, 3) == 3;
+        if (descriptor != 3)
+            close(descriptor);
         return moved;
     }
-
-private:
-    int saved_;
+    const int saved;
 };
 
 class MessagePortTest : public ::testing::Test {
@@ -512,10 +477,10 @@ TEST_F(MessagePortTest, TakesOverAStaleSocketButNeitherALiveServerNorAnotherFile
 }
 
 TEST_F(MessagePortTest, ReceiveTimeoutLeavesThePortUsableForTheNextRequest) {
-    Gate slowReply;
+    std::atomic<bool> late{false};
     PortServer server(kName, [&](SInt32 msgid, CFDataRef data) {
         if (msgid == 5)
-            slowReply.Wait(1);
+            WaitFor([&] { return late.load(); });
         return EchoWithMsgid(msgid, data);
     });
     ASSERT_TRUE(server.Started());
@@ -530,7 +495,7 @@ TEST_F(MessagePortTest, ReceiveTimeoutLeavesThePortUsableForTheNextRequest) {
     EXPECT_TRUE(CFMessagePortIsValid(remote.as<CFMessagePortRef>()));
 
     // The late reply to "slow" is never taken for this one's.
-    slowReply.Open();
+    late = true;
     EXPECT_EQ(Request(remote, 6, "fast", 1, kCFMessagePortWaitForever), (Reply{0, "fast@6"}));
 }
 
@@ -588,10 +553,10 @@ TEST_F(MessagePortTest, ReportsEachWayAServerCanFail) {
 }
 
 TEST_F(MessagePortTest, InvalidatingARemotePortEndsTheRequestWaitingOnIt) {
-    std::atomic<int> entered{0};
-    Gate gate;
+    std::atomic<int> entered{0}, released{0};
     PortServer server(kName, [&](SInt32 msgid, CFDataRef data) {
-        gate.Wait(++entered); // held until the test has seen the request end
+        const int request = ++entered;
+        WaitFor([&] { return released >= request; }); // until the test has seen the request end
         return EchoWithMsgid(msgid, data);
     });
     ASSERT_TRUE(server.Started());
@@ -606,7 +571,7 @@ TEST_F(MessagePortTest, InvalidatingARemotePortEndsTheRequestWaitingOnIt) {
         CFMessagePortInvalidate(remote.as<CFMessagePortRef>());
         ASSERT_EQ(waiting.wait_for(std::chrono::seconds(5)), std::future_status::ready);
         EXPECT_EQ(waiting.get().status, kCFMessagePortIsInvalid);
-        gate.Open();
+        ++released;
     }
 }
 
@@ -629,11 +594,11 @@ TEST_F(MessagePortTest, ServesOnlyAListeningSocketHandedOverForThisProcess) {
         PassedDescriptor passed;
         int pair[2] = {-1, -1};
         if (test.listening) {
-            ASSERT_TRUE(PassedDescriptor::Install(RawListen(SocketPath())));
+            ASSERT_TRUE(passed.Install(RawListen(SocketPath())));
         } else {
             ASSERT_EQ(socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, pair), 0);
             close(pair[1]);
-            ASSERT_TRUE(PassedDescriptor::Install(pair[0]));
+            ASSERT_TRUE(passed.Install(pair[0]));
         }
         setenv("LISTEN_PID", std::to_string(getpid() + test.otherPid).c_str(), 1);
         setenv("LISTEN_FDS", "1", 1);
