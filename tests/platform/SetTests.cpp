@@ -112,30 +112,6 @@ TEST(CFSet, NullCallbacksUsePointerIdentity) {
     EXPECT_EQ(CFGetRetainCount(five.get()), 1);
 }
 
-TEST(CFSet, LargeSetKeepsEveryMemberFindable) {
-    const intptr_t count = 100000;
-    std::vector<const void*> tokens;
-    for (intptr_t i = 0; i < count; ++i)
-        tokens.push_back(Token(i * 16)); // pointer-like: low bits are zero
-    auto set = Own(CFSetCreateMutable(nullptr, 0, nullptr));
-    for (const void* token : tokens)
-        CFSetAddValue(set.get(), token);
-    for (intptr_t i = 0; i < count; i += 2)
-        CFSetRemoveValue(set.get(), tokens[size_t(i)]);
-    ASSERT_EQ(CFSetGetCount(set.get()), count / 2);
-    for (intptr_t i = 0; i < count; ++i)
-        ASSERT_EQ(CFSetContainsValue(set.get(), tokens[size_t(i)]), i % 2 == 1) << i;
-    std::vector<const void*> members = membersOf(set.get());
-    for (size_t i = 0; i < members.size(); ++i)
-        ASSERT_EQ(members[i], tokens[2 * i + 1]);
-
-    auto whole = Own(CFSetCreate(nullptr, tokens.data(), count, nullptr));
-    auto reversed = std::vector<const void*>(tokens.rbegin(), tokens.rend());
-    auto wholeReversed = Own(CFSetCreate(nullptr, reversed.data(), count, nullptr));
-    EXPECT_TRUE(CFEqual(whole.get(), wholeReversed.get()));
-    EXPECT_FALSE(CFEqual(whole.get(), set.get()));
-}
-
 TEST(CFSet, ChangingImmutableSetIsReportedAndIgnoredAndDescriptionListsMembers) {
     auto a = MakeText("a");
     auto set = makeSet({a.get()});
