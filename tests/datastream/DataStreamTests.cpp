@@ -218,26 +218,18 @@ TEST_F(DataStream, UnterminatedCStringWarns) {
 }
 
 TEST_F(DataStream, ShowDumpsBothStacksThenTheBuffer) {
-    auto show = [&] { return StderrOf([&] { QZDataStreamShow(stream); }); };
-    std::string dump = show();
-    const std::string stacks = "readStack:\n"
-                               "\tid:0\tcnt:0\t <s:24 l:0/24 p:24>\n"
-                               "writeStack:\n"
-                               "\tid:0\tcnt:0\t <s:24 l:0/24 p:24>\n"
-                               "\n";
-    EXPECT_EQ(dump.substr(0, stacks.size()), stacks);
-    EXPECT_GT(dump.size(), stacks.size()); // the buffer's description follows
-
+    const auto expectDump = [&](const std::string& stacks) {
+        const std::string dump = StderrOf([&] { QZDataStreamShow(stream); });
+        EXPECT_EQ(dump.substr(0, stacks.size()), stacks);
+        EXPECT_GT(dump.size(), stacks.size()); // the buffer's description follows
+    };
+    expectDump("readStack:\n\tid:0\tcnt:0\t <s:24 l:0/24 p:24>\n"
+               "writeStack:\n\tid:0\tcnt:0\t <s:24 l:0/24 p:24>\n\n");
     QZDataStreamOpenWriteSegment(stream);
     QZDataStreamAppendUInt32(stream, 9);
-    dump = show();
-    const std::string nested = "readStack:\n"
-                               "\tid:0\tcnt:0\t <s:24 l:0/52 p:24>\n"
-                               "writeStack:\n"
-                               "\tid:1\tcnt:1\t <s:48 l:4/52 p:52>\n"
-                               "\tid:0\tcnt:0\t <s:24 l:0/52 p:24>\n"
-                               "\n";
-    EXPECT_EQ(dump.substr(0, nested.size()), nested);
+    expectDump(
+        "readStack:\n\tid:0\tcnt:0\t <s:24 l:0/52 p:24>\n"
+        "writeStack:\n\tid:1\tcnt:1\t <s:48 l:4/52 p:52>\n\tid:0\tcnt:0\t <s:24 l:0/52 p:24>\n\n");
 }
 
 TEST_F(DataStream, FinishedBufferReadsBackInAnotherStream) {
