@@ -4,6 +4,7 @@
 #include <cmath>
 #include <cstdint>
 #include <cstring>
+#include <iomanip>
 #include <limits>
 
 #include "platform/CFNumber.h"
@@ -122,7 +123,7 @@ TEST(Number, ConvertsBetweenTypeCodesAndReportsLoss) {
     };
     for (const Case& row : cases) {
         SCOPED_TRACE(testing::Message()
-                     << row.from << " " << double(row.value) << " as " << row.to);
+                     << row.from << " " << std::setprecision(21) << row.value << " as " << row.to);
         Ref number = Make(row.from, row.value);
         unsigned char out[8] = {};
         EXPECT_EQ(bool(CFNumberGetValue(number.as<CFNumberRef>(), row.to, out)), row.exact);
@@ -166,7 +167,7 @@ TEST(Number, ComparesByValueAcrossTypeCodes) {
         {F32, 0.5, F64, -0.5, kCFCompareGreaterThan},
     };
     for (const Case& row : cases) {
-        SCOPED_TRACE(testing::Message() << double(row.a) << " vs " << double(row.b));
+        SCOPED_TRACE(testing::Message() << std::setprecision(21) << row.a << " vs " << row.b);
         Ref a = Make(row.aType, row.a), b = Make(row.bType, row.b);
         EXPECT_EQ(CFNumberCompare(a.as<CFNumberRef>(), b.as<CFNumberRef>(), nullptr), row.order);
         EXPECT_EQ(bool(CFEqual(a.get(), b.get())), row.order == kCFCompareEqualTo);
