@@ -620,18 +620,16 @@ TEST_F(MessagePortTest, ServesOnlyAListeningSocketHandedOverForThisProcess) {
     }
 }
 
-TEST_F(MessagePortTest, SocketPathNeedsASafeNameAndDirectory) {
-    using glyphwell::port::SocketPathForName;
-    EXPECT_EQ(SocketPathForName(kName), runtime_.Path() + "/" + kName);
-    for (const std::string& bad : Lines{"", ".", "..", "a/b", std::string(120, 'n')})
-        EXPECT_EQ(SocketPathForName(bad), "") << bad;
-}
-
-TEST_F(MessagePortTest, WithoutARuntimeDirectorySocketsLiveInAPrivateDirectoryOfTheHome) {
+TEST_F(MessagePortTest,
+       SocketsNeedASafeNameAndLiveInAPrivateDirectoryOfTheHomeWithoutARuntimeDirectory) {
     // A home whose name holds a newline: the log line must not be forged by it.
     const std::string home = runtime_.Path() + "/home\nforged";
     const std::string directory = home + "/.glyphwell";
     const std::string logged = runtime_.Path() + "/home\\nforged/.glyphwell";
+    using glyphwell::port::SocketPathForName;
+    EXPECT_EQ(SocketPathForName(kName), runtime_.Path() + "/" + kName);
+    for (const std::string& bad : Lines{"", ".", "..", "a/b", std::string(120, 'n')})
+        EXPECT_EQ(SocketPathForName(bad), "") << "a name that is not safe: " << bad;
     const struct Case {
         const char* what;
         char kind; ///< what is at the directory's path first: nothing, a directory, a link, a file
@@ -666,7 +664,7 @@ TEST_F(MessagePortTest, WithoutARuntimeDirectorySocketsLiveInAPrivateDirectoryOf
             prepared = bool(std::ofstream(directory) << "x");
         ASSERT_TRUE(prepared);
         LogCapture log;
-        const std::string path = glyphwell::port::SocketPathForName("n");
+        const std::string path = SocketPathForName("n");
         if (test.refusal.empty()) {
             EXPECT_EQ(path, directory + "/n");
             struct stat status;
