@@ -47,11 +47,9 @@ TEST(CFArray, RetainsWhatItHoldsAndCopiesAreIndependent) {
     CFArrayAppendValue(array.get(), one.get());
     CFArrayInsertValueAtIndex(array.get(), 0, one.get());
     CFArrayAppendValue(array.get(), two.get());
-    EXPECT_EQ(CFGetRetainCount(one.get()), 3);
-    EXPECT_EQ(CFGetRetainCount(two.get()), 2);
+    EXPECT_EQ(RetainCounts({one.get(), two.get()}), (Counts{3, 2}));
     CFArraySetValueAtIndex(array.get(), 0, two.get()); // one -> two
-    EXPECT_EQ(CFGetRetainCount(one.get()), 2);
-    EXPECT_EQ(CFGetRetainCount(two.get()), 3);
+    EXPECT_EQ(RetainCounts({one.get(), two.get()}), (Counts{2, 3}));
     CFArrayRemoveValueAtIndex(array.get(), 2);
     EXPECT_EQ(CFGetRetainCount(two.get()), 2);
     // Replacing a value by itself must not free it in between.
@@ -69,8 +67,7 @@ TEST(CFArray, RetainsWhatItHoldsAndCopiesAreIndependent) {
     array.reset();
     frozen.reset();
     copy.reset();
-    EXPECT_EQ(CFGetRetainCount(one.get()), 1);
-    EXPECT_EQ(CFGetRetainCount(two.get()), 1);
+    EXPECT_EQ(RetainCounts({one.get(), two.get()}), (Counts{1, 1}));
 }
 
 TEST(CFArray, NullCallbacksKeepCountsAndCompareByPointer) {

@@ -47,24 +47,19 @@ TEST(CFDictionary, RetainsKeysAndValuesAndGivesThemBack) {
     auto first = MakeInt(1), second = MakeInt(2);
     auto dictionary = makeMutable();
     CFDictionarySetValue(dictionary.get(), key.get(), first.get());
-    EXPECT_EQ(CFGetRetainCount(key.get()), 2);
-    EXPECT_EQ(CFGetRetainCount(first.get()), 2);
+    EXPECT_EQ(RetainCounts({key.get(), first.get()}), (Counts{2, 2}));
 
     CFDictionarySetValue(dictionary.get(), key.get(), second.get());
-    EXPECT_EQ(CFGetRetainCount(key.get()), 2);
-    EXPECT_EQ(CFGetRetainCount(first.get()), 1);
-    EXPECT_EQ(CFGetRetainCount(second.get()), 2);
+    EXPECT_EQ(RetainCounts({key.get(), first.get(), second.get()}), (Counts{2, 1, 2}));
     CFDictionarySetValue(dictionary.get(), key.get(), second.get()); // same value again
     EXPECT_EQ(CFGetRetainCount(second.get()), 2);
 
     auto copy = Own(CFDictionaryCreateCopy(nullptr, dictionary.get()));
     EXPECT_EQ(CFGetRetainCount(second.get()), 3);
     CFDictionaryRemoveValue(dictionary.get(), key.get());
-    EXPECT_EQ(CFGetRetainCount(key.get()), 2);
-    EXPECT_EQ(CFGetRetainCount(second.get()), 2);
+    EXPECT_EQ(RetainCounts({key.get(), second.get()}), (Counts{2, 2}));
     copy.reset();
-    EXPECT_EQ(CFGetRetainCount(key.get()), 1);
-    EXPECT_EQ(CFGetRetainCount(second.get()), 1);
+    EXPECT_EQ(RetainCounts({key.get(), second.get()}), (Counts{1, 1}));
 }
 
 TEST(CFDictionary, CreateWithRepeatedKeyKeepsLastValueInFirstPlace) {
@@ -73,8 +68,7 @@ TEST(CFDictionary, CreateWithRepeatedKeyKeepsLastValueInFirstPlace) {
     auto dictionary =
         makeDictionary({{a.get(), v1.get()}, {b.get(), v2.get()}, {alsoA.get(), v3.get()}});
     EXPECT_EQ(pairsOf(dictionary.get()), (Pairs{{a.get(), v3.get()}, {b.get(), v2.get()}}));
-    EXPECT_EQ(CFGetRetainCount(v1.get()), 1);
-    EXPECT_EQ(CFGetRetainCount(alsoA.get()), 1);
+    EXPECT_EQ(RetainCounts({v1.get(), alsoA.get()}), (Counts{1, 1}));
 }
 
 TEST(CFDictionary, ReplacingAndRemovingKeepOrder) {
@@ -109,8 +103,7 @@ TEST(CFDictionary, ReplacingAndRemovingKeepOrder) {
     EXPECT_TRUE(CFDictionaryContainsValue(dictionary.get(), two.get()));
     CFDictionaryRemoveAllValues(dictionary.get());
     EXPECT_EQ(CFDictionaryGetCount(dictionary.get()), 0);
-    EXPECT_EQ(CFGetRetainCount(a.get()), 1);
-    EXPECT_EQ(CFGetRetainCount(one.get()), 1);
+    EXPECT_EQ(RetainCounts({a.get(), one.get()}), (Counts{1, 1}));
 }
 
 TEST(CFDictionary, EqualityIgnoresOrderAndComparesValues) {

@@ -31,12 +31,9 @@ TEST(CFSet, CreateKeepsFirstOfEqualValues) {
     EXPECT_EQ(CFSetGetCount(set.get()), 2);
     EXPECT_EQ(CFSetGetValue(set.get(), realFive.get()), five.get());
     EXPECT_EQ(CFSetGetCountOfValue(set.get(), wideFive.get()), 1);
-    EXPECT_EQ(CFGetRetainCount(five.get()), 2);
-    EXPECT_EQ(CFGetRetainCount(wideFive.get()), 1);
-    EXPECT_EQ(CFGetRetainCount(realFive.get()), 1);
+    EXPECT_EQ(RetainCounts({five.get(), wideFive.get(), realFive.get()}), (Counts{2, 1, 1}));
     set.reset();
-    EXPECT_EQ(CFGetRetainCount(five.get()), 1);
-    EXPECT_EQ(CFGetRetainCount(six.get()), 1);
+    EXPECT_EQ(RetainCounts({five.get(), six.get()}), (Counts{1, 1}));
 }
 
 TEST(CFSet, EqualityIgnoresOrder) {
@@ -64,8 +61,7 @@ TEST(CFSet, AddSetAndReplaceTreatEqualMembersDifferently) {
 
     CFSetSetValue(set.get(), otherOne.get()); // replaces in place
     EXPECT_EQ(membersOf(set.get()), (std::vector<const void*>{otherOne.get(), two.get()}));
-    EXPECT_EQ(CFGetRetainCount(one.get()), 1);
-    EXPECT_EQ(CFGetRetainCount(otherOne.get()), 2);
+    EXPECT_EQ(RetainCounts({one.get(), otherOne.get()}), (Counts{1, 2}));
 
     CFSetReplaceValue(set.get(), three.get()); // absent: nothing
     CFSetReplaceValue(set.get(), one.get());
@@ -96,8 +92,7 @@ TEST(CFSet, EnumeratesInInsertionOrderAfterRemovalAndReleases) {
     EXPECT_EQ(membersOf(set.get()), visited);
     CFSetRemoveAllValues(set.get());
     EXPECT_EQ(CFSetGetCount(set.get()), 0);
-    EXPECT_EQ(CFGetRetainCount(a.get()), 1);
-    EXPECT_EQ(CFGetRetainCount(b.get()), 1);
+    EXPECT_EQ(RetainCounts({a.get(), b.get()}), (Counts{1, 1}));
 }
 
 TEST(CFSet, NullCallbacksUsePointerIdentity) {
