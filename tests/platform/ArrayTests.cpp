@@ -8,10 +8,11 @@
 #include "tests/platform/ContainerTestSupport.h"
 
 using namespace glyphwell::testing;
+using Tokens = std::vector<intptr_t>;
 
 namespace {
 
-CFComparisonResult compareTokens(const void* a, const void* b, void*) {
+CFComparisonResult CompareTokens(const void* a, const void* b, void*) {
     intptr_t left = TokenValue(a), right = TokenValue(b);
     return left < right   ? kCFCompareLessThan
            : left > right ? kCFCompareGreaterThan
@@ -19,20 +20,20 @@ CFComparisonResult compareTokens(const void* a, const void* b, void*) {
 }
 
 // Orders tokens by their hundreds only, so that tokens with the same hundreds tie.
-CFComparisonResult compareHundreds(const void* a, const void* b, void* context) {
+CFComparisonResult CompareHundreds(const void* a, const void* b, void* context) {
     ++*static_cast<int*>(context);
-    return compareTokens(Token(TokenValue(a) / 100), Token(TokenValue(b) / 100), nullptr);
+    return CompareTokens(Token(TokenValue(a) / 100), Token(TokenValue(b) / 100), nullptr);
 }
 
-Owned<CFArrayRef> tokenArray(std::vector<intptr_t> numbers) {
-    std::vector<const void*> values;
+Owned<CFMutableArrayRef> TokenArray(Tokens numbers) {
+    auto array = Own(CFArrayCreateMutable(nullptr, 0, nullptr));
     for (intptr_t number : numbers)
-        values.push_back(Token(number));
-    return Own(CFArrayCreate(nullptr, values.data(), CFIndex(values.size()), nullptr));
+        CFArrayAppendValue(array.get(), Token(number));
+    return array;
 }
 
-std::vector<intptr_t> tokensOf(CFArrayRef array) {
-    std::vector<intptr_t> numbers;
+Tokens TokensOf(CFArrayRef array) {
+    Tokens numbers;
     for (CFIndex i = 0; i < CFArrayGetCount(array); ++i)
         numbers.push_back(TokenValue(CFArrayGetValueAtIndex(array, i)));
     return numbers;
@@ -40,29 +41,33 @@ std::vector<intptr_t> tokensOf(CFArrayRef array) {
 
 } // namespace
 
-TEST(CFArray, RetainsInsertedValuesAndGivesThemBack) {
+TEST(CFArray, RetainsWhatItHoldsAndCopiesAreIndependent) {
     auto one = MakeInt(1), two = MakeInt(2);
     auto array = Own(CFArrayCreateMutable(nullptr, 0, &kCFTypeArrayCallBacks));
     CFArrayAppendValue(array.get(), one.get());
     CFArrayInsertValueAtIndex(array.get(), 0, one.get());
     CFArrayAppendValue(array.get(), two.get());
-    EXPECT_EQ(CFGetRetainCount(one.get()), 3);
-    EXPECT_EQ(CFGetRetainCount(two.get()), 2);
-
+    EXPECT_EQ(RetainCounts({one.get(), two.get()}), (Counts{3, 2}));
     CFArraySetValueAtIndex(array.get(), 0, two.get()); // one -> two
-    EXPECT_EQ(CFGetRetainCount(one.get()), 2);
-    EXPECT_EQ(CFGetRetainCount(two.get()), 3);
+    EXPECT_EQ(RetainCounts({one.get(), two.get()}), (Counts{2, 3}));
     CFArrayRemoveValueAtIndex(array.get(), 2);
     EXPECT_EQ(CFGetRetainCount(two.get()), 2);
-
     // Replacing a value by itself must not free it in between.
     const void* same[] = {one.get()};
     CFArrayReplaceValues(array.get(), CFRangeMake(1, 1), same, 1);
     EXPECT_EQ(CFGetRetainCount(one.get()), 2);
 
+    auto frozen = Own(CFArrayCreateCopy(nullptr, array.get()));
+    auto copy = Own(CFArrayCreateMutableCopy(nullptr, 0, frozen.get()));
+    CFArrayAppendValue(copy.get(), one.get());
+    EXPECT_EQ(CFGetRetainCount(one.get()), 5);
+    CFArrayRemoveAllValues(array.get());
+    EXPECT_EQ(CFArrayGetCount(frozen.get()), 2);
+    EXPECT_EQ(CFGetTypeID(frozen.get()), CFArrayGetTypeID());
     array.reset();
-    EXPECT_EQ(CFGetRetainCount(one.get()), 1);
-    EXPECT_EQ(CFGetRetainCount(two.get()), 1);
+    frozen.reset();
+    copy.reset();
+    EXPECT_EQ(RetainCounts({one.get(), two.get()}), (Counts{1, 1}));
 }
 
 TEST(CFArray, NullCallbacksKeepCountsAndCompareByPointer) {
@@ -73,7 +78,6 @@ TEST(CFArray, NullCallbacksKeepCountsAndCompareByPointer) {
     EXPECT_EQ(CFArrayGetFirstIndexOfValue(array.get(), CFRangeMake(0, 2), otherFive.get()),
               kCFNotFound);
     EXPECT_EQ(CFArrayGetFirstIndexOfValue(array.get(), CFRangeMake(0, 2), nullptr), 1);
-
     auto copy = Own(CFArrayCreateMutableCopy(nullptr, 0, array.get()));
     CFArrayAppendValue(copy.get(), five.get());
     EXPECT_EQ(CFGetRetainCount(five.get()), 1);
@@ -81,25 +85,22 @@ TEST(CFArray, NullCallbacksKeepCountsAndCompareByPointer) {
 }
 
 TEST(CFArray, EqualityComparesElementsInOrder) {
-    auto a1 = MakeInt(1);
-    auto a2 = MakeText("two");
-    auto b1 = MakeNumber(kCFNumberFloat64Type, 1.0);
-    auto b2 = MakeText("two");
-    const void* left[] = {a1.get(), a2.get()};
-    const void* right[] = {b1.get(), b2.get()};
-    const void* reversed[] = {b2.get(), b1.get()};
+    auto one = MakeInt(1), realOne = MakeNumber(kCFNumberFloat64Type, 1.0);
+    auto two = MakeText("two"), alsoTwo = MakeText("two");
+    const void* left[] = {one.get(), two.get()};
+    const void* right[] = {realOne.get(), alsoTwo.get()};
+    const void* reversed[] = {alsoTwo.get(), realOne.get()};
     auto array = Own(CFArrayCreate(nullptr, left, 2, &kCFTypeArrayCallBacks));
     auto same = Own(CFArrayCreate(nullptr, right, 2, &kCFTypeArrayCallBacks));
-    auto otherOrder = Own(CFArrayCreate(nullptr, reversed, 2, &kCFTypeArrayCallBacks));
-    auto shorter = Own(CFArrayCreate(nullptr, left, 1, &kCFTypeArrayCallBacks));
-
     EXPECT_TRUE(CFEqual(array.get(), same.get()));
     EXPECT_EQ(CFHash(array.get()), CFHash(same.get()));
+    auto otherOrder = Own(CFArrayCreate(nullptr, reversed, 2, &kCFTypeArrayCallBacks));
+    auto shorter = Own(CFArrayCreate(nullptr, left, 1, &kCFTypeArrayCallBacks));
     EXPECT_FALSE(CFEqual(array.get(), otherOrder.get()));
     EXPECT_FALSE(CFEqual(array.get(), shorter.get()));
 }
 
-TEST(CFArray, FindsValuesWithinRangeByEquality) {
+TEST(CFArray, FindsCountsAndVisitsValuesWithinRange) {
     auto x = MakeText("x"), y = MakeText("y"), alsoX = MakeText("x");
     const void* values[] = {x.get(), y.get(), x.get(), y.get(), x.get()};
     auto array = Own(CFArrayCreate(nullptr, values, 5, &kCFTypeArrayCallBacks));
@@ -110,92 +111,67 @@ TEST(CFArray, FindsValuesWithinRangeByEquality) {
     EXPECT_EQ(CFArrayGetLastIndexOfValue(array.get(), CFRangeMake(1, 1), alsoX.get()), kCFNotFound);
     EXPECT_TRUE(CFArrayContainsValue(array.get(), CFRangeMake(3, 1), y.get()));
     EXPECT_FALSE(CFArrayContainsValue(array.get(), CFRangeMake(0, 0), x.get()));
+
+    auto tokens = TokenArray({1, 2, 3, 4, 5});
+    Tokens seen;
+    CFArrayApplyFunction(
+        tokens.get(), CFRangeMake(1, 3),
+        [](const void* value, void* context) {
+            static_cast<Tokens*>(context)->push_back(TokenValue(value));
+        },
+        &seen);
+    EXPECT_EQ(seen, (Tokens{2, 3, 4}));
 }
 
+// The index of an equal value, else where it would be inserted, never outside the range.
 TEST(CFArray, BinarySearchGivesEqualOrInsertionIndex) {
-    auto array = tokenArray({10, 20, 20, 30, 40});
-    auto search = [&](CFRange range, intptr_t value) {
-        return CFArrayBSearchValues(array.get(), range, Token(value), compareTokens, nullptr);
-    };
-    CFRange all = CFRangeMake(0, 5);
-    EXPECT_EQ(search(all, 10), 0);
-    EXPECT_EQ(search(all, 20), 1);
-    EXPECT_EQ(search(all, 40), 4);
-    EXPECT_EQ(search(all, 5), 0);
-    EXPECT_EQ(search(all, 25), 3);
-    EXPECT_EQ(search(all, 50), 5);
-    // Within a range, not-found positions stay inside [location, location + length].
-    EXPECT_EQ(search(CFRangeMake(1, 3), 5), 1);
-    EXPECT_EQ(search(CFRangeMake(1, 3), 35), 4);
-    EXPECT_EQ(search(CFRangeMake(2, 0), 99), 2);
+    auto array = TokenArray({10, 20, 20, 30, 40});
+    const struct {
+        CFIndex location, length;
+        intptr_t value;
+        CFIndex index;
+    } cases[] = {{0, 5, 10, 0}, {0, 5, 20, 1}, {0, 5, 40, 4}, {0, 5, 5, 0}, {0, 5, 25, 3},
+                 {0, 5, 50, 5}, {1, 3, 5, 1},  {1, 3, 35, 4}, {2, 0, 99, 2}};
+    for (const auto& row : cases)
+        EXPECT_EQ(CFArrayBSearchValues(array.get(), CFRangeMake(row.location, row.length),
+                                       Token(row.value), CompareTokens, nullptr),
+                  row.index)
+            << row.location << "+" << row.length << " " << row.value;
 }
 
 TEST(CFArray, SortIsStableAndStaysInItsRange) {
-    auto sorted = tokenArray({999, 301, 102, 303, 104, 205, 306, 107, 0});
-    auto array = Own(CFArrayCreateMutableCopy(nullptr, 0, sorted.get()));
+    auto array = TokenArray({999, 301, 102, 303, 104, 205, 306, 107, 0});
     int calls = 0;
-    CFArraySortValues(array.get(), CFRangeMake(1, 7), compareHundreds, &calls);
+    CFArraySortValues(array.get(), CFRangeMake(1, 7), CompareHundreds, &calls);
     EXPECT_GT(calls, 0);
-    EXPECT_EQ(tokensOf(array.get()),
-              (std::vector<intptr_t>{999, 102, 104, 107, 205, 301, 303, 306, 0}));
+    EXPECT_EQ(TokensOf(array.get()), (Tokens{999, 102, 104, 107, 205, 301, 303, 306, 0}));
 }
 
 TEST(CFArray, EditsSpliceInPlace) {
-    auto source = tokenArray({1, 2, 3, 4});
-    auto array = Own(CFArrayCreateMutableCopy(nullptr, 0, source.get()));
+    auto array = TokenArray({1, 2, 3, 4});
     const void* inserted[] = {Token(7), Token(8), Token(9)};
     CFArrayReplaceValues(array.get(), CFRangeMake(1, 2), inserted, 3);
-    EXPECT_EQ(tokensOf(array.get()), (std::vector<intptr_t>{1, 7, 8, 9, 4}));
+    EXPECT_EQ(TokensOf(array.get()), (Tokens{1, 7, 8, 9, 4}));
     CFArrayReplaceValues(array.get(), CFRangeMake(0, 4), nullptr, 0);
-    EXPECT_EQ(tokensOf(array.get()), (std::vector<intptr_t>{4}));
-    CFArrayInsertValueAtIndex(array.get(), 1, Token(5));
+    EXPECT_EQ(TokensOf(array.get()), (Tokens{4}));
+    CFArrayInsertValueAtIndex(array.get(), 1, Token(5)); // an index equal to the count appends
     CFArrayInsertValueAtIndex(array.get(), 0, Token(3));
     CFArrayExchangeValuesAtIndices(array.get(), 0, 2);
-    EXPECT_EQ(tokensOf(array.get()), (std::vector<intptr_t>{5, 4, 3}));
+    EXPECT_EQ(TokensOf(array.get()), (Tokens{5, 4, 3}));
+    CFArraySetValueAtIndex(array.get(), 3, Token(6));
     // Appending a range of the array to itself reads the values before the storage moves.
-    CFArrayAppendArray(array.get(), array.get(), CFRangeMake(0, 3));
-    EXPECT_EQ(tokensOf(array.get()), (std::vector<intptr_t>{5, 4, 3, 5, 4, 3}));
-    CFArrayRemoveAllValues(array.get());
-    EXPECT_EQ(CFArrayGetCount(array.get()), 0);
-}
-
-TEST(CFArray, ApplyFunctionVisitsRangeInIndexOrder) {
-    auto array = tokenArray({1, 2, 3, 4, 5});
-    std::vector<intptr_t> seen;
-    CFArrayApplyFunction(
-        array.get(), CFRangeMake(1, 3),
-        [](const void* value, void* context) {
-            static_cast<std::vector<intptr_t>*>(context)->push_back(TokenValue(value));
-        },
-        &seen);
-    EXPECT_EQ(seen, (std::vector<intptr_t>{2, 3, 4}));
-}
-
-TEST(CFArray, CopiesKeepCallbacksAndAreIndependent) {
-    auto one = MakeInt(1);
-    const void* values[] = {one.get()};
-    auto array = Own(CFArrayCreate(nullptr, values, 1, &kCFTypeArrayCallBacks));
-    auto mutableCopy = Own(CFArrayCreateMutableCopy(nullptr, 0, array.get()));
-    EXPECT_EQ(CFGetRetainCount(one.get()), 3);
-    CFArrayAppendValue(mutableCopy.get(), one.get());
-    EXPECT_EQ(CFGetRetainCount(one.get()), 4);
-    EXPECT_EQ(CFArrayGetCount(array.get()), 1);
-
-    auto frozen = Own(CFArrayCreateCopy(nullptr, mutableCopy.get()));
-    CFArrayRemoveAllValues(mutableCopy.get());
-    EXPECT_EQ(CFArrayGetCount(frozen.get()), 2);
-    EXPECT_EQ(CFGetRetainCount(one.get()), 4);
-    EXPECT_EQ(CFGetTypeID(frozen.get()), CFArrayGetTypeID());
+    CFArrayAppendArray(array.get(), array.get(), CFRangeMake(0, 4));
+    EXPECT_EQ(TokensOf(array.get()), (Tokens{5, 4, 3, 6, 5, 4, 3, 6}));
 }
 
 TEST(CFArray, MisuseIsReportedAndIgnored) {
-    auto array = tokenArray({1, 2});
+    auto array = Own(CFArrayCreateCopy(nullptr, TokenArray({1, 2}).get()));
     LogCapture log;
     CFArrayAppendValue(const_cast<CFMutableArrayRef>(array.get()), Token(3));
     EXPECT_EQ(CFArrayGetValueAtIndex(array.get(), 2), nullptr);
     EXPECT_EQ(CFArrayGetValueAtIndex(array.get(), -1), nullptr);
     EXPECT_EQ(CFArrayGetCountOfValue(array.get(), CFRangeMake(1, 2), Token(2)), 0);
-    EXPECT_EQ(tokensOf(array.get()), (std::vector<intptr_t>{1, 2}));
+    EXPECT_EQ(TokensOf(array.get()), (Tokens{1, 2}));
 
     std::vector<std::string> lines = log.Texts();
     ASSERT_EQ(lines.size(), 8u);
@@ -204,13 +180,6 @@ TEST(CFArray, MisuseIsReportedAndIgnored) {
     EXPECT_EQ(lines[2].rfind("*** Assertion failure in CFArrayGetValueAtIndex, ", 0), 0u);
     EXPECT_EQ(lines[3], "Invalid parameter not satisfying: index lies inside the array");
     EXPECT_EQ(lines[7], "Invalid parameter not satisfying: range lies inside the collection");
-}
-
-TEST(CFArray, IndexEqualToCountAppends) {
-    auto array = Own(CFArrayCreateMutable(nullptr, 0, nullptr));
-    CFArrayInsertValueAtIndex(array.get(), 0, Token(1));
-    CFArraySetValueAtIndex(array.get(), 1, Token(2));
-    EXPECT_EQ(tokensOf(array.get()), (std::vector<intptr_t>{1, 2}));
 }
 
 TEST(CFArray, DescriptionListsElements) {
@@ -222,16 +191,4 @@ TEST(CFArray, DescriptionListsElements) {
     const std::string tail = ">{count = 2, values = (\n\t0 : alpha\n\t1 : beta\n)}";
     ASSERT_GE(text.size(), tail.size());
     EXPECT_EQ(text.substr(text.size() - tail.size()), tail);
-}
-
-// Nested a hundred thousand levels deep, a recursive teardown would overrun the stack.
-TEST(CFArray, DestroysDeepNestingWithoutDeepRecursion) {
-    CFArrayRef inner = CFArrayCreate(nullptr, nullptr, 0, &kCFTypeArrayCallBacks);
-    for (int level = 0; level < 100000; ++level) {
-        const void* values[] = {inner};
-        CFArrayRef outer = CFArrayCreate(nullptr, values, 1, &kCFTypeArrayCallBacks);
-        CFRelease(inner);
-        inner = outer;
-    }
-    CFRelease(inner);
 }

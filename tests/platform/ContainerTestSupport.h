@@ -4,6 +4,7 @@
 #include <cstdint>
 #include <memory>
 #include <type_traits>
+#include <vector>
 
 #include "platform/PropertyValues.h"
 
@@ -30,6 +31,16 @@ inline Owned<CFNumberRef> MakeInt(int value) {
 
 inline Owned<CFStringRef> MakeText(const char* text) {
     return Own(CFStringCreateWithCString(nullptr, text, kCFStringEncodingUTF8));
+}
+
+using Counts = std::vector<CFIndex>;
+
+/// The retain counts of `values`, in order, for one-line checks.
+inline Counts RetainCounts(std::initializer_list<CFTypeRef> values) {
+    Counts counts;
+    for (CFTypeRef value : values)
+        counts.push_back(CFGetRetainCount(value));
+    return counts;
 }
 
 /// A small integer stored as a pointer, for containers with null callbacks.

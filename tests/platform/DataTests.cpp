@@ -34,7 +34,7 @@ protected:
     CFMutableDataRef data = nullptr;
 };
 
-TEST(Data, CreateCopiesTheBytes) {
+TEST(Data, CreateCopiesTheBytesAndNoCopyFreesOrLeavesThemAsAsked) {
     char text[] = "abc";
     CFDataRef data = CFDataCreate(nullptr, U(text), 3);
     text[0] = 'x';
@@ -45,13 +45,10 @@ TEST(Data, CreateCopiesTheBytes) {
     EXPECT_EQ(middle[0], 'b');
     EXPECT_EQ(middle[1], 'c');
     CFRelease(data);
-
     CFDataRef empty = CFDataCreate(nullptr, nullptr, 0);
     EXPECT_EQ(CFDataGetLength(empty), 0);
     CFRelease(empty);
-}
 
-TEST(Data, NoCopyFreesOrLeavesTheBytesAsAsked) {
     // Leak checks fail if the malloc'd bytes are not freed; AddressSanitizer fails if the stack
     // bytes are.
     UInt8* heap = static_cast<UInt8*>(std::malloc(4));
@@ -109,7 +106,7 @@ TEST_F(MutableDataTest, ManySmallAppendsKeepEveryByte) {
     EXPECT_EQ(Bytes(data), expected);
 }
 
-TEST_F(MutableDataTest, SetLengthCutsOrGrowsWithZeros) {
+TEST_F(MutableDataTest, SetLengthAndReplaceCutOrGrowInPlace) {
     Fill("abcdef");
     CFDataSetLength(data, 2);
     EXPECT_EQ(Bytes(data), "ab");
@@ -119,10 +116,9 @@ TEST_F(MutableDataTest, SetLengthCutsOrGrowsWithZeros) {
     EXPECT_EQ(Bytes(data), std::string("ab\0\0\0\0\0", 7));
     CFDataGetMutableBytePtr(data)[6] = 'z';
     EXPECT_EQ(Bytes(data), std::string("ab\0\0\0\0z", 7));
-}
 
-TEST_F(MutableDataTest, ReplaceBytesGrowsOrShrinksTheRange) {
-    Fill("abcdef");
+    Fill("abcdef"); // replacing grows or shrinks the range
+
     CFDataReplaceBytes(data, CFRangeMake(1, 2), U("XYZW"), 4);
     EXPECT_EQ(Bytes(data), "aXYZWdef");
     CFDataReplaceBytes(data, CFRangeMake(0, 5), U("-"), 1);

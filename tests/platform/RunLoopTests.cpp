@@ -12,8 +12,12 @@
 #include "platform/CFRunLoop.h"
 #include "platform/MessagePortWire.h"
 #include "support/PortTestSupport.h"
+#include "support/Values.h"
 
 using glyphwell::PollRunLoopDriver;
+using glyphwell::port::Frame;
+using glyphwell::port::FrameAssembler;
+using namespace glyphwell::testing;
 
 namespace {
 
@@ -42,11 +46,6 @@ bool IsBlocked(pid_t tid) {
 }
 
 } // namespace
-
-TEST(PollRunLoopDriver, RunOnceReturnsAtOnceWhenNothingIsWatched) {
-    PollRunLoopDriver driver;
-    EXPECT_FALSE(driver.RunOnce(-1));
-}
 
 TEST(PollRunLoopDriver, NeverCallsACallbackUnwatchedEarlierInTheSameRound) {
     PollRunLoopDriver driver;
@@ -95,6 +94,7 @@ TEST(PollRunLoopDriver, CallbackMayRunANestedRound) {
 
 TEST(PollRunLoopDriver, WakeEndsAWaitFromAnotherThread) {
     PollRunLoopDriver driver;
+    EXPECT_FALSE(driver.RunOnce(-1)) << "nothing watched: returns at once";
     Pipe idle;
     bool called = false;
     driver.Watch(idle.read, true, false, [&](bool, bool) { called = true; });
@@ -111,13 +111,13 @@ TEST(PollRunLoopDriver, WakeEndsAWaitFromAnotherThread) {
 }
 
 TEST(RunLoop, SourcesAreServedByWhicheverDriverIsInstalled) {
-    glyphwell::testing::TemporaryRuntimeDirectory runtime;
-    CFStringRef name = glyphwell::testing::CreateCFString("org.glyphwell.Test.Loop");
-    CFMessagePortRef port =
-        CFMessagePortCreateLocal(kCFAllocatorDefault, name, nullptr, nullptr, nullptr);
-    CFRelease(name);
-    ASSERT_NE(port, nullptr);
-    CFRunLoopSourceRef source = CFMessagePortCreateRunLoopSource(kCFAllocatorDefault, port, 0);
+    TemporaryRuntimeDirectory runtime;
+    Ref name(CreateCFString("org.glyphwell.Test.Loop"));
+    Ref port(CFMessagePortCreateLocal(kCFAllocatorDefault, name.as<CFStringRef>(), nullptr, nullptr,
+                                      nullptr));
+    ASSERT_TRUE(port);
+    CFRunLoopSourceRef source =
+        CFMessagePortCreateRunLoopSource(kCFAllocatorDefault, port.as<CFMessagePortRef>(), 0);
     CFRunLoopAddSource(CFRunLoopGetCurrent(), source, kCFRunLoopCommonModes);
     CFRunLoopAddSource(CFRunLoopGetCurrent(), source, kCFRunLoopCommonModes); // no-op
 
@@ -128,13 +128,13 @@ TEST(RunLoop, SourcesAreServedByWhicheverDriverIsInstalled) {
     glyphwell::SetRunLoopDriver(&second);
     EXPECT_FALSE(first.RunOnce(0)) << "the source left the old driver";
 
-    const int client = glyphwell::testing::RawConnect(runtime.Path() + "/org.glyphwell.Test.Loop");
+    const int client = RawConnect(runtime.Path() + "/org.glyphwell.Test.Loop");
     ASSERT_GE(client, 0);
-    ASSERT_TRUE(glyphwell::testing::RawWrite(client, glyphwell::testing::RequestFrame(1, "")));
+    ASSERT_TRUE(RawWrite(client, RequestFrame(1, "")));
     std::string reply;
     for (int round = 0; round < 100 && reply.size() < 4; ++round) {
         second.RunOnce(10);
-        reply += glyphwell::testing::RawRead(client, 4 - reply.size(), 0);
+        reply += RawRead(client, 4 - reply.size(), 0);
     }
     EXPECT_EQ(reply, std::string("\x00\x00\x00\x00", 4)) << "a port without callback replies empty";
     close(client);
@@ -143,7 +143,6 @@ TEST(RunLoop, SourcesAreServedByWhicheverDriverIsInstalled) {
     EXPECT_FALSE(second.RunOnce(0));
     glyphwell::SetRunLoopDriver(nullptr);
     CFRelease(source);
-    CFRelease(port);
 }
 
 TEST(FrameAssembler, ReassemblesFramesSplitAtAnyByte) {
@@ -152,15 +151,14 @@ TEST(FrameAssembler, ReassemblesFramesSplitAtAnyByte) {
                              "\x80\x00\x00\x00\x00\x00\x00\x00",
                              19);
     for (size_t piece = 1; piece <= stream.size(); ++piece) {
-        glyphwell::port::FrameAssembler assembler(glyphwell::port::FrameAssembler::Kind::Request,
-                                                  16);
+        FrameAssembler assembler(FrameAssembler::Kind::Request, 16);
         for (size_t at = 0; at < stream.size(); at += piece) {
             const size_t length = std::min(piece, stream.size() - at);
             ASSERT_TRUE(
                 assembler.Append(reinterpret_cast<const uint8_t*>(stream.data()) + at, length));
         }
         ASSERT_TRUE(assembler.HasFrame());
-        glyphwell::port::Frame frame = assembler.TakeFrame();
+        Frame frame = assembler.TakeFrame();
         EXPECT_EQ(frame.msgid, 5);
         EXPECT_EQ(std::string(reinterpret_cast<const char*>(frame.body.Data()), frame.body.Size()),
                   "abc");
@@ -177,11 +175,11 @@ TEST(FrameAssembler, ReassemblesFramesSplitAtAnyByte) {
 TEST(FrameAssembler, RefusesALengthOverItsCapForGood) {
     const uint8_t atCap[] = {0, 0, 0, 16};
     const uint8_t over[] = {0, 0, 0, 17, 'x'};
-    glyphwell::port::FrameAssembler accepting(glyphwell::port::FrameAssembler::Kind::Reply, 16);
+    FrameAssembler accepting(FrameAssembler::Kind::Reply, 16);
     EXPECT_TRUE(accepting.Append(atCap, sizeof atCap));
     EXPECT_TRUE(accepting.IsMidFrame());
     EXPECT_FALSE(accepting.Failed());
-    glyphwell::port::FrameAssembler refusing(glyphwell::port::FrameAssembler::Kind::Reply, 16);
+    FrameAssembler refusing(FrameAssembler::Kind::Reply, 16);
     EXPECT_FALSE(refusing.Append(over, sizeof over));
     EXPECT_TRUE(refusing.Failed());
     EXPECT_EQ(refusing.RefusedLength(), 17u);
@@ -191,8 +189,7 @@ TEST(FrameAssembler, RefusesALengthOverItsCapForGood) {
 }
 
 TEST(FrameAssembler, ReceivesABodyInPlaceWithMemoryFollowingWhatArrived) {
-    glyphwell::port::FrameAssembler assembler(glyphwell::port::FrameAssembler::Kind::Request,
-                                              1u << 20);
+    FrameAssembler assembler(FrameAssembler::Kind::Request, 1u << 20);
     size_t room = 0;
     EXPECT_EQ(assembler.BodyRoom(&room), nullptr) << "no body between frames";
     const uint8_t header[] = {0, 0, 0, 9, 0, 3, 0x0D, 0x40}; // 200,000 bytes
@@ -209,7 +206,7 @@ TEST(FrameAssembler, ReceivesABodyInPlaceWithMemoryFollowingWhatArrived) {
         assembler.CommitBody(count);
         received += count;
     }
-    glyphwell::port::Frame frame = assembler.TakeFrame();
+    Frame frame = assembler.TakeFrame();
     EXPECT_EQ(frame.msgid, 9);
     ASSERT_EQ(frame.body.Size(), 200000u);
     bool same = true;

@@ -18,43 +18,28 @@ using glyphwell::testing::Owned;
 
 namespace {
 
-std::string Text(CFStringRef string) {
-    return glyphwell::Describe(string);
-}
-
 // A new UUID parsed from `text` (null when malformed).
-CFUUIDRef Parse(const char* text) {
-    CFStringRef string = CFStringCreateWithCString(nullptr, text, kCFStringEncodingUTF8);
-    CFUUIDRef uuid = CFUUIDCreateFromString(nullptr, string);
-    CFRelease(string);
-    return uuid;
+Owned<CFUUIDRef> Parse(const char* text) {
+    auto string = Own(CFStringCreateWithCString(nullptr, text, kCFStringEncodingUTF8));
+    return Own(CFUUIDCreateFromString(nullptr, string.get()));
 }
 
-TEST(UUID, BytesGiveTheUpperCaseString) {
+TEST(UUID, BytesAndTextGiveEqualValuesInEitherCase) {
     CFUUIDBytes bytes = {0x01, 0x23, 0x45, 0x67, 0x89, 0xab, 0xcd, 0xef,
                          0x00, 0x11, 0x22, 0x33, 0x44, 0x55, 0x66, 0xff};
-    CFUUIDRef uuid = CFUUIDCreateFromUUIDBytes(nullptr, bytes);
-    EXPECT_EQ(CFGetTypeID(uuid), CFUUIDGetTypeID());
-    CFStringRef string = CFUUIDCreateString(nullptr, uuid);
-    EXPECT_EQ(Text(string), "01234567-89AB-CDEF-0011-2233445566FF");
-    CFUUIDBytes back = CFUUIDGetUUIDBytes(uuid);
+    auto uuid = Own(CFUUIDCreateFromUUIDBytes(nullptr, bytes));
+    EXPECT_EQ(CFGetTypeID(uuid.get()), CFUUIDGetTypeID());
+    EXPECT_EQ(glyphwell::Describe(Own(CFUUIDCreateString(nullptr, uuid.get())).get()),
+              "01234567-89AB-CDEF-0011-2233445566FF");
+    CFUUIDBytes back = CFUUIDGetUUIDBytes(uuid.get());
     EXPECT_EQ(std::memcmp(&back, &bytes, 16), 0);
-    CFRelease(string);
-    CFRelease(uuid);
-}
 
-TEST(UUID, ParsesEitherCaseIntoEqualValues) {
-    CFUUIDRef lower = Parse("0a1b2c3d-4e5f-6071-8293-a4b5c6d7e8f9");
-    CFUUIDRef upper = Parse("0A1B2C3D-4E5F-6071-8293-A4B5C6D7E8F9");
-    ASSERT_NE(lower, nullptr);
-    ASSERT_NE(upper, nullptr);
-    EXPECT_TRUE(CFEqual(lower, upper));
-    EXPECT_EQ(CFHash(lower), CFHash(upper));
-    CFUUIDBytes bytes = CFUUIDGetUUIDBytes(lower);
-    EXPECT_EQ(bytes.byte0, 0x0a);
-    EXPECT_EQ(bytes.byte15, 0xf9);
-    CFRelease(lower);
-    CFRelease(upper);
+    auto lower = Parse("01234567-89ab-cdef-0011-2233445566ff");
+    auto upper = Parse("01234567-89AB-CDEF-0011-2233445566FF");
+    ASSERT_TRUE(lower && upper);
+    EXPECT_TRUE(CFEqual(lower.get(), upper.get()));
+    EXPECT_TRUE(CFEqual(lower.get(), uuid.get()));
+    EXPECT_EQ(CFHash(lower.get()), CFHash(uuid.get()));
 }
 
 TEST(UUID, MalformedTextGivesNull) {
@@ -62,18 +47,15 @@ TEST(UUID, MalformedTextGivesNull) {
          {"", "0a1b2c3d-4e5f-6071-8293-a4b5c6d7e8f", "0a1b2c3d-4e5f-6071-8293-a4b5c6d7e8f90",
           "0a1b2c3d4e5f-6071-8293-a4b5c6d7e8f9-", "0a1b2c3d-4e5f-6071-8293_a4b5c6d7e8f9",
           "0a1b2c3d-4e5f-6071-8293-a4b5c6d7e8g9", "0a1b2c3d-4e5f-6071-8293-a4b5c6d7e8\xc3\xa9"})
-        EXPECT_EQ(Parse(text), nullptr) << text;
+        EXPECT_FALSE(Parse(text)) << text;
 }
 
 TEST(UUID, CreateMakesDistinctVersion4Values) {
-    CFUUIDRef a = CFUUIDCreate(nullptr);
-    CFUUIDRef b = CFUUIDCreate(nullptr);
-    EXPECT_FALSE(CFEqual(a, b));
-    CFUUIDBytes bytes = CFUUIDGetUUIDBytes(a);
+    auto a = Own(CFUUIDCreate(nullptr)), b = Own(CFUUIDCreate(nullptr));
+    EXPECT_FALSE(CFEqual(a.get(), b.get()));
+    CFUUIDBytes bytes = CFUUIDGetUUIDBytes(a.get());
     EXPECT_EQ(bytes.byte6 >> 4, 4);
     EXPECT_EQ(bytes.byte8 >> 6, 2);
-    CFRelease(a);
-    CFRelease(b);
 }
 
 // A one-entry dictionary with property-value callbacks (empty without a key).
@@ -124,20 +106,15 @@ TEST(Error, EqualityComparesDomainCodeAndUserInfo) {
     EXPECT_EQ(CFHash(withReason.get()), CFHash(withReasonAgain.get()));
 }
 
-TEST(Date, ComparesByAbsoluteTime) {
+TEST(Date, ComparesByAbsoluteTimeAndDescribesItInUTC) {
     auto a = Own(CFDateCreate(nullptr, 12.5)), b = Own(CFDateCreate(nullptr, 12.5));
     EXPECT_EQ(CFGetTypeID(a.get()), CFDateGetTypeID());
     EXPECT_EQ(CFDateGetAbsoluteTime(a.get()), 12.5);
     EXPECT_TRUE(CFEqual(a.get(), b.get()));
     EXPECT_EQ(CFHash(a.get()), CFHash(b.get()));
     EXPECT_FALSE(CFEqual(a.get(), Own(CFDateCreate(nullptr, 13.0)).get()));
-}
-
-TEST(Date, DescriptionAndCurrentTime) {
-    CFDateRef epoch = CFDateCreate(nullptr, 86400 + 3661);
-    std::string text = glyphwell::Describe(epoch);
+    std::string text = glyphwell::Describe(Own(CFDateCreate(nullptr, 86400 + 3661)).get());
     EXPECT_EQ(text.substr(text.find('>') + 1), " 2001-01-02 01:01:01 +0000");
-    CFRelease(epoch);
     // 2020-01-01 is 599,616,000 s after the reference date.
     EXPECT_GT(CFAbsoluteTimeGetCurrent(), 599616000.0);
 }
