@@ -34,9 +34,16 @@ TEST(FlattenKinds, WritesTheDocumentedBytesForEveryKind) {
     Ref base(CFURLCreateWithString(nullptr, CFSTR("http://h/a/b"), nullptr));
     const UInt8 bytes[] = {0xDE, 0xAD, 0x00};
     const CFUUIDBytes uuidBytes = {0, 1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11, 12, 13, 14, 15};
+    auto unconvertible = [](size_t before) { // long texts are converted in the output itself
+        std::vector<UniChar> units(before, 'x');
+        units.push_back(0xD800);
+        return Ref(CFStringCreateWithCharacters(nullptr, units.data(), CFIndex(units.size())));
+    };
+    const std::string longURL = "http://h/" + Repeat("a", 0x100000);
     const struct {
         Ref value;
         const char* hex;
+        Lines log = {};
     } rows[] = {
         {Str("abc"), "00 00 00 07 00 00 00 03 61 62 63"},
         {Dict({}), "00 00 00 10 00 00 00 00"},
@@ -76,10 +83,24 @@ TEST(FlattenKinds, WritesTheDocumentedBytesForEveryKind) {
          "00 00 00 11 00 00 00 03 00 00 00 07 00 00 00 01 61 00 00 00 11 00 00 00 01 00 00 01 03 "
          "00 00 00 01 00 00 00 01 03 00 00 00 01 01"},
         {Str("\xF0\x9F\x98\x80"), "00 00 00 07 00 00 00 04 F0 9F 98 80"},
+        // What a reader would refuse or the text cannot be converted is written empty, and the
+        // stream goes on.
+        {Array({unconvertible(0).get(), kCFBooleanTrue}),
+         "00 00 00 11 00 00 00 02 00 00 00 07 00 00 00 00 00 00 01 03 00 00 00 01 01",
+         {kStringFailed}},
+        {Array({unconvertible(100).get(), kCFBooleanTrue}),
+         "00 00 00 11 00 00 00 02 00 00 00 07 00 00 00 00 00 00 01 03 00 00 00 01 01",
+         {kStringFailed}},
+        {Ref(CFURLCreateWithBytes(nullptr, reinterpret_cast<const UInt8*>(longURL.data()),
+                                  CFIndex(longURL.size()), kCFStringEncodingUTF8, nullptr)),
+         "00 00 01 01 00 00 00 00",
+         {"ERROR: Quzel::TCFFlattenContext::FlattenCFURL failed."}},
     };
     for (const auto& row : rows) {
         SCOPED_TRACE(row.hex);
+        LogCapture log;
         EXPECT_EQ(Flattened(row.value.get()), row.hex);
+        EXPECT_EQ(log.Texts(), row.log);
     }
     EXPECT_EQ(Flattened(nullptr), "");
 }
@@ -106,30 +127,6 @@ TEST(FlattenStrings, TextsUpToWhatAReaderTakesAreWrittenWholeAndLongerOnesAsEmpt
         EXPECT_EQ(log.Texts(), row.fits ? Lines{} : Lines{kStringFailed});
         for (const auto& line : log.Lines())
             EXPECT_TRUE(line.channel == glyphwell::LogChannel::System && line.level == 3);
-    }
-}
-
-TEST(FlattenURLs, WritesURLsTheReaderWouldRefuseAsEmpty) {
-    LogCapture log;
-    const std::string text = "http://h/" + Repeat("a", 0x100000);
-    Ref url(CFURLCreateWithBytes(nullptr, reinterpret_cast<const UInt8*>(text.data()),
-                                 CFIndex(text.size()), kCFStringEncodingUTF8, nullptr));
-    ASSERT_TRUE(url);
-    EXPECT_EQ(Flattened(url.get()), "00 00 01 01 00 00 00 00");
-    EXPECT_EQ(log.Texts(), Lines{"ERROR: Quzel::TCFFlattenContext::FlattenCFURL failed."});
-}
-
-TEST(FlattenStrings, WritesUnconvertibleTextAsEmptyAndGoesOn) {
-    // A short text and one long enough to be converted in the output buffer itself, which must
-    // then be cut back to the empty string's head.
-    for (size_t before : {0, 100}) {
-        LogCapture log;
-        std::vector<UniChar> units(before, 'x');
-        units.push_back(0xD800);
-        Ref broken(CFStringCreateWithCharacters(nullptr, units.data(), CFIndex(units.size())));
-        EXPECT_EQ(Flattened(Array({broken.get(), kCFBooleanTrue}).get()),
-                  "00 00 00 11 00 00 00 02 00 00 00 07 00 00 00 00 00 00 01 03 00 00 00 01 01");
-        EXPECT_EQ(log.Texts(), Lines{kStringFailed});
     }
 }
 
@@ -211,16 +208,6 @@ TEST(FlattenEstimates, MatchTheBytesWrittenExceptForStringsAndCharacterSets) {
 
     Ref set(CFCharacterSetCreateWithCharactersInRange(nullptr, CFRangeMake(0x1F600, 2)));
     EXPECT_EQ(TCFFlattenContext::EstimateSize(set.get()), 8200 + 8193);
-}
-
-TEST(FlattenPrimitives, ConvertToBigEndianSwapsOnlyTwoFourAndEightBytes) {
-    uint8_t two[] = {1, 2}, three[] = {1, 2, 3}, eight[] = {1, 2, 3, 4, 5, 6, 7, 8};
-    EXPECT_EQ(ConvertToBigEndian(two, 2), two);
-    EXPECT_EQ(ToHex(two, 2), "02 01");
-    ConvertToBigEndian(three, 3);
-    EXPECT_EQ(ToHex(three, 3), "01 02 03");
-    ConvertToBigEndian(eight, 8);
-    EXPECT_EQ(ToHex(eight, 8), "08 07 06 05 04 03 02 01");
 }
 
 TEST(FlattenPrimitives, StreamOutSwapsEachElementAndLeavesTheSourceAlone) {

@@ -149,9 +149,7 @@ TEST(Resurrect, EachStreamReadsAsItsValueWithItsExactLogLines) {
     }
 }
 
-TEST(Resurrect, SharedValuesComeBackAsThemselves) {
-    EXPECT_EQ(ReadAs(Hex("00 00 01 03 00 00 00 01 07")).value.get(), kCFBooleanTrue);
-    EXPECT_EQ(ReadAs(Hex("00 00 01 03 00 00 00 01 00")).value.get(), kCFBooleanFalse);
+TEST(Resurrect, EmptyAndEqualTextsAreSharedStrings) {
     EXPECT_EQ(ReadAs(Hex("00 00 00 07 00 00 00 00")).value.get(), CFSTR(""));
     EXPECT_EQ(ReadAs(Hex("00 00 00 07 FF FF FF FF")).value.get(), CFSTR(""));
     // Equal texts share one object.

@@ -20,30 +20,26 @@ public:
     explicit ValueGenerator(unsigned seed) : random_(seed) {}
 
     Ref Any(int depth) {
-        const int kinds = depth > 0 ? 14 : 11;
-        // Texts, numbers and data come twice as often as the other scalars.
-        switch (Below(kinds)) {
-        case 0:
-        case 8:
+        // Texts, numbers and data come twice as often as the other scalars; containers only
+        // above the last level.
+        switch ("TNBDCUIETNDAAM"[Below(depth > 0 ? 14 : 11)]) {
+        case 'T':
             return Text();
-        case 1:
-        case 9:
+        case 'N':
             return Number();
-        case 2:
+        case 'B':
             return Ref(CFRetain(Below(2) ? kCFBooleanTrue : kCFBooleanFalse));
-        case 3:
-        case 10:
+        case 'D':
             return Data();
-        case 4:
+        case 'C':
             return CharacterSet();
-        case 5:
+        case 'U':
             return URL();
-        case 6:
+        case 'I':
             return UUID();
-        case 7:
+        case 'E':
             return Error();
-        case 11:
-        case 12:
+        case 'A':
             return Collection(depth - 1, Below(2));
         default:
             return Dictionary(depth - 1);
