@@ -1,5 +1,5 @@
 // String utilities: tilde expansion against the password database, regional suffixes and the
-// language fallback, four-character codes, null-safe equality and the shared unique strings.
+// language fallback, four-character codes and null-safe equality.
 #include <pwd.h>
 #include <string>
 #include <unistd.h>
@@ -153,14 +153,4 @@ TEST(FourCharacterCode, ReadsBytesMostSignificantFirstAsMacRoman) {
     EXPECT_EQ(TextOf(accented.get()), "\xC3\xA9\xE2\x80\xA2  ");
     TCFString adopted(UInt32(0x41424344));
     EXPECT_EQ(TextOf(adopted), "ABCD");
-}
-
-TEST(UniqueString, EqualTextsShareOneString) {
-    Ref a = Str("glyphwell-unique-text"), b = Str("glyphwell-unique-text");
-    CFStringRef first = TCFStr(a.as<CFStringRef>()).GetUniqueString();
-    CFStringRef second = TCFStr(b.as<CFStringRef>()).GetUniqueString();
-    ASSERT_NE(first, nullptr);
-    EXPECT_EQ(first, second);
-    EXPECT_EQ(TextOf(first), "glyphwell-unique-text");
-    EXPECT_EQ(TCFStr(nullptr).GetUniqueString(), nullptr);
 }
