@@ -77,16 +77,16 @@ CFStringRef TCFStr::CreateStringByExpandingTildeInPath(CFStringRef path) {
 }
 
 CFStringRef TCFStr::CreateSubstringWithoutRegionalSuffix() const {
-    if (!string_)
+    if (!ref_)
         return nullptr;
     CFRange separator = Find(CFSTR("_"), 0);
     if (separator.location == kCFNotFound)
         separator = Find(CFSTR("-"), 0);
     if (separator.location != kCFNotFound && !HasPrefix(CFSTR("zh")))
         return CreateSubstring(CFRangeMake(0, separator.location));
-    return TCFRetain(string_);
+    return TCFRetain(ref_);
 }
 
 CFStringRef TCFStr::GetUniqueString() const {
-    return string_ ? TCFStringUniquer().GetUniqueString(string_) : nullptr;
+    return ref_ ? TCFStringUniquer().GetUniqueString(ref_) : nullptr;
 }

@@ -11,7 +11,7 @@ CFMutableArrayRef TCFMutableArray::CreateEmptyArray(CFIndex capacity) {
 TCFMutableArray::TCFMutableArray(CFIndex count, const void** values,
                                  const CFArrayCallBacks* callBacks)
     : TCFArray(CFArrayCreateMutable(kCFAllocatorDefault, 0, callBacks), kAdopted) {
-    if (array_ && count > 0)
+    if (ref_ && count > 0)
         CFArrayReplaceValues(GetMutable(), CFRangeMake(0, 0), values, count);
 }
 
@@ -24,7 +24,7 @@ TCFMutableArray::TCFMutableArray(CFMutableArrayRef array)
     : TCFArray(array ? TCFRetain(array) : CreateEmptyArray(0), kAdopted) {}
 
 bool TCFSortedArray::InsertUnique(const void* value) {
-    CFArray_sequence<const void*> elements(array_);
+    CFArray_sequence<const void*> elements(ref_);
     auto [first, last] = std::equal_range(elements.begin(), elements.end(), value,
                                           TCFComparatorFunctor<-1>(comparator_, context_));
     if (first != last)

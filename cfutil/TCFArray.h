@@ -10,53 +10,34 @@
 #include "platform/CFArray.h"
 
 /// A view of an array value: does not retain, does not release.
-template <class T> class TCFDeque {
+template <class T> class TCFDeque : public TCFReferenceSlot<CFArrayRef> {
 public:
     /// Stores `array` (may be null); does not retain.
-    explicit TCFDeque(CFArrayRef array) : array_(array) {}
+    explicit TCFDeque(CFArrayRef array) : TCFReferenceSlot(array) {}
 
-    /// The held array; does not retain.
-    operator CFArrayRef() const { return array_; }
     /// The element count; 0 for null.
-    CFIndex GetCount() const { return array_ ? CFArrayGetCount(array_) : 0; }
+    CFIndex GetCount() const { return ref_ ? CFArrayGetCount(ref_) : 0; }
     /// The element at `index` (kept below GetCount() by the caller) as T; null for a null array.
     /// Does not retain.
     T At(CFIndex index) const {
-        if (!array_)
+        if (!ref_)
             return nullptr;
-        return static_cast<T>(const_cast<void*>(CFArrayGetValueAtIndex(array_, index)));
+        return static_cast<T>(const_cast<void*>(CFArrayGetValueAtIndex(ref_, index)));
     }
-
-protected:
-    CFArrayRef array_;
 };
 
 /// Owns one count of an array value and releases it when destroyed. Cannot be copied.
-template <class T> class TCFArray : public TCFDeque<T> {
+template <class T> class TCFArray : public TCFReferenceHolder<CFArrayRef, TCFDeque<T>> {
 public:
-    /// Retains `array` (null-safe).
-    explicit TCFArray(CFArrayRef array) : TCFDeque<T>(TCFSafeRetain(array)) {}
-    /// Adopts `array` (no retain; may be null).
-    TCFArray(CFArrayRef array, adopted_t) : TCFDeque<T>(array) {}
+    /// Retains `array` (null-safe), or adopts it with kAdopted (no retain; may be null).
+    using TCFReferenceHolder<CFArrayRef, TCFDeque<T>>::TCFReferenceHolder;
     /// Creates an immutable array of the `count` `values`, handled by `callBacks`.
     TCFArray(const void** values, CFIndex count, const CFArrayCallBacks* callBacks)
-        : TCFDeque<T>(CFArrayCreate(kCFAllocatorDefault, values, count, callBacks)) {}
-    TCFArray(const TCFArray&) = delete;
-    TCFArray& operator=(const TCFArray&) = delete;
-    /// Releases the held array (null-safe).
-    ~TCFArray() { TCFSafeRelease(this->array_); }
-
-    /// Returns the held array with its count and leaves this wrapper null; the caller releases
-    /// the result.
-    CFArrayRef Orphan() {
-        CFArrayRef array = this->array_;
-        this->array_ = nullptr;
-        return array;
-    }
+        : TCFArray(CFArrayCreate(kCFAllocatorDefault, values, count, callBacks), kAdopted) {}
 };
 
 /// Owns a mutable array of untyped references. Every constructor leaves it holding an array.
-class TCFMutableArray : TNoncopyable, public TCFArray<const void*> {
+class TCFMutableArray : public TCFArray<const void*> {
 public:
     /// Creates an empty array of property values (retained, compared with CFEqual); `capacity`
     /// 0 means unlimited. Any integer type is taken, so that TCFMutableArray(0) is not mistaken
@@ -74,7 +55,7 @@ public:
     explicit TCFMutableArray(CFMutableArrayRef array);
 
     /// The held array typed as mutable; does not retain.
-    CFMutableArrayRef GetMutable() const { return const_cast<CFMutableArrayRef>(array_); }
+    CFMutableArrayRef GetMutable() const { return const_cast<CFMutableArrayRef>(ref_); }
     /// Appends `value`, which the array's callbacks retain.
     void Append(const void* value) const { CFArrayAppendValue(GetMutable(), value); }
     /// Appends the elements of `range` of `other`.
@@ -97,15 +78,15 @@ protected:
 
 /// A mutable array of property values that is created by the first Append: until then it holds
 /// null, GetCount() is 0 and Orphan() yields null, so an empty result costs no allocation.
-class TCFLazyMutableArray : TNoncopyable, public TCFArray<const void*> {
+class TCFLazyMutableArray : public TCFArray<const void*> {
 public:
     /// Holds no array.
     TCFLazyMutableArray() : TCFArray(nullptr, kAdopted) {}
 
     /// Creates an empty array of property values with unlimited capacity when none is held.
     void LazyCreate() {
-        if (!array_)
-            array_ = CFArrayCreateMutable(kCFAllocatorDefault, 0, &kCFTypeArrayCallBacks);
+        if (!ref_)
+            Adopt(CFArrayCreateMutable(kCFAllocatorDefault, 0, &kCFTypeArrayCallBacks));
     }
     /// LazyCreate(), then appends `value`, which the array retains.
     void Append(const void* value) {
@@ -113,7 +94,7 @@ public:
         CFArrayAppendValue(GetMutable(), value);
     }
     /// The held array typed as mutable, or null while nothing was appended; does not retain.
-    CFMutableArrayRef GetMutable() const { return const_cast<CFMutableArrayRef>(array_); }
+    CFMutableArrayRef GetMutable() const { return const_cast<CFMutableArrayRef>(ref_); }
 };
 
 /// A mutable array of untyped references kept in ascending order by a three-way comparison

@@ -99,16 +99,4 @@ int TCFBlob::WriteToURL(CFURLRef url) const {
     return error;
 }
 
-TCFData::TCFData(CFDataRef data) : TCFBlob(TCFSafeRetain(data)) {}
-
-TCFData::TCFData(CFURLRef url) : TCFBlob(CreateDataFromFile(url)) {}
-
-TCFData::~TCFData() {
-    TCFSafeRelease(data_);
-}
-
-CFDataRef TCFData::Orphan() {
-    CFDataRef data = data_;
-    data_ = nullptr;
-    return data;
-}
+TCFData::TCFData(CFURLRef url) : TCFReferenceHolder(CreateDataFromFile(url), kAdopted) {}

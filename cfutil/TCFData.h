@@ -5,21 +5,20 @@
 
 #include <cstddef>
 
+#include "cfutil/TCFRetained.h"
 #include "platform/CFData.h"
 #include "platform/CFURL.h"
 
 /// A view of a data value: does not retain, does not release.
-class TCFBlob {
+class TCFBlob : public TCFReferenceSlot<CFDataRef> {
 public:
     /// Stores `data` (may be null); does not retain.
-    explicit TCFBlob(CFDataRef data) : data_(data) {}
+    explicit TCFBlob(CFDataRef data) : TCFReferenceSlot(data) {}
 
-    /// The held data; does not retain.
-    operator CFDataRef() const { return data_; }
     /// The first byte, or null for null data; valid while the data lives unchanged.
-    const UInt8* GetPtr() const { return GetDataPtr(data_); }
+    const UInt8* GetPtr() const { return GetDataPtr(ref_); }
     /// The byte count; 0 for null data.
-    CFIndex GetLength() const { return data_ ? CFDataGetLength(data_) : 0; }
+    CFIndex GetLength() const { return ref_ ? CFDataGetLength(ref_) : 0; }
     /// The first byte of `data`, or null for null data.
     static const UInt8* GetDataPtr(CFDataRef data) {
         return data ? CFDataGetBytePtr(data) : nullptr;
@@ -30,30 +29,19 @@ public:
     /// value of the failing open, write or close; EINVAL for a null URL or one without a POSIX
     /// path.
     int WriteToURL(CFURLRef url) const;
-
-protected:
-    CFDataRef data_;
 };
 
 /// Owns one count of a data value and releases it when destroyed. Cannot be copied.
-class TCFData : public TCFBlob {
+class TCFData : public TCFReferenceHolder<CFDataRef, TCFBlob> {
 public:
-    /// Retains `data` (null-safe).
-    explicit TCFData(CFDataRef data);
+    /// Retains `data` (null-safe), or adopts it with kAdopted (no retain; may be null).
+    using TCFReferenceHolder::TCFReferenceHolder;
     /// Holds null.
-    explicit TCFData(std::nullptr_t) : TCFBlob(nullptr) {}
+    explicit TCFData(std::nullptr_t) : TCFReferenceHolder(nullptr, kAdopted) {}
     /// Reads the whole file of `url` (its absolute POSIX path) into a new data value. Holds null
     /// when the URL is null, the item is not a regular file (its size property is absent, see
     /// kCFURLFileSizeKey), the file is empty or cannot be opened or read, or its size cannot be
     /// held in memory. The size is taken before reading: a file that shrank meanwhile gives the
     /// bytes it still has, one that grew gives its first size's worth of bytes.
     explicit TCFData(CFURLRef url);
-    TCFData(const TCFData&) = delete;
-    TCFData& operator=(const TCFData&) = delete;
-    /// Releases the held data (null-safe).
-    ~TCFData();
-
-    /// Returns the held data with its count and leaves this wrapper null; the caller releases
-    /// the result.
-    CFDataRef Orphan();
 };

@@ -4,19 +4,10 @@
 #include "cfutil/TStackBuffer.h"
 
 TCFDictionary::TCFDictionary(const void** keys, const void** values, CFIndex count)
-    : TCFDict(CFDictionaryCreate(kCFAllocatorDefault, keys, values, count,
-                                 &kCFTypeDictionaryKeyCallBacks,
-                                 &kCFTypeDictionaryValueCallBacks)) {}
-
-TCFDictionary::~TCFDictionary() {
-    TCFSafeRelease(dictionary_);
-}
-
-CFDictionaryRef TCFDictionary::Orphan() {
-    CFDictionaryRef dictionary = dictionary_;
-    dictionary_ = nullptr;
-    return dictionary;
-}
+    : TCFDictionary(CFDictionaryCreate(kCFAllocatorDefault, keys, values, count,
+                                       &kCFTypeDictionaryKeyCallBacks,
+                                       &kCFTypeDictionaryValueCallBacks),
+                    kAdopted) {}
 
 TCFMutableDictionary::TCFMutableDictionary(CFIndex capacity)
     : TCFDictionary(CFDictionaryCreateMutable(kCFAllocatorDefault, capacity,
@@ -25,7 +16,7 @@ TCFMutableDictionary::TCFMutableDictionary(CFIndex capacity)
                     kAdopted) {}
 
 bool TCFDict::ContainsSubset(CFDictionaryRef other) const {
-    if (!dictionary_)
+    if (!ref_)
         return false;
     TCFDict subset(other);
     TStackBuffer<const void*, 30> keys{uint64_t(subset.GetCount())};
@@ -55,7 +46,7 @@ bool IsArray(CFTypeRef value) {
 
 CFDictionaryRef TCFDict::CreateDictionaryFilteredByKey(CFSetRef keys) const {
     if (!keys || CFSetGetCount(keys) == 0)
-        return TCFSafeRetain(dictionary_);
+        return TCFSafeRetain(ref_);
     KeyFilterContext filter(keys);
     ApplyFunction(AddPairWithWantedKey, &filter);
     return filter.OrphanResult();

@@ -15,30 +15,28 @@
 #include "platform/CFString.h"
 
 /// A view of a dictionary value: does not retain, does not release.
-class TCFDict {
+class TCFDict : public TCFReferenceSlot<CFDictionaryRef> {
 public:
     /// Stores `dictionary` (may be null); does not retain.
-    explicit TCFDict(CFDictionaryRef dictionary) : dictionary_(dictionary) {}
+    explicit TCFDict(CFDictionaryRef dictionary) : TCFReferenceSlot(dictionary) {}
 
-    /// The held dictionary; does not retain.
-    operator CFDictionaryRef() const { return dictionary_; }
     /// The number of pairs; 0 for null.
-    CFIndex GetCount() const { return dictionary_ ? CFDictionaryGetCount(dictionary_) : 0; }
+    CFIndex GetCount() const { return ref_ ? CFDictionaryGetCount(ref_) : 0; }
     /// The value for `key`, or null when absent or for null; does not retain.
     const void* GetValue(const void* key) const {
-        return dictionary_ ? CFDictionaryGetValue(dictionary_, key) : nullptr;
+        return ref_ ? CFDictionaryGetValue(ref_, key) : nullptr;
     }
     /// Fills `keys` and `values` (caller arrays of GetCount() entries) pairwise; leaves them
     /// untouched for null. Does not retain.
     void GetKeysAndValues(const void** keys, const void** values) const {
-        if (dictionary_)
-            CFDictionaryGetKeysAndValues(dictionary_, keys, values);
+        if (ref_)
+            CFDictionaryGetKeysAndValues(ref_, keys, values);
     }
     /// Calls function(key, value, context) once for each pair; nothing for null. The function
     /// must not change this dictionary.
     void ApplyFunction(CFDictionaryApplierFunction function, void* context) const {
-        if (dictionary_)
-            CFDictionaryApplyFunction(dictionary_, function, context);
+        if (ref_)
+            CFDictionaryApplyFunction(ref_, function, context);
     }
 
     /// True when every key of `other` is present here with an equal value (CFEqual). False when
@@ -49,39 +47,27 @@ public:
     /// when `keys` is null or empty, this dictionary itself with one more count (null for null),
     /// without copying or filtering anything.
     CFDictionaryRef CreateDictionaryFilteredByKey(CFSetRef keys) const;
-
-protected:
-    CFDictionaryRef dictionary_;
 };
 
 /// Owns one count of a dictionary value and releases it when destroyed. Cannot be copied.
-class TCFDictionary : public TCFDict {
+class TCFDictionary : public TCFReferenceHolder<CFDictionaryRef, TCFDict> {
 public:
     /// Creates an immutable dictionary of `count` pairs, keys and values retained and compared
     /// as property values.
     TCFDictionary(const void** keys, const void** values, CFIndex count);
     /// Adopts `dictionary` (no retain; may be null).
-    TCFDictionary(CFDictionaryRef dictionary, adopted_t) : TCFDict(dictionary) {}
-    TCFDictionary(const TCFDictionary&) = delete;
-    TCFDictionary& operator=(const TCFDictionary&) = delete;
-    /// Releases the held dictionary (null-safe).
-    ~TCFDictionary();
-
-    /// Returns the held dictionary with its count and leaves this wrapper null; the caller
-    /// releases the result.
-    CFDictionaryRef Orphan();
+    TCFDictionary(CFDictionaryRef dictionary, adopted_t)
+        : TCFReferenceHolder(dictionary, kAdopted) {}
 };
 
 /// Owns a new, initially empty mutable dictionary with property-value keys and values.
-class TCFMutableDictionary : TNoncopyable, public TCFDictionary {
+class TCFMutableDictionary : public TCFDictionary {
 public:
     /// Creates an empty mutable dictionary; `capacity` 0 means unlimited.
     explicit TCFMutableDictionary(CFIndex capacity = 0);
 
     /// The held dictionary typed as mutable; does not retain.
-    CFMutableDictionaryRef GetMutable() const {
-        return const_cast<CFMutableDictionaryRef>(dictionary_);
-    }
+    CFMutableDictionaryRef GetMutable() const { return const_cast<CFMutableDictionaryRef>(ref_); }
     /// Adds the pair, or replaces the value of an equal key; the dictionary retains both.
     void SetPair(const void* key, const void* value) const {
         CFDictionarySetValue(GetMutable(), key, value);

@@ -91,13 +91,3 @@ bool TCFNumber::GetCFNumberValueSafely<unsigned long>(CFTypeRef value, unsigned 
     GetCFNumberValue(value, out);
     return true;
 }
-
-TCFNumber::~TCFNumber() {
-    TCFSafeRelease(number_);
-}
-
-CFNumberRef TCFNumber::Orphan() {
-    CFNumberRef number = number_;
-    number_ = nullptr;
-    return number;
-}

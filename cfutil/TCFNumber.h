@@ -11,17 +11,15 @@
 // platform's boolean values: CreateFromBoolean hands out one of two shared numbers.
 #pragma once
 
+#include "cfutil/TCFRetained.h"
 #include "platform/CFNumber.h"
 #include "platform/CFString.h"
 
-class TCFNumber {
+class TCFNumber : public TCFReferenceHolder<CFNumberRef> {
 public:
     /// Adopts Create<T>(value).
-    template <class T> explicit TCFNumber(T value) : number_(Create<T>(value)) {}
-    TCFNumber(const TCFNumber&) = delete;
-    TCFNumber& operator=(const TCFNumber&) = delete;
-    /// Releases the held number (null-safe).
-    ~TCFNumber();
+    template <class T>
+    explicit TCFNumber(T value) : TCFReferenceHolder(Create<T>(value), kAdopted) {}
 
     /// A new number of the platform number type for T holding `value` (see the table above).
     /// Returns a new reference; the caller releases it. Null only when the platform refuses.
@@ -50,15 +48,6 @@ public:
     /// Like GetCFNumberValue, for any property value or null: returns true when `out` was taken
     /// from a number or boolean, false with `out` set to 0 otherwise. Does not retain.
     template <class T> static bool GetCFNumberValueSafely(CFTypeRef value, T& out);
-
-    /// The held number; does not retain.
-    operator CFNumberRef() const { return number_; }
-    /// Returns the held number with its count and leaves this wrapper null; the caller
-    /// releases the result.
-    CFNumberRef Orphan();
-
-private:
-    CFNumberRef number_;
 };
 
 template <> CFNumberRef TCFNumber::Create<SInt8>(SInt8 value);

@@ -25,7 +25,7 @@ void TCFMutableSet::AddValues(CFArrayRef array) const {
 void TCFMutableSet::Union(CFSetRef other) const {
     // Adding a set to itself changes nothing; skipping it also keeps the set from being changed
     // while it is enumerated.
-    if (!other || other == set_)
+    if (!other || other == ref_)
         return;
     CFSetApplyFunction(other, AddToSet, GetMutable());
 }
@@ -34,7 +34,7 @@ void TCFMutableSet::MinusSet(CFSetRef other) const {
     if (!other)
         return;
     // Removing members of the set that is being enumerated would corrupt the enumeration.
-    if (other == set_) {
+    if (other == ref_) {
         CFSetRemoveAllValues(GetMutable());
         return;
     }

@@ -8,39 +8,21 @@
 #include "platform/CFSet.h"
 
 /// Owns one count of a set value and releases it when destroyed. Cannot be copied.
-template <class T> class TCFSet {
+template <class T> class TCFSet : public TCFReferenceHolder<CFSetRef> {
 public:
-    /// Retains `set` (null-safe).
-    explicit TCFSet(CFSetRef set) : set_(TCFSafeRetain(set)) {}
-    /// Adopts `set` (no retain; may be null).
-    TCFSet(CFSetRef set, adopted_t) : set_(set) {}
-    TCFSet(const TCFSet&) = delete;
-    TCFSet& operator=(const TCFSet&) = delete;
-    /// Releases the held set (null-safe).
-    ~TCFSet() { TCFSafeRelease(set_); }
+    /// Retains `set` (null-safe), or adopts it with kAdopted (no retain; may be null).
+    using TCFReferenceHolder::TCFReferenceHolder;
 
-    /// The held set; does not retain.
-    operator CFSetRef() const { return set_; }
     /// The member count; 0 for null.
-    CFIndex GetCount() const { return set_ ? CFSetGetCount(set_) : 0; }
+    CFIndex GetCount() const { return ref_ ? CFSetGetCount(ref_) : 0; }
     /// Fills `values` (a caller array of GetCount() entries) with the members; leaves it
     /// untouched for null. Does not retain.
     void GetValues(const void** values) const {
-        if (set_)
-            CFSetGetValues(set_, values);
+        if (ref_)
+            CFSetGetValues(ref_, values);
     }
     /// True when the set holds a member equal to `value`; false for null.
-    bool ContainsValue(T value) const { return set_ && CFSetContainsValue(set_, value); }
-    /// Returns the held set with its count and leaves this wrapper null; the caller releases
-    /// the result.
-    CFSetRef Orphan() {
-        CFSetRef set = set_;
-        set_ = nullptr;
-        return set;
-    }
-
-protected:
-    CFSetRef set_;
+    bool ContainsValue(T value) const { return ref_ && CFSetContainsValue(ref_, value); }
 };
 
 /// Owns a mutable set of untyped references, with set algebra in place.
@@ -61,7 +43,7 @@ public:
     TCFMutableSet(CFMutableSetRef set, adopted_t) : TCFSet(set, kAdopted) {}
 
     /// The held set typed as mutable; does not retain.
-    CFMutableSetRef GetMutable() const { return const_cast<CFMutableSetRef>(set_); }
+    CFMutableSetRef GetMutable() const { return const_cast<CFMutableSetRef>(ref_); }
     /// Adds `value` when no equal member is present; the set retains it.
     void AddValue(const void* value) const { CFSetAddValue(GetMutable(), value); }
     /// Removes the member equal to `value`, if any.

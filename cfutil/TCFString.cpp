@@ -1,9 +1,7 @@
 #include "cfutil/TCFString.h"
 
-#include "cfutil/TCFRetained.h"
-
 UniChar TCFStr::GetCharacterAtIndex(CFIndex index) const {
-    return string_ ? CFStringGetCharacterAtIndex(string_, index) : 0;
+    return ref_ ? CFStringGetCharacterAtIndex(ref_, index) : 0;
 }
 
 CFIndex TCFStr::GetMaxSize(CFStringEncoding encoding) const {
@@ -11,45 +9,35 @@ CFIndex TCFStr::GetMaxSize(CFStringEncoding encoding) const {
 }
 
 bool TCFStr::GetCString(char* buffer, CFIndex size, CFStringEncoding encoding) const {
-    return string_ && CFStringGetCString(string_, buffer, size, encoding);
+    return ref_ && CFStringGetCString(ref_, buffer, size, encoding);
 }
 
 CFIndex TCFStr::GetMaxSizeOfFileSystemRepresentation() const {
-    return string_ ? CFStringGetMaximumSizeOfFileSystemRepresentation(string_) : 0;
+    return ref_ ? CFStringGetMaximumSizeOfFileSystemRepresentation(ref_) : 0;
 }
 
 bool TCFStr::GetFileSystemRepresentation(char* buffer, CFIndex size) const {
-    return string_ && CFStringGetFileSystemRepresentation(string_, buffer, size);
+    return ref_ && CFStringGetFileSystemRepresentation(ref_, buffer, size);
 }
 
 CFRange TCFStr::Find(CFStringRef string, CFStringCompareFlags options) const {
-    if (!string_ || !string)
+    if (!ref_ || !string)
         return CFRangeMake(kCFNotFound, 0);
-    return CFStringFind(string_, string, options);
+    return CFStringFind(ref_, string, options);
 }
 
 bool TCFStr::HasPrefix(CFStringRef prefix) const {
-    return string_ && prefix && CFStringHasPrefix(string_, prefix);
+    return ref_ && prefix && CFStringHasPrefix(ref_, prefix);
 }
 
 CFStringRef TCFStr::CreateSubstring(CFRange range) const {
-    return string_ ? CFStringCreateWithSubstring(kCFAllocatorDefault, string_, range) : nullptr;
+    return ref_ ? CFStringCreateWithSubstring(kCFAllocatorDefault, ref_, range) : nullptr;
 }
 
-TCFString::TCFString(UInt32 code) : TCFStr(CFString::CopyAsString(code)) {}
+TCFString::TCFString(UInt32 code) : TCFString(CFString::CopyAsString(code)) {}
 
 TCFString::TCFString(const UInt8* bytes, CFIndex length, CFStringEncoding encoding)
-    : TCFStr(CFStringCreateWithBytes(kCFAllocatorDefault, bytes, length, encoding, false)) {}
-
-TCFString::~TCFString() {
-    TCFSafeRelease(string_);
-}
-
-CFStringRef TCFString::Orphan() {
-    CFStringRef string = string_;
-    string_ = nullptr;
-    return string;
-}
+    : TCFString(CFStringCreateWithBytes(kCFAllocatorDefault, bytes, length, encoding, false)) {}
 
 TCFMutableString::TCFMutableString(CFIndex maxLength)
     : TCFString(CFStringCreateMutable(kCFAllocatorDefault, maxLength)) {}

@@ -4,18 +4,17 @@
 #pragma once
 
 #include "cfutil/CFStringUtilities.h"
+#include "cfutil/TCFRetained.h"
 #include "platform/CFString.h"
 
 /// A view of a string value: does not retain, does not release.
-class TCFStr {
+class TCFStr : public TCFReferenceSlot<CFStringRef> {
 public:
     /// Stores `string` (may be null); does not retain.
-    explicit TCFStr(CFStringRef string) : string_(string) {}
+    explicit TCFStr(CFStringRef string) : TCFReferenceSlot(string) {}
 
-    /// The held string; does not retain.
-    operator CFStringRef() const { return string_; }
     /// Length in UTF-16 units; 0 for null.
-    CFIndex GetLength() const { return string_ ? CFStringGetLength(string_) : 0; }
+    CFIndex GetLength() const { return ref_ ? CFStringGetLength(ref_) : 0; }
     /// The UTF-16 unit at `index` (kept below GetLength() by the caller); 0 for null.
     UniChar GetCharacterAtIndex(CFIndex index) const;
     /// The largest byte count GetLength() units can need in `encoding`.
@@ -54,29 +53,18 @@ public:
     /// The process-wide shared string with the held string's text (TCFStringUniquer), or null
     /// for null. Does not retain: the uniquer owns the result for the life of the process.
     CFStringRef GetUniqueString() const;
-
-protected:
-    CFStringRef string_;
 };
 
 /// Owns one count of a string value and releases it when destroyed. Cannot be copied.
-class TCFString : public TCFStr {
+class TCFString : public TCFReferenceHolder<CFStringRef, TCFStr> {
 public:
     /// Adopts `string` (no retain; may be null): meant for the result of a Create or Copy call.
-    explicit TCFString(CFStringRef string) : TCFStr(string) {}
+    explicit TCFString(CFStringRef string) : TCFReferenceHolder(string, kAdopted) {}
     /// Adopts CFString::CopyAsString(code): 0x61626364 gives "abcd".
     explicit TCFString(UInt32 code);
     /// Adopts a new string of `length` bytes in `encoding` (not as an external representation:
     /// a byte-order mark is kept as text); null when the bytes do not decode.
     TCFString(const UInt8* bytes, CFIndex length, CFStringEncoding encoding);
-    TCFString(const TCFString&) = delete;
-    TCFString& operator=(const TCFString&) = delete;
-    /// Releases the held string (null-safe).
-    ~TCFString();
-
-    /// Returns the held string with its count and leaves this wrapper null; the caller releases
-    /// the result.
-    CFStringRef Orphan();
 };
 
 /// Owns a new, initially empty mutable string.
@@ -86,7 +74,7 @@ public:
     explicit TCFMutableString(CFIndex maxLength = 0);
 
     /// The held string typed as mutable; does not retain.
-    CFMutableStringRef GetMutable() const { return const_cast<CFMutableStringRef>(string_); }
+    CFMutableStringRef GetMutable() const { return const_cast<CFMutableStringRef>(ref_); }
     /// Appends the text of `string`.
     void Append(CFStringRef string) const { CFStringAppend(GetMutable(), string); }
     /// Replaces the units of `range` with `string`.

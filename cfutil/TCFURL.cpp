@@ -34,19 +34,10 @@ bool IsURL(CFTypeRef value) {
 } // namespace
 
 TCFURL::TCFURL(CFStringRef path, is_file_t, CFURLRef baseURL)
-    : url_(path ? CFURLCreateWithFileSystemPathRelativeToBase(kCFAllocatorDefault, path,
-                                                              kCFURLPOSIXPathStyle, false, baseURL)
-                : nullptr) {}
-
-TCFURL::~TCFURL() {
-    TCFSafeRelease(url_);
-}
-
-CFURLRef TCFURL::Orphan() {
-    CFURLRef url = url_;
-    url_ = nullptr;
-    return url;
-}
+    : TCFURL(path ? CFURLCreateWithFileSystemPathRelativeToBase(
+                        kCFAllocatorDefault, path, kCFURLPOSIXPathStyle, false, baseURL)
+                  : nullptr,
+             kAdopted) {}
 
 CFTypeRef TCFURL::CopyNormalizedPath(CFURLRef url, bool asURL) {
     if (!url)
@@ -69,14 +60,14 @@ CFTypeRef TCFURL::CopyNormalizedPath(CFURLRef url, bool asURL) {
 }
 
 CFStringRef TCFURL::CopyNormalizedPath() const {
-    return static_cast<CFStringRef>(CopyNormalizedPath(url_, false));
+    return static_cast<CFStringRef>(CopyNormalizedPath(ref_, false));
 }
 
 CFArrayRef TCFURL::CreateComponentPathURLs() const {
-    if (!url_)
+    if (!ref_)
         return nullptr;
     TCFURLComponentsRFC2396 components;
-    if (!CFURLCopyComponents(url_, kCFURLComponentDecompositionRFC2396, &components) ||
+    if (!CFURLCopyComponents(ref_, kCFURLComponentDecompositionRFC2396, &components) ||
         !components.pathComponents || CFArrayGetCount(components.pathComponents) == 0)
         return nullptr;
 
@@ -111,10 +102,10 @@ bool TCFURL::ConformsToUTI(CFStringRef type) const {
 }
 
 CFTypeRef TCFURL::CopyProperty(CFStringRef key, CFErrorRef* error) const {
-    if (!url_)
+    if (!ref_)
         return nullptr;
     CFTypeRef value = nullptr;
-    CFURLCopyResourcePropertyForKey(url_, key, &value, error);
+    CFURLCopyResourcePropertyForKey(ref_, key, &value, error);
     return value;
 }
 
@@ -153,7 +144,7 @@ CFURLRef TCFURL::CopySymlinkTarget(CFURLRef url) {
 }
 
 CFStringRef TCFURL::CopyFilePath(CFURLPathStyle style) const {
-    return url_ ? CFURLCopyFileSystemPath(url_, style) : nullptr;
+    return ref_ ? CFURLCopyFileSystemPath(ref_, style) : nullptr;
 }
 
 CFStringRef TCFURL::CopyAbsoluteFilePath() const {

@@ -13,32 +13,21 @@
 #include "platform/CFError.h"
 #include "platform/CFURL.h"
 
-class TCFURL {
+class TCFURL : public TCFReferenceHolder<CFURLRef> {
 public:
-    /// Retains `url` (null-safe).
-    explicit TCFURL(CFURLRef url) : url_(TCFSafeRetain(url)) {}
-    /// Adopts `url` (no retain; may be null).
-    TCFURL(CFURLRef url, adopted_t) : url_(url) {}
+    /// Retains `url` (null-safe), or adopts it with kAdopted (no retain; may be null).
+    using TCFReferenceHolder::TCFReferenceHolder;
     /// Creates a URL for the POSIX-style `path`, relative to `baseURL` when the path is relative
     /// (the current directory when `baseURL` is null), never marked as a directory: a trailing
     /// slash of the path is dropped. Null when `path` is null or the platform rejects it.
     TCFURL(CFStringRef path, is_file_t, CFURLRef baseURL);
-    TCFURL(const TCFURL&) = delete;
-    TCFURL& operator=(const TCFURL&) = delete;
-    /// Releases the held URL (null-safe).
-    ~TCFURL();
 
-    /// The held URL; does not retain.
-    operator CFURLRef() const { return url_; }
     /// Value equality by TCFSafeEqual (two nulls are equal).
-    bool operator==(CFURLRef url) const { return TCFSafeEqual(url_, url); }
-    bool operator!=(CFURLRef url) const { return !TCFSafeEqual(url_, url); }
+    bool operator==(CFURLRef url) const { return TCFSafeEqual(ref_, url); }
+    bool operator!=(CFURLRef url) const { return !TCFSafeEqual(ref_, url); }
     /// A new URL: the held one resolved against its base; null for null. Returns a new
     /// reference; the caller releases it.
-    CFURLRef CopyAbsoluteURL() const { return url_ ? CFURLCopyAbsoluteURL(url_) : nullptr; }
-    /// Returns the held URL with its count and leaves this wrapper null; the caller releases
-    /// the result.
-    CFURLRef Orphan();
+    CFURLRef CopyAbsoluteURL() const { return ref_ ? CFURLCopyAbsoluteURL(ref_) : nullptr; }
 
     /// URL text constants; no operation here reads them.
     static const CFStringRef kCFURLFragmentSeparator;                 ///< "#"
@@ -95,7 +84,4 @@ public:
     /// `urls`, in order; elements that are not URLs are skipped. Null when `urls` is null or
     /// yields no string. The caller releases the result.
     static CFArrayRef ConvertURLArrayToStringArray(CFArrayRef urls);
-
-private:
-    CFURLRef url_;
 };

@@ -13,12 +13,7 @@
 #include "cfutil/TCFBookmark.h"
 #include "support/Values.h"
 
-using glyphwell::testing::Hex;
-using glyphwell::testing::NewFileURL;
-using glyphwell::testing::Ref;
-using glyphwell::testing::TemporaryDirectoryTest;
-using glyphwell::testing::TextOf;
-using glyphwell::testing::ToHex;
+using namespace glyphwell::testing;
 
 namespace {
 
@@ -58,19 +53,16 @@ TEST(BookmarkRecord, ReadsEveryValueKind) {
     ASSERT_TRUE(properties);
     auto dictionary = properties.as<CFDictionaryRef>();
     EXPECT_EQ(CFDictionaryGetCount(dictionary), 5);
-    EXPECT_EQ(TextOf(CFDictionaryGetValue(dictionary, CFSTR("k"))), "v");
-    SInt64 number = 0;
-    CFNumberGetValue(static_cast<CFNumberRef>(CFDictionaryGetValue(dictionary, CFSTR("n"))),
-                     kCFNumberSInt64Type, &number);
-    EXPECT_EQ(number, 10);
-    EXPECT_EQ(CFDictionaryGetValue(dictionary, CFSTR("b")), kCFBooleanTrue);
-    EXPECT_EQ(
-        CFDateGetAbsoluteTime(static_cast<CFDateRef>(CFDictionaryGetValue(dictionary, CFSTR("d")))),
-        631152000.5);
-    EXPECT_EQ(TextOf(CFDictionaryGetValue(dictionary, CFSTR("u"))), "file:///x");
+    const std::pair<CFStringRef, std::string> values[] = {
+        {CFSTR("k"), "v"},         {CFSTR("n"), "10"},
+        {CFSTR("b"), "true"},      {CFSTR("d"), std::to_string(631152000.5)},
+        {CFSTR("u"), "file:///x"},
+    };
+    for (const auto& [key, expected] : values)
+        EXPECT_EQ(ValueText(CFDictionaryGetValue(dictionary, key)), expected) << TextOf(key);
 
     Ref data = DataOf(Hex(kRecord));
-    Ref keys = glyphwell::testing::Array({CFSTR("k"), CFSTR("absent")});
+    Ref keys = Array({CFSTR("k"), CFSTR("absent")});
     Ref selected(
         TCFBookmark::CopyPropertiesFromBookmarkData(data.as<CFDataRef>(), keys.as<CFArrayRef>()));
     EXPECT_EQ(CFDictionaryGetCount(selected.as<CFDictionaryRef>()), 1);
@@ -129,7 +121,7 @@ TEST_F(Bookmarks, RecordsPathIdentityAndRequestedProperties) {
     std::string path = WriteFile("font.ttf", "0123456789");
     struct stat status;
     ASSERT_EQ(lstat(path.c_str(), &status), 0);
-    Ref keys = glyphwell::testing::Array({kCFURLIsRegularFileKey});
+    Ref keys = Array({kCFURLIsRegularFileKey});
     Ref bookmark = Bookmark(path, keys.as<CFArrayRef>());
     ASSERT_TRUE(bookmark);
 
@@ -157,22 +149,20 @@ TEST_F(Bookmarks, PropertiesAreReadWithoutTouchingTheFile) {
     ASSERT_TRUE(bookmark);
     ASSERT_EQ(remove(path.c_str()), 0);
 
-    auto data = bookmark.as<CFDataRef>();
-    Ref name(TCFBookmark::CopyPropertyFromBookmarkData(data, kCFURLNameKey));
-    EXPECT_EQ(TextOf(name.get()), "font.ttf");
-    Ref parent(TCFBookmark::CopyPropertyFromBookmarkData(data, kCFURLParentDirectoryURLKey));
-    EXPECT_EQ(TextOf(parent.get()), "file://" + directory_ + "/");
-    Ref size(TCFBookmark::CopyPropertyFromBookmarkData(data, kCFURLFileSizeKey));
-    SInt64 bytes = 0;
-    ASSERT_TRUE(size);
-    CFNumberGetValue(size.as<CFNumberRef>(), kCFNumberSInt64Type, &bytes);
-    EXPECT_EQ(bytes, 10);
-    Ref regular(TCFBookmark::CopyPropertyFromBookmarkData(data, kCFURLIsRegularFileKey));
-    EXPECT_EQ(regular.get(), kCFBooleanTrue);
-    Ref modified(TCFBookmark::CopyPropertyFromBookmarkData(data, kCFURLContentModificationDateKey));
-    EXPECT_TRUE(modified);
-    EXPECT_EQ(TCFBookmark::CopyPropertyFromBookmarkData(data, _kCFURLFileSizeOfResourceForkKey),
-              nullptr);
+    const std::pair<CFStringRef, std::string> rows[] = {
+        {kCFURLNameKey, "font.ttf"},
+        {kCFURLParentDirectoryURLKey, "file://" + directory_ + "/"},
+        {kCFURLFileSizeKey, "10"},
+        {kCFURLIsRegularFileKey, "true"},
+        {kCFURLIsDirectoryKey, "false"},
+        {_kCFURLFileSizeOfResourceForkKey, "<null>"},
+    };
+    for (const auto& [key, expected] : rows) {
+        Ref value(TCFBookmark::CopyPropertyFromBookmarkData(bookmark.as<CFDataRef>(), key));
+        EXPECT_EQ(ValueText(value.get()), expected) << TextOf(key);
+    }
+    EXPECT_TRUE(Ref(TCFBookmark::CopyPropertyFromBookmarkData(bookmark.as<CFDataRef>(),
+                                                              kCFURLContentModificationDateKey)));
 }
 
 TEST_F(Bookmarks, ResolvesByPathAndReportsAReplacedItemAsStale) {
@@ -205,14 +195,12 @@ TEST_F(Bookmarks, ResolvesByPathAndReportsAReplacedItemAsStale) {
     CFRelease(error);
 }
 
-TEST_F(Bookmarks, DirectoryResolvesToADirectoryURL) {
+TEST_F(Bookmarks, DirectoryResolvesToADirectoryURLAndMissingOrNonFileItemsHaveNone) {
     Ref bookmark = Bookmark(directory_, nullptr, true);
     Ref url(TCFBookmark::CreateURLByResolvingBookmarkData(bookmark.as<CFDataRef>(), nullptr,
                                                           nullptr, nullptr, 0, nullptr));
     EXPECT_EQ(TextOf(url.get()), "file://" + directory_ + "/");
-}
 
-TEST_F(Bookmarks, NoBookmarkForMissingItemsOrNonFileURLs) {
     EXPECT_FALSE(Bookmark(PathOf("missing"), nullptr));
     Ref web(CFURLCreateWithString(nullptr, CFSTR("http://example.com/a"), nullptr));
     EXPECT_EQ(TCFBookmark::InitBookmarkData(web.as<CFURLRef>(), nullptr, 0), nullptr);

@@ -22,6 +22,21 @@ inline CFURLRef NewFileURL(const std::string& path, bool isDirectory = false) {
         nullptr, reinterpret_cast<const UInt8*>(path.data()), CFIndex(path.size()), isDirectory);
 }
 
+/// A readable text of a property value: strings and URLs as their text, booleans as "true" or
+/// "false", numbers as a decimal integer, dates as their absolute time, "<null>" for null.
+inline std::string ValueText(CFTypeRef value) {
+    if (value && CFGetTypeID(value) == CFBooleanGetTypeID())
+        return value == kCFBooleanTrue ? "true" : "false";
+    if (value && CFGetTypeID(value) == CFNumberGetTypeID()) {
+        SInt64 number = 0;
+        CFNumberGetValue(static_cast<CFNumberRef>(value), kCFNumberSInt64Type, &number);
+        return std::to_string(number);
+    }
+    if (value && CFGetTypeID(value) == CFDateGetTypeID())
+        return std::to_string(CFDateGetAbsoluteTime(static_cast<CFDateRef>(value)));
+    return TextOf(value);
+}
+
 /// A fresh directory under the system's temporary directory for each test (mkdtemp), and the
 /// environment variables a test changed put back as they were.
 class TemporaryDirectoryTest : public ::testing::Test {

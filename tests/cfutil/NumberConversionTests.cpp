@@ -14,10 +14,7 @@
 #include "platform/PropertyValues.h"
 #include "support/Values.h"
 
-using glyphwell::testing::Array;
-using glyphwell::testing::Num;
-using glyphwell::testing::Ref;
-using glyphwell::testing::Str;
+using namespace glyphwell::testing;
 
 namespace {
 
@@ -62,9 +59,6 @@ private:
 
 } // namespace
 
-// ---------------------------------------------------------------------------------------------
-// Creating numbers
-
 TEST(NumberCreate, EachNativeTypeKeepsItsPlatformNumberType) {
     TCFAdopted<CFNumberRef> character(TCFNumber::Create<SInt8>(-5));
     TCFAdopted<CFNumberRef> integer(TCFNumber::Create<SInt64>(LONG_MIN));
@@ -99,9 +93,6 @@ TEST(SharedBooleanNumbers, EachCallReturnsTheSameIntegerNumberWithOneMoreCount) 
     EXPECT_NE(no.get(), first);
     EXPECT_FALSE(TCFTypeRef::GetBooleanValue(no.get()));
 }
-
-// ---------------------------------------------------------------------------------------------
-// Parsing strings
 
 TEST(NumberFromString, WholeNumbersBecomeLongsAndOthersDoubles) {
     for (auto [text, expected] :
@@ -143,33 +134,24 @@ TEST_F(CommaDecimalLocale, DecimalPointIsAlwaysAFullStop) {
     EXPECT_FALSE(Parse("3,5"));
 }
 
-// ---------------------------------------------------------------------------------------------
-// Truth values and unsigned readings
-
-TEST(BooleanValue, StringsTrueAndYesInAnyCaseAreTrue) {
+TEST(BooleanValue, TrueForTrueOrYesInAnyCaseAndExactNonZeroThirtyTwoBitIntegers) {
     for (const char* text : {"true", "TRUE", "True", "YES", "yes", "yEs"})
         EXPECT_TRUE(TCFTypeRef::GetBooleanValue(Str(text).get())) << text;
     for (const char* text : {"1", "false", "", "true ", "y"})
         EXPECT_FALSE(TCFTypeRef::GetBooleanValue(Str(text).get())) << text;
+    const std::pair<Ref, bool> rows[] = {
+        {Num(kCFNumberLongType, 1L), true},     {Num(kCFNumberLongType, -1L), true},
+        {Num(kCFNumberDoubleType, 3.0), true},  {Num(kCFNumberLongType, 0L), false},
+        {Num(kCFNumberDoubleType, 2.5), false}, {Num(kCFNumberLongType, 1L << 32), false},
+        {Ref(CFRetain(kCFBooleanTrue)), true},  {Ref(CFRetain(kCFBooleanFalse)), false},
+        {Array({kCFBooleanTrue}), false},       {Ref(), false},
+    };
+    for (const auto& [value, expected] : rows)
+        EXPECT_EQ(TCFTypeRef::GetBooleanValue(value.get()), expected)
+            << glyphwell::Describe(value.get());
 }
 
-TEST(BooleanValue, NumbersAreTrueWhenAnExactNonZeroThirtyTwoBitInteger) {
-    EXPECT_TRUE(TCFTypeRef::GetBooleanValue(Num(kCFNumberLongType, 1L).get()));
-    EXPECT_TRUE(TCFTypeRef::GetBooleanValue(Num(kCFNumberLongType, -1L).get()));
-    EXPECT_TRUE(TCFTypeRef::GetBooleanValue(Num(kCFNumberDoubleType, 3.0).get()));
-    EXPECT_FALSE(TCFTypeRef::GetBooleanValue(Num(kCFNumberLongType, 0L).get()));
-    EXPECT_FALSE(TCFTypeRef::GetBooleanValue(Num(kCFNumberDoubleType, 2.5).get()));
-    EXPECT_FALSE(TCFTypeRef::GetBooleanValue(Num(kCFNumberLongType, 1L << 32).get()));
-}
-
-TEST(BooleanValue, BooleansReadAsThemselvesAndOtherKindsAsFalse) {
-    EXPECT_TRUE(TCFTypeRef::GetBooleanValue(kCFBooleanTrue));
-    EXPECT_FALSE(TCFTypeRef::GetBooleanValue(kCFBooleanFalse));
-    EXPECT_FALSE(TCFTypeRef::GetBooleanValue(nullptr));
-    EXPECT_FALSE(TCFTypeRef::GetBooleanValue(Array({kCFBooleanTrue}).get()));
-}
-
-TEST(NumberValue, BooleansGiveOneAndZeroAndNumbersTheirSixtyFourBitValue) {
+TEST(NumberValue, BooleansGiveOneAndZeroNumbersTheirSixtyFourBitValueAndOtherKindsZero) {
     unsigned long out = 99;
     TCFNumber::GetCFNumberValue(kCFBooleanTrue, out);
     EXPECT_EQ(out, 1UL);
@@ -179,10 +161,8 @@ TEST(NumberValue, BooleansGiveOneAndZeroAndNumbersTheirSixtyFourBitValue) {
     EXPECT_EQ(out, 42UL);
     TCFNumber::GetCFNumberValue(Num(kCFNumberDoubleType, -2.9).get(), out);
     EXPECT_EQ(out, 0xFFFFFFFFFFFFFFFEUL);
-}
 
-TEST(NumberValue, SafeReadingRejectsOtherKindsWithZero) {
-    unsigned long out = 99;
+    out = 99;
     EXPECT_FALSE(TCFNumber::GetCFNumberValueSafely(Str("42").get(), out));
     EXPECT_EQ(out, 0UL);
     out = 99;

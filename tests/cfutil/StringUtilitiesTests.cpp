@@ -1,5 +1,5 @@
 // String utilities: tilde expansion against the password database, regional suffixes and the
-// language fallback, four-character codes, null-safe equality and the shared unique strings.
+// language fallback, four-character codes and null-safe equality.
 #include <pwd.h>
 #include <string>
 #include <unistd.h>
@@ -8,14 +8,13 @@
 
 #include "cfutil/CFStringUtilities.h"
 #include "cfutil/FileTestSupport.h"
+#include "cfutil/TCFRetained.h"
 #include "cfutil/TCFString.h"
 #include "platform/HomeDirectory.h"
 #include "support/ScopedEnvironment.h"
 #include "support/Values.h"
 
-using glyphwell::testing::Ref;
-using glyphwell::testing::Str;
-using glyphwell::testing::TextOf;
+using namespace glyphwell::testing;
 
 namespace {
 
@@ -23,12 +22,6 @@ std::string Expand(const std::string& path) {
     Ref input = Str(path);
     Ref expanded(TCFStr::CreateStringByExpandingTildeInPath(input.as<CFStringRef>()));
     return TextOf(expanded.get());
-}
-
-std::string WithoutSuffix(const std::string& language) {
-    Ref input = Str(language);
-    Ref base(TCFStr(input.as<CFStringRef>()).CreateSubstringWithoutRegionalSuffix());
-    return TextOf(base.get());
 }
 
 } // namespace
@@ -95,21 +88,16 @@ TEST(TildeExpansion, PathsWithoutLeadingTildeOrKnownUserAreReturnedRetained) {
     }
 }
 
-TEST(RegionalSuffix, CutsAtFirstUnderscoreElseFirstHyphen) {
-    EXPECT_EQ(WithoutSuffix("en_US"), "en");
-    EXPECT_EQ(WithoutSuffix("pt-BR"), "pt");
-    EXPECT_EQ(WithoutSuffix("en-US_POSIX"), "en-US");
-    EXPECT_EQ(WithoutSuffix("_x"), "");
-}
-
-TEST(RegionalSuffix, ChineseAndPlainIdentifiersStayWholeAndRetained) {
-    for (const char* text : {"zh_CN", "zh-Hant", "en", "zh"}) {
+TEST(RegionalSuffix, CutsAtFirstUnderscoreElseHyphenAndKeepsChineseWhole) {
+    const std::pair<const char*, const char*> rows[] = {
+        {"en_US", "en"},    {"pt-BR", "pt"},      {"en-US_POSIX", "en-US"}, {"_x", ""},
+        {"zh_CN", nullptr}, {"zh-Hant", nullptr}, {"en", nullptr},          {"zh", nullptr},
+    };
+    for (const auto& [text, expected] : rows) {
         Ref input = Str(text);
-        CFIndex before = CFGetRetainCount(input.get());
-        CFStringRef result = TCFStr(input.as<CFStringRef>()).CreateSubstringWithoutRegionalSuffix();
-        EXPECT_EQ(result, input.get()) << text;
-        EXPECT_EQ(CFGetRetainCount(input.get()), before + 1) << text;
-        CFRelease(result);
+        Ref result(TCFStr(input.as<CFStringRef>()).CreateSubstringWithoutRegionalSuffix());
+        EXPECT_EQ(TextOf(result.get()), expected ? expected : text);
+        EXPECT_TRUE(expected || result.get() == input.get()) << text; // the input, retained
     }
     EXPECT_EQ(TCFStr(nullptr).CreateSubstringWithoutRegionalSuffix(), nullptr);
 }
@@ -136,13 +124,21 @@ TEST(LanguageLookup, FallsBackOnceToTheBaseLanguage) {
     EXPECT_EQ(CFDictionary::GetValue(table.as<CFDictionaryRef>(), CFSTR("zh")), chinese.get());
 }
 
-TEST(StringEquality, NullsAndDistinctEqualStrings) {
-    Ref a = Str("same"), b = Str("same"), c = Str("other");
-    EXPECT_TRUE(StringEqual(nullptr, nullptr));
-    EXPECT_FALSE(StringEqual(a.as<CFStringRef>(), nullptr));
-    EXPECT_FALSE(StringEqual(nullptr, a.as<CFStringRef>()));
-    EXPECT_TRUE(StringEqual(a.as<CFStringRef>(), b.as<CFStringRef>()));
-    EXPECT_FALSE(StringEqual(a.as<CFStringRef>(), c.as<CFStringRef>()));
+TEST(StringEquality, NullsByIdentityAndStringsByContent) {
+    Ref same = Str("same"), alsoSame = Str("same"), other = Str("other");
+    const CFStringRef a = same.as<CFStringRef>(), b = alsoSame.as<CFStringRef>();
+    const struct {
+        CFStringRef first, second;
+        bool equal;
+    } rows[] = {{nullptr, nullptr, true},
+                {a, nullptr, false},
+                {nullptr, a, false},
+                {a, b, true},
+                {a, other.as<CFStringRef>(), false}};
+    for (const auto& row : rows) {
+        EXPECT_EQ(StringEqual(row.first, row.second), row.equal);
+        EXPECT_EQ(TCFSafeEqual(row.first, row.second), row.equal);
+    }
 }
 
 TEST(FourCharacterCode, ReadsBytesMostSignificantFirstAsMacRoman) {
@@ -157,14 +153,4 @@ TEST(FourCharacterCode, ReadsBytesMostSignificantFirstAsMacRoman) {
     EXPECT_EQ(TextOf(accented.get()), "\xC3\xA9\xE2\x80\xA2  ");
     TCFString adopted(UInt32(0x41424344));
     EXPECT_EQ(TextOf(adopted), "ABCD");
-}
-
-TEST(UniqueString, EqualTextsShareOneString) {
-    Ref a = Str("glyphwell-unique-text"), b = Str("glyphwell-unique-text");
-    CFStringRef first = TCFStr(a.as<CFStringRef>()).GetUniqueString();
-    CFStringRef second = TCFStr(b.as<CFStringRef>()).GetUniqueString();
-    ASSERT_NE(first, nullptr);
-    EXPECT_EQ(first, second);
-    EXPECT_EQ(TextOf(first), "glyphwell-unique-text");
-    EXPECT_EQ(TCFStr(nullptr).GetUniqueString(), nullptr);
 }

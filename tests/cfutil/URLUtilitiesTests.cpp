@@ -18,12 +18,8 @@
 #include "cfutil/TCFURL.h"
 #include "support/Values.h"
 
-using glyphwell::testing::NewFileURL;
-using glyphwell::testing::Ref;
-using glyphwell::testing::Str;
-using glyphwell::testing::TemporaryDirectoryTest;
-using glyphwell::testing::TextOf;
-using glyphwell::testing::Texts;
+using namespace glyphwell::testing;
+using Strings = std::vector<std::string>;
 
 namespace {
 
@@ -31,80 +27,86 @@ Ref URL(const std::string& text) {
     return Ref(CFURLCreateWithString(nullptr, Str(text).as<CFStringRef>(), nullptr));
 }
 
-std::vector<std::string> ComponentPathURLs(const std::string& text) {
-    Ref url = URL(text);
-    Ref urls(TCFURL(url.as<CFURLRef>()).CreateComponentPathURLs());
-    return Texts(urls.as<CFArrayRef>());
+Ref Bytes(const std::string& bytes) {
+    return Ref(
+        CFDataCreate(nullptr, reinterpret_cast<const UInt8*>(bytes.data()), CFIndex(bytes.size())));
 }
 
-std::string NormalizedPath(const std::string& text) {
-    Ref url = URL(text);
-    Ref path(TCFURL::CopyNormalizedPath(url.as<CFURLRef>(), false));
-    return TextOf(path.get());
+std::string Contents(const TCFBlob& data) {
+    return std::string(reinterpret_cast<const char*>(data.GetPtr()), size_t(data.GetLength()));
 }
 
 class FileUtilities : public TemporaryDirectoryTest {};
 
 } // namespace
 
-TEST(NormalizedPath, DropsPrivatePrefixMatchedOnEightCharacters) {
-    EXPECT_EQ(NormalizedPath("file:///private/etc/hosts"), "/etc/hosts");
-    EXPECT_EQ(NormalizedPath("file:///private/tmp"), "/tmp");
-    EXPECT_EQ(NormalizedPath("file:///privateer/x"), "er/x");
-    EXPECT_EQ(NormalizedPath("file:///private"), "");
-    EXPECT_EQ(NormalizedPath("file:///var/x"), "/var/x");
-
-    Ref hosts = URL("file:///private/etc/hosts");
-    Ref asURL(TCFURL::CopyNormalizedPath(hosts.as<CFURLRef>(), true));
-    EXPECT_EQ(TextOf(asURL.get()), "file:///etc/hosts");
-    Ref root = URL("file:///private");
-    EXPECT_EQ(TCFURL::CopyNormalizedPath(root.as<CFURLRef>(), true), nullptr);
-}
-
-TEST(NormalizedPath, UnchangedURLIsReturnedWithOneMoreCount) {
-    Ref url = URL("file:///var/x");
-    CFIndex before = CFGetRetainCount(url.get());
-    CFTypeRef result = TCFURL::CopyNormalizedPath(url.as<CFURLRef>(), true);
-    EXPECT_EQ(result, url.get());
-    EXPECT_EQ(CFGetRetainCount(url.get()), before + 1);
-    CFRelease(result);
+TEST(URLUtilities, NullURLYieldsNullOrFalseEverywhere) {
+    TCFURL none(nullptr);
+    CFErrorRef error = nullptr;
     EXPECT_EQ(TCFURL::CopyNormalizedPath(nullptr, true), nullptr);
-    EXPECT_EQ(TCFURL(nullptr).CopyNormalizedPath(), nullptr);
+    EXPECT_EQ(none.CopyNormalizedPath(), nullptr);
+    EXPECT_EQ(none.CreateComponentPathURLs(), nullptr);
+    EXPECT_EQ(TCFURL::CreateStandardizedURLFromURL(nullptr), nullptr);
+    EXPECT_EQ(TCFURL::ConvertURLArrayToStringArray(nullptr), nullptr);
+    EXPECT_EQ(TCFURL::CopySymlinkTarget(nullptr), nullptr);
+    EXPECT_EQ(none.CopyProperty(kCFURLNameKey, &error), nullptr);
+    EXPECT_EQ(error, nullptr);
+    EXPECT_FALSE(none.ConformsToUTI(CFSTR("font/ttf")));
+    EXPECT_EQ(CFDataRef(TCFData(static_cast<CFURLRef>(nullptr))), nullptr);
+    EXPECT_EQ(TCFBlob(Bytes("x").as<CFDataRef>()).WriteToURL(nullptr), EINVAL);
 }
 
-TEST(NormalizedPath, URLWithoutPathNeedsTheInMemoryFontMarker) {
-    Ref font = URL("memory://font/iNmEmOrYcGfOnT_0001");
-    CFStringRef string = CFURLGetString(font.as<CFURLRef>());
-    Ref path(TCFURL::CopyNormalizedPath(font.as<CFURLRef>(), false));
-    EXPECT_EQ(path.get(), string);
-    Ref same(TCFURL::CopyNormalizedPath(font.as<CFURLRef>(), true));
-    EXPECT_EQ(same.get(), font.get());
-    EXPECT_EQ(NormalizedPath("http://example.com/a"), "<null>");
-    EXPECT_EQ(NormalizedPath("memory://font/inmemorycgfont_0001"), "<null>");
+TEST(NormalizedPath, DropsPrivateOnEightCharactersAndKeepsMarkedURLsWithoutPath) {
+    const char* marked = "memory://font/iNmEmOrYcGfOnT_0001";
+    const struct {
+        const char* url;
+        bool asURL;
+        const char* expected;
+        bool same; // the input URL (or, for a path, the URL's own string) with one more count
+    } rows[] = {
+        {"file:///private/etc/hosts", false, "/etc/hosts", false},
+        {"file:///private/tmp", false, "/tmp", false},
+        {"file:///privateer/x", false, "er/x", false},
+        {"file:///private", false, "", false},
+        {"file:///var/x", false, "/var/x", false},
+        {"file:///private/etc/hosts", true, "file:///etc/hosts", false},
+        {"file:///private", true, "<null>", false},
+        {"file:///var/x", true, "file:///var/x", true},
+        {marked, false, marked, true},
+        {marked, true, marked, true},
+        {"http://example.com/a", false, "<null>", false},
+        {"memory://font/inmemorycgfont_0001", false, "<null>", false},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(testing::Message() << row.url << " asURL " << row.asURL);
+        Ref url = URL(row.url);
+        Ref result(TCFURL::CopyNormalizedPath(url.as<CFURLRef>(), row.asURL));
+        EXPECT_EQ(TextOf(result.get()), row.expected);
+        CFTypeRef input = row.asURL ? url.get() : CFURLGetString(url.as<CFURLRef>());
+        EXPECT_EQ(result.get() == input, row.same);
+    }
 }
 
-TEST(ComponentPathURLs, ListsTheURLAndItsAncestorsDeepestFirst) {
-    EXPECT_EQ(ComponentPathURLs("file:///a/b/c"),
-              (std::vector<std::string>{"file:///a/b/c", "file:///a/b", "file:///a"}));
-    EXPECT_EQ(ComponentPathURLs("file:///a"), (std::vector<std::string>{"file:///a"}));
-    EXPECT_EQ(ComponentPathURLs("file:///a/b/"),
-              (std::vector<std::string>{"file:///a/b/", "file:///a/b", "file:///a"}));
-    // "/" splits into two empty components: the URL made of both is the root itself.
-    EXPECT_EQ(ComponentPathURLs("file:///"), (std::vector<std::string>{"file:///"}));
-}
-
-TEST(ComponentPathURLs, DropsQueryAndParametersKeepsAuthorityAndFragment) {
-    EXPECT_EQ(ComponentPathURLs("file:///a/b?q=1#frag"),
-              (std::vector<std::string>{"file:///a/b#frag", "file:///a#frag"}));
-    EXPECT_EQ(
-        ComponentPathURLs("http://user@host:8080/a/b;type=x?q#f"),
-        (std::vector<std::string>{"http://user@host:8080/a/b#f", "http://user@host:8080/a#f"}));
-}
-
-TEST(ComponentPathURLs, NullWhenThereIsNoHierarchicalPath) {
-    EXPECT_TRUE(ComponentPathURLs("http://host").empty());
-    EXPECT_TRUE(ComponentPathURLs("mailto:someone@example.com").empty());
-    EXPECT_EQ(TCFURL(nullptr).CreateComponentPathURLs(), nullptr);
+TEST(ComponentPathURLs, ListsTheURLAndItsAncestorsWithoutQueryOrParameters) {
+    const struct {
+        const char* url;
+        Strings expected;
+    } rows[] = {
+        {"file:///a/b/c", {"file:///a/b/c", "file:///a/b", "file:///a"}},
+        {"file:///a", {"file:///a"}},
+        {"file:///a/b/", {"file:///a/b/", "file:///a/b", "file:///a"}},
+        {"file:///", {"file:///"}}, // two empty components make the root itself
+        {"file:///a/b?q=1#frag", {"file:///a/b#frag", "file:///a#frag"}},
+        {"http://user@host:8080/a/b;type=x?q#f",
+         {"http://user@host:8080/a/b#f", "http://user@host:8080/a#f"}},
+        {"http://host", {}},
+        {"mailto:someone@example.com", {}},
+    };
+    for (const auto& row : rows) {
+        Ref url = URL(row.url);
+        Ref urls(TCFURL(url.as<CFURLRef>()).CreateComponentPathURLs());
+        EXPECT_EQ(Texts(urls.get()), row.expected) << row.url;
+    }
 }
 
 TEST(URLComponents, DecomposesAfterRFC2396AndComposesTheSameText) {
@@ -117,7 +119,7 @@ TEST(URLComponents, DecomposesAfterRFC2396AndComposesTheSameText) {
     EXPECT_EQ(TextOf(parts.userInfo), "me:pw");
     EXPECT_EQ(TextOf(parts.host), "[::1]");
     EXPECT_EQ(parts.port, 8080);
-    EXPECT_EQ(Texts(parts.pathComponents), (std::vector<std::string>{"", "a%20b", "c"}));
+    EXPECT_EQ(Texts(parts.pathComponents), (Strings{"", "a%20b", "c"}));
     EXPECT_EQ(TextOf(parts.parameterString), "p=1");
     EXPECT_EQ(TextOf(parts.query), "q=2");
     EXPECT_EQ(TextOf(parts.fragment), "frag");
@@ -130,21 +132,18 @@ TEST(URLComponents, DecomposesAfterRFC2396AndComposesTheSameText) {
     EXPECT_EQ(TextOf(parts.host), "");
     EXPECT_EQ(parts.port, kCFNotFound);
     EXPECT_EQ(parts.userInfo, nullptr);
-}
 
-TEST(URLComponents, RejectsMalformedPortsAndOpaqueURLs) {
-    TCFURLComponentsRFC2396 parts;
-    for (const char* text : {"http://host:99999999999/a", "mailto:a@b"}) {
-        Ref url = URL(text);
-        ASSERT_TRUE(url) << text;
-        EXPECT_FALSE(
-            CFURLCopyComponents(url.as<CFURLRef>(), kCFURLComponentDecompositionRFC2396, &parts))
-            << text;
-        EXPECT_EQ(parts.scheme, nullptr) << text;
+    for (const char* bad : {"http://host:99999999999/a", "mailto:a@b"}) {
+        Ref malformed = URL(bad);
+        ASSERT_TRUE(malformed) << bad;
+        EXPECT_FALSE(CFURLCopyComponents(malformed.as<CFURLRef>(),
+                                         kCFURLComponentDecompositionRFC2396, &parts))
+            << bad;
+        EXPECT_EQ(parts.scheme, nullptr) << bad;
     }
 }
 
-TEST(StandardizedURL, RewritesLocalhostPrefixOnly) {
+TEST(URLUtilities, StandardizedURLRewritesOnlyTheLocalhostPrefix) {
     Ref localhost = URL("file://localhost/tmp/x");
     Ref standardized(TCFURL::CreateStandardizedURLFromURL(localhost.as<CFURLRef>()));
     EXPECT_EQ(TextOf(standardized.get()), "file:///tmp/x");
@@ -153,159 +152,120 @@ TEST(StandardizedURL, RewritesLocalhostPrefixOnly) {
         Ref same(TCFURL::CreateStandardizedURLFromURL(url.as<CFURLRef>()));
         EXPECT_EQ(same.get(), url.get()) << text;
     }
-    EXPECT_EQ(TCFURL::CreateStandardizedURLFromURL(nullptr), nullptr);
 }
 
-TEST(URLStringArray, OwnStringsInOrderAndNullWhenEmpty) {
+TEST(URLUtilities, StringArrayHoldsOwnStringsInOrderAndIsNullWhenEmpty) {
     Ref base = URL("file:///base/");
     Ref relative(CFURLCreateWithString(nullptr, CFSTR("child"), base.as<CFURLRef>()));
     Ref absolute = URL("http://example.com/a");
-    Ref urls = glyphwell::testing::Array({relative.get(), CFSTR("not a URL"), absolute.get()});
+    Ref urls = Array({relative.get(), CFSTR("not a URL"), absolute.get()});
     Ref strings(TCFURL::ConvertURLArrayToStringArray(urls.as<CFArrayRef>()));
-    EXPECT_EQ(Texts(strings.as<CFArrayRef>()),
-              (std::vector<std::string>{"child", "http://example.com/a"}));
-    Ref empty = glyphwell::testing::Array({});
-    EXPECT_EQ(TCFURL::ConvertURLArrayToStringArray(empty.as<CFArrayRef>()), nullptr);
-    EXPECT_EQ(TCFURL::ConvertURLArrayToStringArray(nullptr), nullptr);
+    EXPECT_EQ(Texts(strings.get()), (Strings{"child", "http://example.com/a"}));
+    EXPECT_EQ(TCFURL::ConvertURLArrayToStringArray(Array({}).as<CFArrayRef>()), nullptr);
 }
 
-TEST_F(FileUtilities, SymlinkTargetResolvesEveryLinkAndDotSegment) {
+TEST_F(FileUtilities, SymlinkTargetResolvesLinksAndDotsElseGivesTheInput) {
     std::string target = WriteFile("dir/target.ttf", "x");
     ASSERT_EQ(symlink("dir/target.ttf", PathOf("first").c_str()), 0);
     ASSERT_EQ(symlink("first", PathOf("second").c_str()), 0);
-    Ref link(NewFileURL(PathOf("second")));
-    Ref resolved(TCFURL::CopySymlinkTarget(link.as<CFURLRef>()));
-    EXPECT_EQ(TextOf(resolved.get()), "file://" + target);
-
-    Ref dotted(NewFileURL(PathOf("dir/../dir/./target.ttf")));
-    Ref clean(TCFURL::CopySymlinkTarget(dotted.as<CFURLRef>()));
-    EXPECT_EQ(TextOf(clean.get()), "file://" + target);
-
-    Ref directory(NewFileURL(PathOf("dir"), true));
-    Ref notDirectory(TCFURL::CopySymlinkTarget(directory.as<CFURLRef>()));
-    EXPECT_EQ(TextOf(notDirectory.get()), "file://" + PathOf("dir"));
-}
-
-TEST_F(FileUtilities, SymlinkTargetFallsBackToTheInputWhenUnresolvable) {
     ASSERT_EQ(symlink("missing", PathOf("dangling").c_str()), 0);
-    Ref dangling(NewFileURL(PathOf("dangling")));
-    CFIndex before = CFGetRetainCount(dangling.get());
-    Ref same(TCFURL::CopySymlinkTarget(dangling.as<CFURLRef>()));
-    EXPECT_EQ(same.get(), dangling.get());
-    EXPECT_EQ(CFGetRetainCount(dangling.get()), before + 1);
-    Ref web = URL("http://example.com/a");
-    EXPECT_EQ(TCFURL::CopySymlinkTarget(web.as<CFURLRef>()), nullptr);
-    EXPECT_EQ(TCFURL::CopySymlinkTarget(nullptr), nullptr);
+    const struct {
+        std::string path;
+        bool isDirectory;
+        std::string expected; // empty: the input URL itself
+    } rows[] = {
+        {PathOf("second"), false, "file://" + target},
+        {PathOf("dir/../dir/./target.ttf"), false, "file://" + target},
+        {PathOf("dir"), true, "file://" + PathOf("dir")}, // never a directory URL
+        {PathOf("dangling"), false, ""},
+    };
+    for (const auto& row : rows) {
+        Ref url(NewFileURL(row.path, row.isDirectory));
+        Ref resolved(TCFURL::CopySymlinkTarget(url.as<CFURLRef>()));
+        if (row.expected.empty())
+            EXPECT_EQ(resolved.get(), url.get()) << row.path;
+        else
+            EXPECT_EQ(TextOf(resolved.get()), row.expected) << row.path;
+    }
+    EXPECT_EQ(TCFURL::CopySymlinkTarget(URL("http://example.com/a").as<CFURLRef>()), nullptr);
 }
 
-TEST_F(FileUtilities, DataFromURLReadsTheWholeFile) {
-    std::string small(10, '\0');
-    for (int i = 0; i < 10; ++i)
-        small[size_t(i)] = char('0' + i);
-    Ref smallURL(NewFileURL(WriteFile("small", small)));
-    TCFData smallData(smallURL.as<CFURLRef>());
-    ASSERT_EQ(smallData.GetLength(), 10);
-    EXPECT_EQ(std::string(reinterpret_cast<const char*>(smallData.GetPtr()), 10), "0123456789");
-
-    std::string large(1000, 'a');
-    large[999] = 'z';
-    Ref largeURL(NewFileURL(WriteFile("large", large)));
-    TCFData largeData(largeURL.as<CFURLRef>());
-    ASSERT_EQ(largeData.GetLength(), 1000);
-    EXPECT_EQ(largeData.GetPtr()[999], 'z');
+TEST_F(FileUtilities, DataFromURLReadsWholeFilesAndIsNullForOtherItems) {
+    for (size_t size : {10, 1000}) { // inside and beyond the reader's stack buffer
+        std::string contents;
+        for (size_t i = 0; i < size; ++i)
+            contents += char('0' + i % 10);
+        Ref url(NewFileURL(WriteFile("file" + std::to_string(size), contents)));
+        EXPECT_EQ(Contents(TCFData(url.as<CFURLRef>())), contents);
+    }
+    for (const auto& [path, isDirectory] : {std::pair{WriteFile("empty", ""), false},
+                                            {PathOf("missing"), false},
+                                            {directory_, true}}) {
+        Ref url(NewFileURL(path, isDirectory));
+        EXPECT_EQ(CFDataRef(TCFData(url.as<CFURLRef>())), nullptr) << path;
+    }
 }
 
-TEST_F(FileUtilities, DataFromURLIsNullForEmptyMissingAndNonRegularItems) {
-    Ref empty(NewFileURL(WriteFile("empty", "")));
-    EXPECT_EQ(CFDataRef(TCFData(empty.as<CFURLRef>())), nullptr);
-    Ref missing(NewFileURL(PathOf("missing")));
-    EXPECT_EQ(CFDataRef(TCFData(missing.as<CFURLRef>())), nullptr);
-    Ref directory(NewFileURL(directory_, true));
-    EXPECT_EQ(CFDataRef(TCFData(directory.as<CFURLRef>())), nullptr);
-    EXPECT_EQ(CFDataRef(TCFData(static_cast<CFURLRef>(nullptr))), nullptr);
-}
-
-TEST_F(FileUtilities, WriteToURLCreatesOrTruncatesWithMode0644) {
+TEST_F(FileUtilities, WriteToURLCreatesOrTruncatesWithMode0644AndReportsErrors) {
     mode_t previous = umask(022);
     Ref path(NewFileURL(PathOf("written")));
-    TCFBlob empty(nullptr);
-    EXPECT_EQ(empty.WriteToURL(path.as<CFURLRef>()), 0);
+    EXPECT_EQ(TCFBlob(nullptr).WriteToURL(path.as<CFURLRef>()), 0);
     struct stat status;
     ASSERT_EQ(stat(PathOf("written").c_str(), &status), 0);
     EXPECT_EQ(status.st_size, 0);
     EXPECT_EQ(status.st_mode & 0777, 0644u);
-
-    Ref bytes(CFDataCreate(nullptr, reinterpret_cast<const UInt8*>("hello, world"), 12));
-    EXPECT_EQ(TCFBlob(bytes.as<CFDataRef>()).WriteToURL(path.as<CFURLRef>()), 0);
-    Ref shorter(CFDataCreate(nullptr, reinterpret_cast<const UInt8*>("bye"), 3));
-    EXPECT_EQ(TCFBlob(shorter.as<CFDataRef>()).WriteToURL(path.as<CFURLRef>()), 0);
-    TCFData read(path.as<CFURLRef>());
-    ASSERT_EQ(read.GetLength(), 3);
-    EXPECT_EQ(std::string(reinterpret_cast<const char*>(read.GetPtr()), 3), "bye");
     umask(previous);
-}
 
-TEST_F(FileUtilities, WriteToURLReportsTheOpenError) {
+    EXPECT_EQ(TCFBlob(Bytes("hello, world").as<CFDataRef>()).WriteToURL(path.as<CFURLRef>()), 0);
+    EXPECT_EQ(TCFBlob(Bytes("bye").as<CFDataRef>()).WriteToURL(path.as<CFURLRef>()), 0);
+    EXPECT_EQ(Contents(TCFData(path.as<CFURLRef>())), "bye");
+
     Ref inMissingDirectory(NewFileURL(PathOf("no/such/file")));
-    Ref bytes(CFDataCreate(nullptr, reinterpret_cast<const UInt8*>("x"), 1));
-    EXPECT_EQ(TCFBlob(bytes.as<CFDataRef>()).WriteToURL(inMissingDirectory.as<CFURLRef>()), ENOENT);
     Ref directory(NewFileURL(directory_, true));
-    EXPECT_EQ(TCFBlob(bytes.as<CFDataRef>()).WriteToURL(directory.as<CFURLRef>()), EISDIR);
-    EXPECT_EQ(TCFBlob(bytes.as<CFDataRef>()).WriteToURL(nullptr), EINVAL);
+    TCFBlob bytes(Bytes("x").as<CFDataRef>());
+    EXPECT_EQ(bytes.WriteToURL(inMissingDirectory.as<CFURLRef>()), ENOENT);
+    EXPECT_EQ(bytes.WriteToURL(directory.as<CFURLRef>()), EISDIR);
 }
 
-TEST_F(FileUtilities, PropertiesOfARegularFile) {
+TEST_F(FileUtilities, PropertiesDescribeTheItemItself) {
     std::string path = WriteFile("sub/font file.ttf", "0123456789");
     // 2021-01-01 00:00:00.5 UTC: 631152000.5 seconds after 2001-01-01.
     struct timespec times[2] = {{1609459200, 500000000}, {1609459200, 500000000}};
     ASSERT_EQ(utimensat(AT_FDCWD, path.c_str(), times, 0), 0);
-    TCFURL url(NewFileURL(path), kAdopted);
-
-    Ref name(url.CopyProperty(kCFURLNameKey, nullptr));
-    EXPECT_EQ(TextOf(name.get()), "font file.ttf");
-    Ref parent(url.CopyProperty(kCFURLParentDirectoryURLKey, nullptr));
-    EXPECT_EQ(TextOf(parent.get()), "file://" + PathOf("sub") + "/");
-    Ref regular(url.CopyProperty(kCFURLIsRegularFileKey, nullptr));
-    EXPECT_EQ(regular.get(), kCFBooleanTrue);
-    Ref directory(url.CopyProperty(kCFURLIsDirectoryKey, nullptr));
-    EXPECT_EQ(directory.get(), kCFBooleanFalse);
-    Ref size(url.CopyProperty(kCFURLFileSizeKey, nullptr));
-    SInt64 bytes = 0;
-    ASSERT_TRUE(size);
-    CFNumberGetValue(size.as<CFNumberRef>(), kCFNumberSInt64Type, &bytes);
-    EXPECT_EQ(bytes, 10);
-    Ref modified(url.CopyProperty(kCFURLContentModificationDateKey, nullptr));
-    ASSERT_TRUE(modified);
-    EXPECT_DOUBLE_EQ(CFDateGetAbsoluteTime(modified.as<CFDateRef>()), 631152000.5);
-    Ref created(url.CopyProperty(kCFURLCreationDateKey, nullptr));
+    ASSERT_EQ(symlink("sub/font file.ttf", PathOf("link").c_str()), 0);
+    TCFURL file(NewFileURL(path), kAdopted), link(NewFileURL(PathOf("link")), kAdopted);
+    TCFURL directory(NewFileURL(directory_, true), kAdopted), root(NewFileURL("/", true), kAdopted);
+    const struct {
+        const TCFURL& url;
+        CFStringRef key;
+        std::string expected;
+    } rows[] = {
+        {file, kCFURLNameKey, "font file.ttf"},
+        {file, kCFURLParentDirectoryURLKey, "file://" + PathOf("sub") + "/"},
+        {file, kCFURLIsRegularFileKey, "true"},
+        {file, kCFURLIsDirectoryKey, "false"},
+        {file, kCFURLIsSymbolicLinkKey, "false"},
+        {file, kCFURLFileSizeKey, "10"},
+        {file, kCFURLContentModificationDateKey, std::to_string(631152000.5)},
+        {file, _kCFURLFileSizeOfResourceForkKey, "<null>"},
+        {link, kCFURLIsSymbolicLinkKey, "true"},
+        {link, kCFURLIsRegularFileKey, "false"},
+        {link, kCFURLFileSizeKey, "<null>"},
+        {directory, kCFURLIsDirectoryKey, "true"},
+        {directory, kCFURLFileSizeKey, "<null>"},
+        {root, kCFURLNameKey, "/"},
+        {root, kCFURLParentDirectoryURLKey, "<null>"},
+    };
+    for (const auto& row : rows) {
+        Ref value(row.url.CopyProperty(row.key, nullptr));
+        EXPECT_EQ(ValueText(value.get()), row.expected)
+            << TextOf(row.url) << " " << TextOf(row.key);
+    }
+    Ref created(file.CopyProperty(kCFURLCreationDateKey, nullptr));
     if (created) { // only where the file system records birth times
         EXPECT_NEAR(CFDateGetAbsoluteTime(created.as<CFDateRef>()), CFAbsoluteTimeGetCurrent(), 60);
     }
-    EXPECT_EQ(url.CopyProperty(_kCFURLFileSizeOfResourceForkKey, nullptr), nullptr);
-}
 
-TEST_F(FileUtilities, PropertiesOfLinksAndDirectoriesDescribeTheItemItself) {
-    WriteFile("target", "0123456789");
-    ASSERT_EQ(symlink("target", PathOf("link").c_str()), 0);
-    TCFURL link(NewFileURL(PathOf("link")), kAdopted);
-    Ref isLink(link.CopyProperty(kCFURLIsSymbolicLinkKey, nullptr));
-    EXPECT_EQ(isLink.get(), kCFBooleanTrue);
-    Ref isRegular(link.CopyProperty(kCFURLIsRegularFileKey, nullptr));
-    EXPECT_EQ(isRegular.get(), kCFBooleanFalse);
-    EXPECT_EQ(link.CopyProperty(kCFURLFileSizeKey, nullptr), nullptr);
-
-    TCFURL directory(NewFileURL(directory_, true), kAdopted);
-    Ref isDirectory(directory.CopyProperty(kCFURLIsDirectoryKey, nullptr));
-    EXPECT_EQ(isDirectory.get(), kCFBooleanTrue);
-    EXPECT_EQ(directory.CopyProperty(kCFURLFileSizeKey, nullptr), nullptr);
-
-    TCFURL root(NewFileURL("/", true), kAdopted);
-    Ref rootName(root.CopyProperty(kCFURLNameKey, nullptr));
-    EXPECT_EQ(TextOf(rootName.get()), "/");
-    EXPECT_EQ(root.CopyProperty(kCFURLParentDirectoryURLKey, nullptr), nullptr);
-}
-
-TEST_F(FileUtilities, PropertyOfAMissingItemFailsWithAPOSIXError) {
     TCFURL missing(NewFileURL(PathOf("missing")), kAdopted);
     CFErrorRef error = nullptr;
     EXPECT_EQ(missing.CopyProperty(kCFURLNameKey, &error), nullptr);
@@ -313,10 +273,6 @@ TEST_F(FileUtilities, PropertyOfAMissingItemFailsWithAPOSIXError) {
     EXPECT_TRUE(CFEqual(CFErrorGetDomain(error), kCFErrorDomainPOSIX));
     EXPECT_EQ(CFErrorGetCode(error), ENOENT);
     CFRelease(error);
-
-    error = nullptr;
-    EXPECT_EQ(TCFURL(nullptr).CopyProperty(kCFURLNameKey, &error), nullptr);
-    EXPECT_EQ(error, nullptr);
 }
 
 namespace {
@@ -350,57 +306,61 @@ protected:
         return TextOf(type.get());
     }
 
-    bool Conforms(const std::string& name, const char* type) {
-        std::string path = WriteFile(name, "x");
-        TCFURL url(NewFileURL(path), kAdopted);
-        Ref wanted = Str(type);
-        return url.ConformsToUTI(wanted.as<CFStringRef>());
+    bool Conforms(const std::string& name, CFStringRef type) {
+        std::string path = name.back() == '/' ? PathOf(name) : WriteFile(name, "x");
+        return TCFURL(NewFileURL(path), kAdopted).ConformsToUTI(type);
     }
 };
 
 } // namespace
 
 TEST_F(TypeConformance, TypeComesFromTheBestMatchingGlob) {
-    EXPECT_EQ(TypeOf("a.ttf"), "font/ttf");
-    EXPECT_EQ(TypeOf("B.TTF"), "font/ttf");
-    EXPECT_EQ(TypeOf("x.special.ttf"), "application/x-special-font");
-    EXPECT_EQ(TypeOf("main.C"), "text/x-c++src");
-    EXPECT_EQ(TypeOf("main.c"), "text/x-csrc");
-    EXPECT_EQ(TypeOf("Makefile"), "text/x-makefile");
-    EXPECT_EQ(TypeOf("unknown.bin"), "application/octet-stream");
     std::filesystem::create_directories(PathOf("folder.ttf"));
-    EXPECT_EQ(TypeOf("folder.ttf/"), "inode/directory");
-}
+    const std::pair<const char*, const char*> rows[] = {
+        {"a.ttf", "font/ttf"},
+        {"B.TTF", "font/ttf"},
+        {"main.C", "text/x-c++src"},
+        {"main.c", "text/x-csrc"},
+        {"Makefile", "text/x-makefile"},
+        {"unknown.bin", "application/octet-stream"},
+        {"folder.ttf/", "inode/directory"},
+        {"x.special.ttf", "application/x-special-font"},
+    };
+    for (const auto& [name, type] : rows)
+        EXPECT_EQ(TypeOf(name), type) << name;
 
-TEST_F(TypeConformance, UserDatabaseReplacesTheGlobsOfTheTypesItLists) {
     WriteFile("user/mime/globs2", "50:font/ttf:*.truetype\n"
                                   "50:font/otf:__NOGLOBS__\n");
-    EXPECT_EQ(TypeOf("a.truetype"), "font/ttf");
-    EXPECT_EQ(TypeOf("a.ttf"), "application/octet-stream");
-    EXPECT_EQ(TypeOf("a.otf"), "application/octet-stream");
-    EXPECT_EQ(TypeOf("a.ttc"), "font/collection");
+    EXPECT_EQ(TypeOf("a.truetype"), "font/ttf"); // the user's list replaces the system's
+    EXPECT_EQ(TypeOf("b.ttf"), "application/octet-stream");
+    EXPECT_EQ(TypeOf("b.otf"), "application/octet-stream");
+    EXPECT_EQ(TypeOf("b.ttc"), "font/collection");
 }
 
 TEST_F(TypeConformance, ConformanceFollowsTheSubclassChain) {
-    EXPECT_TRUE(Conforms("a.otf", "font/otf"));
-    EXPECT_TRUE(Conforms("a.otf", "FONT/TTF"));
-    EXPECT_TRUE(Conforms("a.otf", "font/sfnt"));
-    EXPECT_TRUE(Conforms("a.otf", "application/octet-stream"));
-    EXPECT_FALSE(Conforms("a.ttf", "font/collection"));
-    EXPECT_FALSE(Conforms("a.ttc", "font/ttf"));
-    EXPECT_TRUE(Conforms("main.c", "text/plain"));
-    EXPECT_FALSE(Conforms("a.ttf", "text/plain"));
-}
-
-TEST_F(TypeConformance, NoConformanceForMissingItemsDirectoriesOrNull) {
+    std::filesystem::create_directories(PathOf("folder"));
+    const struct {
+        const char* name;
+        CFStringRef type;
+        bool conforms;
+    } rows[] = {
+        {"a.otf", CFSTR("font/otf"), true},
+        {"a.otf", CFSTR("FONT/TTF"), true},
+        {"a.otf", CFSTR("font/sfnt"), true},
+        {"a.otf", CFSTR("application/octet-stream"), true},
+        {"a.ttf", CFSTR("font/collection"), false},
+        {"a.ttc", CFSTR("font/ttf"), false},
+        {"main.c", CFSTR("text/plain"), true},
+        {"a.ttf", CFSTR("text/plain"), false},
+        {"a.ttf", nullptr, false},
+        {"folder/", CFSTR("inode/directory"), true},
+        {"folder/", CFSTR("application/octet-stream"), false},
+    };
+    for (const auto& row : rows)
+        EXPECT_EQ(Conforms(row.name, row.type), row.conforms)
+            << row.name << " " << TextOf(row.type);
     TCFURL missing(NewFileURL(PathOf("missing.ttf")), kAdopted);
     EXPECT_FALSE(missing.ConformsToUTI(CFSTR("font/ttf")));
-    TCFURL directory(NewFileURL(directory_, true), kAdopted);
-    EXPECT_TRUE(directory.ConformsToUTI(CFSTR("inode/directory")));
-    EXPECT_FALSE(directory.ConformsToUTI(CFSTR("application/octet-stream")));
-    EXPECT_FALSE(TCFURL(nullptr).ConformsToUTI(CFSTR("font/ttf")));
-    TCFURL file(NewFileURL(WriteFile("a.ttf", "x")), kAdopted);
-    EXPECT_FALSE(file.ConformsToUTI(nullptr));
 }
 
 namespace {
@@ -415,35 +375,33 @@ protected:
 
 } // namespace
 
-TEST_F(ConfigurationDirectory, MissingDirectoryIsCreatedWithMode0700) {
-    SetEnvironment("XDG_RUNTIME_DIR", PathOf("run").c_str());
-    EXPECT_EQ(DirectoryURL(kUserRuntimeDirectory), "file://" + PathOf("run") + "/");
+TEST_F(ConfigurationDirectory, ComesFromTheEnvironmentAndIsCreatedWithMode0700) {
+    WriteFile("occupied", "x");
+    const struct {
+        const char* variable;
+        std::string value; // "-": unset
+        confstr_path_t name;
+        std::string expected;
+    } rows[] = {
+        {"XDG_RUNTIME_DIR", PathOf("run"), kUserRuntimeDirectory, "file://" + PathOf("run") + "/"},
+        {"XDG_CACHE_HOME", PathOf("cache"), kUserCacheDirectory, "file://" + PathOf("cache") + "/"},
+        {"TMPDIR", PathOf("tmp"), kUserTemporaryDirectory, "file://" + PathOf("tmp") + "/"},
+        {"TMPDIR", "-", kUserTemporaryDirectory, "file:///tmp/"},
+        // An existing file counts as present.
+        {"XDG_RUNTIME_DIR", PathOf("occupied"), kUserRuntimeDirectory,
+         "file://" + PathOf("occupied") + "/"},
+        {"XDG_RUNTIME_DIR", "-", kUserRuntimeDirectory, "<null>"},
+        {"XDG_RUNTIME_DIR", "relative/run", kUserRuntimeDirectory, "<null>"},
+        {"XDG_RUNTIME_DIR", PathOf("no/parent"), kUserRuntimeDirectory, "<null>"},
+    };
+    for (const auto& row : rows) {
+        SetEnvironment(row.variable, row.value == "-" ? nullptr : row.value.c_str());
+        EXPECT_EQ(DirectoryURL(row.name), row.expected) << row.variable << "=" << row.value;
+    }
     struct stat status;
     ASSERT_EQ(stat(PathOf("run").c_str(), &status), 0);
     EXPECT_TRUE(S_ISDIR(status.st_mode));
     EXPECT_EQ(status.st_mode & 0777, 0700u);
-
-    SetEnvironment("XDG_CACHE_HOME", PathOf("cache").c_str());
-    EXPECT_EQ(DirectoryURL(kUserCacheDirectory), "file://" + PathOf("cache") + "/");
-    SetEnvironment("TMPDIR", PathOf("tmp").c_str());
-    EXPECT_EQ(DirectoryURL(kUserTemporaryDirectory), "file://" + PathOf("tmp") + "/");
-}
-
-TEST_F(ConfigurationDirectory, ExistingFileCountsAsPresent) {
-    WriteFile("occupied", "x");
-    SetEnvironment("XDG_RUNTIME_DIR", PathOf("occupied").c_str());
-    EXPECT_EQ(DirectoryURL(kUserRuntimeDirectory), "file://" + PathOf("occupied") + "/");
-}
-
-TEST_F(ConfigurationDirectory, NullWithoutAValueOrWhenCreationFails) {
-    SetEnvironment("XDG_RUNTIME_DIR", nullptr);
-    EXPECT_EQ(DirectoryURL(kUserRuntimeDirectory), "<null>");
-    SetEnvironment("XDG_RUNTIME_DIR", "relative/run");
-    EXPECT_EQ(DirectoryURL(kUserRuntimeDirectory), "<null>");
-    SetEnvironment("XDG_RUNTIME_DIR", PathOf("no/parent").c_str());
-    EXPECT_EQ(DirectoryURL(kUserRuntimeDirectory), "<null>");
-    SetEnvironment("TMPDIR", nullptr);
-    EXPECT_EQ(DirectoryURL(kUserTemporaryDirectory), "file:///tmp/");
 }
 
 TEST_F(ConfigurationDirectory, PathMustFitIn1024BytesWithItsTerminator) {

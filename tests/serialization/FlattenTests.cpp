@@ -1,24 +1,24 @@
+// The writer: the exact bytes of every kind, texts and URLs a reader would refuse, failures
+// and their log lines, the size estimates and the byte-order primitives.
 #include <gtest/gtest.h>
 
 #include <string>
 
 #include "serialization/TCFFlattenContext.h"
+#include "support/FlattenedBytes.h"
 #include "support/LogCapture.h"
 #include "support/Values.h"
 
 using namespace glyphwell::testing;
+using Lines = std::vector<std::string>;
 
 namespace {
 
-/// The flattened bytes of `value` in a new buffer, as upper-case hex.
 std::string Flattened(CFTypeRef value) {
-    Ref buffer(CFDataCreateMutable(nullptr, 0));
-    {
-        TCFFlattenContext context(const_cast<__CFData*>(buffer.as<CFDataRef>()), false);
-        context.Flatten(value);
-    }
-    return ToHex(buffer.as<CFDataRef>());
+    return ToHex(FlattenedBytes(value));
 }
+
+const char kStringFailed[] = "ERROR: Quzel::TCFFlattenContext::FlattenCFString failed.";
 
 std::string Repeat(const std::string& unit, size_t times) {
     std::string text;
@@ -29,13 +29,21 @@ std::string Repeat(const std::string& unit, size_t times) {
 
 } // namespace
 
-TEST(FlattenKinds, WritesTheDocumentedBytesForEveryScalarKind) {
-    Ref a = Str("a");
+TEST(FlattenKinds, WritesTheDocumentedBytesForEveryKind) {
+    Ref a = Str("a"), domain = Str("D"), inner = Array({kCFBooleanFalse});
+    Ref base(CFURLCreateWithString(nullptr, CFSTR("http://h/a/b"), nullptr));
     const UInt8 bytes[] = {0xDE, 0xAD, 0x00};
     const CFUUIDBytes uuidBytes = {0, 1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11, 12, 13, 14, 15};
+    auto unconvertible = [](size_t before) { // long texts are converted in the output itself
+        std::vector<UniChar> units(before, 'x');
+        units.push_back(0xD800);
+        return Ref(CFStringCreateWithCharacters(nullptr, units.data(), CFIndex(units.size())));
+    };
+    const std::string longURL = "http://h/" + Repeat("a", 0x100000);
     const struct {
         Ref value;
         const char* hex;
+        Lines log = {};
     } rows[] = {
         {Str("abc"), "00 00 00 07 00 00 00 03 61 62 63"},
         {Dict({}), "00 00 00 10 00 00 00 00"},
@@ -61,42 +69,43 @@ TEST(FlattenKinds, WritesTheDocumentedBytesForEveryScalarKind) {
          "00 00 00 1B 00 00 00 0C 00 00 00 00 00 20 00 00 00 00 00 10"},
         {Array({}), "00 00 00 11 00 00 00 00"},
         {Set({}), "00 00 01 00 00 00 00 00"},
+        // Errors keep the code cut to 32 bits and lose their user info.
+        {Ref(CFErrorCreate(nullptr, domain.as<CFStringRef>(), 0x100000002L,
+                           Dict({{domain.get(), kCFBooleanTrue}}).as<CFDictionaryRef>())),
+         "00 00 01 04 00 00 00 02 00 00 00 07 00 00 00 01 44"},
+        // Relative URLs are written as their absolute form.
+        {Ref(CFURLCreateWithString(nullptr, CFSTR("c?q"), base.as<CFURLRef>())),
+         "00 00 01 01 00 00 00 0E 68 74 74 70 3A 2F 2F 68 2F 61 2F 63 3F 71"},
+        {Ref(CFURLCreateWithBytes(nullptr, nullptr, 0, kCFStringEncodingUTF8, nullptr)),
+         "00 00 01 01 00 00 00 00"},
+        // Containers depth first, in order.
+        {Array({a.get(), inner.get(), kCFBooleanTrue}),
+         "00 00 00 11 00 00 00 03 00 00 00 07 00 00 00 01 61 00 00 00 11 00 00 00 01 00 00 01 03 "
+         "00 00 00 01 00 00 00 01 03 00 00 00 01 01"},
+        {Str("\xF0\x9F\x98\x80"), "00 00 00 07 00 00 00 04 F0 9F 98 80"},
+        // What a reader would refuse or the text cannot be converted is written empty, and the
+        // stream goes on.
+        {Array({unconvertible(0).get(), kCFBooleanTrue}),
+         "00 00 00 11 00 00 00 02 00 00 00 07 00 00 00 00 00 00 01 03 00 00 00 01 01",
+         {kStringFailed}},
+        {Array({unconvertible(100).get(), kCFBooleanTrue}),
+         "00 00 00 11 00 00 00 02 00 00 00 07 00 00 00 00 00 00 01 03 00 00 00 01 01",
+         {kStringFailed}},
+        {Ref(CFURLCreateWithBytes(nullptr, reinterpret_cast<const UInt8*>(longURL.data()),
+                                  CFIndex(longURL.size()), kCFStringEncodingUTF8, nullptr)),
+         "00 00 01 01 00 00 00 00",
+         {"ERROR: Quzel::TCFFlattenContext::FlattenCFURL failed."}},
     };
     for (const auto& row : rows) {
         SCOPED_TRACE(row.hex);
+        LogCapture log;
         EXPECT_EQ(Flattened(row.value.get()), row.hex);
+        EXPECT_EQ(log.Texts(), row.log);
     }
     EXPECT_EQ(Flattened(nullptr), "");
 }
 
-TEST(FlattenKinds, WritesErrorsWithTheCodeCutTo32BitsAndWithoutUserInfo) {
-    Ref domain = Str("D");
-    Ref info = Dict({{domain.get(), kCFBooleanTrue}});
-    Ref error(
-        CFErrorCreate(nullptr, domain.as<CFStringRef>(), 0x100000002L, info.as<CFDictionaryRef>()));
-    EXPECT_EQ(Flattened(error.get()), "00 00 01 04 00 00 00 02 00 00 00 07 00 00 00 01 44");
-}
-
-TEST(FlattenKinds, WritesRelativeURLsAsTheirAbsoluteForm) {
-    Ref base(CFURLCreateWithString(nullptr, CFSTR("http://h/a/b"), nullptr));
-    Ref url(CFURLCreateWithString(nullptr, CFSTR("c?q"), base.as<CFURLRef>()));
-    EXPECT_EQ(Flattened(url.get()),
-              "00 00 01 01 00 00 00 0E 68 74 74 70 3A 2F 2F 68 2F 61 2F 63 3F 71");
-    Ref empty(CFURLCreateWithBytes(nullptr, nullptr, 0, kCFStringEncodingUTF8, nullptr));
-    ASSERT_TRUE(empty);
-    EXPECT_EQ(Flattened(empty.get()), "00 00 01 01 00 00 00 00");
-}
-
-TEST(FlattenContainers, WritesElementsDepthFirstInOrder) {
-    Ref a = Str("a");
-    Ref inner = Array({kCFBooleanFalse});
-    EXPECT_EQ(Flattened(Array({a.get(), inner.get(), kCFBooleanTrue}).get()),
-              "00 00 00 11 00 00 00 03 00 00 00 07 00 00 00 01 61 00 00 00 11 00 00 00 01 00 00 "
-              "01 03 00 00 00 01 00 00 00 01 03 00 00 00 01 01");
-}
-
 TEST(FlattenStrings, TextsUpToWhatAReaderTakesAreWrittenWholeAndLongerOnesAsEmpty) {
-    EXPECT_EQ(Flattened(Str("\xF0\x9F\x98\x80").get()), "00 00 00 07 00 00 00 04 F0 9F 98 80");
     // The limit is 0x100000 bytes, and units: 0x40000 astral characters are 0x80000 units but
     // exactly 0x100000 bytes. Longer texts are written as empty with one line each, since a
     // reader refusing them would lose the rest of the stream.
@@ -111,49 +120,13 @@ TEST(FlattenStrings, TextsUpToWhatAReaderTakesAreWrittenWholeAndLongerOnesAsEmpt
     for (const auto& row : rows) {
         SCOPED_TRACE(testing::Message() << row.text.size() << " bytes");
         LogCapture log;
-        Ref buffer(CFDataCreateMutable(nullptr, 0));
-        {
-            TCFFlattenContext context(const_cast<__CFData*>(buffer.as<CFDataRef>()), false);
-            context.Flatten(Str(row.text).get());
-        }
-        EXPECT_EQ(ToHex(CFDataGetBytePtr(buffer.as<CFDataRef>()), 8),
+        const std::vector<uint8_t> bytes = FlattenedBytes(Str(row.text).get());
+        EXPECT_EQ(ToHex(bytes.data(), 8),
                   row.fits ? "00 00 00 07 00 10 00 00" : "00 00 00 07 00 00 00 00");
-        EXPECT_EQ(CFDataGetLength(buffer.as<CFDataRef>()), row.fits ? 8 + 0x100000 : 8);
-        if (row.fits) {
-            EXPECT_TRUE(log.Lines().empty());
-        } else {
-            ASSERT_EQ(log.Lines().size(), 1u);
-            EXPECT_EQ(log.Lines()[0].text,
-                      "ERROR: Quzel::TCFFlattenContext::FlattenCFString failed.");
-            EXPECT_EQ(log.Lines()[0].channel, glyphwell::LogChannel::System);
-            EXPECT_EQ(log.Lines()[0].level, 3);
-        }
-    }
-}
-
-TEST(FlattenURLs, WritesURLsTheReaderWouldRefuseAsEmpty) {
-    LogCapture log;
-    const std::string text = "http://h/" + Repeat("a", 0x100000);
-    Ref url(CFURLCreateWithBytes(nullptr, reinterpret_cast<const UInt8*>(text.data()),
-                                 CFIndex(text.size()), kCFStringEncodingUTF8, nullptr));
-    ASSERT_TRUE(url);
-    EXPECT_EQ(Flattened(url.get()), "00 00 01 01 00 00 00 00");
-    EXPECT_EQ(log.Texts(),
-              std::vector<std::string>{"ERROR: Quzel::TCFFlattenContext::FlattenCFURL failed."});
-}
-
-TEST(FlattenStrings, WritesUnconvertibleTextAsEmptyAndGoesOn) {
-    // A short text and one long enough to be converted in the output buffer itself, which must
-    // then be cut back to the empty string's head.
-    for (size_t before : {0, 100}) {
-        LogCapture log;
-        std::vector<UniChar> units(before, 'x');
-        units.push_back(0xD800);
-        Ref broken(CFStringCreateWithCharacters(nullptr, units.data(), CFIndex(units.size())));
-        EXPECT_EQ(Flattened(Array({broken.get(), kCFBooleanTrue}).get()),
-                  "00 00 00 11 00 00 00 02 00 00 00 07 00 00 00 00 00 00 01 03 00 00 00 01 01");
-        EXPECT_EQ(log.Texts(), std::vector<std::string>{
-                                   "ERROR: Quzel::TCFFlattenContext::FlattenCFString failed."});
+        EXPECT_EQ(bytes.size(), row.fits ? 8 + 0x100000u : 8u);
+        EXPECT_EQ(log.Texts(), row.fits ? Lines{} : Lines{kStringFailed});
+        for (const auto& line : log.Lines())
+            EXPECT_TRUE(line.channel == glyphwell::LogChannel::System && line.level == 3);
     }
 }
 
@@ -235,16 +208,6 @@ TEST(FlattenEstimates, MatchTheBytesWrittenExceptForStringsAndCharacterSets) {
 
     Ref set(CFCharacterSetCreateWithCharactersInRange(nullptr, CFRangeMake(0x1F600, 2)));
     EXPECT_EQ(TCFFlattenContext::EstimateSize(set.get()), 8200 + 8193);
-}
-
-TEST(FlattenPrimitives, ConvertToBigEndianSwapsOnlyTwoFourAndEightBytes) {
-    uint8_t two[] = {1, 2}, three[] = {1, 2, 3}, eight[] = {1, 2, 3, 4, 5, 6, 7, 8};
-    EXPECT_EQ(ConvertToBigEndian(two, 2), two);
-    EXPECT_EQ(ToHex(two, 2), "02 01");
-    ConvertToBigEndian(three, 3);
-    EXPECT_EQ(ToHex(three, 3), "01 02 03");
-    ConvertToBigEndian(eight, 8);
-    EXPECT_EQ(ToHex(eight, 8), "08 07 06 05 04 03 02 01");
 }
 
 TEST(FlattenPrimitives, StreamOutSwapsEachElementAndLeavesTheSourceAlone) {
