@@ -116,6 +116,13 @@ public:
         std::unique_lock<std::mutex> lock(shared_->mutex);
         return shared_->changed.wait_for(lock, kRunTimeout, [this] { return shared_->ended; });
     }
+    /// Waits until the run let go of its handler: it can report nothing more.
+    bool WaitForRelease() const {
+        const auto deadline = std::chrono::steady_clock::now() + kRunTimeout;
+        while (shared_.use_count() > 1 && std::chrono::steady_clock::now() < deadline)
+            std::this_thread::sleep_for(milliseconds(10));
+        return shared_.use_count() == 1;
+    }
     std::vector<Event> Events() const {
         std::lock_guard<std::mutex> lock(shared_->mutex);
         return shared_->events;
@@ -345,6 +352,7 @@ TEST_F(FontServiceTest, AnInterruptedTransferEndsTheRunAndLeavesNoFile) {
         if (canceller.joinable())
             canceller.join();
         ASSERT_TRUE(ended);
+        EXPECT_TRUE(recorder.WaitForRelease());
         EXPECT_TRUE(WaitForEmptyDownloadFolder()) << DownloadFolder().join(", ").toStdString();
         EXPECT_EQ(recorder.States(), c.states);
         EXPECT_TRUE(recorder.Events().back().matched.empty());
