@@ -92,11 +92,11 @@ TEST_F(CatalogTest, ReturnsTheAssetsOfEachRequestedFontInRequestOrder) {
 }
 
 TEST_F(CatalogTest, TheUserCatalogComesFirstAndChangesAreReadAgain) {
-    WriteCatalog(system_.path() + "/b",
-                 "{\"assets\": [" + Asset("B", "1", "{\"postScriptName\": \"F\"}") + "]}");
+    const QByteArray text =
+        "{\"assets\": [" + Asset("B", "1", "{\"postScriptName\": \"F\"}") + "]}";
+    WriteCatalog(system_.path() + "/b", text);
     EXPECT_EQ(Query({"F"}), std::vector<std::string>{"B"});
-    WriteCatalog(home_.path(),
-                 "{\"assets\": [" + Asset("User", "1", "{\"postScriptName\": \"F\"}") + "]}");
+    WriteCatalog(home_.path(), QByteArray(text).replace("\"B\"", "\"User\""));
     EXPECT_EQ(Query({"F"}), std::vector<std::string>{"User"});
 }
 
