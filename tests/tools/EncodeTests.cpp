@@ -115,8 +115,7 @@ TEST(EncodeCommand, RefusesAValueTheWriterCannotCarryUnchanged) {
                                  9));
 }
 
-TEST(EncodeCommand, ReportsUnknownOptionsAndMissingFiles) {
-    EXPECT_EQ(Encode("{}", {"--bogus"}).status, 2);
+TEST(EncodeCommand, ReportsAMissingInputFile) {
     const Result missing = Encode("", {"/nonexistent/input.json"});
     EXPECT_EQ(missing.status, 1);
     EXPECT_NE(missing.err.find("cannot open /nonexistent/input.json"), std::string::npos);

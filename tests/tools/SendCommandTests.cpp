@@ -50,6 +50,10 @@ TEST_F(SendCommandTest, PrintsTheReplyOrSaysWhyThereIsNone) {
 
     EchoServer server;
     ASSERT_TRUE(server.Started());
+    const std::string tagged = R"({"a": [1, {"$data": "3q0="}]})";
+    const std::string unreadable = "ERROR: Quzel got corrupted data. (cftype)\n"
+                                   "*** don't how to resurrect type 99999\n"
+                                   "glyphwell send: the reply is not a readable value\n";
     struct Case {
         std::vector<std::string> options; ///< after --msgid
         std::string input;
@@ -58,20 +62,9 @@ TEST_F(SendCommandTest, PrintsTheReplyOrSaysWhyThereIsNone) {
         std::string out;
         std::string err;
     } cases[] = {
-        {{"-7", "--compact"},
-         R"({"a": [1, {"$data": "3q0="}]})",
-         "",
-         0,
-         "{\"a\":[1,{\"$data\":\"3q0=\"}]}\n",
-         ""},
+        {{"-7", "--compact"}, tagged, "", 0, "{\"a\":[1,{\"$data\":\"3q0=\"}]}\n", ""},
         {{"99", "--empty"}, "", "", 0, "", "glyphwell send: the reply is empty\n"},
-        {{"1"},
-         "{}",
-         "xyz",
-         1,
-         "null\n",
-         "ERROR: Quzel got corrupted data. (cftype)\n*** don't how to resurrect type 99999\n"
-         "glyphwell send: the reply is not a readable value\n"},
+        {{"1"}, "{}", "xyz", 1, "null\n", unreadable},
     };
     for (const Case& c : cases) {
         SCOPED_TRACE(c.options[0]);
@@ -159,6 +152,8 @@ TEST_F(SendCommandTest, RejectsIncompleteCommandLines) {
          "glyphwell ask-download: unknown argument --send-timeout\n"},
         {{"ask-activation", "--candidate", "/a.ttf", "--bundle"},
          "glyphwell ask-activation: --bundle needs a value\n"},
+        {{"encode", "--bogus"}, nullptr},
+        {{"decode", "--expect", "bogus"}, nullptr},
     };
     for (const Case& c : cases) {
         const ToolResult result = Invoke(c.arguments, "{}");
