@@ -17,6 +17,10 @@ const char kName[] = "org.glyphwell.Test.Client";
 std::string Big32(uint32_t value) {
     return {char(value >> 24), char(value >> 16), char(value >> 8), char(value)};
 }
+uint32_t Length(const std::string& big32) {
+    const auto* b = reinterpret_cast<const unsigned char*>(big32.data());
+    return uint32_t(b[0]) << 24 | b[1] << 16 | b[2] << 8 | b[3];
+}
 /// A flattened string value.
 std::string String(const std::string& text) {
     return Big32(7) + Big32(uint32_t(text.size())) + text;
@@ -31,17 +35,13 @@ std::string Reply(char result, char suppress, int extraCount = 0, const std::str
            String("QZUIPropertySuppress") + Answer(suppress) + extra;
 }
 
-struct RequestDeleter {
-    void operator()(glyphwell_request* r) const { glyphwell_request_free(r); }
-};
-struct ReplyDeleter {
-    void operator()(glyphwell_reply* r) const { glyphwell_reply_free(r); }
-};
-using Request = std::unique_ptr<glyphwell_request, RequestDeleter>;
-using Reply_ = std::unique_ptr<glyphwell_reply, ReplyDeleter>;
+using Request = std::unique_ptr<glyphwell_request, decltype(&glyphwell_request_free)>;
 
+Request NewRequest(int question) {
+    return Request(glyphwell_request_new(question), glyphwell_request_free);
+}
 Request DownloadRequest() {
-    Request request(glyphwell_request_new(GLYPHWELL_ASK_DOWNLOAD));
+    Request request = NewRequest(GLYPHWELL_ASK_DOWNLOAD);
     glyphwell_request_add_font(request.get(), "Example-Bold", "Example");
     return request;
 }
@@ -56,12 +56,9 @@ public:
             const int connection = accept(listener_, nullptr, nullptr);
             if (connection < 0)
                 return;
-            const std::string head = RawRead(connection, 8);
-            if (head.size() == 8) {
-                const auto* b = reinterpret_cast<const unsigned char*>(head.data());
-                const size_t length = size_t(b[4]) << 24 | b[5] << 16 | b[6] << 8 | b[7];
-                request = head + RawRead(connection, length);
-            }
+            request = RawRead(connection, 8);
+            if (request.size() == 8)
+                request += RawRead(connection, Length(request.substr(4)));
             RawWrite(connection, answer);
             if (hold)
                 RawRead(connection, 1, -1);
@@ -93,8 +90,8 @@ protected:
 
 TEST_F(ClientTest, RefusesRequestsTheirQuestionDoesNotTake) {
     EXPECT_EQ(glyphwell_request_new(3), nullptr);
-    Request activation(glyphwell_request_new(GLYPHWELL_ASK_ACTIVATION));
-    Request download(glyphwell_request_new(GLYPHWELL_ASK_DOWNLOAD));
+    Request activation = NewRequest(GLYPHWELL_ASK_ACTIVATION);
+    Request download = NewRequest(GLYPHWELL_ASK_DOWNLOAD);
     const void* bytes = nullptr;
     size_t length = 0;
     struct Case {
@@ -188,12 +185,13 @@ TEST_F(ClientTest, SendsTheFlattenedRequestAndReadsTheAnswers) {
                                    Big32(1) + Big32(0x101) + Big32(uint32_t(url.size())) + url;
     const std::string answer = Reply(1, 1, 1, candidates);
     ScriptedServer server(Big32(uint32_t(answer.size())) + answer);
-    Request request(glyphwell_request_new(GLYPHWELL_ASK_ACTIVATION));
+    Request request = NewRequest(GLYPHWELL_ASK_ACTIVATION);
     ASSERT_EQ(glyphwell_request_add_candidate_file(request.get(), "/fonts/A Font.otf"), 0);
     ASSERT_EQ(glyphwell_request_add_font(request.get(), "A-Bold", "A"), 0);
     glyphwell_reply* raw = nullptr;
     ASSERT_EQ(glyphwell_request_send(request.get(), kName, -1, &raw), GLYPHWELL_OK);
-    Reply_ reply(raw);
+    std::unique_ptr<glyphwell_reply, decltype(&glyphwell_reply_free)> reply(raw,
+                                                                            glyphwell_reply_free);
     EXPECT_EQ(glyphwell_reply_get_result(raw), 1);
     EXPECT_EQ(glyphwell_reply_get_suppress(raw), 1);
     ASSERT_EQ(glyphwell_reply_get_candidate_count(raw), 1u);

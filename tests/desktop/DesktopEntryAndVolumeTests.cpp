@@ -96,15 +96,12 @@ TEST(MountInfo, ParsesEscapesAndTheLongestAndLastStackedMountHoldsAPath) {
 TEST(VolumeName, IsTheLabelElseTheMountPointNameAndNoneOnTheRootFileSystem) {
     QTemporaryDir directory;
     const QString canonical = QFileInfo(directory.path()).canonicalFilePath();
-    const QString device = WriteFile(directory.filePath("fake-device"), "");
-    QDir(directory.path()).mkdir("by-label");
+    for (const char* folder : {"by-label", "labelled/fonts", "plain", "bound"})
+        QDir(directory.path()).mkpath(folder);
+    for (const char* file : {"fake-device", "labelled/fonts/A.ttf", "plain/B.ttf", "bound/C.ttf"})
+        WriteFile(directory.filePath(file), "");
+    const QString device = directory.filePath("fake-device");
     QFile::link(device, directory.filePath("by-label/Fonts\\x20Disk"));
-    QDir(directory.path()).mkpath("labelled/fonts");
-    QDir(directory.path()).mkpath("plain");
-    QDir(directory.path()).mkpath("bound");
-    const QString font = WriteFile(directory.filePath("labelled/fonts/A.ttf"), "");
-    WriteFile(directory.filePath("plain/B.ttf"), "");
-    WriteFile(directory.filePath("bound/C.ttf"), "");
     const QString table =
         WriteFile(directory.filePath("mountinfo"),
                   QStringLiteral("1 0 8:1 / / rw - ext4 /dev/root rw\n"
@@ -115,7 +112,8 @@ TEST(VolumeName, IsTheLabelElseTheMountPointNameAndNoneOnTheRootFileSystem) {
                       .toUtf8());
     const QString labels = directory.filePath("by-label");
 
-    EXPECT_EQ(QZNonRootVolumeName(font, table, labels), "Fonts Disk");
+    EXPECT_EQ(QZNonRootVolumeName(directory.filePath("labelled/fonts/A.ttf"), table, labels),
+              "Fonts Disk");
     EXPECT_EQ(QZNonRootVolumeName(directory.filePath("plain/B.ttf"), table, labels), "plain");
     // A bind mount of the root file system is still the system's volume.
     EXPECT_EQ(QZNonRootVolumeName(directory.filePath("bound/C.ttf"), table, labels), "");

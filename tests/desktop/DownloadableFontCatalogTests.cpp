@@ -46,28 +46,21 @@ protected:
     }
     /// The "LocalID"s a query for `names` returns, in order.
     std::vector<std::string> Query(std::initializer_list<const char*> names) {
-        std::vector<Ref> fonts;
-        std::vector<const void*> values;
+        Ref request(CFArrayCreateMutable(nullptr, 0, &kCFTypeArrayCallBacks));
         for (const char* name : names)
-            values.push_back(fonts.emplace_back(Dict({{NSFontNameKey(), Str(name).get()}})).get());
-        Ref request(
-            CFArrayCreate(nullptr, values.data(), CFIndex(values.size()), &kCFTypeArrayCallBacks));
+            CFArrayAppendValue(request.as<CFMutableArrayRef>(),
+                               Dict({{CFSTR("NSFontNameAttribute"), Str(name).get()}}).get());
         last_ = Ref(QZCopyDownloadableFontAttributesForRequests(request.as<CFArrayRef>()));
         std::vector<std::string> identifiers;
         for (CFIndex i = 0; i < CFArrayGetCount(last_.as<CFArrayRef>()); ++i)
             identifiers.push_back(String(At(i), "LocalID"));
         return identifiers;
     }
-    static CFStringRef NSFontNameKey() { return CFSTR("NSFontNameAttribute"); }
     CFDictionaryRef At(CFIndex i) const {
         return static_cast<CFDictionaryRef>(CFArrayGetValueAtIndex(last_.as<CFArrayRef>(), i));
     }
     static std::string String(CFDictionaryRef dictionary, const char* key) {
-        char buffer[256] = {};
-        CFStringGetCString(
-            static_cast<CFStringRef>(CFDictionaryGetValue(dictionary, Str(key).get())), buffer,
-            sizeof buffer, kCFStringEncodingUTF8);
-        return buffer;
+        return TextOf(CFDictionaryGetValue(dictionary, Str(key).get()));
     }
 
     QTemporaryDir home_;
@@ -99,11 +92,11 @@ TEST_F(CatalogTest, ReturnsTheAssetsOfEachRequestedFontInRequestOrder) {
 }
 
 TEST_F(CatalogTest, TheUserCatalogComesFirstAndChangesAreReadAgain) {
-    WriteCatalog(system_.path() + "/b",
-                 "{\"assets\": [" + Asset("B", "1", "{\"postScriptName\": \"F\"}") + "]}");
+    const QByteArray text =
+        "{\"assets\": [" + Asset("B", "1", "{\"postScriptName\": \"F\"}") + "]}";
+    WriteCatalog(system_.path() + "/b", text);
     EXPECT_EQ(Query({"F"}), std::vector<std::string>{"B"});
-    WriteCatalog(home_.path(),
-                 "{\"assets\": [" + Asset("User", "1", "{\"postScriptName\": \"F\"}") + "]}");
+    WriteCatalog(home_.path(), QByteArray(text).replace("\"B\"", "\"User\""));
     EXPECT_EQ(Query({"F"}), std::vector<std::string>{"User"});
 }
 
@@ -200,13 +193,13 @@ TEST(LogEscape, EscapesControlsBackslashesAndMalformedUTF8) {
 /// Each problem as "line:column asset: message" (asset problems) or "kind: message".
 std::vector<std::string> Problems(const std::vector<QZCatalogProblem>& problems) {
     std::vector<std::string> texts;
-    for (const QZCatalogProblem& problem : problems)
-        texts.push_back(problem.kind == QZCatalogProblem::Kind::Asset
-                            ? std::to_string(problem.line) + ":" + std::to_string(problem.column) +
-                                  " " + std::to_string(problem.asset) + ": " + problem.message
-                            : (problem.kind == QZCatalogProblem::Kind::Unreadable ? "unreadable: "
-                                                                                  : "malformed: ") +
-                                  problem.message.substr(0, 32));
+    for (const QZCatalogProblem& p : problems)
+        texts.push_back(
+            p.kind == QZCatalogProblem::Kind::Asset
+                ? std::to_string(p.line) + ":" + std::to_string(p.column) + " " +
+                      std::to_string(p.asset) + ": " + p.message
+                : (p.kind == QZCatalogProblem::Kind::Unreadable ? "unreadable: " : "malformed: ") +
+                      p.message.substr(0, 32));
     return texts;
 }
 

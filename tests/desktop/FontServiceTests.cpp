@@ -11,7 +11,6 @@
 #include <fcntl.h>
 #include <fontconfig/fontconfig.h>
 #include <mutex>
-#include <openssl/evp.h>
 #include <sys/wait.h>
 #include <thread>
 #include <unistd.h>
@@ -30,30 +29,27 @@
 
 namespace {
 
-using glyphwell::testing::kDejaVu;
-using glyphwell::testing::ReadFile;
-using glyphwell::testing::SHA256Of;
-
-using glyphwell::testing::Dict;
-using glyphwell::testing::LogCapture;
-using glyphwell::testing::LoopbackHTTPServer;
-using glyphwell::testing::Ref;
-using glyphwell::testing::Str;
+using namespace glyphwell::testing;
 using std::chrono::milliseconds;
+using Resource = LoopbackHTTPServer::Resource;
 
 constexpr auto kRunTimeout = std::chrono::seconds(20);
-
-std::string Utf8(CFTypeRef value) {
-    if (!value || CFGetTypeID(value) != CFStringGetTypeID())
-        return {};
-    return glyphwell::Describe(value);
-}
 
 int64_t Int64(CFTypeRef value) {
     int64_t number = -1;
     if (value && CFGetTypeID(value) == CFNumberGetTypeID())
         CFNumberGetValue(static_cast<CFNumberRef>(value), kCFNumberSInt64Type, &number);
     return number;
+}
+
+/// The `key` of each dictionary of an array.
+std::vector<std::string> Names(CFTypeRef array, const char* key) {
+    std::vector<std::string> names;
+    for (CFIndex i = 0; array && i < CFArrayGetCount(static_cast<CFArrayRef>(array)); ++i)
+        names.push_back(TextOf(CFDictionaryGetValue(
+            static_cast<CFDictionaryRef>(CFArrayGetValueAtIndex(static_cast<CFArrayRef>(array), i)),
+            Str(key).get())));
+    return names;
 }
 
 /// What one callback carried.
@@ -65,43 +61,27 @@ struct Event {
     int64_t downloaded = -1;
     int64_t total = -1;
     bool hasCancelHandler = false;
-    std::string errorDomain;
-    CFIndex errorCode = 0;
-    std::string failureReason;
+    std::string error; ///< "domain code: failure reason" (state 8)
 };
 
-std::vector<std::string> Names(CFTypeRef array, CFStringRef key) {
-    std::vector<std::string> names;
-    if (!array || CFGetTypeID(array) != CFArrayGetTypeID())
-        return names;
-    for (CFIndex i = 0; i < CFArrayGetCount(static_cast<CFArrayRef>(array)); ++i)
-        names.push_back(Utf8(CFDictionaryGetValue(
-            static_cast<CFDictionaryRef>(CFArrayGetValueAtIndex(static_cast<CFArrayRef>(array), i)),
-            key)));
-    return names;
-}
-
 Event Read(uint32_t state, CFDictionaryRef progress) {
+    const auto get = [progress](CFStringRef key) { return CFDictionaryGetValue(progress, key); };
     Event event;
     event.state = state;
-    event.names = Names(CFDictionaryGetValue(progress, kCTFontDescriptorMatchingDescriptors),
-                        CFSTR("NSFontNameAttribute"));
-    const void* result = CFDictionaryGetValue(progress, kCTFontDescriptorMatchingResult);
-    event.matched = Names(result, CFSTR("NSFontNameAttribute"));
-    event.matchedFamilies = Names(result, CFSTR("NSFontFamilyAttribute"));
-    event.downloaded =
-        Int64(CFDictionaryGetValue(progress, kCTFontDescriptorMatchingTotalDownloadedSize));
-    event.total = Int64(CFDictionaryGetValue(progress, kCTFontDescriptorMatchingTotalAssetSize));
-    const void* handler =
-        CFDictionaryGetValue(progress, kCTFontDescriptorMatchingCancelDownloadHandler);
+    event.names = Names(get(kCTFontDescriptorMatchingDescriptors), "NSFontNameAttribute");
+    event.matched = Names(get(kCTFontDescriptorMatchingResult), "NSFontNameAttribute");
+    event.matchedFamilies = Names(get(kCTFontDescriptorMatchingResult), "NSFontFamilyAttribute");
+    event.downloaded = Int64(get(kCTFontDescriptorMatchingTotalDownloadedSize));
+    event.total = Int64(get(kCTFontDescriptorMatchingTotalAssetSize));
+    const void* handler = get(kCTFontDescriptorMatchingCancelDownloadHandler);
     event.hasCancelHandler = handler && CFGetTypeID(handler) == QZCancelDownloadHandlerGetTypeID();
-    if (const void* error = CFDictionaryGetValue(progress, kCTFontDescriptorMatchingError)) {
+    if (const void* error = get(kCTFontDescriptorMatchingError)) {
         auto* cfError = static_cast<CFErrorRef>(const_cast<void*>(error));
-        event.errorDomain = Utf8(CFErrorGetDomain(cfError));
-        event.errorCode = CFErrorGetCode(cfError);
         Ref userInfo(CFErrorCopyUserInfo(cfError));
-        event.failureReason = Utf8(CFDictionaryGetValue(userInfo.as<CFDictionaryRef>(),
-                                                        kCFErrorLocalizedFailureReasonKey));
+        event.error = TextOf(CFErrorGetDomain(cfError)) + " " +
+                      std::to_string(CFErrorGetCode(cfError)) + ": " +
+                      TextOf(CFDictionaryGetValue(userInfo.as<CFDictionaryRef>(),
+                                                  kCFErrorLocalizedFailureReasonKey));
     }
     return event;
 }
@@ -136,6 +116,13 @@ public:
         std::unique_lock<std::mutex> lock(shared_->mutex);
         return shared_->changed.wait_for(lock, kRunTimeout, [this] { return shared_->ended; });
     }
+    /// Waits until the run let go of its handler: it can report nothing more.
+    bool WaitForRelease() const {
+        const auto deadline = std::chrono::steady_clock::now() + kRunTimeout;
+        while (shared_.use_count() > 1 && std::chrono::steady_clock::now() < deadline)
+            std::this_thread::sleep_for(milliseconds(10));
+        return shared_.use_count() == 1;
+    }
     std::vector<Event> Events() const {
         std::lock_guard<std::mutex> lock(shared_->mutex);
         return shared_->events;
@@ -161,17 +148,10 @@ private:
 };
 
 /// A resource sent `chunk` bytes at a time with `pause` after each.
-LoopbackHTTPServer::Resource Throttled(size_t chunk, milliseconds pause) {
-    LoopbackHTTPServer::Resource resource;
+Resource Throttled(size_t chunk, milliseconds pause) {
+    Resource resource;
     resource.chunkSize = chunk;
     resource.pauseBetweenChunks = pause;
-    return resource;
-}
-
-/// A resource whose connection is closed after `bytes` bytes of the body.
-LoopbackHTTPServer::Resource Dropped(size_t bytes) {
-    LoopbackHTTPServer::Resource resource;
-    resource.dropAfter = bytes;
     return resource;
 }
 
@@ -180,35 +160,31 @@ protected:
     void SetUp() override {
         ASSERT_TRUE(root_.isValid());
         ASSERT_TRUE(server_.IsListening());
-        fonts_ = glyphwell::testing::UsePrivateFonts(root_.path());
+        fonts_ = UsePrivateFonts(root_.path());
         ASSERT_FALSE(fonts_.isEmpty());
         ASSERT_FALSE(QZIsFontInstalled("DejaVuSans-Bold"));
     }
-    void TearDown() override { glyphwell::testing::StopUsingPrivateFonts(); }
+    void TearDown() override { StopUsingPrivateFonts(); }
 
     /// Serves the DejaVu file `file` at "/<file>" with `resource`'s delivery settings and
-    /// returns its catalog entry holding `postScriptName`. `sha256` and `size` replace the
-    /// file's own when given.
+    /// returns its catalog entry holding `postScriptName`; `sha256` replaces the file's own.
     std::string ServeFont(const QString& file, const std::string& localID,
-                          const std::string& postScriptName,
-                          LoopbackHTTPServer::Resource resource = {}, std::string sha256 = {},
-                          int64_t size = -1) {
+                          const std::string& postScriptName, Resource resource = {},
+                          std::string sha256 = {}) {
         resource.body = ReadFile(kDejaVu + file);
         EXPECT_FALSE(resource.body.empty()) << file.toStdString();
         if (sha256.empty())
             sha256 = SHA256Of(resource.body);
-        if (size < 0)
-            size = int64_t(resource.body.size());
         const std::string path = "/" + file.toStdString();
         server_.Serve(path, resource);
         return "{\"LocalID\": \"" + localID + "\", \"url\": \"" + server_.URL(path) +
-               "\", \"size\": " + std::to_string(size) + ", \"sha256\": \"" + sha256 +
-               "\", \"fonts\": [{\"postScriptName\": \"" + postScriptName + "\"}]}";
+               "\", \"size\": " + std::to_string(resource.body.size()) + ", \"sha256\": \"" +
+               sha256 + "\", \"fonts\": [{\"postScriptName\": \"" + postScriptName + "\"}]}";
     }
     void WriteCatalog(const std::vector<std::string>& assets) {
         std::string text = "{\"assets\": [";
-        for (size_t i = 0; i < assets.size(); ++i)
-            text += (i ? ", " : "") + assets[i];
+        for (const std::string& asset : assets)
+            text += (&asset == &assets[0] ? "" : ", ") + asset;
         text += "]}";
         QDir().mkpath(root_.path() + "/data/glyphwell");
         QFile file(root_.path() + "/data/glyphwell/downloadable-fonts.json");
@@ -216,39 +192,28 @@ protected:
         file.write(text.data(), qint64(text.size()));
     }
     static Ref Descriptors(std::initializer_list<const char*> names) {
-        std::vector<Ref> dictionaries;
+        Ref array(CFArrayCreateMutable(nullptr, 0, &kCFTypeArrayCallBacks));
         for (const char* name : names)
-            dictionaries.push_back(Dict({{Str("NSFontNameAttribute").get(), Str(name).get()}}));
-        std::vector<const void*> values;
-        for (const Ref& dictionary : dictionaries)
-            values.push_back(dictionary.get());
-        return Ref(
-            CFArrayCreate(nullptr, values.data(), CFIndex(values.size()), &kCFTypeArrayCallBacks));
+            CFArrayAppendValue(array.as<CFMutableArrayRef>(),
+                               Dict({{CFSTR("NSFontNameAttribute"), Str(name).get()}}).get());
+        return array;
     }
     /// Every entry of the download folder, hidden ones included.
     QStringList DownloadFolder() const {
         return QDir(fonts_ + "/glyphwell")
             .entryList(QDir::Files | QDir::Hidden | QDir::NoDotAndDotDot, QDir::Name);
     }
-    /// Waits until the download folder holds nothing (the run ends without a last callback).
-    bool WaitForEmptyDownloadFolder() const {
-        const auto deadline = std::chrono::steady_clock::now() + kRunTimeout;
-        while (!DownloadFolder().isEmpty() && std::chrono::steady_clock::now() < deadline)
-            std::this_thread::sleep_for(milliseconds(10));
-        return DownloadFolder().isEmpty();
-    }
     /// What another application finds: fc-list with the same environment.
     static std::string ListedFile(const std::string& postScriptName) {
         const std::string command =
             "fc-list --format '%{file}\\n' ':postscriptname=" + postScriptName + "'";
-        FILE* pipe = popen(command.c_str(), "r");
-        if (!pipe)
-            return {};
         std::string output;
         char buffer[512];
-        while (size_t n = fread(buffer, 1, sizeof buffer, pipe))
-            output.append(buffer, n);
-        pclose(pipe);
+        if (FILE* pipe = popen(command.c_str(), "r")) {
+            while (size_t n = fread(buffer, 1, sizeof buffer, pipe))
+                output.append(buffer, n);
+            pclose(pipe);
+        }
         return output;
     }
 
@@ -257,43 +222,66 @@ protected:
     LoopbackHTTPServer server_;
 };
 
-TEST_F(FontServiceTest, DownloadsInstallsAndMatchesAMissingFont) {
-    const std::string original = ReadFile(kDejaVu + "DejaVuSans-Bold.ttf");
-    WriteCatalog({ServeFont("DejaVuSans-Bold.ttf", "org.dejavu.SansBold", "DejaVuSans-Bold",
-                            Throttled(64 * 1024, milliseconds(20)))});
+TEST_F(FontServiceTest, DownloadsWhatIsMissingAndGoesOnAfterAFailure) {
+    const std::string bold = ReadFile(kDejaVu + "DejaVuSans-Bold.ttf");
+    const std::string serif = ReadFile(kDejaVu + "DejaVuSerif.ttf");
+    // An installed font is matched without a download.
+    ASSERT_TRUE(QFile::copy(kDejaVu + "DejaVuSansMono.ttf", fonts_ + "/DejaVuSansMono.ttf"));
+    ASSERT_TRUE(QZReloadFontConfiguration());
+    WriteCatalog(
+        {ServeFont("DejaVuSans-Bold.ttf", "bold", "DejaVuSans-Bold", {}, std::string(64, '0')),
+         ServeFont("DejaVuSerif.ttf", "org.dejavu.Serif", "DejaVuSerif",
+                   Throttled(64 * 1024, milliseconds(20))),
+         ServeFont("DejaVuSansMono.ttf", "mono", "DejaVuSansMono")});
     Recorder recorder;
     ASSERT_TRUE(QZMatchFontDescriptorsWithProgressHandler(
-        Descriptors({"DejaVuSans-Bold"}).as<CFArrayRef>(), nullptr, recorder.Handler()));
+        Descriptors({"DejaVuSans-Bold", "NotInTheCatalog", "DejaVuSansMono", "DejaVuSerif"})
+            .as<CFArrayRef>(),
+        nullptr, recorder.Handler()));
     ASSERT_TRUE(recorder.WaitForEnd());
 
-    EXPECT_EQ(recorder.States(), (std::vector<uint32_t>{0, 2, 4, 5, 6, 7, 1}));
+    EXPECT_EQ(recorder.States(),
+              (std::vector<uint32_t>{0, 2, 4, 5, 8, 2, 8, 2, 7, 2, 4, 5, 6, 7, 1}));
     const std::vector<Event> events = recorder.Events();
-    const int64_t size = int64_t(original.size());
+    std::vector<std::string> failures;
+    // The byte count goes on from the failed asset's full size.
+    const int64_t size = int64_t(bold.size() + serif.size());
     int64_t previous = 0;
-    for (const Event& event : events) {
-        EXPECT_TRUE(event.hasCancelHandler) << "state " << event.state;
-        if (event.state >= 2 && event.state <= 7) {
-            EXPECT_EQ(event.names, std::vector<std::string>{"DejaVuSans-Bold"});
+    for (size_t i = 0; i < events.size(); ++i) {
+        const Event& event = events[i];
+        SCOPED_TRACE(i);
+        EXPECT_TRUE(event.hasCancelHandler);
+        if (event.state >= 2) {
+            EXPECT_EQ(event.names.size(), 1u);
         }
         if (event.state >= 4 && event.state <= 6) {
             EXPECT_EQ(event.total, size);
             EXPECT_GE(event.downloaded, previous);
             previous = event.downloaded;
         }
+        if (event.state == kCTFontDescriptorMatchingDidFailWithError)
+            failures.push_back(event.names.at(0) + " " + event.error);
     }
+    EXPECT_EQ(failures, (std::vector<std::string>{
+                            "DejaVuSans-Bold QZFontDownloadErrorDomain 2: The downloaded file is "
+                            "damaged: its SHA-256 checksum is not the expected one.",
+                            "NotInTheCatalog QZFontDownloadErrorDomain 1: No downloadable font "
+                            "has this name."}));
     EXPECT_EQ(events[2].downloaded, 0);
     EXPECT_EQ(events[events.size() - 4].downloaded, size); // the last state 5
     EXPECT_EQ(events[events.size() - 3].downloaded, size); // state 6
-    EXPECT_EQ(events.back().matched, std::vector<std::string>{"DejaVuSans-Bold"});
-    EXPECT_EQ(events.back().matchedFamilies, std::vector<std::string>{"DejaVu Sans"});
+    EXPECT_EQ(events.back().matched, (std::vector<std::string>{"DejaVuSansMono", "DejaVuSerif"}));
+    EXPECT_EQ(events.back().matchedFamilies,
+              (std::vector<std::string>{"DejaVu Sans Mono", "DejaVu Serif"}));
+    EXPECT_EQ(server_.RequestCount("/DejaVuSansMono.ttf"), 0);
 
-    const QString installed = fonts_ + "/glyphwell/org.dejavu.SansBold.ttf";
-    EXPECT_EQ(DownloadFolder(), QStringList{"org.dejavu.SansBold.ttf"});
-    EXPECT_TRUE(ReadFile(installed) == original);
-    const std::optional<QZInstalledFont> found = QZFindInstalledFont("DejaVuSans-Bold");
+    const QString installed = fonts_ + "/glyphwell/org.dejavu.Serif.ttf";
+    EXPECT_EQ(DownloadFolder(), QStringList{"org.dejavu.Serif.ttf"});
+    EXPECT_TRUE(ReadFile(installed) == serif);
+    const std::optional<QZInstalledFont> found = QZFindInstalledFont("DejaVuSerif");
     ASSERT_TRUE(found);
     EXPECT_EQ(found->file, installed.toStdString());
-    EXPECT_EQ(ListedFile("DejaVuSans-Bold"), installed.toStdString() + "\n");
+    EXPECT_EQ(ListedFile("DejaVuSerif"), installed.toStdString() + "\n");
     // Another application starting now reads the folder from the cache instead of scanning it.
     FcConfig* fresh = FcInitLoadConfig();
     FcCache* cache = FcDirCacheLoad(
@@ -305,121 +293,65 @@ TEST_F(FontServiceTest, DownloadsInstallsAndMatchesAMissingFont) {
     FcConfigDestroy(fresh);
 }
 
-TEST_F(FontServiceTest, MatchesAnInstalledFontWithoutDownloading) {
-    ASSERT_TRUE(QFile::copy(kDejaVu + "DejaVuSerif.ttf", fonts_ + "/DejaVuSerif.ttf"));
-    ASSERT_TRUE(QZReloadFontConfiguration());
-    WriteCatalog({ServeFont("DejaVuSerif.ttf", "serif", "DejaVuSerif")});
-    Recorder recorder;
-    QZMatchFontDescriptorsWithProgressHandler(Descriptors({"DejaVuSerif"}).as<CFArrayRef>(),
-                                              nullptr, recorder.Handler());
-    ASSERT_TRUE(recorder.WaitForEnd());
-
-    EXPECT_EQ(recorder.States(), (std::vector<uint32_t>{0, 2, 7, 1}));
-    EXPECT_EQ(recorder.Events().back().matched, std::vector<std::string>{"DejaVuSerif"});
-    EXPECT_EQ(server_.RequestCount("/DejaVuSerif.ttf"), 0);
-    EXPECT_TRUE(DownloadFolder().isEmpty());
-}
-
-TEST_F(FontServiceTest, CancelHandlerAbortsTheTransferAndFinishesWithoutAFile) {
+TEST_F(FontServiceTest, AnInterruptedTransferEndsTheRunAndLeavesNoFile) {
+    const std::string size = std::to_string(ReadFile(kDejaVu + "DejaVuSans-Bold.ttf").size());
     // At 1 KiB per 50 ms the whole file would take half a minute, longer than the wait.
-    WriteCatalog({ServeFont("DejaVuSans-Bold.ttf", "bold", "DejaVuSans-Bold",
-                            Throttled(1024, milliseconds(50)))});
-    std::thread canceller;
-    std::once_flag cancelOnce;
-    Recorder recorder([&](const Event& event, CFTypeRef cancelHandler) {
-        if (event.state == kCTFontDescriptorMatchingDownloading) {
-            // Like the window's Cancel button: another thread calls the kept handler.
-            std::call_once(cancelOnce, [&] {
+    const Resource slow = Throttled(1024, milliseconds(50));
+    Resource dropped;
+    dropped.dropAfter = 10000;
+    enum class Stop { CancelHandler, FalseToProgress, FalseToFailure };
+    struct Case {
+        const char* name;
+        Stop stop;
+        Resource resource;
+        std::vector<uint32_t> states;
+        std::string error; ///< of the last callback
+    } cases[] = {
+        // Cancelling ends the run with a finish and no match, the second font included.
+        {"cancel handler", Stop::CancelHandler, slow, {0, 2, 4, 5, 1}, ""},
+        // After a false answer nothing more is reported.
+        {"false answer", Stop::FalseToProgress, slow, {0, 2, 4, 5}, ""},
+        {"dropped connection",
+         Stop::FalseToFailure,
+         dropped,
+         {0, 2, 4, 5, 8},
+         "QZFontDownloadErrorDomain 2: The connection ended after 10000 of " + size + " bytes."},
+    };
+    for (const Case& c : cases) {
+        SCOPED_TRACE(c.name);
+        WriteCatalog({ServeFont("DejaVuSans-Bold.ttf", "bold", "DejaVuSans-Bold", c.resource)});
+        std::thread canceller;
+        Recorder recorder([&](const Event& event, CFTypeRef cancelHandler) {
+            if (c.stop == Stop::FalseToFailure)
+                return event.state != kCTFontDescriptorMatchingDidFailWithError;
+            if (event.state != kCTFontDescriptorMatchingDownloading)
+                return true;
+            if (c.stop == Stop::FalseToProgress)
+                return false;
+            if (!canceller.joinable()) {
+                // Like the window's Cancel button: another thread calls the kept handler.
                 CFRetain(cancelHandler);
                 canceller = std::thread([cancelHandler] {
                     QZCancelDownloadHandlerInvoke(cancelHandler);
                     CFRelease(cancelHandler);
                 });
-            });
-        }
-        return true;
-    });
-    QZMatchFontDescriptorsWithProgressHandler(
-        Descriptors({"DejaVuSans-Bold", "DejaVuSerif"}).as<CFArrayRef>(), nullptr,
-        recorder.Handler());
-    const bool ended = recorder.WaitForEnd();
-    if (canceller.joinable())
-        canceller.join();
-    ASSERT_TRUE(ended);
-
-    EXPECT_EQ(recorder.States(), (std::vector<uint32_t>{0, 2, 4, 5, 1}));
-    EXPECT_TRUE(recorder.Events().back().matched.empty());
-    EXPECT_TRUE(DownloadFolder().isEmpty()) << DownloadFolder().join(", ").toStdString();
-    EXPECT_FALSE(QZIsFontInstalled("DejaVuSans-Bold"));
-}
-
-TEST_F(FontServiceTest, FalseAnswerEndsTheRunAndRemovesThePartialFile) {
-    WriteCatalog({ServeFont("DejaVuSans-Bold.ttf", "bold", "DejaVuSans-Bold",
-                            Throttled(1024, milliseconds(50)))});
-    Recorder recorder([](const Event& event, CFTypeRef) {
-        return event.state != kCTFontDescriptorMatchingDownloading;
-    });
-    QZMatchFontDescriptorsWithProgressHandler(Descriptors({"DejaVuSans-Bold"}).as<CFArrayRef>(),
-                                              nullptr, recorder.Handler());
-    ASSERT_TRUE(recorder.WaitForEnd());
-    EXPECT_TRUE(WaitForEmptyDownloadFolder()) << DownloadFolder().join(", ").toStdString();
-    // Nothing is reported after the false answer.
-    std::this_thread::sleep_for(milliseconds(200));
-    EXPECT_EQ(recorder.States(), (std::vector<uint32_t>{0, 2, 4, 5}));
-}
-
-TEST_F(FontServiceTest, ChecksumMismatchFailsAndTheRunGoesOnToTheNextFont) {
-    WriteCatalog(
-        {ServeFont("DejaVuSans-Bold.ttf", "bold", "DejaVuSans-Bold", {}, std::string(64, '0')),
-         ServeFont("DejaVuSerif.ttf", "serif", "DejaVuSerif"),
-         ServeFont("DejaVuSansMono.ttf", "mono", "DejaVuSansMono")});
-    Recorder recorder;
-    QZMatchFontDescriptorsWithProgressHandler(
-        Descriptors({"DejaVuSans-Bold", "NotInTheCatalog", "DejaVuSerif"}).as<CFArrayRef>(),
-        nullptr, recorder.Handler());
-    ASSERT_TRUE(recorder.WaitForEnd());
-
-    EXPECT_EQ(recorder.States(), (std::vector<uint32_t>{0, 2, 4, 5, 8, 2, 8, 2, 4, 5, 6, 7, 1}));
-    std::vector<Event> failures;
-    for (const Event& event : recorder.Events())
-        if (event.state == kCTFontDescriptorMatchingDidFailWithError)
-            failures.push_back(event);
-    ASSERT_EQ(failures.size(), 2u);
-    EXPECT_EQ(failures[0].names, std::vector<std::string>{"DejaVuSans-Bold"});
-    EXPECT_EQ(failures[0].errorDomain, "QZFontDownloadErrorDomain");
-    EXPECT_EQ(failures[0].errorCode, 2);
-    EXPECT_EQ(failures[0].failureReason,
-              "The downloaded file is damaged: its SHA-256 checksum is not the expected one.");
-    EXPECT_EQ(failures[1].names, std::vector<std::string>{"NotInTheCatalog"});
-    EXPECT_EQ(failures[1].errorCode, 1);
-    EXPECT_EQ(failures[1].failureReason, "No downloadable font has this name.");
-    // The byte count goes on from the failed asset's full size.
-    const int64_t boldSize = int64_t(ReadFile(kDejaVu + "DejaVuSans-Bold.ttf").size());
-    const int64_t serifSize = int64_t(ReadFile(kDejaVu + "DejaVuSerif.ttf").size());
-    for (const Event& event : recorder.Events())
-        if (event.state == kCTFontDescriptorMatchingDidFinishDownloading) {
-            EXPECT_EQ(event.downloaded, boldSize + serifSize);
-        }
-    EXPECT_EQ(recorder.Events().back().matched, std::vector<std::string>{"DejaVuSerif"});
-    EXPECT_EQ(DownloadFolder(), QStringList{"serif.ttf"});
-}
-
-TEST_F(FontServiceTest, DroppedConnectionFailsWithTheBytesReceived) {
-    const std::string size = std::to_string(ReadFile(kDejaVu + "DejaVuSans-Bold.ttf").size());
-    WriteCatalog({ServeFont("DejaVuSans-Bold.ttf", "bold", "DejaVuSans-Bold", Dropped(10000))});
-    Recorder recorder([](const Event& event, CFTypeRef) {
-        return event.state != kCTFontDescriptorMatchingDidFailWithError;
-    });
-    QZMatchFontDescriptorsWithProgressHandler(
-        Descriptors({"DejaVuSans-Bold", "DejaVuSerif"}).as<CFArrayRef>(), nullptr,
-        recorder.Handler());
-    ASSERT_TRUE(recorder.WaitForEnd());
-
-    // The false answer to the failure ends the run: no second font, no finish.
-    EXPECT_EQ(recorder.States(), (std::vector<uint32_t>{0, 2, 4, 5, 8}));
-    EXPECT_EQ(recorder.Events().back().failureReason,
-              "The connection ended after 10000 of " + size + " bytes.");
-    EXPECT_TRUE(WaitForEmptyDownloadFolder());
+            }
+            return true;
+        });
+        QZMatchFontDescriptorsWithProgressHandler(
+            Descriptors({"DejaVuSans-Bold", "DejaVuSerif"}).as<CFArrayRef>(), nullptr,
+            recorder.Handler());
+        const bool ended = recorder.WaitForEnd();
+        if (canceller.joinable())
+            canceller.join();
+        ASSERT_TRUE(ended);
+        EXPECT_TRUE(recorder.WaitForRelease());
+        EXPECT_TRUE(DownloadFolder().isEmpty()) << DownloadFolder().join(", ").toStdString();
+        EXPECT_EQ(recorder.States(), c.states);
+        EXPECT_TRUE(recorder.Events().back().matched.empty());
+        EXPECT_EQ(recorder.Events().back().error, c.error);
+        EXPECT_FALSE(QZIsFontInstalled("DejaVuSans-Bold"));
+    }
 }
 
 /// QZDownloadFontAsset on its own, into the download folder.
@@ -442,69 +374,14 @@ protected:
                                    QZFontInstallDirectory(), progress, cancellation);
     }
     /// Serves `resource` with `body` at `path`; its URL.
-    std::string Serve(const std::string& path, const std::string& body,
-                      LoopbackHTTPServer::Resource resource = {}) {
+    std::string Serve(const std::string& path, const std::string& body, Resource resource = {}) {
         resource.body = body;
         server_.Serve(path, std::move(resource));
         return server_.URL(path);
     }
 };
 
-TEST_F(FontDownloaderTest, FetchesFileURLsIntoANameMadeFromTheLocalID) {
-    const std::string body = ReadFile(kDejaVu + "DejaVuSansMono.ttf");
-    const QZFontDownloadResult result =
-        Download("file://" + (kDejaVu + "DejaVuSansMono.ttf").toStdString(), body, "../fonts/Mono");
-    ASSERT_EQ(result.outcome, QZFontDownloadOutcome::Installed) << result.failureReason;
-    const std::string expected = (fonts_ + "/glyphwell/_._fonts_Mono-").toStdString() +
-                                 SHA256Of("../fonts/Mono").substr(0, 16) + ".ttf";
-    EXPECT_EQ(result.path, expected);
-    EXPECT_TRUE(ReadFile(QString::fromStdString(expected)) == body);
-    EXPECT_TRUE(QZIsFontInstalled("DejaVuSansMono"));
-}
-
-TEST_F(FontDownloaderTest, FailuresSayWhyAndLeaveNoFile) {
-    const std::string serif = ReadFile(kDejaVu + "DejaVuSerif.ttf");
-    const std::string serifSize = std::to_string(serif.size());
-    const std::string notAFont(4096, 'x');
-    LoopbackHTTPServer::Resource resource;
-    resource.body = serif;
-    server_.Serve("/serif", resource);
-    resource.body = notAFont;
-    server_.Serve("/not-a-font", resource);
-    resource.body.clear();
-    resource.redirectTo = "file://" + (kDejaVu + "DejaVuSerif.ttf").toStdString();
-    server_.Serve("/to-file", resource);
-    struct Case {
-        std::string url;
-        std::string body; ///< gives the expected size and SHA-256
-        std::string reason;
-    };
-    const std::vector<Case> cases = {
-        {server_.URL("/missing"), serif, "The server answered with the HTTP status 404."},
-        {server_.URL("/serif"), serif + "!",
-         "The server offers " + serifSize + " bytes, but the font should have " +
-             std::to_string(serif.size() + 1) + " bytes."},
-        {server_.URL("/not-a-font"), notAFont, "The downloaded file is not a font."},
-        // A redirect never reaches a local file.
-        {server_.URL("/to-file"), serif,
-         "Fonts are downloaded only from https, http and file addresses, and redirected only to "
-         "https and http ones."},
-        {"ftp://127.0.0.1/font.ttf", serif,
-         "Fonts are downloaded only from https, http and file addresses, and redirected only to "
-         "https and http ones."},
-        {"file:///nonexistent/font.ttf", serif,
-         "The download failed: Couldn't open file /nonexistent/font.ttf"},
-    };
-    for (const Case& test : cases) {
-        SCOPED_TRACE(test.url);
-        const QZFontDownloadResult result = Download(test.url, test.body);
-        EXPECT_EQ(result.outcome, QZFontDownloadOutcome::Failed);
-        EXPECT_EQ(result.failureReason, test.reason);
-        EXPECT_TRUE(DownloadFolder().isEmpty()) << DownloadFolder().join(", ").toStdString();
-    }
-}
-
-TEST_F(FontDownloaderTest, ARejectedUpdateLeavesTheInstalledFontAndAVerifiedOneReplacesIt) {
+TEST_F(FontDownloaderTest, AFailedUpdateLeavesTheInstalledFontAndAVerifiedOneReplacesIt) {
     const std::string bold = ReadFile(kDejaVu + "DejaVuSans-Bold.ttf");
     const std::string serif = ReadFile(kDejaVu + "DejaVuSerif.ttf");
     const std::string installed = (fonts_ + "/glyphwell/bold.ttf").toStdString();
@@ -513,27 +390,43 @@ TEST_F(FontDownloaderTest, ARejectedUpdateLeavesTheInstalledFontAndAVerifiedOneR
     const int unnamed = open(QZFontInstallDirectory().c_str(), O_TMPFILE | O_RDWR, 0600);
     if (unnamed >= 0)
         close(unnamed);
+    Resource redirect;
+    redirect.redirectTo = "file://" + (kDejaVu + "DejaVuSerif.ttf").toStdString();
+    const std::string schemes = "Fonts are downloaded only from https, http and file addresses, "
+                                "and redirected only to https and http ones.";
     using Op = QZFontFileOperation;
     struct Case {
-        std::string body;
+        std::string url;  ///< empty: `body` served
+        std::string body; ///< gives the expected size and SHA-256
         Op operation;
         int error; ///< injected into `operation`
         std::string reason;
     };
     const std::vector<Case> cases = {
-        {std::string(4096, 'x'), Op::Write, 0, "The downloaded file is not a font."},
-        {serif, Op::Write, 0, "The downloaded file does not hold the font “DejaVuSans-Bold”."},
-        {bold, Op::Write, ENOSPC, "The font file cannot be written: No space left on device"},
-        {bold, Op::Sync, EIO, "The font file cannot be written: Input/output error"},
-        {bold, Op::Link, unnamed >= 0 ? EDQUOT : 0,
+        {server_.URL("/missing"), bold, Op::Write, 0,
+         "The server answered with the HTTP status 404."},
+        {Serve("/serif", serif), serif + "!", Op::Write, 0,
+         "The server offers " + std::to_string(serif.size()) + " bytes, but the font should have " +
+             std::to_string(serif.size() + 1) + " bytes."},
+        // A redirect never reaches a local file.
+        {Serve("/to-file", "", redirect), serif, Op::Write, 0, schemes},
+        {"ftp://127.0.0.1/font.ttf", serif, Op::Write, 0, schemes},
+        {"file:///nonexistent/font.ttf", serif, Op::Write, 0,
+         "The download failed: Couldn't open file /nonexistent/font.ttf"},
+        {"", std::string(4096, 'x'), Op::Write, 0, "The downloaded file is not a font."},
+        {"", serif, Op::Write, 0, "The downloaded file does not hold the font “DejaVuSans-Bold”."},
+        {"", bold, Op::Write, ENOSPC, "The font file cannot be written: No space left on device"},
+        {"", bold, Op::Sync, EIO, "The font file cannot be written: Input/output error"},
+        {"", bold, Op::Link, unnamed >= 0 ? EDQUOT : 0,
          unnamed >= 0 ? "The font file cannot be written: Disk quota exceeded" : ""},
-        {bold, Op::Rename, EROFS, "The font file cannot be written: Read-only file system"},
+        {"", bold, Op::Rename, EROFS, "The font file cannot be written: Read-only file system"},
     };
     for (const Case& test : cases) {
         SCOPED_TRACE(test.reason);
         QZInjectFontFileFault(test.operation, test.error);
         const QZFontDownloadResult result =
-            Download(Serve("/v2", test.body), test.body, "bold", {"DejaVuSans-Bold"});
+            Download(test.url.empty() ? Serve("/v2", test.body) : test.url, test.body, "bold",
+                     {"DejaVuSans-Bold"});
         QZInjectFontFileFault(test.operation, 0);
         EXPECT_EQ(result.failureReason, test.reason);
         EXPECT_EQ(DownloadFolder(), QStringList{"bold.ttf"});
@@ -576,11 +469,17 @@ TEST_F(FontDownloaderTest, AKilledWriterLeavesNothingOnceTheNextDownloadStarts) 
         kill(child, SIGKILL);
         waitpid(child, nullptr, 0);
         LogCapture log;
+        // A file URL, and a local ID that is no safe file name.
         const std::string url = "file://" + (kDejaVu + "DejaVuSansMono.ttf").toStdString();
-        ASSERT_EQ(Download(url, mono, "mono").outcome, QZFontDownloadOutcome::Installed);
-        EXPECT_EQ(DownloadFolder(), QStringList{"mono.ttf"});
+        const QZFontDownloadResult result = Download(url, mono, "../fonts/Mono");
+        ASSERT_EQ(result.outcome, QZFontDownloadOutcome::Installed) << result.failureReason;
+        const std::string name =
+            "_._fonts_Mono-" + SHA256Of("../fonts/Mono").substr(0, 16) + ".ttf";
+        EXPECT_EQ(DownloadFolder(), QStringList{QString::fromStdString(name)});
+        EXPECT_EQ(result.path, directory + "/" + name);
+        EXPECT_TRUE(ReadFile(QString::fromStdString(result.path)) == mono);
         EXPECT_EQ(log.Texts().size(), kind == 'n' ? 1u : 0u);
-        QFile::remove(fonts_ + "/glyphwell/mono.ttf");
+        QFile::remove(QString::fromStdString(result.path));
     }
 }
 
@@ -597,11 +496,11 @@ TEST_F(FontDownloaderTest, ANamedTemporaryThatCannotBeLockedIsRemovedAtOnce) {
 
 TEST_F(FontDownloaderTest, SlowAndSilentServersAreGivenUpAndCancelWorksMeanwhile) {
     const std::string serif = ReadFile(kDejaVu + "DejaVuSerif.ttf");
-    LoopbackHTTPServer::Resource silent;
+    Resource silent;
     silent.neverAnswer = true;
     using std::chrono::milliseconds;
     struct Case {
-        LoopbackHTTPServer::Resource resource;
+        Resource resource;
         QZDownloadLimits limits;
         bool cancel;
         std::string reason; ///< empty: cancelled

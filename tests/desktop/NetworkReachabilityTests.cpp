@@ -59,54 +59,31 @@ Probe ProbeNamespace(const std::string& setup, Probe expected) {
     return Probe(WEXITSTATUS(status));
 }
 
-class NetworkNamespaceTest : public ::testing::Test {
-protected:
-    void SetUp() override {
-        if (geteuid() != 0)
-            GTEST_SKIP() << "network namespaces need root";
-        if (std::system("command -v ip >/dev/null 2>&1") != 0)
-            GTEST_SKIP() << "no ip command";
-    }
-    /// Probes, skipping the test when the namespace or its links cannot be made.
-    void ExpectProbe(const std::string& setup, Probe expected) {
+TEST(NetworkNamespace, ReachableOnlyByADefaultRouteOverARunningLink) {
+    if (geteuid() != 0 || std::system("command -v ip >/dev/null 2>&1") != 0)
+        GTEST_SKIP() << "network namespaces need root and the ip command";
+    // A veth pair whose two ends stay in the namespace: both up gives a carrier.
+    const std::string veth = "ip link add gw0 type veth peer name gw1; "
+                             "ip link set gw0 up; ip link set gw1 up; ";
+    const std::string v4 = veth + "ip addr add 10.211.0.1/24 dev gw0; ";
+    const std::pair<std::string, Probe> cases[] = {
+        {"ip addr add 10.211.0.1/24 dev lo", Probe::NotReachable},
+        {v4 + "ip route add default via 10.211.0.2 dev gw0", Probe::Reachable},
+        {veth + "ip -6 addr add fd00:211::1/64 dev gw0 nodad; "
+                "ip -6 route add default via fd00:211::2 dev gw0",
+         Probe::Reachable},
+        // The peer goes down: gw0 stays up but stops running; its route stays in the table.
+        {v4 + "ip route add default via 10.211.0.2 dev gw0; ip link set gw1 down; "
+              "ip route show default | grep -q gw0",
+         Probe::NotReachable},
+        {v4 + "ip route add unreachable default", Probe::NotReachable},
+    };
+    for (const auto& [setup, expected] : cases) {
         const Probe found = ProbeNamespace(setup, expected);
         if (found == Probe::Unavailable)
             GTEST_SKIP() << "cannot make the namespace: " << setup;
         EXPECT_EQ(int(found), int(expected)) << setup;
     }
-};
-
-// A veth pair whose two ends stay in the namespace: both up gives a carrier.
-constexpr char kVethUp[] = "ip link add gw0 type veth peer name gw1; "
-                           "ip link set gw0 up; ip link set gw1 up; "
-                           "ip addr add 10.211.0.1/24 dev gw0; ";
-
-TEST_F(NetworkNamespaceTest, NoDefaultRouteIsNotReachable) {
-    ExpectProbe("ip addr add 10.211.0.1/24 dev lo", Probe::NotReachable);
-}
-
-TEST_F(NetworkNamespaceTest, DefaultRouteOverARunningLinkIsReachable) {
-    ExpectProbe(std::string(kVethUp) + "ip route add default via 10.211.0.2 dev gw0",
-                Probe::Reachable);
-}
-
-TEST_F(NetworkNamespaceTest, IPv6DefaultRouteAloneIsReachable) {
-    ExpectProbe("ip link add gw0 type veth peer name gw1; ip link set gw0 up; ip link set gw1 up; "
-                "ip -6 addr add fd00:211::1/64 dev gw0 nodad; "
-                "ip -6 route add default via fd00:211::2 dev gw0",
-                Probe::Reachable);
-}
-
-TEST_F(NetworkNamespaceTest, DefaultRouteOverALinkWithoutCarrierIsNotReachable) {
-    // The peer goes down: gw0 stays up but stops running; its route stays in the table.
-    ExpectProbe(std::string(kVethUp) +
-                    "ip route add default via 10.211.0.2 dev gw0; ip link set gw1 down; "
-                    "ip route show default | grep -q gw0",
-                Probe::NotReachable);
-}
-
-TEST_F(NetworkNamespaceTest, UnreachableDefaultRouteIsNotReachable) {
-    ExpectProbe(std::string(kVethUp) + "ip route add unreachable default", Probe::NotReachable);
 }
 
 } // namespace

@@ -8,6 +8,7 @@
 #include "desktop/QZProcessWatch.h"
 #include "tests/desktop/DesktopTestEnvironment.h"
 #include "tests/support/LogCapture.h"
+#include "tests/support/ScopedEnvironment.h"
 
 namespace {
 
@@ -30,16 +31,11 @@ TEST(ProcessWatch, WatchesNothingForInvalidOrVanishedProcessesWithoutLogging) {
 }
 
 TEST(FileManagerReveal, WithoutASessionBusLogsOneLineAndSendsNothing) {
-    const bool wasSet = qEnvironmentVariableIsSet("DBUS_SESSION_BUS_ADDRESS");
-    const QByteArray previous = qgetenv("DBUS_SESSION_BUS_ADDRESS");
-    qputenv("DBUS_SESSION_BUS_ADDRESS", "unix:path=/nonexistent/glyphwell-test-bus");
+    glyphwell::testing::ScopedEnvironment environment;
+    environment.Set("DBUS_SESSION_BUS_ADDRESS", "unix:path=/nonexistent/glyphwell-test-bus");
     LogCapture log;
     QZRevealInFileManager({QStringLiteral("file:///A.ttf")});
     QZRevealInFileManager({}); // nothing to show: not even a connection attempt
-    if (wasSet)
-        qputenv("DBUS_SESSION_BUS_ADDRESS", previous);
-    else
-        qunsetenv("DBUS_SESSION_BUS_ADDRESS");
 
     const auto lines = log.Texts();
     ASSERT_EQ(lines.size(), 1u);

@@ -3,7 +3,6 @@
 #pragma once
 
 #include <poll.h>
-#include <stdlib.h>
 #include <sys/socket.h>
 #include <sys/un.h>
 #include <unistd.h>
@@ -15,13 +14,13 @@
 #include <functional>
 #include <future>
 #include <mutex>
-#include <optional>
 #include <string>
 #include <thread>
 
 #include "platform/CFData.h"
 #include "platform/CFMessagePort.h"
 #include "platform/CFString.h"
+#include "support/ScopedEnvironment.h"
 
 namespace glyphwell::testing {
 
@@ -32,16 +31,9 @@ public:
         char pattern[] = "/tmp/gw-port-XXXXXX";
         const char* made = mkdtemp(pattern);
         path_ = made ? made : "";
-        const char* previous = getenv("XDG_RUNTIME_DIR");
-        if (previous)
-            previous_ = previous;
-        setenv("XDG_RUNTIME_DIR", path_.c_str(), 1);
+        environment_.Set("XDG_RUNTIME_DIR", path_.c_str());
     }
     ~TemporaryRuntimeDirectory() {
-        if (previous_)
-            setenv("XDG_RUNTIME_DIR", previous_->c_str(), 1);
-        else
-            unsetenv("XDG_RUNTIME_DIR");
         std::error_code ignored;
         std::filesystem::remove_all(path_, ignored);
     }
@@ -52,7 +44,7 @@ public:
 
 private:
     std::string path_;
-    std::optional<std::string> previous_;
+    ScopedEnvironment environment_;
 };
 
 inline CFStringRef CreateCFString(const std::string& text) {
@@ -147,37 +139,29 @@ private:
     PollRunLoopDriver* driver_ = nullptr;
 };
 
-/// A blocking stream socket connected to `path`, or -1.
-inline int RawConnect(const std::string& path) {
+/// A blocking stream socket at `path`: connected to it, or else bound and listening there (no
+/// server behind it); -1 when that fails.
+inline int RawSocket(const std::string& path, bool listening) {
     sockaddr_un address{};
     address.sun_family = AF_UNIX;
     if (path.size() >= sizeof address.sun_path)
         return -1;
     std::memcpy(address.sun_path, path.data(), path.size());
+    const auto* named = reinterpret_cast<const sockaddr*>(&address);
     const int descriptor = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
     if (descriptor >= 0 &&
-        connect(descriptor, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
+        (listening ? bind(descriptor, named, sizeof address) != 0 || listen(descriptor, 16) != 0
+                   : connect(descriptor, named, sizeof address) != 0)) {
         close(descriptor);
         return -1;
     }
     return descriptor;
 }
-
-/// A socket bound and listening at `path` (no server behind it), or -1.
+inline int RawConnect(const std::string& path) {
+    return RawSocket(path, false);
+}
 inline int RawListen(const std::string& path) {
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    if (path.size() >= sizeof address.sun_path)
-        return -1;
-    std::memcpy(address.sun_path, path.data(), path.size());
-    const int descriptor = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    if (descriptor >= 0 &&
-        (bind(descriptor, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0 ||
-         listen(descriptor, 16) != 0)) {
-        close(descriptor);
-        return -1;
-    }
-    return descriptor;
+    return RawSocket(path, true);
 }
 
 inline bool RawWrite(int descriptor, const std::string& bytes) {

@@ -18,10 +18,7 @@ inline const QString kDejaVu = QStringLiteral("/usr/share/fonts/truetype/dejavu/
 
 inline std::string ReadFile(const QString& path) {
     QFile file(path);
-    if (!file.open(QIODevice::ReadOnly))
-        return {};
-    const QByteArray bytes = file.readAll();
-    return std::string(bytes.constData(), size_t(bytes.size()));
+    return file.open(QIODevice::ReadOnly) ? file.readAll().toStdString() : std::string();
 }
 
 /// Points the XDG directories and fontconfig at `root`: the user font directory is

@@ -10,9 +10,10 @@
 #include <QProcess>
 #include <QStringList>
 #include <QTemporaryDir>
-#include <cstdlib>
 #include <string>
 #include <vector>
+
+#include "support/ScopedEnvironment.h"
 
 namespace glyphwell::testing {
 
@@ -48,18 +49,10 @@ public:
         address_ = QString::fromUtf8(daemon_.readLine()).trimmed();
         if (address_.isEmpty())
             return;
-        const char* previous = getenv("DBUS_SESSION_BUS_ADDRESS");
-        hadPrevious_ = previous != nullptr;
-        if (previous)
-            previous_ = previous;
-        setenv("DBUS_SESSION_BUS_ADDRESS", address_.toUtf8().constData(), 1);
+        environment_.Set("DBUS_SESSION_BUS_ADDRESS", address_.toUtf8().constData());
     }
 
     ~PrivateSessionBus() {
-        if (hadPrevious_)
-            setenv("DBUS_SESSION_BUS_ADDRESS", previous_.c_str(), 1);
-        else
-            unsetenv("DBUS_SESSION_BUS_ADDRESS");
         if (daemon_.state() != QProcess::NotRunning) {
             daemon_.kill();
             daemon_.waitForFinished(10000);
@@ -75,8 +68,7 @@ private:
     QTemporaryDir directory_;
     QProcess daemon_;
     QString address_;
-    std::string previous_;
-    bool hadPrevious_ = false;
+    ScopedEnvironment environment_;
 };
 
 /// Owns org.freedesktop.FileManager1 on the bus at `address` over a connection of its own, and

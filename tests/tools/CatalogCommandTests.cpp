@@ -7,26 +7,29 @@
 #include <filesystem>
 #include <fstream>
 #include <nlohmann/json.hpp>
-#include <sstream>
 
 #include "support/LoopbackHTTPServer.h"
 #include "support/SHA256.h"
-#include "tools/Commands.h"
+#include "tests/tools/ToolRun.h"
 
 namespace {
 
 namespace fs = std::filesystem;
 using Json = nlohmann::ordered_json;
 using glyphwell::testing::SHA256Of;
+using Result = glyphwell::testing::ToolResult;
 
 const std::string kDejaVu = "/usr/share/fonts/truetype/dejavu/";
 const std::string kCollection = "/usr/share/fonts/truetype/wqy/wqy-microhei.ttc";
 
-struct Result {
-    int status;
-    std::string out;
-    std::string err;
-};
+/// A resource with `body`, or redirected to `redirect`.
+glyphwell::testing::LoopbackHTTPServer::Resource Served(std::string body,
+                                                        std::string redirect = {}) {
+    glyphwell::testing::LoopbackHTTPServer::Resource resource;
+    resource.body = std::move(body);
+    resource.redirectTo = std::move(redirect);
+    return resource;
+}
 
 std::string Contents(const std::string& path) {
     std::ifstream file(path, std::ios::binary);
@@ -44,10 +47,7 @@ protected:
 
     Result Run(std::vector<std::string> arguments) {
         arguments.insert(arguments.begin(), "catalog");
-        std::istringstream in;
-        std::ostringstream out, err;
-        const int status = glyphwell::tools::RunTool(arguments, in, out, err);
-        return {status, out.str(), err.str()};
+        return glyphwell::testing::Invoke(arguments);
     }
     Result Add(const std::vector<std::string>& files, const std::string& prefix) {
         std::vector<std::string> arguments = {"add"};
@@ -172,7 +172,7 @@ TEST_F(CatalogCommandTest, FetchComparesEveryAssetWithTheCatalog) {
             .status,
         0);
     EXPECT_EQ(Run({"check", catalog_}).status, 0);
-    server.Serve("/fonts/DejaVuSans-Bold.ttf", {sans});
+    server.Serve("/fonts/DejaVuSans-Bold.ttf", Served(sans));
 
     std::string changed = serif;
     changed[1000] ^= 1;
@@ -196,9 +196,7 @@ TEST_F(CatalogCommandTest, FetchComparesEveryAssetWithTheCatalog) {
         {"missing", false, "", "asset DejaVuSerif: cannot download "},
     };
     for (const Case& c : cases) {
-        server.Serve("/fonts/DejaVuSerif.ttf", {c.body});
-        if (!c.serve)
-            server.Serve("/fonts/DejaVuSerif.ttf", {"", 1 << 20, {}, std::string::npos, "/gone"});
+        server.Serve("/fonts/DejaVuSerif.ttf", c.serve ? Served(c.body) : Served("", "/gone"));
         const Result result = Run({"check", catalog_, "--fetch"});
         EXPECT_EQ(result.status, c.problem.empty() ? 0 : 1) << c.what;
         const std::string summary = catalog_ + ": 2 assets, 2 fonts, downloaded; " +

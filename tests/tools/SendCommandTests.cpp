@@ -2,10 +2,9 @@
 #include <gtest/gtest.h>
 
 #include <nlohmann/json.hpp>
-#include <sstream>
 
 #include "support/PortTestSupport.h"
-#include "tools/Commands.h"
+#include "tests/tools/ToolRun.h"
 
 using namespace glyphwell::testing;
 
@@ -13,51 +12,27 @@ namespace {
 
 const char kName[] = "org.glyphwell.Test.Tool";
 
-struct Result {
-    int status;
-    std::string out;
-    std::string err;
-};
-
-Result Invoke(std::vector<std::string> arguments, const std::string& input = "") {
-    std::istringstream in(input);
-    std::ostringstream out, err;
-    const int status = glyphwell::tools::RunTool(arguments, in, out, err);
-    return {status, out.str(), err.str()};
-}
-
-/// A server that replies with the request's own bytes and remembers the last message id.
+/// A server that replies with the request's own bytes (or the bytes set) and remembers the last
+/// request.
 class EchoServer {
 public:
     EchoServer()
         : server_(kName, [this](SInt32 msgid, CFDataRef data) -> CFDataRef {
-              lastMsgid = msgid;
-              lastLength = CFDataGetLength(data);
               std::lock_guard<std::mutex> lock(mutex_);
-              lastRequest_ = BytesOf(data);
-              return reply_.empty() ? CFDataCreateCopy(kCFAllocatorDefault, data)
-                                    : CreateCFData(reply_);
+              lastMsgid = msgid;
+              lastRequest = BytesOf(data);
+              return reply.empty() ? CFDataCreateCopy(kCFAllocatorDefault, data)
+                                   : CreateCFData(reply);
           }) {}
 
     bool Started() const { return server_.Started(); }
-    /// Answers later requests with these bytes instead.
-    void SetReply(const std::string& bytes) {
-        std::lock_guard<std::mutex> lock(mutex_);
-        reply_ = bytes;
-    }
-
-    std::string LastRequest() {
-        std::lock_guard<std::mutex> lock(mutex_);
-        return lastRequest_;
-    }
-
-    std::atomic<SInt32> lastMsgid{0};
-    std::atomic<CFIndex> lastLength{-1};
+    /// Read and written under `mutex_`, that is between requests.
+    std::string reply; ///< empty: echo
+    SInt32 lastMsgid = 0;
+    std::string lastRequest;
 
 private:
     std::mutex mutex_;
-    std::string reply_;
-    std::string lastRequest_;
     PortServer server_;
 };
 
@@ -68,45 +43,47 @@ protected:
 
 } // namespace
 
-TEST_F(SendCommandTest, PrintsTheReplyToATaggedJSONRequest) {
-    EchoServer server;
-    ASSERT_TRUE(server.Started());
-    const Result result = Invoke({"send", "--msgid", "-7", "--name", kName, "--compact"},
-                                 R"({"a": [1, {"$data": "3q0="}]})");
-    EXPECT_EQ(result.status, 0) << result.err;
-    EXPECT_EQ(result.out, "{\"a\":[1,{\"$data\":\"3q0=\"}]}\n");
-    EXPECT_EQ(result.err, "");
-    EXPECT_EQ(server.lastMsgid, -7);
-}
-
-TEST_F(SendCommandTest, SaysSoWhenTheReplyIsEmpty) {
-    EchoServer server;
-    ASSERT_TRUE(server.Started());
-    const Result result = Invoke({"send", "--msgid", "99", "--empty", "--name", kName});
-    EXPECT_EQ(result.status, 0);
-    EXPECT_EQ(result.out, "");
-    EXPECT_EQ(result.err, "glyphwell send: the reply is empty\n");
-    EXPECT_EQ(server.lastMsgid, 99);
-    EXPECT_EQ(server.lastLength, 0);
-}
-
-TEST_F(SendCommandTest, FailsWhenNothingListensOrTheReplyIsUnreadable) {
-    Result result = Invoke({"send", "--msgid", "1", "--name", kName}, "{}");
+TEST_F(SendCommandTest, PrintsTheReplyOrSaysWhyThereIsNone) {
+    ToolResult result = Invoke({"send", "--msgid", "1", "--name", kName}, "{}");
     EXPECT_EQ(result.status, 1);
     EXPECT_EQ(result.err, "glyphwell send: nothing answers on the port org.glyphwell.Test.Tool\n");
 
     EchoServer server;
     ASSERT_TRUE(server.Started());
-    server.SetReply("xyz");
-    result = Invoke({"send", "--msgid", "1", "--name", kName}, "{}");
-    EXPECT_EQ(result.status, 1);
-    const std::string last = "glyphwell send: the reply is not a readable value\n";
-    ASSERT_GE(result.err.size(), last.size());
-    EXPECT_EQ(result.err.substr(result.err.size() - last.size()), last);
+    const std::string tagged = R"({"a": [1, {"$data": "3q0="}]})";
+    const std::string unreadable = "ERROR: Quzel got corrupted data. (cftype)\n"
+                                   "*** don't how to resurrect type 99999\n"
+                                   "glyphwell send: the reply is not a readable value\n";
+    struct Case {
+        std::vector<std::string> options; ///< after --msgid
+        std::string input;
+        std::string reply; ///< empty: the request's own bytes
+        int status;
+        std::string out;
+        std::string err;
+    } cases[] = {
+        {{"-7", "--compact"}, tagged, "", 0, "{\"a\":[1,{\"$data\":\"3q0=\"}]}\n", ""},
+        {{"99", "--empty"}, "", "", 0, "", "glyphwell send: the reply is empty\n"},
+        {{"1"}, "{}", "xyz", 1, "null\n", unreadable},
+    };
+    for (const Case& c : cases) {
+        SCOPED_TRACE(c.options[0]);
+        server.reply = c.reply;
+        std::vector<std::string> arguments = {"send", "--name", kName, "--msgid"};
+        arguments.insert(arguments.end(), c.options.begin(), c.options.end());
+        result = Invoke(arguments, c.input);
+        EXPECT_EQ(result.status, c.status);
+        EXPECT_EQ(result.out, c.out);
+        EXPECT_EQ(result.err, c.err);
+        EXPECT_EQ(server.lastMsgid, std::stoi(c.options[0]));
+        if (c.input.empty()) {
+            EXPECT_EQ(server.lastRequest, "");
+        }
+    }
 }
 
 TEST_F(SendCommandTest, AskActivationBuildsTheMessageId1Request) {
-    const Result result =
+    const ToolResult result =
         Invoke({"ask-activation", "--dry-run", "--compact", "--font", "Example-Bold", "--app",
                 "Writer", "--bundle", "/usr/share/applications/writer.desktop", "--candidate",
                 "/fonts/A Font.otf", "/fonts/b.ttf"});
@@ -125,19 +102,19 @@ TEST_F(SendCommandTest, AskDownloadSendsTheMessageId2Request) {
     EchoServer server;
     ASSERT_TRUE(server.Started());
     // {"QZUIPropertyResult": number 1 of type 7, "QZUIPropertySuppress": number 0 of type 7}
-    const Result reply = Invoke(
+    const ToolResult reply = Invoke(
         {"encode"},
         R"({"QZUIPropertyResult": {"$number": 1, "$type": 7}, "QZUIPropertySuppress": {"$number": 0, "$type": 7}})");
     ASSERT_EQ(reply.status, 0) << reply.err;
-    server.SetReply(reply.out);
-    const Result result = Invoke({"ask-download", "--name", kName, "--compact", "--font",
-                                  "ExampleSans-Regular:Example Sans", "Other-Bold", "--app",
-                                  "Writer", "--pid", "4242", "--suppress"});
+    server.reply = reply.out;
+    const ToolResult result = Invoke({"ask-download", "--name", kName, "--compact", "--font",
+                                      "ExampleSans-Regular:Example Sans", "Other-Bold", "--app",
+                                      "Writer", "--pid", "4242", "--suppress"});
     ASSERT_EQ(result.status, 0) << result.err;
     EXPECT_EQ(server.lastMsgid, 2);
     EXPECT_EQ(result.out, "{\"QZUIPropertyResult\":{\"$number\":1,\"$type\":7},"
                           "\"QZUIPropertySuppress\":{\"$number\":0,\"$type\":7}}\n");
-    const Result request = Invoke({"decode", "--compact"}, server.LastRequest());
+    const ToolResult request = Invoke({"decode", "--compact"}, server.lastRequest);
     ASSERT_EQ(request.status, 0) << request.err;
     EXPECT_EQ(nlohmann::json::parse(request.out), nlohmann::json::parse(R"({
         "QZUIPropertyApplicationName": "Writer",
@@ -175,11 +152,14 @@ TEST_F(SendCommandTest, RejectsIncompleteCommandLines) {
          "glyphwell ask-download: unknown argument --send-timeout\n"},
         {{"ask-activation", "--candidate", "/a.ttf", "--bundle"},
          "glyphwell ask-activation: --bundle needs a value\n"},
+        {{"encode", "--bogus"}, nullptr},
+        {{"decode", "--expect", "bogus"}, nullptr},
     };
     for (const Case& c : cases) {
-        const Result result = Invoke(c.arguments, "{}");
+        const ToolResult result = Invoke(c.arguments, "{}");
         EXPECT_EQ(result.status, 2) << c.arguments.back();
-        if (c.message)
+        if (c.message) {
             EXPECT_EQ(result.err, c.message);
+        }
     }
 }
