@@ -106,9 +106,8 @@ TEST(Resurrect, EachStreamReadsAsItsValueWithItsExactLogLines) {
         {"00 00 01 02 00 00 00 00", A, ""},
         {"00 00 01 02 00 00 00 0F", A, "", {Corrupt("cfuuid")}},
         {"00 00 01 04 FF FF FF FE 00 00 00 07 00 00 00 01 44", A, "="},
-        {"00 00 01 04 00 00 00 01 00 00 00 07 00 00 00 00", A,
-         ""}, // no domain {"00 00 00 11 00 00 00 01 00 00 01 01 00 00 00 00", A, "00 00 00 11 00 00
-              // 00 01 00 00 01 01 00 00 00 00"},
+        {"00 00 01 04 00 00 00 01 00 00 00 07 00 00 00 00", A, ""}, // no domain
+        {"00 00 00 11 00 00 00 01 00 00 01 01 00 00 00 00", A, "="},
         {"00 00 01 01 00 10 00 01", A, "00 00 01 01 00 00 00 00", {Corrupt("cfurl")}},
         // Containers: an array missing an element is lost, also when its count is huge (without
         // reserving memory for it); bad set and dictionary counts give empty ones (a set's with
@@ -150,14 +149,14 @@ TEST(Resurrect, EachStreamReadsAsItsValueWithItsExactLogLines) {
 }
 
 TEST(Resurrect, EmptyAndEqualTextsAreSharedStrings) {
-    EXPECT_EQ(ReadAs(Hex("00 00 00 07 00 00 00 00")).value.get(), CFSTR(""));
-    EXPECT_EQ(ReadAs(Hex("00 00 00 07 FF FF FF FF")).value.get(), CFSTR(""));
-    // Equal texts share one object.
     const Read pair = ReadAs(Hex("00 00 00 11 00 00 00 02 00 00 00 07 00 00 00 02 68 69 00 00 00 "
                                  "07 00 00 00 02 68 69"));
     ASSERT_TRUE(pair.value);
-    EXPECT_EQ(CFArrayGetValueAtIndex(pair.value.as<CFArrayRef>(), 0),
-              CFArrayGetValueAtIndex(pair.value.as<CFArrayRef>(), 1));
+    EXPECT_EQ((std::vector{ReadAs(Hex("00 00 00 07 00 00 00 00")).value.get(),
+                           ReadAs(Hex("00 00 00 07 FF FF FF FF")).value.get(),
+                           CFArrayGetValueAtIndex(pair.value.as<CFArrayRef>(), 0)}),
+              (std::vector<CFTypeRef>{CFSTR(""), CFSTR(""),
+                                      CFArrayGetValueAtIndex(pair.value.as<CFArrayRef>(), 1)}));
 }
 
 TEST(Resurrect, EmptyRangeReportsTypeAndNullBytesReadNothing) {
