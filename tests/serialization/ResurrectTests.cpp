@@ -45,14 +45,6 @@ Read ReadAs(const std::vector<uint8_t>& bytes, TCFType expected = kTCFTypeAny) {
     return result;
 }
 
-std::vector<uint8_t> Repeated(const std::string& hex, unsigned times) {
-    std::vector<uint8_t> bytes;
-    for (unsigned i = 0; i < times; ++i)
-        for (uint8_t b : Hex(hex))
-            bytes.push_back(b);
-    return bytes;
-}
-
 } // namespace
 
 TEST(Resurrect, EachStreamReadsAsItsValueWithItsExactLogLines) {
@@ -212,10 +204,10 @@ TEST(Resurrect, DictionaryBeyondThirtyPairsKeepsEveryPairBeforeTheCut) {
 }
 
 TEST(Resurrect, AcceptsDeepNestingAndRejectsDeeperAsCorrupt) {
-    auto nested = [](unsigned levels) {
-        std::vector<uint8_t> bytes = Repeated("00 00 00 11 00 00 00 01", levels - 1);
-        for (uint8_t b : Hex("00 00 00 11 00 00 00 00"))
-            bytes.push_back(b);
+    auto nested = [](unsigned levels) { // arrays of one array, the innermost empty
+        std::vector<uint8_t> bytes;
+        for (unsigned i = 0; i < levels; ++i)
+            bytes.insert(bytes.end(), {0, 0, 0, 0x11, 0, 0, 0, i + 1 < levels});
         return bytes;
     };
     // The deepest accepted value reads, writes back the same bytes and is released.
