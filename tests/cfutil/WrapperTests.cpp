@@ -72,6 +72,9 @@ TEST(OwningWrappers, ConstructorsMakeWhatTheyName) {
     EXPECT_EQ(TCFString(utf8WithMark, 5, kCFStringEncodingUTF8).GetLength(), 3); // mark is text
     EXPECT_FALSE(TCFString(invalid, 1, kCFStringEncodingUTF8));
 
+    TCFError error(CFSTR("Domain"), 7, nullptr);
+    EXPECT_EQ((std::pair{CFGetRetainCount(error), CFErrorGetCode(error)}), std::pair(1L, 7L));
+
     TCFURL file(CFSTR("/tmp/folder/"), kIsFile, nullptr);
     ASSERT_TRUE(file);
     EXPECT_FALSE(CFURLHasDirectoryPath(file));
