@@ -141,7 +141,6 @@ TEST(SetWrappers, MutableSetAddsDistinctValuesAndRemoves) {
 
     TCFMutableSet adopted(CFSetCreateMutableCopy(kCFAllocatorDefault, 0, set), kAdopted);
     EXPECT_EQ(adopted.GetCount(), 1);
-    EXPECT_NE(adopted.GetMutable(), set.GetMutable());
 }
 
 TEST(UTF8Buffer, HoldsTheUTF8PathOfAnyLengthAndNothingForNull) {
