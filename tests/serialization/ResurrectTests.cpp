@@ -182,15 +182,12 @@ TEST(Resurrect, TextEndingTheBytesIsReadWithoutPassingTheEnd) {
 TEST(Resurrect, DictionaryBeyondThirtyPairsKeepsEveryPairBeforeTheCut) {
     // 40 pairs of 20 bytes each ("kNN" and a boolean), cut after the 35th: the element tables
     // have grown past their 30 inline entries by then.
-    std::vector<Ref> keys;
-    std::vector<const void*> keyRefs, valueRefs;
-    for (int i = 0; i < 40; ++i) {
-        keys.push_back(Str((i < 10 ? "k0" : "k") + std::to_string(i)));
-        keyRefs.push_back(keys.back().get());
-        valueRefs.push_back(i % 2 ? kCFBooleanTrue : kCFBooleanFalse);
-    }
-    Ref whole(CFDictionaryCreate(nullptr, keyRefs.data(), valueRefs.data(), 40,
-                                 &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks));
+    Ref whole(CFDictionaryCreateMutable(nullptr, 0, &kCFTypeDictionaryKeyCallBacks,
+                                        &kCFTypeDictionaryValueCallBacks));
+    for (int i = 0; i < 40; ++i)
+        CFDictionarySetValue(const_cast<CFMutableDictionaryRef>(whole.as<CFDictionaryRef>()),
+                             Str((i < 10 ? "k0" : "k") + std::to_string(i)).get(),
+                             i % 2 ? kCFBooleanTrue : kCFBooleanFalse);
     auto bytes = FlattenedBytes(whole.get());
     ASSERT_EQ(bytes.size(), 8u + 40 * 20);
     EXPECT_TRUE(CFEqual(ReadAs(bytes, kTCFTypeDictionary).value.get(), whole.get()));
@@ -199,7 +196,7 @@ TEST(Resurrect, DictionaryBeyondThirtyPairsKeepsEveryPairBeforeTheCut) {
     const Read cut = ReadAs(bytes, kTCFTypeDictionary);
     ASSERT_TRUE(cut.value);
     EXPECT_EQ(CFDictionaryGetCount(cut.value.as<CFDictionaryRef>()), 35);
-    EXPECT_EQ(CFDictionaryGetValue(cut.value.as<CFDictionaryRef>(), keyRefs[34]), kCFBooleanFalse);
+    EXPECT_EQ(CFDictionaryGetValue(cut.value.as<CFDictionaryRef>(), CFSTR("k34")), kCFBooleanFalse);
     EXPECT_EQ(cut.log, (Lines{Corrupt("cftype"), kUnknown + "99999", kTruncating}));
 }
 
