@@ -182,13 +182,10 @@ TEST(RoundTrip, GeneratedTreesOfEveryKindReadBackEqual) {
 
 TEST(RoundTrip, WideContainersAndTextsAtTheLimits) {
     ValueGenerator generator(7);
-    std::vector<Ref> items;
-    std::vector<const void*> values;
-    for (int i = 0; i < 100000; ++i) {
-        items.push_back(i % 2 ? generator.Number() : generator.Text());
-        values.push_back(items.back().get());
-    }
-    Ref wide(CFArrayCreate(nullptr, values.data(), CFIndex(values.size()), &kCFTypeArrayCallBacks));
+    Ref wide(CFArrayCreateMutable(nullptr, 0, &kCFTypeArrayCallBacks));
+    for (int i = 0; i < 100000; ++i)
+        CFArrayAppendValue(const_cast<CFMutableArrayRef>(wide.as<CFArrayRef>()),
+                           (i % 2 ? generator.Number() : generator.Text()).get());
     EXPECT_TRUE(CFEqual(ReadBack(FlattenedBytes(wide.get())).get(), wide.get()));
 
     for (const auto& [unit, count] :
