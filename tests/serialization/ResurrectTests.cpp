@@ -2,7 +2,6 @@
 // the stream counts as corrupt.
 #include <gtest/gtest.h>
 
-#include <cstring>
 #include <memory>
 #include <string>
 #include <vector>
@@ -170,10 +169,9 @@ TEST(Resurrect, EmptyRangeReportsTypeAndNullBytesReadNothing) {
 TEST(Resurrect, TextEndingTheBytesIsReadWithoutPassingTheEnd) {
     // Exactly the eleven bytes on the heap, with no terminator after the text: the text is read
     // in place, and the sanitizer would report a read past the block.
-    const unsigned char stream[] = {0, 0, 0, 7, 0, 0, 0, 3, 'e', 'n', 'd'};
-    std::unique_ptr<unsigned char[]> bytes(new unsigned char[sizeof stream]);
-    std::memcpy(bytes.get(), stream, sizeof stream);
-    TCFResurrectContext context(bytes.get(), sizeof stream);
+    std::unique_ptr<unsigned char[]> bytes(
+        new unsigned char[11]{0, 0, 0, 7, 0, 0, 0, 3, 'e', 'n', 'd'});
+    TCFResurrectContext context(bytes.get(), 11);
     Ref value(context.RetrieveCFString());
     EXPECT_EQ(TextOf(value.get()), "end");
     EXPECT_FALSE(context.IsCorrupted());
