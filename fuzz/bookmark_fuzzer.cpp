@@ -3,25 +3,17 @@
 #include <cstddef>
 #include <cstdint>
 
+#include "FuzzSupport.h"
 #include "cfutil/TCFBookmark.h"
-#include "platform/Log.h"
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
-    static const bool quiet = [] {
-        glyphwell::SetLogSink([](const glyphwell::LogRecord&) {});
-        return true;
-    }();
-    (void)quiet;
-    CFDataRef bookmark = CFDataCreate(kCFAllocatorDefault, data, CFIndex(size));
-    if (CFDictionaryRef properties = TCFBookmark::CopyPropertiesFromBookmarkData(bookmark, nullptr))
-        CFRelease(properties);
+    fuzz::Quiet();
+    fuzz::Owned<CFDataRef> bookmark{CFDataCreate(kCFAllocatorDefault, data, CFIndex(size))};
+    fuzz::Owned<CFDictionaryRef> properties{
+        TCFBookmark::CopyPropertiesFromBookmarkData(bookmark, nullptr)};
     Boolean stale = false;
-    CFErrorRef error = nullptr;
-    if (CFURLRef url = TCFBookmark::CreateURLByResolvingBookmarkData(bookmark, &stale, nullptr,
-                                                                     nullptr, 0, &error))
-        CFRelease(url);
-    if (error)
-        CFRelease(error);
-    CFRelease(bookmark);
+    fuzz::Owned<CFErrorRef> error{nullptr};
+    fuzz::Owned<CFURLRef> url{TCFBookmark::CreateURLByResolvingBookmarkData(
+        bookmark, &stale, nullptr, nullptr, 0, &error.ref)};
     return 0;
 }

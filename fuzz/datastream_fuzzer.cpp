@@ -10,16 +10,12 @@
 #include <cstdio>
 #include <cstring>
 
+#include "FuzzSupport.h"
 #include "datastream/QZDataStream.h"
 #include "platform/CFBase.h"
 #include "platform/CFData.h"
 
 namespace {
-
-void check(bool condition) {
-    if (!condition)
-        __builtin_trap();
-}
 
 bool inside(QZDataStreamRef stream, const void* pointer, int64_t size) {
     const UInt8* base = CFDataGetBytePtr(stream->data);
@@ -38,7 +34,7 @@ void run(QZDataStreamRef stream, const uint8_t* program, size_t size) {
         switch (op) {
         case 0: {
             int64_t opened = QZDataStreamOpenReadSegment(stream);
-            check(opened == -1 || opened == stream->readTop);
+            fuzz::Check(opened == -1 || opened == stream->readTop);
             break;
         }
         case 1:
@@ -46,17 +42,17 @@ void run(QZDataStreamRef stream, const uint8_t* program, size_t size) {
             break;
         case 2:
             header = QZDataStreamSkipReadSegment(stream);
-            check(!header || inside(stream, header, sizeof *header));
+            fuzz::Check(!header || inside(stream, header, sizeof *header));
             break;
         case 3:
             QZDataStreamResetReadSegment(stream);
             break;
         case 4:
             QZDataStreamResetStream(stream);
-            check(stream->readTop == 0);
+            fuzz::Check(stream->readTop == 0);
             break;
         case 5:
-            check(QZDataStreamReadBytes(stream, scratch, argument) <= argument);
+            fuzz::Check(QZDataStreamReadBytes(stream, scratch, argument) <= argument);
             ++i;
             break;
         case 6:
@@ -67,16 +63,16 @@ void run(QZDataStreamRef stream, const uint8_t* program, size_t size) {
             break;
         case 8:
             text = QZDataStreamReadString(stream, &length);
-            check(length >= 0 && (!text || inside(stream, text, length)));
-            check(text || length == 0);
+            fuzz::Check(length >= 0 && (!text || inside(stream, text, length)));
+            fuzz::Check(text || length == 0);
             break;
         case 9:
             text = QZDataStreamReadString(stream, nullptr);
-            check(!text || inside(stream, text, int64_t(strlen(text)) + 1));
+            fuzz::Check(!text || inside(stream, text, int64_t(strlen(text)) + 1));
             break;
         case 10:
             text = QZDataStreamReadCString(stream);
-            check(!text || inside(stream, text, int64_t(strlen(text)) + 1));
+            fuzz::Check(!text || inside(stream, text, int64_t(strlen(text)) + 1));
             break;
         case 11:
             QZDataStreamBytesLeftToRead(stream);
@@ -84,7 +80,7 @@ void run(QZDataStreamRef stream, const uint8_t* program, size_t size) {
             break;
         case 12:
             header = QZDataStreamCurrentReadSegment(stream);
-            check(!header || inside(stream, header, sizeof *header));
+            fuzz::Check(!header || inside(stream, header, sizeof *header));
             break;
         default:
             if (argument % 16 == 0)
@@ -118,12 +114,12 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* input, size_t size) {
     CFDataAppendBytes(data, input, CFIndex(bufferSize));
     QZDataStreamRef stream = QZDataStreamWithData(data);
     CFRelease(data);
-    check(stream && CFDataGetLength(stream->data) >= 24);
+    fuzz::Check(stream && CFDataGetLength(stream->data) >= 24);
 
     run(stream, input + bufferSize, size - bufferSize);
 
     QZDataStreamClearStream(stream);
-    check(CFDataGetLength(stream->data) == 24);
+    fuzz::Check(CFDataGetLength(stream->data) == 24);
     QZDataStreamFree(stream);
     return 0;
 }

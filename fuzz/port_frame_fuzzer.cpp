@@ -10,17 +10,9 @@
 #include <cstdint>
 #include <cstring>
 
+#include "FuzzSupport.h"
 #include "platform/CFMessagePort.h"
 #include "platform/MessagePortWire.h"
-
-namespace {
-
-void check(bool condition) {
-    if (!condition)
-        __builtin_trap();
-}
-
-} // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     using glyphwell::port::FrameAssembler;
@@ -44,8 +36,8 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
             std::memcpy(target, data + at, count);
             assembler.CommitBody(count);
         } else if (!assembler.Append(data + at, count)) {
-            check(assembler.Failed() && assembler.RefusedLength() > cap);
-            check(assembler.BufferedBytes() == 0 && !assembler.HasFrame());
+            fuzz::Check(assembler.Failed() && assembler.RefusedLength() > cap);
+            fuzz::Check(assembler.BufferedBytes() == 0 && !assembler.HasFrame());
             return 0;
         }
         at += count;
@@ -53,11 +45,11 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
         inPlace = !inPlace;
         while (assembler.HasFrame()) {
             glyphwell::port::Frame frame = assembler.TakeFrame();
-            check(frame.body.Size() <= cap);
-            check(frame.body.Size() == 0 || frame.body.Data() != nullptr);
+            fuzz::Check(frame.body.Size() <= cap);
+            fuzz::Check(frame.body.Size() == 0 || frame.body.Data() != nullptr);
             takenOut += headerSize + frame.body.Size();
         }
-        check(assembler.BufferedBytes() == fed - takenOut);
+        fuzz::Check(assembler.BufferedBytes() == fed - takenOut);
     }
     return 0;
 }

@@ -111,43 +111,38 @@ TEST(BookmarkRecord, NullAndNonDataInputsYieldNull) {
     EXPECT_EQ(
         TCFBookmark::CreateURLByResolvingBookmarkData(nullptr, &stale, nullptr, nullptr, 0, &error),
         nullptr);
+    Ref owned(error);
     EXPECT_FALSE(stale);
     ASSERT_NE(error, nullptr);
     EXPECT_EQ(CFErrorGetCode(error), EINVAL);
-    CFRelease(error);
 }
 
-TEST_F(Bookmarks, RecordsPathIdentityAndRequestedProperties) {
+TEST_F(Bookmarks, RecordsPathIdentityAndPropertiesReadWithoutTouchingTheFile) {
     std::string path = WriteFile("font.ttf", "0123456789");
     struct stat status;
     ASSERT_EQ(lstat(path.c_str(), &status), 0);
     Ref keys = Array({kCFURLIsRegularFileKey});
     Ref bookmark = Bookmark(path, keys.as<CFArrayRef>());
-    ASSERT_TRUE(bookmark);
+    Ref full = Bookmark(path, TCFBookmark::GetDefaultProperties());
+    ASSERT_TRUE(bookmark && full);
+    ASSERT_EQ(remove(path.c_str()), 0);
 
-    std::vector<uint8_t> expected = Hex("47 57 42 4D 00 01");
+    std::vector<uint8_t> record = Hex("47 57 42 4D 00 01");
     auto put = [&](uint64_t value, int width) {
         for (int shift = (width - 1) * 8; shift >= 0; shift -= 8)
-            expected.push_back(uint8_t(value >> shift));
+            record.push_back(uint8_t(value >> shift));
     };
     put(path.size(), 4);
-    expected.insert(expected.end(), path.begin(), path.end());
+    record.insert(record.end(), path.begin(), path.end());
     put(uint64_t(status.st_dev), 8);
     put(uint64_t(status.st_ino), 8);
     put(1, 4);
-    std::string key = "kCFURLIsRegularFileKey"; // keys are stored by their text
-    put(key.size(), 4);
-    expected.insert(expected.end(), key.begin(), key.end());
-    expected.push_back(0x03);
-    expected.push_back(0x01);
-    EXPECT_EQ(ToHex(bookmark.as<CFDataRef>()), ToHex(expected));
-}
-
-TEST_F(Bookmarks, PropertiesAreReadWithoutTouchingTheFile) {
-    std::string path = WriteFile("font.ttf", "0123456789");
-    Ref bookmark = Bookmark(path, TCFBookmark::GetDefaultProperties());
-    ASSERT_TRUE(bookmark);
-    ASSERT_EQ(remove(path.c_str()), 0);
+    std::string name = "kCFURLIsRegularFileKey"; // keys are stored by their text
+    put(name.size(), 4);
+    record.insert(record.end(), name.begin(), name.end());
+    record.push_back(0x03);
+    record.push_back(0x01);
+    EXPECT_EQ(ToHex(bookmark.as<CFDataRef>()), ToHex(record));
 
     const std::pair<CFStringRef, std::string> rows[] = {
         {kCFURLNameKey, "font.ttf"},
@@ -158,10 +153,10 @@ TEST_F(Bookmarks, PropertiesAreReadWithoutTouchingTheFile) {
         {_kCFURLFileSizeOfResourceForkKey, "<null>"},
     };
     for (const auto& [key, expected] : rows) {
-        Ref value(TCFBookmark::CopyPropertyFromBookmarkData(bookmark.as<CFDataRef>(), key));
+        Ref value(TCFBookmark::CopyPropertyFromBookmarkData(full.as<CFDataRef>(), key));
         EXPECT_EQ(ValueText(value.get()), expected) << TextOf(key);
     }
-    EXPECT_TRUE(Ref(TCFBookmark::CopyPropertyFromBookmarkData(bookmark.as<CFDataRef>(),
+    EXPECT_TRUE(Ref(TCFBookmark::CopyPropertyFromBookmarkData(full.as<CFDataRef>(),
                                                               kCFURLContentModificationDateKey)));
 }
 

@@ -4,6 +4,7 @@
 #include <clocale>
 #include <cstring>
 #include <string>
+#include <tuple>
 #include <vector>
 
 #include <gtest/gtest.h>
@@ -64,15 +65,16 @@ TEST(NumberCreate, EachNativeTypeKeepsItsPlatformNumberType) {
     TCFAdopted<CFNumberRef> integer(TCFNumber::Create<SInt64>(LONG_MIN));
     TCFAdopted<CFNumberRef> real(TCFNumber::Create<double>(2.25));
     TCFNumber yes(true), no(false);
-    EXPECT_EQ(CFNumberGetType(character), kCFNumberCharType);
-    EXPECT_EQ(CFNumberGetType(integer), kCFNumberLongType);
-    EXPECT_EQ(CFNumberGetType(real), kCFNumberDoubleType);
-    EXPECT_EQ(CFNumberGetType(yes), kCFNumberIntType);
-    EXPECT_EQ(CFNumberGetByteSize(yes), 4);
-    EXPECT_EQ(LongOf(integer), LONG_MIN);
-    EXPECT_EQ(DoubleOf(real), 2.25);
-    EXPECT_EQ(LongOf(yes), 1);
-    EXPECT_EQ(LongOf(no), 0);
+    using Kind = std::tuple<CFNumberType, CFIndex, double>;
+    auto kind = [](CFNumberRef number) {
+        return Kind{CFNumberGetType(number), CFNumberGetByteSize(number), DoubleOf(number)};
+    };
+    EXPECT_EQ((std::vector{kind(character), kind(integer), kind(real), kind(yes), kind(no)}),
+              (std::vector<Kind>{{kCFNumberCharType, 1, -5},
+                                 {kCFNumberLongType, 8, double(LONG_MIN)},
+                                 {kCFNumberDoubleType, 8, 2.25},
+                                 {kCFNumberIntType, 4, 1},
+                                 {kCFNumberIntType, 4, 0}}));
 }
 
 TEST(SharedBooleanNumbers, EachCallReturnsTheSameIntegerNumberWithOneMoreCount) {
@@ -84,14 +86,11 @@ TEST(SharedBooleanNumbers, EachCallReturnsTheSameIntegerNumberWithOneMoreCount) 
     EXPECT_NE(static_cast<CFTypeRef>(first), kCFBooleanTrue);
     EXPECT_EQ(CFNumberGetType(first), kCFNumberIntType);
     EXPECT_EQ(LongOf(first), 1);
-    EXPECT_TRUE(TCFTypeRef::GetBooleanValue(first));
     CFRelease(first);
     CFRelease(second);
     EXPECT_EQ(CFGetRetainCount(first), count - 1); // the shared count stays
-
     Ref no(TCFNumber::CreateFromBoolean(false));
-    EXPECT_NE(no.get(), first);
-    EXPECT_FALSE(TCFTypeRef::GetBooleanValue(no.get()));
+    EXPECT_EQ((std::pair{no.get() != first, LongOf(no.get())}), std::pair(true, 0L));
 }
 
 TEST(NumberFromString, WholeNumbersBecomeLongsAndOthersDoubles) {
@@ -152,24 +151,26 @@ TEST(BooleanValue, TrueForTrueOrYesInAnyCaseAndExactNonZeroThirtyTwoBitIntegers)
 }
 
 TEST(NumberValue, BooleansGiveOneAndZeroNumbersTheirSixtyFourBitValueAndOtherKindsZero) {
-    unsigned long out = 99;
-    TCFNumber::GetCFNumberValue(kCFBooleanTrue, out);
-    EXPECT_EQ(out, 1UL);
-    TCFNumber::GetCFNumberValue(kCFBooleanFalse, out);
-    EXPECT_EQ(out, 0UL);
-    TCFNumber::GetCFNumberValue(Num(kCFNumberSInt8Type, SInt8(42)).get(), out);
-    EXPECT_EQ(out, 42UL);
-    TCFNumber::GetCFNumberValue(Num(kCFNumberDoubleType, -2.9).get(), out);
-    EXPECT_EQ(out, 0xFFFFFFFFFFFFFFFEUL);
-
-    out = 99;
-    EXPECT_FALSE(TCFNumber::GetCFNumberValueSafely(Str("42").get(), out));
-    EXPECT_EQ(out, 0UL);
-    out = 99;
-    EXPECT_FALSE(TCFNumber::GetCFNumberValueSafely(nullptr, out));
-    EXPECT_EQ(out, 0UL);
-    EXPECT_TRUE(TCFNumber::GetCFNumberValueSafely(kCFBooleanTrue, out));
-    EXPECT_EQ(out, 1UL);
-    EXPECT_TRUE(TCFNumber::GetCFNumberValueSafely(Num(kCFNumberLongType, -1L).get(), out));
-    EXPECT_EQ(out, 0xFFFFFFFFFFFFFFFFUL);
+    const struct {
+        Ref value;
+        unsigned long expected;
+        bool isNumber; // else only the safe reading takes it, and refuses it
+    } rows[] = {
+        {Ref(CFRetain(kCFBooleanTrue)), 1, true},
+        {Ref(CFRetain(kCFBooleanFalse)), 0, true},
+        {Num(kCFNumberSInt8Type, SInt8(42)), 42, true},
+        {Num(kCFNumberDoubleType, -2.9), 0xFFFFFFFFFFFFFFFEUL, true},
+        {Num(kCFNumberLongType, -1L), 0xFFFFFFFFFFFFFFFFUL, true},
+        {Str("42"), 0, false},
+        {Ref(), 0, false},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(glyphwell::Describe(row.value.get()));
+        unsigned long plain = 99, safe = 99;
+        if (row.isNumber)
+            TCFNumber::GetCFNumberValue(row.value.get(), plain);
+        EXPECT_EQ(TCFNumber::GetCFNumberValueSafely(row.value.get(), safe), row.isNumber);
+        EXPECT_EQ(safe, row.expected);
+        EXPECT_EQ(plain, row.isNumber ? row.expected : 99);
+    }
 }

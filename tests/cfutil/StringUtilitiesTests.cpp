@@ -3,6 +3,7 @@
 #include <pwd.h>
 #include <string>
 #include <unistd.h>
+#include <vector>
 
 #include <gtest/gtest.h>
 
@@ -107,18 +108,12 @@ TEST(LanguageLookup, FallsBackOnceToTheBaseLanguage) {
     Ref table = glyphwell::testing::Dict({{CFSTR("en"), english.get()},
                                           {CFSTR("zh"), chinese.get()},
                                           {CFSTR("pt_BR"), brazilian.get()}});
-    auto lookup = [&](const char* language) {
-        Ref key = Str(language);
-        return CFDictionary::GetValueForLanguage(table.as<CFDictionaryRef>(),
-                                                 key.as<CFStringRef>());
-    };
-    EXPECT_EQ(lookup("en_GB"), english.get());
-    EXPECT_EQ(lookup("en-AU"), english.get());
-    EXPECT_EQ(lookup("en"), english.get());
-    EXPECT_EQ(lookup("pt_BR"), brazilian.get());
-    EXPECT_EQ(lookup("pt"), nullptr);
-    EXPECT_EQ(lookup("zh_TW"), nullptr);
-    EXPECT_EQ(lookup("fr"), nullptr);
+    std::vector<CFTypeRef> found;
+    for (const char* language : {"en_GB", "en-AU", "en", "pt_BR", "pt", "zh_TW", "fr"})
+        found.push_back(CFDictionary::GetValueForLanguage(table.as<CFDictionaryRef>(),
+                                                          Str(language).as<CFStringRef>()));
+    EXPECT_EQ(found, (std::vector<CFTypeRef>{english.get(), english.get(), english.get(),
+                                             brazilian.get(), nullptr, nullptr, nullptr}));
     EXPECT_EQ(CFDictionary::GetValueForLanguage(nullptr, CFSTR("en")), nullptr);
     EXPECT_EQ(CFDictionary::GetValue(nullptr, CFSTR("en")), nullptr);
     EXPECT_EQ(CFDictionary::GetValue(table.as<CFDictionaryRef>(), CFSTR("zh")), chinese.get());
@@ -142,15 +137,10 @@ TEST(StringEquality, NullsByIdentityAndStringsByContent) {
 }
 
 TEST(FourCharacterCode, ReadsBytesMostSignificantFirstAsMacRoman) {
-    Ref text(CFString::CopyAsString(0x74657874));
-    EXPECT_EQ(TextOf(text.get()), "text");
-    Ref stopped(CFString::CopyAsString(0x61006364));
-    EXPECT_EQ(TextOf(stopped.get()), "a");
-    Ref empty(CFString::CopyAsString(0));
-    EXPECT_EQ(TextOf(empty.get()), "");
-    // Mac Roman 0x8E is e with acute accent, 0xA5 a bullet.
-    Ref accented(CFString::CopyAsString(0x8EA52020));
-    EXPECT_EQ(TextOf(accented.get()), "\xC3\xA9\xE2\x80\xA2  ");
-    TCFString adopted(UInt32(0x41424344));
-    EXPECT_EQ(TextOf(adopted), "ABCD");
+    // Mac Roman 0x8E is e with acute accent, 0xA5 a bullet; a zero byte ends the text.
+    const std::pair<UInt32, std::string> rows[] = {
+        {0x74657874, "text"}, {0x61006364, "a"}, {0, ""}, {0x8EA52020, "\xC3\xA9\xE2\x80\xA2  "}};
+    for (const auto& [code, expected] : rows)
+        EXPECT_EQ(TextOf(Ref(CFString::CopyAsString(code)).get()), expected) << code;
+    EXPECT_EQ(TextOf(TCFString(UInt32(0x41424344))), "ABCD");
 }

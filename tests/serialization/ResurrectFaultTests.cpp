@@ -19,17 +19,15 @@ using namespace glyphwell::testing;
 /// A value that makes the reader allocate in every way it can: containers past their inline
 /// tables, strings new to the uniquer, numbers, data, URLs, a character set and an error.
 Ref RichValue() {
-    std::vector<Ref> parts;
     Ref list(CFArrayCreateMutable(nullptr, 0, &kCFTypeArrayCallBacks));
-    for (int i = 0; i < 40; ++i) {
-        parts.push_back(Str("fault-injection-text-" + std::to_string(i)));
-        CFArrayAppendValue(list.as<CFMutableArrayRef>(), parts.back().get());
-    }
+    for (int i = 0; i < 40; ++i)
+        CFArrayAppendValue(list.as<CFMutableArrayRef>(),
+                           Str("fault-injection-text-" + std::to_string(i)).get());
     Ref number = Num(kCFNumberSInt32Type, 7);
     const UInt8 bytes[] = {1, 2, 3};
     Ref data(CFDataCreate(nullptr, bytes, 3));
     Ref url(CFURLCreateWithString(nullptr, CFSTR("https://example.org/a"), nullptr));
-    Ref set = Set({number.get(), parts[0].get()});
+    Ref set = Set({number.get(), CFArrayGetValueAtIndex(list.as<CFArrayRef>(), 0)});
     Ref characters(CFCharacterSetCreateWithCharactersInRange(nullptr, CFRangeMake(0x41, 26)));
     Ref error(CFErrorCreate(nullptr, CFSTR("FaultDomain"), 3, nullptr));
     return Dict({{CFSTR("list"), list.get()},

@@ -2,7 +2,6 @@
 // the stream counts as corrupt.
 #include <gtest/gtest.h>
 
-#include <cstring>
 #include <memory>
 #include <string>
 #include <vector>
@@ -43,14 +42,6 @@ Read ReadAs(const std::vector<uint8_t>& bytes, TCFType expected = kTCFTypeAny) {
     result.log = capture.Texts();
     result.corrupted = context.IsCorrupted();
     return result;
-}
-
-std::vector<uint8_t> Repeated(const std::string& hex, unsigned times) {
-    std::vector<uint8_t> bytes;
-    for (unsigned i = 0; i < times; ++i)
-        for (uint8_t b : Hex(hex))
-            bytes.push_back(b);
-    return bytes;
 }
 
 } // namespace
@@ -106,9 +97,8 @@ TEST(Resurrect, EachStreamReadsAsItsValueWithItsExactLogLines) {
         {"00 00 01 02 00 00 00 00", A, ""},
         {"00 00 01 02 00 00 00 0F", A, "", {Corrupt("cfuuid")}},
         {"00 00 01 04 FF FF FF FE 00 00 00 07 00 00 00 01 44", A, "="},
-        {"00 00 01 04 00 00 00 01 00 00 00 07 00 00 00 00", A,
-         ""}, // no domain {"00 00 00 11 00 00 00 01 00 00 01 01 00 00 00 00", A, "00 00 00 11 00 00
-              // 00 01 00 00 01 01 00 00 00 00"},
+        {"00 00 01 04 00 00 00 01 00 00 00 07 00 00 00 00", A, ""}, // no domain
+        {"00 00 00 11 00 00 00 01 00 00 01 01 00 00 00 00", A, "="},
         {"00 00 01 01 00 10 00 01", A, "00 00 01 01 00 00 00 00", {Corrupt("cfurl")}},
         // Containers: an array missing an element is lost, also when its count is huge (without
         // reserving memory for it); bad set and dictionary counts give empty ones (a set's with
@@ -150,14 +140,14 @@ TEST(Resurrect, EachStreamReadsAsItsValueWithItsExactLogLines) {
 }
 
 TEST(Resurrect, EmptyAndEqualTextsAreSharedStrings) {
-    EXPECT_EQ(ReadAs(Hex("00 00 00 07 00 00 00 00")).value.get(), CFSTR(""));
-    EXPECT_EQ(ReadAs(Hex("00 00 00 07 FF FF FF FF")).value.get(), CFSTR(""));
-    // Equal texts share one object.
     const Read pair = ReadAs(Hex("00 00 00 11 00 00 00 02 00 00 00 07 00 00 00 02 68 69 00 00 00 "
                                  "07 00 00 00 02 68 69"));
     ASSERT_TRUE(pair.value);
-    EXPECT_EQ(CFArrayGetValueAtIndex(pair.value.as<CFArrayRef>(), 0),
-              CFArrayGetValueAtIndex(pair.value.as<CFArrayRef>(), 1));
+    EXPECT_EQ((std::vector{ReadAs(Hex("00 00 00 07 00 00 00 00")).value.get(),
+                           ReadAs(Hex("00 00 00 07 FF FF FF FF")).value.get(),
+                           CFArrayGetValueAtIndex(pair.value.as<CFArrayRef>(), 0)}),
+              (std::vector<CFTypeRef>{CFSTR(""), CFSTR(""),
+                                      CFArrayGetValueAtIndex(pair.value.as<CFArrayRef>(), 1)}));
 }
 
 TEST(Resurrect, EmptyRangeReportsTypeAndNullBytesReadNothing) {
@@ -179,10 +169,9 @@ TEST(Resurrect, EmptyRangeReportsTypeAndNullBytesReadNothing) {
 TEST(Resurrect, TextEndingTheBytesIsReadWithoutPassingTheEnd) {
     // Exactly the eleven bytes on the heap, with no terminator after the text: the text is read
     // in place, and the sanitizer would report a read past the block.
-    const unsigned char stream[] = {0, 0, 0, 7, 0, 0, 0, 3, 'e', 'n', 'd'};
-    std::unique_ptr<unsigned char[]> bytes(new unsigned char[sizeof stream]);
-    std::memcpy(bytes.get(), stream, sizeof stream);
-    TCFResurrectContext context(bytes.get(), sizeof stream);
+    std::unique_ptr<unsigned char[]> bytes(
+        new unsigned char[11]{0, 0, 0, 7, 0, 0, 0, 3, 'e', 'n', 'd'});
+    TCFResurrectContext context(bytes.get(), 11);
     Ref value(context.RetrieveCFString());
     EXPECT_EQ(TextOf(value.get()), "end");
     EXPECT_FALSE(context.IsCorrupted());
@@ -191,15 +180,12 @@ TEST(Resurrect, TextEndingTheBytesIsReadWithoutPassingTheEnd) {
 TEST(Resurrect, DictionaryBeyondThirtyPairsKeepsEveryPairBeforeTheCut) {
     // 40 pairs of 20 bytes each ("kNN" and a boolean), cut after the 35th: the element tables
     // have grown past their 30 inline entries by then.
-    std::vector<Ref> keys;
-    std::vector<const void*> keyRefs, valueRefs;
-    for (int i = 0; i < 40; ++i) {
-        keys.push_back(Str((i < 10 ? "k0" : "k") + std::to_string(i)));
-        keyRefs.push_back(keys.back().get());
-        valueRefs.push_back(i % 2 ? kCFBooleanTrue : kCFBooleanFalse);
-    }
-    Ref whole(CFDictionaryCreate(nullptr, keyRefs.data(), valueRefs.data(), 40,
-                                 &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks));
+    Ref whole(CFDictionaryCreateMutable(nullptr, 0, &kCFTypeDictionaryKeyCallBacks,
+                                        &kCFTypeDictionaryValueCallBacks));
+    for (int i = 0; i < 40; ++i)
+        CFDictionarySetValue(const_cast<CFMutableDictionaryRef>(whole.as<CFDictionaryRef>()),
+                             Str((i < 10 ? "k0" : "k") + std::to_string(i)).get(),
+                             i % 2 ? kCFBooleanTrue : kCFBooleanFalse);
     auto bytes = FlattenedBytes(whole.get());
     ASSERT_EQ(bytes.size(), 8u + 40 * 20);
     EXPECT_TRUE(CFEqual(ReadAs(bytes, kTCFTypeDictionary).value.get(), whole.get()));
@@ -208,15 +194,15 @@ TEST(Resurrect, DictionaryBeyondThirtyPairsKeepsEveryPairBeforeTheCut) {
     const Read cut = ReadAs(bytes, kTCFTypeDictionary);
     ASSERT_TRUE(cut.value);
     EXPECT_EQ(CFDictionaryGetCount(cut.value.as<CFDictionaryRef>()), 35);
-    EXPECT_EQ(CFDictionaryGetValue(cut.value.as<CFDictionaryRef>(), keyRefs[34]), kCFBooleanFalse);
+    EXPECT_EQ(CFDictionaryGetValue(cut.value.as<CFDictionaryRef>(), CFSTR("k34")), kCFBooleanFalse);
     EXPECT_EQ(cut.log, (Lines{Corrupt("cftype"), kUnknown + "99999", kTruncating}));
 }
 
 TEST(Resurrect, AcceptsDeepNestingAndRejectsDeeperAsCorrupt) {
-    auto nested = [](unsigned levels) {
-        std::vector<uint8_t> bytes = Repeated("00 00 00 11 00 00 00 01", levels - 1);
-        for (uint8_t b : Hex("00 00 00 11 00 00 00 00"))
-            bytes.push_back(b);
+    auto nested = [](unsigned levels) { // arrays of one array, the innermost empty
+        std::vector<uint8_t> bytes;
+        for (unsigned i = 0; i < levels; ++i)
+            bytes.insert(bytes.end(), {0, 0, 0, 0x11, 0, 0, 0, i + 1 < levels});
         return bytes;
     };
     // The deepest accepted value reads, writes back the same bytes and is released.

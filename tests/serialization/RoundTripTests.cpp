@@ -22,29 +22,19 @@ public:
     Ref Any(int depth) {
         // Texts, numbers and data come twice as often as the other scalars; containers only
         // above the last level.
-        switch ("TNBDCUIETNDAAM"[Below(depth > 0 ? 14 : 11)]) {
-        case 'T':
-            return Text();
-        case 'N':
-            return Number();
-        case 'B':
-            return Ref(CFRetain(Below(2) ? kCFBooleanTrue : kCFBooleanFalse));
-        case 'D':
-            return Data();
-        case 'C':
-            return CharacterSet();
-        case 'U':
-            return URL();
-        case 'I':
-            return UUID();
-        case 'E':
-            return Error();
-        case 'A':
-            return Collection(depth - 1, Below(2));
-        default:
-            return Dictionary(depth - 1);
-        }
+        using Scalar = Ref (ValueGenerator::*)();
+        static const Scalar scalars[] = {
+            &ValueGenerator::Text,   &ValueGenerator::Number,       &ValueGenerator::Bool,
+            &ValueGenerator::Data,   &ValueGenerator::CharacterSet, &ValueGenerator::URL,
+            &ValueGenerator::UUID,   &ValueGenerator::Error,        &ValueGenerator::Text,
+            &ValueGenerator::Number, &ValueGenerator::Data};
+        const int kind = Below(depth > 0 ? 14 : 11);
+        if (kind < 11)
+            return (this->*scalars[kind])();
+        return kind < 13 ? Collection(depth - 1, Below(2)) : Dictionary(depth - 1);
     }
+
+    Ref Bool() { return Ref(CFRetain(Below(2) ? kCFBooleanTrue : kCFBooleanFalse)); }
 
     Ref Text() {
         // One to four UTF-8 bytes, the largest scalar, the replacement character, DEL.
@@ -192,13 +182,10 @@ TEST(RoundTrip, GeneratedTreesOfEveryKindReadBackEqual) {
 
 TEST(RoundTrip, WideContainersAndTextsAtTheLimits) {
     ValueGenerator generator(7);
-    std::vector<Ref> items;
-    std::vector<const void*> values;
-    for (int i = 0; i < 100000; ++i) {
-        items.push_back(i % 2 ? generator.Number() : generator.Text());
-        values.push_back(items.back().get());
-    }
-    Ref wide(CFArrayCreate(nullptr, values.data(), CFIndex(values.size()), &kCFTypeArrayCallBacks));
+    Ref wide(CFArrayCreateMutable(nullptr, 0, &kCFTypeArrayCallBacks));
+    for (int i = 0; i < 100000; ++i)
+        CFArrayAppendValue(const_cast<CFMutableArrayRef>(wide.as<CFArrayRef>()),
+                           (i % 2 ? generator.Number() : generator.Text()).get());
     EXPECT_TRUE(CFEqual(ReadBack(FlattenedBytes(wide.get())).get(), wide.get()));
 
     for (const auto& [unit, count] :
