@@ -81,22 +81,28 @@ struct __CFString final : public CFObject {
     /// Every string is freed unsized: an 8-bit one is larger than the class.
     static void operator delete(void* memory) { ::operator delete(memory); }
 
-    ~__CFString() override { delete wide.load(std::memory_order_acquire); }
+    ~__CFString() override {
+        if (Is8Bit())
+            delete narrow.wide.load(std::memory_order_acquire);
+        else
+            units.~basic_string();
+    }
 
     bool Is8Bit() const { return form != Form::UTF16; }
     /// The 8-bit form's bytes, zero-terminated. Only for an 8-bit string.
     const char* Bytes() const { return reinterpret_cast<const char*>(this + 1); }
     char* MutableBytes() { return reinterpret_cast<char*>(this + 1); }
-    std::string_view Narrow() const { return {Bytes(), byteCount}; }
+    std::string_view Narrow() const { return {Bytes(), narrow.byteCount}; }
+    size_t ByteCount() const { return narrow.byteCount; }
     /// Length in UTF-16 units.
-    size_t Length() const { return form == Form::UTF16 ? units.size() : length8; }
+    size_t Length() const { return form == Form::UTF16 ? units.size() : narrow.length; }
 
     /// The UTF-16 units. An 8-bit string makes them on first demand and keeps them, unchanged,
     /// for its life; threads racing to make them agree on one copy (the others are freed).
     std::u16string_view Wide() const {
         if (form == Form::UTF16)
             return units;
-        const std::u16string* made = wide.load(std::memory_order_acquire);
+        const std::u16string* made = narrow.wide.load(std::memory_order_acquire);
         return made ? *made : *MakeWide();
     }
 
@@ -164,9 +170,18 @@ struct __CFString final : public CFObject {
                            [&unit](char16_t decoded) { return *unit++ == decoded; });
     }
 
-    std::u16string units;       ///< the UTF-16 form's units; empty in the 8-bit form
-    const size_t byteCount = 0; ///< the 8-bit form's byte count
-    const size_t length8 = 0;   ///< the 8-bit form's length in UTF-16 units
+    /// What the 8-bit form knows of its bytes, which follow the object.
+    struct NarrowText {
+        size_t byteCount; ///< bytes kept, without the terminating zero
+        size_t length;    ///< UTF-16 units they make
+        /// The UTF-16 units once made, else null. Published once, never changed.
+        mutable std::atomic<const std::u16string*> wide;
+    };
+    // One form or the other; `form` says which, and the destructor ends the right one.
+    union {
+        std::u16string units; ///< the UTF-16 form's units
+        NarrowText narrow;    ///< the 8-bit form's
+    };
     const Form form;
     const bool isMutable;
     /// The hash of an immutable string once computed, else 0. Immutable strings are shared
@@ -175,22 +190,19 @@ struct __CFString final : public CFObject {
 
 private:
     __CFString(size_t count, size_t length, Form form)
-        : CFObject(kStringKind), byteCount(count), length8(length), form(form), isMutable(false) {}
+        : CFObject(kStringKind), narrow{count, length, {nullptr}}, form(form), isMutable(false) {}
 
     const std::u16string* MakeWide() const {
         auto made = std::make_unique<std::u16string>();
-        made->reserve(length8);
-        text::Decode(reinterpret_cast<const uint8_t*>(Bytes()), byteCount, kCFStringEncodingUTF8,
-                     false, *made);
+        made->reserve(narrow.length);
+        text::Decode(reinterpret_cast<const uint8_t*>(Bytes()), narrow.byteCount,
+                     kCFStringEncodingUTF8, false, *made);
         const std::u16string* expected = nullptr;
-        if (wide.compare_exchange_strong(expected, made.get(), std::memory_order_acq_rel,
-                                         std::memory_order_acquire))
+        if (narrow.wide.compare_exchange_strong(expected, made.get(), std::memory_order_acq_rel,
+                                                std::memory_order_acquire))
             return made.release();
         return expected; // another thread published first; ours is freed
     }
-
-    /// The 8-bit form's UTF-16 units once made, else null. Published once, never changed.
-    mutable std::atomic<const std::u16string*> wide{nullptr};
 };
 
 namespace {
@@ -287,10 +299,10 @@ void AppendUnits(std::u16string& out, const __CFString* object) {
         out += object->units;
         break;
     case Form::ASCII:
-        out.append(object->Bytes(), object->Bytes() + object->byteCount);
+        out.append(object->Bytes(), object->Bytes() + object->ByteCount());
         break;
     case Form::UTF8:
-        text::Decode(reinterpret_cast<const uint8_t*>(object->Bytes()), object->byteCount,
+        text::Decode(reinterpret_cast<const uint8_t*>(object->Bytes()), object->ByteCount(),
                      kCFStringEncodingUTF8, false, out);
         break;
     }
@@ -303,7 +315,7 @@ std::u16string_view Units(const __CFString* object, std::u16string& scratch) {
         return {};
     if (object->form != Form::ASCII)
         return object->Wide();
-    scratch.assign(object->Bytes(), object->Bytes() + object->byteCount);
+    scratch.assign(object->Bytes(), object->Bytes() + object->ByteCount());
     return scratch;
 }
 
@@ -612,7 +624,7 @@ CFIndex CFStringGetBytes(CFStringRef string, CFRange range, CFStringEncoding enc
     // Kept bytes are copied as they are: for ASCII, any range, as far as the buffer takes it;
     // for UTF-8, the whole text when it fits (a part goes through the units below).
     if (object->Is8Bit() && KeepsBytesFor(object, encoding)) {
-        size_t count = object->form == Form::ASCII ? size_t(range.length) : object->byteCount;
+        size_t count = object->form == Form::ASCII ? size_t(range.length) : object->ByteCount();
         bool whole = range.location == 0 && size_t(range.length) == object->Length();
         if (object->form == Form::ASCII || (whole && (!buffer || count <= capacity))) {
             if (buffer) {
@@ -647,7 +659,7 @@ Boolean CFStringGetCString(CFStringRef string, char* buffer, CFIndex bufferSize,
     bool converted = false;
     size_t count = 0;
     if (object->Is8Bit() && KeepsBytesFor(object, encoding)) {
-        count = object->byteCount;
+        count = object->ByteCount();
         converted = count <= room;
         if (converted)
             std::memcpy(buffer, object->Bytes(), count);
@@ -669,7 +681,7 @@ Boolean CFStringGetCString(CFStringRef string, char* buffer, CFIndex bufferSize,
 const char* CFStringGetCStringPtr(CFStringRef string, CFStringEncoding encoding) {
     const __CFString* object = Get(string);
     if (!object || !object->Is8Bit() || !KeepsBytesFor(object, encoding) ||
-        std::memchr(object->Bytes(), 0, object->byteCount))
+        std::memchr(object->Bytes(), 0, object->ByteCount()))
         return nullptr;
     return object->Bytes();
 }
@@ -691,8 +703,9 @@ Boolean CFStringGetFileSystemRepresentation(CFStringRef string, char* buffer, CF
     if (!object)
         return false;
     // A path cannot hold a zero byte: refuse rather than hand out a shortened path.
-    bool hasZero = object->Is8Bit() ? std::memchr(object->Bytes(), 0, object->byteCount) != nullptr
-                                    : object->units.find(u'\0') != std::u16string::npos;
+    bool hasZero = object->Is8Bit()
+                       ? std::memchr(object->Bytes(), 0, object->ByteCount()) != nullptr
+                       : object->units.find(u'\0') != std::u16string::npos;
     if (hasZero) {
         if (buffer && maxBufLen > 0)
             buffer[0] = '\0';
