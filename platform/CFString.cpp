@@ -113,19 +113,22 @@ struct __CFString final : public CFObject {
     /// keeps it, so that every dictionary it becomes a key of does not hash it again; a mutable
     /// one computes it each time.
     CFHashCode Hash() const override {
-        if (isMutable)
-            return HashUnits();
         // Relaxed is enough: every thread computes the same value, and 0 means "not yet" (a
-        // string whose hash is 0 just computes it each time).
-        CFHashCode h = cachedHash.load(std::memory_order_relaxed);
-        if (h == 0) {
-            h = HashUnits();
-            cachedHash.store(h, std::memory_order_relaxed);
-        }
-        return h;
+        // string whose hash is 0 just computes it each time). A mutable string never stores it.
+        const CFHashCode h = cachedHash.load(std::memory_order_relaxed);
+        return h != 0 ? h : ComputeHash();
     }
     std::string Description() const override {
         return Is8Bit() ? std::string(Narrow()) : text::EncodeUTF8Lossy(units);
+    }
+
+    /// Computes the hash, and keeps it when the string is immutable. Out of line, so that the
+    /// kept hash is returned without setting up the loops.
+    __attribute__((noinline)) CFHashCode ComputeHash() const {
+        const CFHashCode h = HashUnits();
+        if (!isMutable)
+            cachedHash.store(h, std::memory_order_relaxed);
+        return h;
     }
 
     CFHashCode HashUnits() const {
