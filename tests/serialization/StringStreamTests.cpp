@@ -27,12 +27,9 @@ TEST(StringStream, EveryFormWritesTheSameBytesAndReadsBackAsKeptUTF8) {
     for (const std::string& text : texts) {
         SCOPED_TRACE(text);
         Ref narrow = Str(text);
-        // The same text held as UTF-16 units: a mutable string, and an immutable one where the
-        // text is not all ASCII (an immutable ASCII string keeps bytes whatever it was made from).
+        // The same text held as UTF-16 units: mutable, and immutable where it is not all ASCII.
         Ref twin(CFStringCreateMutableCopy(nullptr, 0, narrow.as<CFStringRef>()));
-        const std::u16string units = Units(narrow.as<CFStringRef>());
-        Ref immutable(CFStringCreateWithCharacters(
-            nullptr, reinterpret_cast<const UniChar*>(units.data()), CFIndex(units.size())));
+        Ref immutable(CFStringCreateCopy(nullptr, twin.as<CFStringRef>()));
         std::vector<uint8_t> expected = {
             0, 0, 0, 7, 0, 0, uint8_t(text.size() >> 8), uint8_t(text.size())};
         expected.insert(expected.end(), text.begin(), text.end());
