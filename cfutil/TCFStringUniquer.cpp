@@ -268,12 +268,19 @@ __attribute__((noinline)) CFStringRef TCFStringUniquerImp::Enter(const char* byt
     return unique;
 }
 
-/// Converts `string` to UTF-8 in a buffer that is inline up to 128 bytes, then uniques the text
-/// up to the first zero byte. The input itself comes back when it has no UTF-8 form (a lone
-/// surrogate) or its text is empty, so a non-null input never yields null.
+/// Uniques the UTF-8 text of `string` up to its first zero byte: the bytes it keeps when it was
+/// made from 8-bit text, else its conversion in a buffer that is inline up to 128 bytes. The
+/// input itself comes back when it has no UTF-8 form (a lone surrogate) or its text is empty, so
+/// a non-null input never yields null.
 CFStringRef TCFStringUniquerImp::GetUniqueString(CFStringRef string) {
     if (!string)
         return nullptr;
+    if (const std::optional<std::string_view> bytes = glyphwell::UTF8Bytes(string)) {
+        const void* zero = std::memchr(bytes->data(), 0, bytes->size());
+        const size_t length =
+            zero ? size_t(static_cast<const char*>(zero) - bytes->data()) : bytes->size();
+        return length > 0 ? GetUniqueString(bytes->data(), CFIndex(length)) : string;
+    }
     const CFIndex size =
         CFStringGetMaximumSizeForEncoding(CFStringGetLength(string), kCFStringEncodingUTF8) + 1;
     TStackBuffer<char, 128> buffer{uint64_t(size)};

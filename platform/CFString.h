@@ -1,12 +1,18 @@
 // Strings: immutable (or mutable) sequences of UTF-16 code units, with conversion to and from
 // byte encodings. Text is never normalised; equality compares code units.
 //
+// An immutable string made from ASCII or UTF-8 bytes keeps those bytes and makes its UTF-16 units
+// only when a caller asks for them (CFStringGetCharactersPtr, or indexing into non-ASCII text);
+// this does not change what any operation returns. Such a string is equal to, and hashes the
+// same as, the string of the same text made from UTF-16 units.
+//
 // Bad input: reported once through the assertion handler (naming the function called); then
 // creators give null, readers 0, false or null, and modifiers change nothing (see CFBase.h).
 #pragma once
 
 #include <optional>
 #include <string>
+#include <string_view>
 
 #include "platform/CFBase.h"
 
@@ -83,7 +89,8 @@ void CFStringInsert(CFMutableStringRef string, CFIndex index, CFStringRef insert
 CFIndex CFStringGetLength(CFStringRef string);
 UniChar CFStringGetCharacterAtIndex(CFStringRef string, CFIndex index);
 void CFStringGetCharacters(CFStringRef string, CFRange range, UniChar* buffer);
-/// Pointer to the string's UTF-16 units; valid while the string lives unchanged.
+/// Pointer to the string's UTF-16 units; valid while the string lives unchanged. Never null for
+/// a string: one that keeps 8-bit bytes makes its units on the first call and keeps them.
 const UniChar* CFStringGetCharactersPtr(CFStringRef string);
 
 /// Converts the units of `range` into `encoding`, writing at most `maxBufLen` bytes to `buffer`
@@ -98,7 +105,9 @@ CFIndex CFStringGetBytes(CFStringRef string, CFRange range, CFStringEncoding enc
 /// Zero-terminated conversion of the whole string; false when it does not fit or cannot convert.
 Boolean CFStringGetCString(CFStringRef string, char* buffer, CFIndex bufferSize,
                            CFStringEncoding encoding);
-/// The bytes of a string in `encoding` when it keeps them directly (never here): null.
+/// The zero-terminated bytes of a string in `encoding` when it keeps them directly (a string
+/// made from ASCII, for an encoding that agrees with ASCII; one made from UTF-8, for UTF-8) and
+/// they hold no zero byte; null otherwise. Valid while the string lives.
 const char* CFStringGetCStringPtr(CFStringRef string, CFStringEncoding encoding);
 /// The largest byte count `length` UTF-16 units can need in `encoding` (3 per unit in UTF-8).
 CFIndex CFStringGetMaximumSizeForEncoding(CFIndex length, CFStringEncoding encoding);
@@ -126,5 +135,10 @@ namespace glyphwell {
 /// when `lossByte` is 0, for a string holding a lone surrogate, which has no UTF-8 form; otherwise
 /// `lossByte` stands in for each lone surrogate.
 std::optional<std::string> UTF8String(CFStringRef string, UInt8 lossByte = 0);
+
+/// The UTF-8 bytes `string` keeps (all of them, zero bytes included) when it was made from ASCII
+/// or UTF-8; nothing for a string held as UTF-16 or for anything but a string. Does not copy;
+/// the view is valid while the string lives. For writers that copy text out without converting.
+std::optional<std::string_view> UTF8Bytes(CFStringRef string);
 
 } // namespace glyphwell

@@ -165,6 +165,23 @@ bool ConvertText(CFStringRef string, CFIndex length, UInt8* text, CFIndex* byteC
 } // namespace
 
 void TCFFlattenContext::FlattenCFString(__CFString const* string) {
+    // A string that keeps UTF-8 bytes is copied as it is, head and text in one append when short.
+    if (const std::optional<std::string_view> bytes = glyphwell::UTF8Bytes(string)) {
+        const CFIndex byteCount = CFIndex(bytes->size());
+        if (byteCount <= kTCFMaxStringLength) {
+            if (8 + byteCount <= kShortStringRoom) {
+                UInt8 value[kShortStringRoom];
+                Put32(value, kTCFTypeString);
+                Put32(value + 4, static_cast<uint32_t>(byteCount));
+                std::memcpy(value + 8, bytes->data(), bytes->size());
+                CFDataAppendBytes(stream, value, 8 + byteCount);
+            } else {
+                StreamOutHead(stream, kTCFTypeString, byteCount);
+                CFDataAppendBytes(stream, reinterpret_cast<const UInt8*>(bytes->data()), byteCount);
+            }
+            return;
+        }
+    }
     const CFIndex length = CFStringGetLength(string);
     // Each text is converted once. A short one is converted on the stack behind its head and
     // appended in one call; a longer one straight into the buffer, after room is made for its

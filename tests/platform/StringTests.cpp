@@ -134,14 +134,15 @@ TEST(StringGetBytes, CountsUnitsAndBytesWithoutABuffer) {
 
 TEST(StringGetBytes, RoomyAndExactBuffersGiveTheSameUTF8) {
     // ASCII runs of every length up to 40 around each width of character: a buffer with room
-    // for 3 bytes per unit and one of exactly the UTF-8 size take different paths.
+    // for 3 bytes per unit and one of exactly the UTF-8 size take different paths. The text is
+    // held as UTF-16 units, so that it is converted rather than copied.
     for (const char* other : {"\xC3\xA9", "\xE2\x82\xAC", "\xF0\x9F\x98\x80"}) {
         for (size_t run = 0; run <= 40; ++run) {
             std::string text;
             for (size_t i = 0; i < run; ++i)
                 text += char('a' + i % 26);
             text = text + other + text.substr(0, run / 2) + other;
-            auto string = FromBytes(text, kCFStringEncodingUTF8);
+            auto string = FromUnits(Units(FromBytes(text, kCFStringEncodingUTF8).get()));
             const CFIndex length = CFStringGetLength(string.get());
             Converted roomy = Convert(string.get(), kCFStringEncodingUTF8, 3 * size_t(length));
             Converted exact = Convert(string.get(), kCFStringEncodingUTF8, text.size());
