@@ -66,36 +66,6 @@ TEST(Data, CreateCopiesTheBytesAndNoCopyFreesOrLeavesThemAsAsked) {
     CFRelease(borrowed);
 }
 
-TEST(Data, EqualityAndHashFollowTheBytes) {
-    using glyphwell::testing::Own;
-    auto a = Own(CFDataCreate(nullptr, U("hello"), 5));
-    auto b = Own(CFDataCreateMutableCopy(nullptr, 0, a.get()));
-    EXPECT_TRUE(CFEqual(a.get(), b.get()));
-    EXPECT_EQ(CFHash(a.get()), CFHash(b.get()));
-    EXPECT_FALSE(CFEqual(a.get(), Own(CFDataCreate(nullptr, U("hellp"), 5)).get()));
-    EXPECT_FALSE(CFEqual(a.get(), Own(CFDataCreate(nullptr, U("hell"), 4)).get()));
-
-    // Past the hashed prefix the length still tells long data apart.
-    std::string longText(100, 'q');
-    EXPECT_NE(CFHash(Own(CFDataCreate(nullptr, U(longText.c_str()), 100)).get()),
-              CFHash(Own(CFDataCreate(nullptr, U(longText.c_str()), 99)).get()));
-}
-
-TEST(Data, DescriptionShowsLengthAndUpTo64BytesInHex) {
-    CFDataRef data = CFDataCreate(nullptr, U("ab\x01\xff"), 4);
-    std::string text = glyphwell::Describe(data);
-    EXPECT_EQ(text.substr(0, 8), "<CFData ");
-    EXPECT_EQ(text.substr(text.find('>') + 1), "{length = 4, bytes = 0x616201ff}");
-    CFRelease(data);
-
-    std::string seventy(70, '\x11');
-    CFDataRef big = CFDataCreate(nullptr, U(seventy.c_str()), 70);
-    text = glyphwell::Describe(big);
-    EXPECT_EQ(text.substr(text.find('>') + 1),
-              "{length = 70, bytes = 0x" + std::string(128, '1') + "...}");
-    CFRelease(big);
-}
-
 TEST_F(MutableDataTest, ManySmallAppendsKeepEveryByte) {
     std::string expected;
     for (int i = 0; i < 5000; ++i) {
@@ -143,38 +113,6 @@ TEST_F(MutableDataTest, BytesTakenFromItselfSurviveGrowthAndOverlap) {
     for (int i = 0; i < 64; ++i)
         expected += "abc";
     EXPECT_EQ(Bytes(data), expected);
-}
-
-TEST_F(MutableDataTest, RangesOutsideTheDataAreReportedAndIgnored) {
-    Fill("abc");
-    glyphwell::testing::LogCapture log;
-    CFDataDeleteBytes(data, CFRangeMake(2, 2));
-    CFDataReplaceBytes(data, CFRangeMake(-1, 1), U("x"), 1);
-    CFDataReplaceBytes(data, CFRangeMake(0, 1), U("x"), -1);
-    CFDataSetLength(data, -1);
-    CFDataIncreaseLength(data, -1);
-    CFDataAppendBytes(data, U("x"), -1);
-    UInt8 buffer[4] = {'-', '-', '-', '-'};
-    CFDataGetBytes(data, CFRangeMake(1, 3), buffer);
-    EXPECT_EQ(Bytes(data), "abc");
-    EXPECT_EQ(buffer[0], '-');
-    std::vector<std::string> texts = log.Texts();
-    ASSERT_EQ(texts.size(), 14u);
-    EXPECT_EQ(texts[1], "Invalid parameter not satisfying: RangeInside(range, object->length)");
-}
-
-TEST(Data, MutatingImmutableDataIsReportedAndIgnored) {
-    CFDataRef data = CFDataCreate(nullptr, U("abc"), 3);
-    CFMutableDataRef forced = const_cast<CFMutableDataRef>(data);
-    glyphwell::testing::LogCapture log;
-    CFDataAppendBytes(forced, U("d"), 1);
-    CFDataSetLength(forced, 0);
-    EXPECT_EQ(CFDataGetMutableBytePtr(forced), nullptr);
-    EXPECT_EQ(Bytes(data), "abc");
-    std::vector<std::string> texts = log.Texts();
-    ASSERT_EQ(texts.size(), 6u);
-    EXPECT_EQ(texts[1], "Invalid parameter not satisfying: object != nullptr && object->isMutable");
-    CFRelease(data);
 }
 
 } // namespace
