@@ -11,6 +11,7 @@
 #include <filesystem>
 #include <fstream>
 #include <future>
+#include <optional>
 #include <vector>
 
 #include "platform/CFMessagePort.h"
@@ -49,9 +50,9 @@ struct Reply {
 };
 
 /// One request through `remote`.
-Reply Request(const Ref& remote, SInt32 msgid, const std::string& body,
+Reply Request(const Ref& remote, SInt32 msgid, const std::optional<std::string>& body,
               CFTimeInterval sendTimeout = 10, CFTimeInterval receiveTimeout = 10) {
-    Ref data(CreateCFData(body));
+    Ref data(body ? CreateCFData(*body) : nullptr);
     CFDataRef reply = nullptr;
     const SInt32 status =
         CFMessagePortSendRequest(remote.as<CFMessagePortRef>(), msgid, data.as<CFDataRef>(),
@@ -73,6 +74,12 @@ std::future<Reply> SendLater(SInt32 msgid, const std::string& body) {
 
 bool IsReady(std::future<Reply>& reply) {
     return reply.wait_for(std::chrono::seconds(0)) == std::future_status::ready;
+}
+
+/// True when `descriptor` has bytes to read (or its end) within `timeoutMs`.
+bool HasBytes(int descriptor, int timeoutMs = 0) {
+    pollfd entry{descriptor, POLLIN, 0};
+    return poll(&entry, 1, timeoutMs) > 0;
 }
 
 /// A local port on the test's own thread; the test runs its driver.
@@ -113,6 +120,17 @@ public:
         return true;
     }
 
+    /// Runs the loop until `client` has bytes to read, then reads up to `count` of them.
+    std::string Answer(int client, size_t count) {
+        RunUntil([&] { return HasBytes(client); });
+        return RawRead(client, count);
+    }
+
+    /// Writes `frame` from `client`, then reads up to `count` bytes of the answer.
+    std::string Ask(int client, const std::string& frame, size_t count) {
+        return RawWrite(client, frame) ? Answer(client, count) : "<not sent>";
+    }
+
 private:
     static CFDataRef Callback(CFMessagePortRef, SInt32 msgid, CFDataRef data, void* info) {
         return static_cast<LocalPort*>(info)->handler_(msgid, data);
@@ -126,12 +144,6 @@ private:
 /// Replies with the request bytes, "@" and the msgid.
 CFDataRef EchoWithMsgid(SInt32 msgid, CFDataRef data) {
     return CreateCFData(BytesOf(data) + "@" + std::to_string(msgid));
-}
-
-/// True when `descriptor` has bytes to read (or its end) within `timeoutMs`.
-bool HasBytes(int descriptor, int timeoutMs = 0) {
-    pollfd entry{descriptor, POLLIN, 0};
-    return poll(&entry, 1, timeoutMs) > 0;
 }
 
 /// Waits up to 10 s for `condition`.
@@ -156,9 +168,20 @@ struct PassedDescriptor {
     const int saved;
 };
 
+/// A raw client connection, closed when it goes.
+struct Client {
+    explicit Client(const std::string& path) : fd(RawConnect(path)) { EXPECT_GE(fd, 0); }
+    Client(const Client&) = delete;
+    ~Client() { Close(); }
+    void Close() { fd >= 0 && close(std::exchange(fd, -1)); }
+    operator int() const { return fd; }
+    int fd;
+};
+
 class MessagePortTest : public ::testing::Test {
 protected:
     std::string SocketPath() const { return runtime_.Path() + "/" + kName; }
+    Client Connect() const { return Client(SocketPath()); }
 
     TemporaryRuntimeDirectory runtime_;
 };
@@ -189,14 +212,7 @@ TEST_F(MessagePortTest, AnswersEveryRequestOfManyConcurrentClients) {
         client.join();
     EXPECT_EQ(answered, 200 * 50);
     EXPECT_EQ(handled, 200 * 50);
-
-    Ref remote = Remote(kName);
-    CFDataRef reply = nullptr;
-    ASSERT_EQ(CFMessagePortSendRequest(remote.as<CFMessagePortRef>(), 3, nullptr, 5, 5,
-                                       kCFRunLoopDefaultMode, &reply),
-              kCFMessagePortSuccess);
-    Ref owned(reply);
-    EXPECT_EQ(BytesOf(reply), "@3");
+    EXPECT_EQ(Request(Remote(kName), 3, std::nullopt, 5, 5), (Reply{0, "@3"})); // no data
 }
 
 TEST_F(MessagePortTest, AnswersPipelinedFramesOneAtATimeWithExactBytes) {
@@ -212,15 +228,13 @@ TEST_F(MessagePortTest, AnswersPipelinedFramesOneAtATimeWithExactBytes) {
         return EchoWithMsgid(msgid, data);
     });
     server = &local;
-    const int client = RawConnect(SocketPath());
-    ASSERT_GE(client, 0);
+    Client client = Connect();
     // msgid 1 with "ab", then msgid -1 with no body, in one write.
     ASSERT_TRUE(RawWrite(client, HexText("00 00 00 01 00 00 00 02 61 62 FF FF FF FF 00 00 00 00")));
     ASSERT_TRUE(local.RunUntil([&] { return events.size() == 4; }));
     EXPECT_EQ(events, (Lines{"enter 1", "leave 1", "enter -1", "leave -1"}));
     EXPECT_EQ(RawRead(client, 15),
               HexText("00 00 00 04") + "ab@1" + HexText("00 00 00 03") + "@-1");
-    close(client);
 }
 
 TEST_F(MessagePortTest, PortsAndSourcesArePropertyValues) {
@@ -286,7 +300,7 @@ TEST_F(MessagePortTest, NestedRequestFromAnotherClientIsAnsweredFirst) {
 
 TEST_F(MessagePortTest, ClientLeavingWithdrawsItsRequestAndItsReplyIsDropped) {
     LogCapture log;
-    int client = -1;
+    std::optional<Client> client;
     int withdrawals = 0;
     bool returned = false;
     std::shared_ptr<glyphwell::port::PendingRequest> request;
@@ -296,15 +310,14 @@ TEST_F(MessagePortTest, ClientLeavingWithdrawsItsRequestAndItsReplyIsDropped) {
             return CreateCFData("still serving");
         request = glyphwell::port::CurrentRequest();
         request->SetWithdrawalHandler([&] { ++withdrawals; });
-        close(client); // the client gives up while its question is up
+        client->Close(); // the client gives up while its question is up
         EXPECT_TRUE(server->RunUntil([&] { return request->IsWithdrawn(); }));
         returned = true;
         return CreateCFData("nobody reads this");
     });
     server = &local;
-    client = RawConnect(SocketPath());
-    ASSERT_GE(client, 0);
-    ASSERT_TRUE(RawWrite(client, RequestFrame(7, "question")));
+    client.emplace(SocketPath());
+    ASSERT_TRUE(RawWrite(*client, RequestFrame(7, "question")));
     ASSERT_TRUE(local.RunUntil([&] { return returned; }));
 
     EXPECT_EQ(withdrawals, 1);
@@ -392,8 +405,7 @@ TEST_F(MessagePortTest, ConnectionsEndingMidRequestLogOneLineAndLeaveTheOthersSe
         SCOPED_TRACE(ToHex(reinterpret_cast<const uint8_t*>(test.bytes.data()), test.bytes.size()));
         log.Clear();
         handled = 0;
-        const int client = RawConnect(SocketPath());
-        ASSERT_GE(client, 0);
+        Client client = Connect();
         ASSERT_TRUE(RawWrite(client, test.bytes));
         if (test.end == ClientShutsDown) {
             ASSERT_EQ(shutdown(client, SHUT_WR), 0);
@@ -402,7 +414,7 @@ TEST_F(MessagePortTest, ConnectionsEndingMidRequestLogOneLineAndLeaveTheOthersSe
         if (test.end != ClientCloses) {
             EXPECT_TRUE(RawSeesClose(client)) << "closed once everything is answered";
         }
-        close(client);
+        client.Close();
         ASSERT_TRUE(WaitFor([&] { return log.Texts().size() >= test.lines.size(); }));
         EXPECT_EQ(handled, test.handled);
         EXPECT_EQ(Send(kName, 3, "whole").bytes, "whole@3");
@@ -418,8 +430,7 @@ TEST_F(MessagePortTest, WritesALargeReplyWithoutHoldingUpOtherClients) {
         return msgid == 9 ? CreateCFData(large) : EchoWithMsgid(msgid, data);
     });
     ASSERT_TRUE(server.Started());
-    const int slowReader = RawConnect(SocketPath());
-    ASSERT_GE(slowReader, 0);
+    Client slowReader = Connect();
     ASSERT_TRUE(RawWrite(slowReader, RequestFrame(9, "")));
     ASSERT_TRUE(HasBytes(slowReader, 10000)) << "the large reply has begun";
 
@@ -428,7 +439,6 @@ TEST_F(MessagePortTest, WritesALargeReplyWithoutHoldingUpOtherClients) {
     ASSERT_EQ(received.size(), 4 + large.size());
     EXPECT_EQ(received.substr(0, 4), std::string("\x00\x80\x00\x00", 4));
     EXPECT_TRUE(received.compare(4, std::string::npos, large) == 0);
-    close(slowReader);
 }
 
 TEST_F(MessagePortTest, TakesOverAStaleSocketButNeitherALiveServerNorAnotherFile) {
@@ -686,28 +696,21 @@ TEST_F(MessagePortTest, ServesConnectionsInTurnAndDropsTheQueueOfAClientThatHung
         return EchoWithMsgid(msgid, data);
     });
     ASSERT_NE(local.Port(), nullptr);
-    const int flood = RawConnect(SocketPath());
-    const int other = RawConnect(SocketPath());
-    ASSERT_GE(flood, 0);
-    ASSERT_GE(other, 0);
+    Client flood = Connect(), other = Connect();
     std::string frames;
     for (int i = 0; i < 500; ++i)
         frames += RequestFrame(1, "");
     ASSERT_TRUE(RawWrite(flood, frames));
     ASSERT_TRUE(RawWrite(other, RequestFrame(2, "")));
     // The other client is served within the first round, not after the 500.
-    ASSERT_TRUE(local.RunUntil([&] { return HasBytes(other); }));
-    EXPECT_EQ(RawRead(other, 6), std::string("\x00\x00\x00\x02@2", 6));
+    EXPECT_EQ(local.Answer(other, 6), HexText("00 00 00 02") + "@2");
     EXPECT_LE(std::find(handled.begin(), handled.end(), 2) - handled.begin(), 2);
 
     // The flooding client hangs up: what it queued is dropped, not worked through.
-    close(flood);
+    flood.Close();
     ASSERT_TRUE(local.RunUntil([&] { return !glyphwell::port::IsReceivingRequest(local.Port()); }));
     EXPECT_LT(std::count(handled.begin(), handled.end(), 1), 10);
-    ASSERT_TRUE(RawWrite(other, RequestFrame(3, "")));
-    ASSERT_TRUE(local.RunUntil([&] { return HasBytes(other); }));
-    EXPECT_EQ(RawRead(other, 6), std::string("\x00\x00\x00\x02@3", 6));
-    close(other);
+    EXPECT_EQ(local.Ask(other, RequestFrame(3, ""), 6), HexText("00 00 00 02") + "@3");
 }
 
 TEST_F(MessagePortTest, ClosesARequestThatStalledButNotOneThatKeepsComing) {
@@ -715,10 +718,7 @@ TEST_F(MessagePortTest, ClosesARequestThatStalledButNotOneThatKeepsComing) {
     LocalPort local(kName, EchoWithMsgid);
     ASSERT_NE(local.Port(), nullptr);
     glyphwell::port::SetStallTimeout(local.Port(), std::chrono::milliseconds(300));
-    const int stalled = RawConnect(SocketPath());
-    const int slow = RawConnect(SocketPath());
-    ASSERT_GE(stalled, 0);
-    ASSERT_GE(slow, 0);
+    Client stalled = Connect(), slow = Connect();
     ASSERT_TRUE(RawWrite(stalled, std::string("\x00\x00\x00\x01\x00", 5)));
     ASSERT_TRUE(local.RunUntil([&] { return glyphwell::port::IsReceivingRequest(local.Port()); }));
 
@@ -733,8 +733,6 @@ TEST_F(MessagePortTest, ClosesARequestThatStalledButNotOneThatKeepsComing) {
     EXPECT_TRUE(RawSeesClose(stalled));
     EXPECT_EQ(log.Texts(),
               Lines{kPrefix + "closed a connection whose request made no progress for 0.3 s"});
-    close(stalled);
-    close(slow);
 }
 
 TEST_F(MessagePortTest, BoundsTheBytesHeldByUnfinishedRequests) {
@@ -759,9 +757,7 @@ TEST_F(MessagePortTest, BoundsTheBytesHeldByUnfinishedRequests) {
     EXPECT_EQ(log.Texts(), Lines{kPrefix + "unfinished requests held 61464 bytes (the limit is "
                                            "56320); closed the connection holding 30728 of them"});
     // The others go on: the first finishes its request and is answered.
-    ASSERT_TRUE(RawWrite(clients[0].descriptor, std::string(10240, 'x')));
-    ASSERT_TRUE(local.RunUntil([&] { return HasBytes(clients[0].descriptor); }));
-    EXPECT_EQ(RawRead(clients[0].descriptor, 4), std::string("\x00\x00\x78\x02", 4));
+    EXPECT_EQ(local.Ask(clients[0].descriptor, std::string(10240, 'x'), 4), HexText("00 00 78 02"));
     for (const Client& client : clients)
         close(client.descriptor);
 }
@@ -804,11 +800,10 @@ TEST_F(MessagePortTest, AReplyWriteThatFailsClosesOnlyThatConnection) {
         log.Clear();
         failingSendCalls = 0;
         glyphwell::port::SetReplySendFunctionForTesting(test.send);
-        const int client = RawConnect(SocketPath());
-        ASSERT_GE(client, 0);
+        Client client = Connect();
         ASSERT_TRUE(RawWrite(client, RequestFrame(9, "")));
         EXPECT_EQ(RawRead(client, 4), test.read); // the failed write: up to the server's close
-        close(client);
+        client.Close();
         ASSERT_TRUE(WaitFor([&] { return !log.Texts().empty(); }));
         glyphwell::port::SetReplySendFunctionForTesting(nullptr);
         EXPECT_EQ(Send(kName, 1, "others").bytes, "others@1");
@@ -821,35 +816,19 @@ TEST_F(MessagePortTest, RefusesConnectionsOfAProcessBeyondItsLimitWithOneLogLine
     LocalPort local(kName, EchoWithMsgid);
     ASSERT_NE(local.Port(), nullptr);
     glyphwell::port::SetConnectionLimitPerProcess(local.Port(), 2);
-    int clients[4];
-    for (int& client : clients)
-        ASSERT_GE(client = RawConnect(SocketPath()), 0);
+    Client clients[4] = {Connect(), Connect(), Connect(), Connect()};
     ASSERT_TRUE(local.RunUntil([&] { return HasBytes(clients[2]) && HasBytes(clients[3]); }));
     EXPECT_TRUE(RawSeesClose(clients[2]));
     EXPECT_TRUE(RawSeesClose(clients[3]));
-    EXPECT_EQ(log.Texts(), (std::vector<std::string>{
-                               "message port org.glyphwell.Test.Port: refused a connection from "
-                               "process " +
-                               std::to_string(getpid()) + ", which holds 2 already"}));
+    EXPECT_EQ(log.Texts(), Lines{kPrefix + "refused a connection from process " +
+                                 std::to_string(getpid()) + ", which holds 2 already"});
     // The admitted ones are served, and a closed one makes room for a new one.
-    ASSERT_TRUE(RawWrite(clients[1], RequestFrame(5, "b")));
-    ASSERT_TRUE(local.RunUntil([&] { return HasBytes(clients[1]); }));
-    EXPECT_EQ(RawRead(clients[1], 7), std::string("\x00\x00\x00\x03"
-                                                  "b@5",
-                                                  7));
-    close(clients[0]);
-    close(clients[2]);
-    close(clients[3]);
+    EXPECT_EQ(local.Ask(clients[1], RequestFrame(5, "b"), 7), HexText("00 00 00 03") + "b@5");
+    for (const int i : {0, 2, 3})
+        clients[i].Close();
     ASSERT_TRUE(local.RunUntil([&] { return !glyphwell::port::IsReceivingRequest(local.Port()); }));
-    const int next = RawConnect(SocketPath());
-    ASSERT_TRUE(RawWrite(next, RequestFrame(6, "c")));
-    ASSERT_TRUE(local.RunUntil([&] { return HasBytes(next); }));
-    EXPECT_EQ(RawRead(next, 7), std::string("\x00\x00\x00\x03"
-                                            "c@6",
-                                            7));
+    EXPECT_EQ(local.Ask(Connect(), RequestFrame(6, "c"), 7), HexText("00 00 00 03") + "c@6");
     EXPECT_EQ(log.Texts().size(), 1u);
-    close(next);
-    close(clients[1]);
 }
 
 namespace {
@@ -872,39 +851,30 @@ TEST_F(MessagePortTest, OutOfDescriptorsRefusesAClientOrWaitsForAConnectionToClo
     LogCapture log;
     LocalPort local(kName, EchoWithMsgid);
     ASSERT_NE(local.Port(), nullptr);
-    const int first = RawConnect(SocketPath());
-    ASSERT_TRUE(RawWrite(first, RequestFrame(1, "a")));
-    ASSERT_TRUE(local.RunUntil([&] { return HasBytes(first); }));
-    ASSERT_EQ(RawRead(first, 7).size(), 7u);
+    Client first = Connect();
+    ASSERT_EQ(local.Ask(first, RequestFrame(1, "a"), 7).size(), 7u);
     glyphwell::port::SetAcceptFunctionForTesting(AcceptOrRunOut);
 
     // With its spare descriptor the port accepts the client only to refuse it.
     failingAccepts = 1;
-    const int refused = RawConnect(SocketPath());
+    Client refused = Connect();
     ASSERT_TRUE(local.RunUntil([&] { return HasBytes(refused); }));
     EXPECT_TRUE(RawSeesClose(refused));
-    close(refused);
 
     // When even that fails, the port stops accepting until a connection closes, then serves the
     // client that waited.
     failingAccepts = 2;
-    const int waiting = RawConnect(SocketPath());
+    Client waiting = Connect();
     ASSERT_TRUE(RawWrite(waiting, RequestFrame(7, "d")));
     ASSERT_TRUE(local.RunUntil([&] { return log.Texts().size() == 2; }));
     const auto until = std::chrono::steady_clock::now() + std::chrono::milliseconds(300);
     local.RunUntil([&] { return HasBytes(waiting) || std::chrono::steady_clock::now() > until; });
     EXPECT_FALSE(HasBytes(waiting));
-    close(first);
-    ASSERT_TRUE(local.RunUntil([&] { return HasBytes(waiting); }));
+    first.Close();
+    EXPECT_EQ(local.Answer(waiting, 7), HexText("00 00 00 03") + "d@7");
     glyphwell::port::SetAcceptFunctionForTesting(nullptr);
-    EXPECT_EQ(RawRead(waiting, 7), std::string("\x00\x00\x00\x03"
-                                               "d@7",
-                                               7));
-    EXPECT_EQ(log.Texts(),
-              (std::vector<std::string>{
-                  "message port org.glyphwell.Test.Port: out of file descriptors; refused a "
-                  "connection",
-                  "message port org.glyphwell.Test.Port: out of file descriptors; accepting again "
-                  "when a connection closes"}));
-    close(waiting);
+    EXPECT_EQ(
+        log.Texts(),
+        (Lines{kPrefix + "out of file descriptors; refused a connection",
+               kPrefix + "out of file descriptors; accepting again when a connection closes"}));
 }
