@@ -69,29 +69,6 @@ TEST(PollRunLoopDriver, NeverCallsACallbackUnwatchedEarlierInTheSameRound) {
     EXPECT_EQ(newCalls, 1);
 }
 
-TEST(PollRunLoopDriver, CallbackMayRunANestedRound) {
-    PollRunLoopDriver driver;
-    Pipe outer, inner;
-    std::vector<std::string> events;
-    driver.Watch(outer.read, true, false, [&](bool readable, bool) {
-        EXPECT_TRUE(readable);
-        char byte;
-        ASSERT_EQ(read(outer.read, &byte, 1), 1);
-        events.push_back("outer");
-        ASSERT_EQ(write(inner.write, "y", 1), 1);
-        driver.RunOnce(1000);
-        events.push_back("outer done");
-    });
-    driver.Watch(inner.read, true, false, [&](bool, bool) {
-        char byte;
-        ASSERT_EQ(read(inner.read, &byte, 1), 1);
-        events.push_back("inner");
-    });
-    ASSERT_EQ(write(outer.write, "x", 1), 1);
-    ASSERT_TRUE(driver.RunOnce(1000));
-    EXPECT_EQ(events, (std::vector<std::string>{"outer", "inner", "outer done"}));
-}
-
 TEST(PollRunLoopDriver, WakeEndsAWaitFromAnotherThread) {
     PollRunLoopDriver driver;
     EXPECT_FALSE(driver.RunOnce(-1)) << "nothing watched: returns at once";
