@@ -158,7 +158,6 @@ TEST_F(DataStream, StringsAreOneItemEachAndReadBackInPlace) {
     QZDataStreamAppendEmptyStrings(stream, 0);
     QZDataStreamAppendEmptyStrings(stream, -2);
     QZDataStreamAppendEmptyStrings(stream, 2);
-    EXPECT_EQ(BufferOf(stream).size(), 30u);
     EXPECT_EQ(HeaderAt(stream, 0), (Fields{0, 24, 6, 30, -1, 3}));
 
     QZDataStreamResetStream(stream);
@@ -238,8 +237,7 @@ TEST_F(DataStream, ClearingEmptiesTheCurrentSegmentOrTheStreamAndKeepsCounters) 
     QZDataStreamOpenWriteSegment(stream);
     QZDataStreamAppendCString(stream, "deep");
     QZDataStreamClearStream(stream); // closes both open segments first
-    EXPECT_EQ(stream->writeTop, 0);
-    EXPECT_EQ(stream->readTop, 0);
+    EXPECT_EQ(std::make_pair(stream->writeTop, stream->readTop), (std::pair<int64_t, int64_t>{}));
     EXPECT_EQ(BufferOf(stream).size(), 24u);
     EXPECT_EQ(HeaderAt(stream, 0), (Fields{0, 24, 0, 24, -1, 2}));
     QZDataStreamOpenWriteSegment(stream);
@@ -250,8 +248,7 @@ TEST_F(DataStream, RootCannotBeClosedMissingHeadersCannotBeOpenedAndNullDoesNoth
     QZDataStreamAppendUInt32(stream, 5);
     QZDataStreamCloseWriteSegment(stream);
     QZDataStreamCloseReadSegment(stream);
-    EXPECT_EQ(stream->writeTop, 0);
-    EXPECT_EQ(stream->readTop, 0);
+    EXPECT_EQ(std::make_pair(stream->writeTop, stream->readTop), (std::pair<int64_t, int64_t>{}));
     EXPECT_EQ(HeaderAt(stream, 0), (Fields{0, 24, 4, 28, -1, 1}));
 
     QZDataStreamResetStream(stream);
