@@ -177,16 +177,4 @@ TEST(Number, ComparesByValueAcrossTypeCodes) {
     }
 }
 
-TEST(Boolean, SharedConstantsCarryTheirValueAndAreNeverDestroyed) {
-    EXPECT_EQ(CFGetTypeID(kCFBooleanTrue), CFBooleanGetTypeID());
-    EXPECT_TRUE(CFBooleanGetValue(kCFBooleanTrue));
-    EXPECT_FALSE(CFBooleanGetValue(kCFBooleanFalse));
-    for (int i = 0; i < 3; ++i)
-        CFRelease(kCFBooleanTrue);
-    CFRetain(kCFBooleanFalse);
-    EXPECT_EQ(CFGetRetainCount(kCFBooleanTrue), 0x7fffffffffffffffL);
-    EXPECT_EQ(CFGetRetainCount(kCFBooleanFalse), 0x7fffffffffffffffL);
-    EXPECT_TRUE(CFBooleanGetValue(kCFBooleanTrue));
-}
-
 } // namespace

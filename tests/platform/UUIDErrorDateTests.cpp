@@ -96,12 +96,4 @@ TEST(Date, KeepsItsAbsoluteTime) {
     EXPECT_GT(CFAbsoluteTimeGetCurrent(), 599616000.0);
 }
 
-TEST(Null, IsOneSharedImmortalValue) {
-    EXPECT_EQ(CFGetTypeID(kCFNull), CFNullGetTypeID());
-    EXPECT_NE(CFNullGetTypeID(), CFDateGetTypeID());
-    CFRelease(kCFNull);
-    EXPECT_EQ(CFGetRetainCount(kCFNull), 0x7fffffffffffffffL);
-    EXPECT_TRUE(CFEqual(kCFNull, kCFNull));
-}
-
 } // namespace

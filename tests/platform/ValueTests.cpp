@@ -83,6 +83,24 @@ Ref Error(CFTypeRef domain, CFIndex code, CFTypeRef info = nullptr) {
     return Ref(CFErrorCreate(nullptr, CFStringRef(domain), code, CFDictionaryRef(info)));
 }
 
+TEST(Values, SharedConstantsCarryTheirValueAndAreNeverDestroyed) {
+    for (int i = 0; i < 3; ++i) {
+        CFRelease(kCFBooleanTrue);
+        CFRelease(kCFNull);
+    }
+    CFRetain(kCFBooleanFalse);
+    const CFIndex immortal = 0x7fffffffffffffffL;
+    EXPECT_EQ((std::vector<CFIndex>{CFGetRetainCount(kCFBooleanTrue),
+                                    CFGetRetainCount(kCFBooleanFalse), CFGetRetainCount(kCFNull)}),
+              (std::vector<CFIndex>{immortal, immortal, immortal}));
+    EXPECT_EQ((std::vector<CFTypeID>{CFGetTypeID(kCFBooleanTrue), CFGetTypeID(kCFNull)}),
+              (std::vector<CFTypeID>{CFBooleanGetTypeID(), CFNullGetTypeID()}));
+    EXPECT_NE(CFNullGetTypeID(), CFDateGetTypeID());
+    EXPECT_TRUE(CFBooleanGetValue(kCFBooleanTrue));
+    EXPECT_FALSE(CFBooleanGetValue(kCFBooleanFalse));
+    EXPECT_TRUE(CFEqual(kCFNull, kCFNull));
+}
+
 // The address after the kind's name differs from run to run; the rest is exact.
 TEST(Values, DescriptionsShowTheKindAndTheValue) {
     const struct {
