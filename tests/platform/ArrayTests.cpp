@@ -147,4 +147,3 @@ TEST(CFArray, EditsSpliceInPlace) {
     CFArrayAppendArray(array.get(), array.get(), CFRangeMake(0, 4));
     EXPECT_EQ(TokensOf(array.get()), (Tokens{5, 4, 3, 6, 5, 4, 3, 6}));
 }
-

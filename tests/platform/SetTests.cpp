@@ -93,4 +93,3 @@ TEST(CFSet, NullCallbacksUsePointerIdentity) {
     EXPECT_EQ(membersOf(copy.get()), (std::vector<const void*>{otherFive.get(), nullptr}));
     EXPECT_EQ(CFGetRetainCount(five.get()), 1);
 }
-
