@@ -93,6 +93,7 @@ public:
         CFMessagePortContext context{0, this, nullptr, nullptr, nullptr};
         port_ = CFMessagePortCreateLocal(kCFAllocatorDefault, portName.as<CFStringRef>(), Callback,
                                          &context, nullptr);
+        EXPECT_NE(port_, nullptr) << "cannot create the local port";
         if (port_) {
             Ref source(CFMessagePortCreateRunLoopSource(kCFAllocatorDefault, port_, 0));
             CFRunLoopAddSource(CFRunLoopGetCurrent(), source.as<CFRunLoopSourceRef>(),
@@ -239,7 +240,6 @@ TEST_F(MessagePortTest, AnswersPipelinedFramesOneAtATimeWithExactBytes) {
 
 TEST_F(MessagePortTest, PortsAndSourcesArePropertyValues) {
     LocalPort local(kName, EchoWithMsgid);
-    ASSERT_NE(local.Port(), nullptr);
     EXPECT_NE(access((SocketPath() + ".lock").c_str(), F_OK), 0) << "the lock file is gone";
     EXPECT_EQ(CFGetTypeID(local.Port()), CFMessagePortGetTypeID());
     EXPECT_EQ(TextOf(Ref(CFCopyTypeIDDescription(CFMessagePortGetTypeID())).get()),
@@ -288,7 +288,6 @@ TEST_F(MessagePortTest, NestedRequestFromAnotherClientIsAnsweredFirst) {
         return CreateCFData("outer");
     });
     server = &local;
-    ASSERT_NE(local.Port(), nullptr);
 
     std::future<Reply> first = SendLater(1, "");
     ASSERT_TRUE(local.RunUntil([&] { return IsReady(first); }));
@@ -338,7 +337,6 @@ TEST_F(MessagePortTest, RefusesAPeerOfAnotherUserWithOneLogLine) {
         GTEST_SKIP() << "needs root to run a client as another user";
     LogCapture log;
     LocalPort local(kName, EchoWithMsgid);
-    ASSERT_NE(local.Port(), nullptr);
     // Open the directory and socket to everyone: the peer check is what must refuse.
     ASSERT_EQ(chmod(runtime_.Path().c_str(), 0711), 0);
     ASSERT_EQ(chmod(SocketPath().c_str(), 0666), 0);
@@ -695,7 +693,6 @@ TEST_F(MessagePortTest, ServesConnectionsInTurnAndDropsTheQueueOfAClientThatHung
         handled.push_back(msgid);
         return EchoWithMsgid(msgid, data);
     });
-    ASSERT_NE(local.Port(), nullptr);
     Client flood = Connect(), other = Connect();
     std::string frames;
     for (int i = 0; i < 500; ++i)
@@ -716,7 +713,6 @@ TEST_F(MessagePortTest, ServesConnectionsInTurnAndDropsTheQueueOfAClientThatHung
 TEST_F(MessagePortTest, ClosesARequestThatStalledButNotOneThatKeepsComing) {
     LogCapture log;
     LocalPort local(kName, EchoWithMsgid);
-    ASSERT_NE(local.Port(), nullptr);
     glyphwell::port::SetStallTimeout(local.Port(), std::chrono::milliseconds(300));
     Client stalled = Connect(), slow = Connect();
     ASSERT_TRUE(RawWrite(stalled, std::string("\x00\x00\x00\x01\x00", 5)));
@@ -738,7 +734,6 @@ TEST_F(MessagePortTest, ClosesARequestThatStalledButNotOneThatKeepsComing) {
 TEST_F(MessagePortTest, BoundsTheBytesHeldByUnfinishedRequests) {
     LogCapture log;
     LocalPort local(kName, EchoWithMsgid);
-    ASSERT_NE(local.Port(), nullptr);
     glyphwell::port::SetUnfinishedRequestLimit(local.Port(), 56320);
     // Three unfinished requests of 20, 30 and 10 KiB: any two fit, all three do not, and the
     // one holding the most goes.
@@ -814,7 +809,6 @@ TEST_F(MessagePortTest, AReplyWriteThatFailsClosesOnlyThatConnection) {
 TEST_F(MessagePortTest, RefusesConnectionsOfAProcessBeyondItsLimitWithOneLogLine) {
     LogCapture log;
     LocalPort local(kName, EchoWithMsgid);
-    ASSERT_NE(local.Port(), nullptr);
     glyphwell::port::SetConnectionLimitPerProcess(local.Port(), 2);
     Client clients[4] = {Connect(), Connect(), Connect(), Connect()};
     ASSERT_TRUE(local.RunUntil([&] { return HasBytes(clients[2]) && HasBytes(clients[3]); }));
@@ -850,7 +844,6 @@ int AcceptOrRunOut(int descriptor, sockaddr* address, socklen_t* length, int fla
 TEST_F(MessagePortTest, OutOfDescriptorsRefusesAClientOrWaitsForAConnectionToClose) {
     LogCapture log;
     LocalPort local(kName, EchoWithMsgid);
-    ASSERT_NE(local.Port(), nullptr);
     Client first = Connect();
     ASSERT_EQ(local.Ask(first, RequestFrame(1, "a"), 7).size(), 7u);
     glyphwell::port::SetAcceptFunctionForTesting(AcceptOrRunOut);
