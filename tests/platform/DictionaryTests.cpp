@@ -7,6 +7,7 @@
 #include "platform/PropertyValues.h"
 #include "support/LogCapture.h"
 #include "tests/platform/ContainerTestSupport.h"
+#include "tests/support/Values.h"
 
 using namespace glyphwell::testing;
 
@@ -223,22 +224,12 @@ TEST(CFDictionary, LookupsHoldWhileGrowingAndShrinkingAcrossEightPairs) {
 TEST(CFDictionary, DestroysDeepNestingWithoutDeepRecursion) {
     for (const int kinds : {1, 3}) { // arrays only; dictionaries, sets and arrays in turn
         SCOPED_TRACE(kinds);
-        CFTypeRef inner = CFArrayCreate(nullptr, nullptr, 0, &kCFTypeArrayCallBacks);
+        Ref inner = Array({});
         for (int level = 0; level < 100000; ++level) {
-            const void* items[] = {inner};
-            const void* keys[] = {CFSTR("k")};
             const int kind = kinds == 1 ? 2 : level % 3;
-            CFTypeRef outer;
-            if (kind == 0)
-                outer = CFDictionaryCreate(nullptr, keys, items, 1, &kCFTypeDictionaryKeyCallBacks,
-                                           &kCFTypeDictionaryValueCallBacks);
-            else if (kind == 1)
-                outer = CFSetCreate(nullptr, items, 1, &kCFTypeSetCallBacks);
-            else
-                outer = CFArrayCreate(nullptr, items, 1, &kCFTypeArrayCallBacks);
-            CFRelease(inner);
-            inner = outer;
+            inner = kind == 0   ? Dict({{CFSTR("k"), inner.get()}})
+                    : kind == 1 ? Set({inner.get()})
+                                : Array({inner.get()});
         }
-        CFRelease(inner);
     }
 }
