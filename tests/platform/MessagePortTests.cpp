@@ -218,17 +218,15 @@ TEST_F(MessagePortTest, AnswersEveryRequestOfManyConcurrentClients) {
 
 TEST_F(MessagePortTest, AnswersPipelinedFramesOneAtATimeWithExactBytes) {
     Lines events;
-    LocalPort* server = nullptr;
     LocalPort local(kName, [&](SInt32 msgid, CFDataRef data) {
         events.push_back("enter " + std::to_string(msgid));
         if (msgid == 1) { // spin the loop a while: the second frame has arrived but must wait
             int rounds = 0;
-            server->RunUntil([&] { return ++rounds > 20; });
+            local.RunUntil([&] { return ++rounds > 20; });
         }
         events.push_back("leave " + std::to_string(msgid));
         return EchoWithMsgid(msgid, data);
     });
-    server = &local;
     Client client = Connect();
     // msgid 1 with "ab", then msgid -1 with no body, in one write.
     ASSERT_TRUE(RawWrite(client, HexText("00 00 00 01 00 00 00 02 61 62 FF FF FF FF 00 00 00 00")));
@@ -271,7 +269,6 @@ TEST_F(MessagePortTest, NestedRequestFromAnotherClientIsAnsweredFirst) {
     Lines events;
     std::shared_ptr<glyphwell::port::PendingRequest> outer;
     std::future<Reply> inner;
-    LocalPort* server = nullptr;
     LocalPort local(kName, [&](SInt32 msgid, CFDataRef) -> CFDataRef {
         if (msgid == 2) {
             events.push_back("inner handled");
@@ -282,12 +279,11 @@ TEST_F(MessagePortTest, NestedRequestFromAnotherClientIsAnsweredFirst) {
         events.push_back("outer entered");
         // The callback waits, as an alert does, in a loop nested on the same driver.
         inner = SendLater(2, "");
-        EXPECT_TRUE(server->RunUntil([&] { return IsReady(inner); }));
+        EXPECT_TRUE(local.RunUntil([&] { return IsReady(inner); }));
         events.push_back("inner answered");
         EXPECT_EQ(glyphwell::port::CurrentRequest(), outer);
         return CreateCFData("outer");
     });
-    server = &local;
 
     std::future<Reply> first = SendLater(1, "");
     ASSERT_TRUE(local.RunUntil([&] { return IsReady(first); }));
@@ -303,18 +299,16 @@ TEST_F(MessagePortTest, ClientLeavingWithdrawsItsRequestAndItsReplyIsDropped) {
     int withdrawals = 0;
     bool returned = false;
     std::shared_ptr<glyphwell::port::PendingRequest> request;
-    LocalPort* server = nullptr;
     LocalPort local(kName, [&](SInt32 msgid, CFDataRef) -> CFDataRef {
         if (msgid != 7)
             return CreateCFData("still serving");
         request = glyphwell::port::CurrentRequest();
         request->SetWithdrawalHandler([&] { ++withdrawals; });
         client->Close(); // the client gives up while its question is up
-        EXPECT_TRUE(server->RunUntil([&] { return request->IsWithdrawn(); }));
+        EXPECT_TRUE(local.RunUntil([&] { return request->IsWithdrawn(); }));
         returned = true;
         return CreateCFData("nobody reads this");
     });
-    server = &local;
     client.emplace(SocketPath());
     ASSERT_TRUE(RawWrite(*client, RequestFrame(7, "question")));
     ASSERT_TRUE(local.RunUntil([&] { return returned; }));
