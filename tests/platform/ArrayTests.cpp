@@ -84,22 +84,6 @@ TEST(CFArray, NullCallbacksKeepCountsAndCompareByPointer) {
     EXPECT_EQ(CFArrayGetCountOfValue(copy.get(), CFRangeMake(0, 3), five.get()), 2);
 }
 
-TEST(CFArray, EqualityComparesElementsInOrder) {
-    auto one = MakeInt(1), realOne = MakeNumber(kCFNumberFloat64Type, 1.0);
-    auto two = MakeText("two"), alsoTwo = MakeText("two");
-    const void* left[] = {one.get(), two.get()};
-    const void* right[] = {realOne.get(), alsoTwo.get()};
-    const void* reversed[] = {alsoTwo.get(), realOne.get()};
-    auto array = Own(CFArrayCreate(nullptr, left, 2, &kCFTypeArrayCallBacks));
-    auto same = Own(CFArrayCreate(nullptr, right, 2, &kCFTypeArrayCallBacks));
-    EXPECT_TRUE(CFEqual(array.get(), same.get()));
-    EXPECT_EQ(CFHash(array.get()), CFHash(same.get()));
-    auto otherOrder = Own(CFArrayCreate(nullptr, reversed, 2, &kCFTypeArrayCallBacks));
-    auto shorter = Own(CFArrayCreate(nullptr, left, 1, &kCFTypeArrayCallBacks));
-    EXPECT_FALSE(CFEqual(array.get(), otherOrder.get()));
-    EXPECT_FALSE(CFEqual(array.get(), shorter.get()));
-}
-
 TEST(CFArray, FindsCountsAndVisitsValuesWithinRange) {
     auto x = MakeText("x"), y = MakeText("y"), alsoX = MakeText("x");
     const void* values[] = {x.get(), y.get(), x.get(), y.get(), x.get()};
@@ -162,33 +146,4 @@ TEST(CFArray, EditsSpliceInPlace) {
     // Appending a range of the array to itself reads the values before the storage moves.
     CFArrayAppendArray(array.get(), array.get(), CFRangeMake(0, 4));
     EXPECT_EQ(TokensOf(array.get()), (Tokens{5, 4, 3, 6, 5, 4, 3, 6}));
-}
-
-TEST(CFArray, MisuseIsReportedAndIgnored) {
-    auto array = Own(CFArrayCreateCopy(nullptr, TokenArray({1, 2}).get()));
-    LogCapture log;
-    CFArrayAppendValue(const_cast<CFMutableArrayRef>(array.get()), Token(3));
-    EXPECT_EQ(CFArrayGetValueAtIndex(array.get(), 2), nullptr);
-    EXPECT_EQ(CFArrayGetValueAtIndex(array.get(), -1), nullptr);
-    EXPECT_EQ(CFArrayGetCountOfValue(array.get(), CFRangeMake(1, 2), Token(2)), 0);
-    EXPECT_EQ(TokensOf(array.get()), (Tokens{1, 2}));
-
-    std::vector<std::string> lines = log.Texts();
-    ASSERT_EQ(lines.size(), 8u);
-    EXPECT_EQ(lines[0].rfind("*** Assertion failure in CFArrayAppendValue, ", 0), 0u) << lines[0];
-    EXPECT_EQ(lines[1], "Invalid parameter not satisfying: array is mutable");
-    EXPECT_EQ(lines[2].rfind("*** Assertion failure in CFArrayGetValueAtIndex, ", 0), 0u);
-    EXPECT_EQ(lines[3], "Invalid parameter not satisfying: index lies inside the array");
-    EXPECT_EQ(lines[7], "Invalid parameter not satisfying: range lies inside the collection");
-}
-
-TEST(CFArray, DescriptionListsElements) {
-    auto a = MakeText("alpha"), b = MakeText("beta");
-    const void* values[] = {a.get(), b.get()};
-    auto array = Own(CFArrayCreate(nullptr, values, 2, &kCFTypeArrayCallBacks));
-    std::string text = glyphwell::Describe(array.get());
-    EXPECT_EQ(text.rfind("<CFArray 0x", 0), 0u) << text;
-    const std::string tail = ">{count = 2, values = (\n\t0 : alpha\n\t1 : beta\n)}";
-    ASSERT_GE(text.size(), tail.size());
-    EXPECT_EQ(text.substr(text.size() - tail.size()), tail);
 }

@@ -15,6 +15,7 @@
 #include "platform/CFNumber.h"
 #include "platform/Log.h"
 #include "tests/support/LogCapture.h"
+#include "tests/support/Values.h"
 
 namespace {
 
@@ -25,6 +26,8 @@ using glyphwell::testing::LogCapture;
 
 TEST(Format, FormatsLikePrintf) {
     const std::string padded = Format("%300d", 1), long_(1000, 'k');
+    const glyphwell::testing::Ref number = glyphwell::testing::Num(kCFNumberFloat64Type, 1.5);
+    int count = -1;
     const std::pair<std::string, std::string> cases[] = {
         {Format("%d|%5.2f|%-4s|%x|%llu|%c|%%", 42, 3.14159, "ab", 255, 18446744073709551615ULL,
                 'Z'),
@@ -52,24 +55,15 @@ TEST(Format, FormatsLikePrintf) {
         {Format("%Ld|%hf|%d", 1, 2), "%Ld|%hf|1"},
         {Format("%99999999999d|%d", 3), "%99999999999d|3"},
         {glyphwell::Format(nullptr), ""},
+        // An object directive inserts the description.
+        {Format("n=%@ b=%@ z=%@ d=%d", number.get(), kCFBooleanTrue, nullptr, 9),
+         "n=1.5 b=true z=(null) d=9"},
+        {Format("[%6@][%-6@][%.2@]", kCFBooleanTrue, kCFBooleanTrue, kCFBooleanFalse),
+         "[  true][true  ][fa]"},
+        {Format("a%nb%d", &count, 5), "ab5"}, // the count directive writes nothing
     };
     for (const auto& [formatted, expected] : cases)
         EXPECT_EQ(formatted, expected);
-}
-
-TEST(Format, ObjectDirectiveInsertsTheDescription) {
-    double value = 1.5;
-    CFNumberRef number = CFNumberCreate(nullptr, kCFNumberFloat64Type, &value);
-    EXPECT_EQ(Format("n=%@ b=%@ z=%@ d=%d", number, kCFBooleanTrue, nullptr, 9),
-              "n=1.5 b=true z=(null) d=9");
-    EXPECT_EQ(Format("[%6@][%-6@][%.2@]", kCFBooleanTrue, kCFBooleanTrue, kCFBooleanFalse),
-              "[  true][true  ][fa]");
-    CFRelease(number);
-}
-
-TEST(Format, CountDirectiveWritesNothing) {
-    int count = -1;
-    EXPECT_EQ(Format("a%nb%d", &count, 5), "ab5");
     EXPECT_EQ(count, -1);
 }
 
@@ -151,30 +145,24 @@ TEST(LogSink, LinesFromManyThreadsArriveWhole) {
         EXPECT_EQ(text.rfind("thread ", 0), 0u) << text;
 }
 
-TEST(Assertion, FailureLogsTwoApplicationLines) {
-    LogCapture log;
-    glyphwell::AssertionFailure("x > 0", "Compute", "Sample.cpp", 12);
-    std::vector<std::pair<LogChannel, std::string>> lines;
-    for (const LogCapture::Line& line : log.Lines())
-        lines.emplace_back(line.channel, line.text);
-    EXPECT_EQ(lines,
-              (decltype(lines){
-                  {LogChannel::Application, "*** Assertion failure in Compute, Sample.cpp:12"},
-                  {LogChannel::Application, "Invalid parameter not satisfying: x > 0"}}));
-}
-
-TEST(Assertion, MacroNamesFunctionFileAndLineAndGoesOn) {
+// A failed assertion logs two application lines (the macro names function, file and line) and
+// the program goes on; one that holds logs nothing.
+TEST(Assertion, FailureLogsTwoApplicationLinesAndGoesOn) {
     LogCapture log;
     int count = 2;
     GW_ASSERT(count == 2);
-    EXPECT_TRUE(log.Texts().empty());
     const int line = __LINE__ + 1;
     GW_ASSERT(count == 3);
-    std::vector<std::string> texts = log.Texts();
-    ASSERT_EQ(texts.size(), 2u);
-    EXPECT_EQ(texts[0], std::string("*** Assertion failure in TestBody, ") + __FILE__ + ":" +
-                            std::to_string(line));
-    EXPECT_EQ(texts[1], "Invalid parameter not satisfying: count == 3");
+    glyphwell::AssertionFailure("x > 0", "Compute", "Sample.cpp", 12);
+    std::vector<std::pair<LogChannel, std::string>> lines;
+    for (const LogCapture::Line& entry : log.Lines())
+        lines.emplace_back(entry.channel, entry.text);
+    const auto app = LogChannel::Application;
+    EXPECT_EQ(lines, (decltype(lines){{app, std::string("*** Assertion failure in TestBody, ") +
+                                                __FILE__ + ":" + std::to_string(line)},
+                                      {app, "Invalid parameter not satisfying: count == 3"},
+                                      {app, "*** Assertion failure in Compute, Sample.cpp:12"},
+                                      {app, "Invalid parameter not satisfying: x > 0"}}));
 }
 
 } // namespace

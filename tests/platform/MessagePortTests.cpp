@@ -11,6 +11,7 @@
 #include <filesystem>
 #include <fstream>
 #include <future>
+#include <optional>
 #include <vector>
 
 #include "platform/CFMessagePort.h"
@@ -49,9 +50,9 @@ struct Reply {
 };
 
 /// One request through `remote`.
-Reply Request(const Ref& remote, SInt32 msgid, const std::string& body,
+Reply Request(const Ref& remote, SInt32 msgid, const std::optional<std::string>& body,
               CFTimeInterval sendTimeout = 10, CFTimeInterval receiveTimeout = 10) {
-    Ref data(CreateCFData(body));
+    Ref data(body ? CreateCFData(*body) : nullptr);
     CFDataRef reply = nullptr;
     const SInt32 status =
         CFMessagePortSendRequest(remote.as<CFMessagePortRef>(), msgid, data.as<CFDataRef>(),
@@ -75,6 +76,12 @@ bool IsReady(std::future<Reply>& reply) {
     return reply.wait_for(std::chrono::seconds(0)) == std::future_status::ready;
 }
 
+/// True when `descriptor` has bytes to read (or its end) within `timeoutMs`.
+bool HasBytes(int descriptor, int timeoutMs = 0) {
+    pollfd entry{descriptor, POLLIN, 0};
+    return poll(&entry, 1, timeoutMs) > 0;
+}
+
 /// A local port on the test's own thread; the test runs its driver.
 class LocalPort {
 public:
@@ -86,6 +93,7 @@ public:
         CFMessagePortContext context{0, this, nullptr, nullptr, nullptr};
         port_ = CFMessagePortCreateLocal(kCFAllocatorDefault, portName.as<CFStringRef>(), Callback,
                                          &context, nullptr);
+        EXPECT_NE(port_, nullptr) << "cannot create the local port";
         if (port_) {
             Ref source(CFMessagePortCreateRunLoopSource(kCFAllocatorDefault, port_, 0));
             CFRunLoopAddSource(CFRunLoopGetCurrent(), source.as<CFRunLoopSourceRef>(),
@@ -113,6 +121,17 @@ public:
         return true;
     }
 
+    /// Runs the loop until `client` has bytes to read, then reads up to `count` of them.
+    std::string Answer(int client, size_t count) {
+        RunUntil([&] { return HasBytes(client); });
+        return RawRead(client, count);
+    }
+
+    /// Writes `frame` from `client`, then reads up to `count` bytes of the answer.
+    std::string Ask(int client, const std::string& frame, size_t count) {
+        return RawWrite(client, frame) ? Answer(client, count) : "<not sent>";
+    }
+
 private:
     static CFDataRef Callback(CFMessagePortRef, SInt32 msgid, CFDataRef data, void* info) {
         return static_cast<LocalPort*>(info)->handler_(msgid, data);
@@ -126,12 +145,6 @@ private:
 /// Replies with the request bytes, "@" and the msgid.
 CFDataRef EchoWithMsgid(SInt32 msgid, CFDataRef data) {
     return CreateCFData(BytesOf(data) + "@" + std::to_string(msgid));
-}
-
-/// True when `descriptor` has bytes to read (or its end) within `timeoutMs`.
-bool HasBytes(int descriptor, int timeoutMs = 0) {
-    pollfd entry{descriptor, POLLIN, 0};
-    return poll(&entry, 1, timeoutMs) > 0;
 }
 
 /// Waits up to 10 s for `condition`.
@@ -156,9 +169,20 @@ struct PassedDescriptor {
     const int saved;
 };
 
+/// A raw client connection, closed when it goes.
+struct Client {
+    explicit Client(const std::string& path) : fd(RawConnect(path)) { EXPECT_GE(fd, 0); }
+    Client(const Client&) = delete;
+    ~Client() { Close(); }
+    void Close() { fd >= 0 && close(std::exchange(fd, -1)); }
+    operator int() const { return fd; }
+    int fd;
+};
+
 class MessagePortTest : public ::testing::Test {
 protected:
     std::string SocketPath() const { return runtime_.Path() + "/" + kName; }
+    Client Connect() const { return Client(SocketPath()); }
 
     TemporaryRuntimeDirectory runtime_;
 };
@@ -189,43 +213,31 @@ TEST_F(MessagePortTest, AnswersEveryRequestOfManyConcurrentClients) {
         client.join();
     EXPECT_EQ(answered, 200 * 50);
     EXPECT_EQ(handled, 200 * 50);
-
-    Ref remote = Remote(kName);
-    CFDataRef reply = nullptr;
-    ASSERT_EQ(CFMessagePortSendRequest(remote.as<CFMessagePortRef>(), 3, nullptr, 5, 5,
-                                       kCFRunLoopDefaultMode, &reply),
-              kCFMessagePortSuccess);
-    Ref owned(reply);
-    EXPECT_EQ(BytesOf(reply), "@3");
+    EXPECT_EQ(Request(Remote(kName), 3, std::nullopt, 5, 5), (Reply{0, "@3"})); // no data
 }
 
 TEST_F(MessagePortTest, AnswersPipelinedFramesOneAtATimeWithExactBytes) {
     Lines events;
-    LocalPort* server = nullptr;
     LocalPort local(kName, [&](SInt32 msgid, CFDataRef data) {
         events.push_back("enter " + std::to_string(msgid));
         if (msgid == 1) { // spin the loop a while: the second frame has arrived but must wait
             int rounds = 0;
-            server->RunUntil([&] { return ++rounds > 20; });
+            local.RunUntil([&] { return ++rounds > 20; });
         }
         events.push_back("leave " + std::to_string(msgid));
         return EchoWithMsgid(msgid, data);
     });
-    server = &local;
-    const int client = RawConnect(SocketPath());
-    ASSERT_GE(client, 0);
+    Client client = Connect();
     // msgid 1 with "ab", then msgid -1 with no body, in one write.
     ASSERT_TRUE(RawWrite(client, HexText("00 00 00 01 00 00 00 02 61 62 FF FF FF FF 00 00 00 00")));
     ASSERT_TRUE(local.RunUntil([&] { return events.size() == 4; }));
     EXPECT_EQ(events, (Lines{"enter 1", "leave 1", "enter -1", "leave -1"}));
     EXPECT_EQ(RawRead(client, 15),
               HexText("00 00 00 04") + "ab@1" + HexText("00 00 00 03") + "@-1");
-    close(client);
 }
 
 TEST_F(MessagePortTest, PortsAndSourcesArePropertyValues) {
     LocalPort local(kName, EchoWithMsgid);
-    ASSERT_NE(local.Port(), nullptr);
     EXPECT_NE(access((SocketPath() + ".lock").c_str(), F_OK), 0) << "the lock file is gone";
     EXPECT_EQ(CFGetTypeID(local.Port()), CFMessagePortGetTypeID());
     EXPECT_EQ(TextOf(Ref(CFCopyTypeIDDescription(CFMessagePortGetTypeID())).get()),
@@ -257,7 +269,6 @@ TEST_F(MessagePortTest, NestedRequestFromAnotherClientIsAnsweredFirst) {
     Lines events;
     std::shared_ptr<glyphwell::port::PendingRequest> outer;
     std::future<Reply> inner;
-    LocalPort* server = nullptr;
     LocalPort local(kName, [&](SInt32 msgid, CFDataRef) -> CFDataRef {
         if (msgid == 2) {
             events.push_back("inner handled");
@@ -268,13 +279,11 @@ TEST_F(MessagePortTest, NestedRequestFromAnotherClientIsAnsweredFirst) {
         events.push_back("outer entered");
         // The callback waits, as an alert does, in a loop nested on the same driver.
         inner = SendLater(2, "");
-        EXPECT_TRUE(server->RunUntil([&] { return IsReady(inner); }));
+        EXPECT_TRUE(local.RunUntil([&] { return IsReady(inner); }));
         events.push_back("inner answered");
         EXPECT_EQ(glyphwell::port::CurrentRequest(), outer);
         return CreateCFData("outer");
     });
-    server = &local;
-    ASSERT_NE(local.Port(), nullptr);
 
     std::future<Reply> first = SendLater(1, "");
     ASSERT_TRUE(local.RunUntil([&] { return IsReady(first); }));
@@ -286,25 +295,22 @@ TEST_F(MessagePortTest, NestedRequestFromAnotherClientIsAnsweredFirst) {
 
 TEST_F(MessagePortTest, ClientLeavingWithdrawsItsRequestAndItsReplyIsDropped) {
     LogCapture log;
-    int client = -1;
+    std::optional<Client> client;
     int withdrawals = 0;
     bool returned = false;
     std::shared_ptr<glyphwell::port::PendingRequest> request;
-    LocalPort* server = nullptr;
     LocalPort local(kName, [&](SInt32 msgid, CFDataRef) -> CFDataRef {
         if (msgid != 7)
             return CreateCFData("still serving");
         request = glyphwell::port::CurrentRequest();
         request->SetWithdrawalHandler([&] { ++withdrawals; });
-        close(client); // the client gives up while its question is up
-        EXPECT_TRUE(server->RunUntil([&] { return request->IsWithdrawn(); }));
+        client->Close(); // the client gives up while its question is up
+        EXPECT_TRUE(local.RunUntil([&] { return request->IsWithdrawn(); }));
         returned = true;
         return CreateCFData("nobody reads this");
     });
-    server = &local;
-    client = RawConnect(SocketPath());
-    ASSERT_GE(client, 0);
-    ASSERT_TRUE(RawWrite(client, RequestFrame(7, "question")));
+    client.emplace(SocketPath());
+    ASSERT_TRUE(RawWrite(*client, RequestFrame(7, "question")));
     ASSERT_TRUE(local.RunUntil([&] { return returned; }));
 
     EXPECT_EQ(withdrawals, 1);
@@ -325,7 +331,6 @@ TEST_F(MessagePortTest, RefusesAPeerOfAnotherUserWithOneLogLine) {
         GTEST_SKIP() << "needs root to run a client as another user";
     LogCapture log;
     LocalPort local(kName, EchoWithMsgid);
-    ASSERT_NE(local.Port(), nullptr);
     // Open the directory and socket to everyone: the peer check is what must refuse.
     ASSERT_EQ(chmod(runtime_.Path().c_str(), 0711), 0);
     ASSERT_EQ(chmod(SocketPath().c_str(), 0666), 0);
@@ -392,8 +397,7 @@ TEST_F(MessagePortTest, ConnectionsEndingMidRequestLogOneLineAndLeaveTheOthersSe
         SCOPED_TRACE(ToHex(reinterpret_cast<const uint8_t*>(test.bytes.data()), test.bytes.size()));
         log.Clear();
         handled = 0;
-        const int client = RawConnect(SocketPath());
-        ASSERT_GE(client, 0);
+        Client client = Connect();
         ASSERT_TRUE(RawWrite(client, test.bytes));
         if (test.end == ClientShutsDown) {
             ASSERT_EQ(shutdown(client, SHUT_WR), 0);
@@ -402,7 +406,7 @@ TEST_F(MessagePortTest, ConnectionsEndingMidRequestLogOneLineAndLeaveTheOthersSe
         if (test.end != ClientCloses) {
             EXPECT_TRUE(RawSeesClose(client)) << "closed once everything is answered";
         }
-        close(client);
+        client.Close();
         ASSERT_TRUE(WaitFor([&] { return log.Texts().size() >= test.lines.size(); }));
         EXPECT_EQ(handled, test.handled);
         EXPECT_EQ(Send(kName, 3, "whole").bytes, "whole@3");
@@ -418,8 +422,7 @@ TEST_F(MessagePortTest, WritesALargeReplyWithoutHoldingUpOtherClients) {
         return msgid == 9 ? CreateCFData(large) : EchoWithMsgid(msgid, data);
     });
     ASSERT_TRUE(server.Started());
-    const int slowReader = RawConnect(SocketPath());
-    ASSERT_GE(slowReader, 0);
+    Client slowReader = Connect();
     ASSERT_TRUE(RawWrite(slowReader, RequestFrame(9, "")));
     ASSERT_TRUE(HasBytes(slowReader, 10000)) << "the large reply has begun";
 
@@ -428,7 +431,6 @@ TEST_F(MessagePortTest, WritesALargeReplyWithoutHoldingUpOtherClients) {
     ASSERT_EQ(received.size(), 4 + large.size());
     EXPECT_EQ(received.substr(0, 4), std::string("\x00\x80\x00\x00", 4));
     EXPECT_TRUE(received.compare(4, std::string::npos, large) == 0);
-    close(slowReader);
 }
 
 TEST_F(MessagePortTest, TakesOverAStaleSocketButNeitherALiveServerNorAnotherFile) {
@@ -685,40 +687,28 @@ TEST_F(MessagePortTest, ServesConnectionsInTurnAndDropsTheQueueOfAClientThatHung
         handled.push_back(msgid);
         return EchoWithMsgid(msgid, data);
     });
-    ASSERT_NE(local.Port(), nullptr);
-    const int flood = RawConnect(SocketPath());
-    const int other = RawConnect(SocketPath());
-    ASSERT_GE(flood, 0);
-    ASSERT_GE(other, 0);
+    Client flood = Connect(), other = Connect();
     std::string frames;
     for (int i = 0; i < 500; ++i)
         frames += RequestFrame(1, "");
     ASSERT_TRUE(RawWrite(flood, frames));
     ASSERT_TRUE(RawWrite(other, RequestFrame(2, "")));
     // The other client is served within the first round, not after the 500.
-    ASSERT_TRUE(local.RunUntil([&] { return HasBytes(other); }));
-    EXPECT_EQ(RawRead(other, 6), std::string("\x00\x00\x00\x02@2", 6));
+    EXPECT_EQ(local.Answer(other, 6), HexText("00 00 00 02") + "@2");
     EXPECT_LE(std::find(handled.begin(), handled.end(), 2) - handled.begin(), 2);
 
     // The flooding client hangs up: what it queued is dropped, not worked through.
-    close(flood);
+    flood.Close();
     ASSERT_TRUE(local.RunUntil([&] { return !glyphwell::port::IsReceivingRequest(local.Port()); }));
     EXPECT_LT(std::count(handled.begin(), handled.end(), 1), 10);
-    ASSERT_TRUE(RawWrite(other, RequestFrame(3, "")));
-    ASSERT_TRUE(local.RunUntil([&] { return HasBytes(other); }));
-    EXPECT_EQ(RawRead(other, 6), std::string("\x00\x00\x00\x02@3", 6));
-    close(other);
+    EXPECT_EQ(local.Ask(other, RequestFrame(3, ""), 6), HexText("00 00 00 02") + "@3");
 }
 
 TEST_F(MessagePortTest, ClosesARequestThatStalledButNotOneThatKeepsComing) {
     LogCapture log;
     LocalPort local(kName, EchoWithMsgid);
-    ASSERT_NE(local.Port(), nullptr);
     glyphwell::port::SetStallTimeout(local.Port(), std::chrono::milliseconds(300));
-    const int stalled = RawConnect(SocketPath());
-    const int slow = RawConnect(SocketPath());
-    ASSERT_GE(stalled, 0);
-    ASSERT_GE(slow, 0);
+    Client stalled = Connect(), slow = Connect();
     ASSERT_TRUE(RawWrite(stalled, std::string("\x00\x00\x00\x01\x00", 5)));
     ASSERT_TRUE(local.RunUntil([&] { return glyphwell::port::IsReceivingRequest(local.Port()); }));
 
@@ -733,14 +723,11 @@ TEST_F(MessagePortTest, ClosesARequestThatStalledButNotOneThatKeepsComing) {
     EXPECT_TRUE(RawSeesClose(stalled));
     EXPECT_EQ(log.Texts(),
               Lines{kPrefix + "closed a connection whose request made no progress for 0.3 s"});
-    close(stalled);
-    close(slow);
 }
 
 TEST_F(MessagePortTest, BoundsTheBytesHeldByUnfinishedRequests) {
     LogCapture log;
     LocalPort local(kName, EchoWithMsgid);
-    ASSERT_NE(local.Port(), nullptr);
     glyphwell::port::SetUnfinishedRequestLimit(local.Port(), 56320);
     // Three unfinished requests of 20, 30 and 10 KiB: any two fit, all three do not, and the
     // one holding the most goes.
@@ -759,9 +746,7 @@ TEST_F(MessagePortTest, BoundsTheBytesHeldByUnfinishedRequests) {
     EXPECT_EQ(log.Texts(), Lines{kPrefix + "unfinished requests held 61464 bytes (the limit is "
                                            "56320); closed the connection holding 30728 of them"});
     // The others go on: the first finishes its request and is answered.
-    ASSERT_TRUE(RawWrite(clients[0].descriptor, std::string(10240, 'x')));
-    ASSERT_TRUE(local.RunUntil([&] { return HasBytes(clients[0].descriptor); }));
-    EXPECT_EQ(RawRead(clients[0].descriptor, 4), std::string("\x00\x00\x78\x02", 4));
+    EXPECT_EQ(local.Ask(clients[0].descriptor, std::string(10240, 'x'), 4), HexText("00 00 78 02"));
     for (const Client& client : clients)
         close(client.descriptor);
 }
@@ -804,11 +789,10 @@ TEST_F(MessagePortTest, AReplyWriteThatFailsClosesOnlyThatConnection) {
         log.Clear();
         failingSendCalls = 0;
         glyphwell::port::SetReplySendFunctionForTesting(test.send);
-        const int client = RawConnect(SocketPath());
-        ASSERT_GE(client, 0);
+        Client client = Connect();
         ASSERT_TRUE(RawWrite(client, RequestFrame(9, "")));
         EXPECT_EQ(RawRead(client, 4), test.read); // the failed write: up to the server's close
-        close(client);
+        client.Close();
         ASSERT_TRUE(WaitFor([&] { return !log.Texts().empty(); }));
         glyphwell::port::SetReplySendFunctionForTesting(nullptr);
         EXPECT_EQ(Send(kName, 1, "others").bytes, "others@1");
@@ -819,37 +803,20 @@ TEST_F(MessagePortTest, AReplyWriteThatFailsClosesOnlyThatConnection) {
 TEST_F(MessagePortTest, RefusesConnectionsOfAProcessBeyondItsLimitWithOneLogLine) {
     LogCapture log;
     LocalPort local(kName, EchoWithMsgid);
-    ASSERT_NE(local.Port(), nullptr);
     glyphwell::port::SetConnectionLimitPerProcess(local.Port(), 2);
-    int clients[4];
-    for (int& client : clients)
-        ASSERT_GE(client = RawConnect(SocketPath()), 0);
+    Client clients[4] = {Connect(), Connect(), Connect(), Connect()};
     ASSERT_TRUE(local.RunUntil([&] { return HasBytes(clients[2]) && HasBytes(clients[3]); }));
     EXPECT_TRUE(RawSeesClose(clients[2]));
     EXPECT_TRUE(RawSeesClose(clients[3]));
-    EXPECT_EQ(log.Texts(), (std::vector<std::string>{
-                               "message port org.glyphwell.Test.Port: refused a connection from "
-                               "process " +
-                               std::to_string(getpid()) + ", which holds 2 already"}));
+    EXPECT_EQ(log.Texts(), Lines{kPrefix + "refused a connection from process " +
+                                 std::to_string(getpid()) + ", which holds 2 already"});
     // The admitted ones are served, and a closed one makes room for a new one.
-    ASSERT_TRUE(RawWrite(clients[1], RequestFrame(5, "b")));
-    ASSERT_TRUE(local.RunUntil([&] { return HasBytes(clients[1]); }));
-    EXPECT_EQ(RawRead(clients[1], 7), std::string("\x00\x00\x00\x03"
-                                                  "b@5",
-                                                  7));
-    close(clients[0]);
-    close(clients[2]);
-    close(clients[3]);
+    EXPECT_EQ(local.Ask(clients[1], RequestFrame(5, "b"), 7), HexText("00 00 00 03") + "b@5");
+    for (const int i : {0, 2, 3})
+        clients[i].Close();
     ASSERT_TRUE(local.RunUntil([&] { return !glyphwell::port::IsReceivingRequest(local.Port()); }));
-    const int next = RawConnect(SocketPath());
-    ASSERT_TRUE(RawWrite(next, RequestFrame(6, "c")));
-    ASSERT_TRUE(local.RunUntil([&] { return HasBytes(next); }));
-    EXPECT_EQ(RawRead(next, 7), std::string("\x00\x00\x00\x03"
-                                            "c@6",
-                                            7));
+    EXPECT_EQ(local.Ask(Connect(), RequestFrame(6, "c"), 7), HexText("00 00 00 03") + "c@6");
     EXPECT_EQ(log.Texts().size(), 1u);
-    close(next);
-    close(clients[1]);
 }
 
 namespace {
@@ -871,40 +838,30 @@ int AcceptOrRunOut(int descriptor, sockaddr* address, socklen_t* length, int fla
 TEST_F(MessagePortTest, OutOfDescriptorsRefusesAClientOrWaitsForAConnectionToClose) {
     LogCapture log;
     LocalPort local(kName, EchoWithMsgid);
-    ASSERT_NE(local.Port(), nullptr);
-    const int first = RawConnect(SocketPath());
-    ASSERT_TRUE(RawWrite(first, RequestFrame(1, "a")));
-    ASSERT_TRUE(local.RunUntil([&] { return HasBytes(first); }));
-    ASSERT_EQ(RawRead(first, 7).size(), 7u);
+    Client first = Connect();
+    ASSERT_EQ(local.Ask(first, RequestFrame(1, "a"), 7).size(), 7u);
     glyphwell::port::SetAcceptFunctionForTesting(AcceptOrRunOut);
 
     // With its spare descriptor the port accepts the client only to refuse it.
     failingAccepts = 1;
-    const int refused = RawConnect(SocketPath());
+    Client refused = Connect();
     ASSERT_TRUE(local.RunUntil([&] { return HasBytes(refused); }));
     EXPECT_TRUE(RawSeesClose(refused));
-    close(refused);
 
     // When even that fails, the port stops accepting until a connection closes, then serves the
     // client that waited.
     failingAccepts = 2;
-    const int waiting = RawConnect(SocketPath());
+    Client waiting = Connect();
     ASSERT_TRUE(RawWrite(waiting, RequestFrame(7, "d")));
     ASSERT_TRUE(local.RunUntil([&] { return log.Texts().size() == 2; }));
     const auto until = std::chrono::steady_clock::now() + std::chrono::milliseconds(300);
     local.RunUntil([&] { return HasBytes(waiting) || std::chrono::steady_clock::now() > until; });
     EXPECT_FALSE(HasBytes(waiting));
-    close(first);
-    ASSERT_TRUE(local.RunUntil([&] { return HasBytes(waiting); }));
+    first.Close();
+    EXPECT_EQ(local.Answer(waiting, 7), HexText("00 00 00 03") + "d@7");
     glyphwell::port::SetAcceptFunctionForTesting(nullptr);
-    EXPECT_EQ(RawRead(waiting, 7), std::string("\x00\x00\x00\x03"
-                                               "d@7",
-                                               7));
-    EXPECT_EQ(log.Texts(),
-              (std::vector<std::string>{
-                  "message port org.glyphwell.Test.Port: out of file descriptors; refused a "
-                  "connection",
-                  "message port org.glyphwell.Test.Port: out of file descriptors; accepting again "
-                  "when a connection closes"}));
-    close(waiting);
+    EXPECT_EQ(
+        log.Texts(),
+        (Lines{kPrefix + "out of file descriptors; refused a connection",
+               kPrefix + "out of file descriptors; accepting again when a connection closes"}));
 }

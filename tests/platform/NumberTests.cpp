@@ -175,41 +175,6 @@ TEST(Number, ComparesByValueAcrossTypeCodes) {
             EXPECT_EQ(CFHash(a.get()), CFHash(b.get()));
         }
     }
-    EXPECT_FALSE(CFEqual(Make(S8, 1).get(), kCFBooleanTrue));
-}
-
-TEST(Number, DescriptionIsTheValue) {
-    EXPECT_EQ(glyphwell::Describe(Make(S32, 1).get()), "1");
-    EXPECT_EQ(glyphwell::Describe(Make(S64, -42).get()), "-42");
-    EXPECT_EQ(glyphwell::Describe(Make(F64, 1.5).get()), "1.5");
-    EXPECT_EQ(glyphwell::Describe(Make(F64, 1).get()), "1");
-    EXPECT_EQ(glyphwell::Describe(Make(F32, 0.1).get()), "0.1");
-}
-
-TEST(Number, WrongKindIsReportedAndGivesNothing) {
-    glyphwell::testing::LogCapture log;
-    int32_t value = 7;
-    EXPECT_FALSE(CFNumberGetValue(reinterpret_cast<CFNumberRef>(kCFBooleanTrue),
-                                  kCFNumberSInt32Type, &value));
-    EXPECT_EQ(value, 7);
-    ASSERT_EQ(log.Texts().size(), 2u);
-    EXPECT_EQ(log.Texts()[1], "Invalid parameter not satisfying: object != nullptr");
-}
-
-TEST(Boolean, SharedConstantsCarryTheirValueAndAreNeverDestroyed) {
-    EXPECT_EQ(CFGetTypeID(kCFBooleanTrue), CFBooleanGetTypeID());
-    EXPECT_TRUE(CFBooleanGetValue(kCFBooleanTrue));
-    EXPECT_FALSE(CFBooleanGetValue(kCFBooleanFalse));
-    EXPECT_FALSE(CFEqual(kCFBooleanTrue, kCFBooleanFalse));
-    EXPECT_NE(CFHash(kCFBooleanTrue), CFHash(kCFBooleanFalse));
-    EXPECT_EQ(glyphwell::Describe(kCFBooleanTrue), "true");
-    EXPECT_EQ(glyphwell::Describe(kCFBooleanFalse), "false");
-    for (int i = 0; i < 3; ++i)
-        CFRelease(kCFBooleanTrue);
-    CFRetain(kCFBooleanFalse);
-    EXPECT_EQ(CFGetRetainCount(kCFBooleanTrue), 0x7fffffffffffffffL);
-    EXPECT_EQ(CFGetRetainCount(kCFBooleanFalse), 0x7fffffffffffffffL);
-    EXPECT_TRUE(CFBooleanGetValue(kCFBooleanTrue));
 }
 
 } // namespace

@@ -69,29 +69,6 @@ TEST(PollRunLoopDriver, NeverCallsACallbackUnwatchedEarlierInTheSameRound) {
     EXPECT_EQ(newCalls, 1);
 }
 
-TEST(PollRunLoopDriver, CallbackMayRunANestedRound) {
-    PollRunLoopDriver driver;
-    Pipe outer, inner;
-    std::vector<std::string> events;
-    driver.Watch(outer.read, true, false, [&](bool readable, bool) {
-        EXPECT_TRUE(readable);
-        char byte;
-        ASSERT_EQ(read(outer.read, &byte, 1), 1);
-        events.push_back("outer");
-        ASSERT_EQ(write(inner.write, "y", 1), 1);
-        driver.RunOnce(1000);
-        events.push_back("outer done");
-    });
-    driver.Watch(inner.read, true, false, [&](bool, bool) {
-        char byte;
-        ASSERT_EQ(read(inner.read, &byte, 1), 1);
-        events.push_back("inner");
-    });
-    ASSERT_EQ(write(outer.write, "x", 1), 1);
-    ASSERT_TRUE(driver.RunOnce(1000));
-    EXPECT_EQ(events, (std::vector<std::string>{"outer", "inner", "outer done"}));
-}
-
 TEST(PollRunLoopDriver, WakeEndsAWaitFromAnotherThread) {
     PollRunLoopDriver driver;
     EXPECT_FALSE(driver.RunOnce(-1)) << "nothing watched: returns at once";
@@ -145,33 +122,6 @@ TEST(RunLoop, SourcesAreServedByWhicheverDriverIsInstalled) {
     CFRelease(source);
 }
 
-TEST(FrameAssembler, ReassemblesFramesSplitAtAnyByte) {
-    const std::string stream("\x00\x00\x00\x05\x00\x00\x00\x03"
-                             "abc"
-                             "\x80\x00\x00\x00\x00\x00\x00\x00",
-                             19);
-    for (size_t piece = 1; piece <= stream.size(); ++piece) {
-        FrameAssembler assembler(FrameAssembler::Kind::Request, 16);
-        for (size_t at = 0; at < stream.size(); at += piece) {
-            const size_t length = std::min(piece, stream.size() - at);
-            ASSERT_TRUE(
-                assembler.Append(reinterpret_cast<const uint8_t*>(stream.data()) + at, length));
-        }
-        ASSERT_TRUE(assembler.HasFrame());
-        Frame frame = assembler.TakeFrame();
-        EXPECT_EQ(frame.msgid, 5);
-        EXPECT_EQ(std::string(reinterpret_cast<const char*>(frame.body.Data()), frame.body.Size()),
-                  "abc");
-        ASSERT_TRUE(assembler.HasFrame());
-        frame = assembler.TakeFrame();
-        EXPECT_EQ(frame.msgid, INT32_MIN);
-        EXPECT_EQ(frame.body.Size(), 0u);
-        EXPECT_FALSE(assembler.HasFrame());
-        EXPECT_FALSE(assembler.IsMidFrame());
-        EXPECT_EQ(assembler.BufferedBytes(), 0u);
-    }
-}
-
 TEST(FrameAssembler, RefusesALengthOverItsCapForGood) {
     const uint8_t atCap[] = {0, 0, 0, 16};
     const uint8_t over[] = {0, 0, 0, 17, 'x'};
@@ -208,10 +158,10 @@ TEST(FrameAssembler, ReceivesABodyInPlaceWithMemoryFollowingWhatArrived) {
     }
     Frame frame = assembler.TakeFrame();
     EXPECT_EQ(frame.msgid, 9);
-    ASSERT_EQ(frame.body.Size(), 200000u);
-    bool same = true;
-    for (size_t i = 0; i < frame.body.Size(); ++i)
-        same = same && frame.body.Data()[i] == uint8_t(i % 251);
-    EXPECT_TRUE(same);
+    std::vector<uint8_t> expected(200000);
+    for (size_t i = 0; i < expected.size(); ++i)
+        expected[i] = uint8_t(i % 251);
+    EXPECT_TRUE(std::vector<uint8_t>(frame.body.Data(), frame.body.Data() + frame.body.Size()) ==
+                expected);
     EXPECT_EQ(assembler.BufferedBytes(), 0u);
 }

@@ -1,16 +1,17 @@
 #include <gtest/gtest.h>
 
-#include <unistd.h>
-
-#include <climits>
+#include <filesystem>
 #include <string>
 #include <utility>
 
 #include "platform/CFURL.h"
 #include "tests/platform/ContainerTestSupport.h"
+#include "tests/support/Values.h"
 
 using glyphwell::testing::Own;
 using glyphwell::testing::Owned;
+using glyphwell::testing::Ref;
+using glyphwell::testing::TextOf;
 
 namespace {
 
@@ -19,20 +20,9 @@ Owned<CFURLRef> URL(const std::string& text, CFURLRef base = nullptr) {
                                     CFIndex(text.size()), kCFStringEncodingUTF8, base));
 }
 
-std::string Text(CFStringRef string) {
-    if (!string)
-        return "(null)";
-    char buffer[1024];
-    return CFStringGetCString(string, buffer, sizeof buffer, kCFStringEncodingUTF8) ? buffer
-                                                                                    : "(bad)";
-}
-
-/// Takes a new string, returns its text and releases it.
+/// Takes a new string, returns its text ("<null>" for null) and releases it.
 std::string Take(CFStringRef string) {
-    std::string text = Text(string);
-    if (string)
-        CFRelease(string);
-    return text;
+    return TextOf(Ref(string).get());
 }
 
 /// The URL's own bytes.
@@ -44,11 +34,6 @@ std::string Bytes(CFURLRef url) {
 
 std::string Absolute(CFURLRef url) {
     return Bytes(Own(CFURLCopyAbsoluteURL(url)).get());
-}
-
-std::string CurrentDirectory() {
-    char buffer[PATH_MAX];
-    return getcwd(buffer, sizeof buffer) ? buffer : "";
 }
 
 // The examples of RFC 3986, section 5.4, against its base; a URL keeps its own bytes unresolved.
@@ -106,7 +91,7 @@ TEST(URLResolution, ChainsOfRelativeBasesResolveFromTheTop) {
 TEST(URL, KeepsItsOwnStringAndHandsOutTheSameURLWhenAlreadyAbsolute) {
     auto url = URL("https://example.org/a%20b?x=1#frag");
     ASSERT_TRUE(url);
-    EXPECT_EQ(Text(CFURLGetString(url.get())), "https://example.org/a%20b?x=1#frag");
+    EXPECT_EQ(TextOf(CFURLGetString(url.get())), "https://example.org/a%20b?x=1#frag");
     auto absolute = Own(CFURLCopyAbsoluteURL(url.get()));
     EXPECT_EQ(absolute.get(), url.get());
     UInt8 small[4];
@@ -164,10 +149,10 @@ TEST(FileURL, PathWithSpacesAndNonASCIIRoundTrips) {
     auto url = Own(CFURLCreateWithFileSystemPath(nullptr, path, kCFURLPOSIXPathStyle, false));
     ASSERT_TRUE(url);
     EXPECT_EQ(Bytes(url.get()), "file:///tmp/My%20Files/r%C3%A9sum%C3%A9%20%231%3Bv=2%25.txt");
-    EXPECT_EQ(Take(CFURLCopyFileSystemPath(url.get(), kCFURLPOSIXPathStyle)), Text(path));
+    EXPECT_EQ(Take(CFURLCopyFileSystemPath(url.get(), kCFURLPOSIXPathStyle)), TextOf(path));
     UInt8 buffer[64];
     ASSERT_TRUE(CFURLGetFileSystemRepresentation(url.get(), true, buffer, sizeof buffer));
-    EXPECT_EQ(std::string(reinterpret_cast<char*>(buffer)), Text(path));
+    EXPECT_EQ(std::string(reinterpret_cast<char*>(buffer)), TextOf(path));
     EXPECT_FALSE(CFURLGetFileSystemRepresentation(url.get(), true, buffer, 10));
 
     const UInt8 raw[] = {'/', 't', 'm', 'p', '/', 0xFF}; // not UTF-8: the bytes still round-trip
@@ -203,7 +188,7 @@ TEST(FileURL, RelativePathIsRelativeToTheCurrentDirectory) {
     EXPECT_EQ(Bytes(url.get()), "a%20b/x:y");
     CFURLRef base = CFURLGetBaseURL(url.get());
     ASSERT_NE(base, nullptr);
-    std::string cwd = CurrentDirectory();
+    const std::string cwd = std::filesystem::current_path().string();
     EXPECT_EQ(Take(CFURLCopyFileSystemPath(base, kCFURLPOSIXPathStyle)), cwd);
     EXPECT_TRUE(CFURLHasDirectoryPath(base));
     EXPECT_EQ(Take(CFURLCopyFileSystemPath(url.get(), kCFURLPOSIXPathStyle)),
@@ -228,9 +213,9 @@ TEST(FileURL, OnlyLocalFileURLsAndSchemelessReferencesHavePaths) {
     EXPECT_EQ(path("file://localhost/etc/x%2Fy"), "/etc/x/y");
     EXPECT_EQ(path("FILE:///"), "/");
     EXPECT_EQ(path("rel/dir/"), "rel/dir");
-    EXPECT_EQ(path("http://a/b"), "(null)");
-    EXPECT_EQ(path("file://elsewhere/b"), "(null)");
-    EXPECT_EQ(path("file:///a%00b"), "(null)");
+    EXPECT_EQ(path("http://a/b"), "<null>");
+    EXPECT_EQ(path("file://elsewhere/b"), "<null>");
+    EXPECT_EQ(path("file:///a%00b"), "<null>");
 }
 
 TEST(URLEditing, AppendDeleteAndStandardizeWorkOnTheOwnPath) {
@@ -263,8 +248,8 @@ TEST(URLEscapes, ReplacesEscapesExceptThoseLeftEscaped) {
     EXPECT_EQ(replace("a%20b%2Fc%C3%A9", CFSTR("")), "a b/c\xC3\xA9");
     EXPECT_EQ(replace("a%20b%2Fc%C3%A9", CFSTR("/\xC3\xA9")), "a b%2Fc%C3%A9");
     EXPECT_EQ(replace("a%20b", nullptr), "a%20b");
-    EXPECT_EQ(replace("bad%2", CFSTR("")), "(null)");
-    EXPECT_EQ(replace("bad%C3", CFSTR("")), "(null)"); // not UTF-8 once decoded
+    EXPECT_EQ(replace("bad%2", CFSTR("")), "<null>");
+    EXPECT_EQ(replace("bad%C3", CFSTR("")), "<null>"); // not UTF-8 once decoded
 }
 
 } // namespace
