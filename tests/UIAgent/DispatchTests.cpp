@@ -3,6 +3,7 @@
 #include <QCheckBox>
 #include <QPointer>
 
+#include "UIAgent/QZNetworkCheck.h"
 #include "UIAgent/QZUIController.h"
 #include "tests/UIAgent/AgentTestSupport.h"
 #include "tests/support/LogCapture.h"
@@ -107,6 +108,10 @@ TEST_F(DispatchTest, RequestsWithNothingToAskAreAnsweredAtOnceWithoutAWindow) {
                {kQZUIPropertyFontProperties, Array({nameless.get()}).get()}}),
          Reply(false, true)},
         {2, Dict({{kQZUIPropertySuppress, one.get()}}), Reply(false, true)},
+        // Regression: not to be asked, with no font that a catalog offers or that is installed,
+        // no window opened and no question was asked (offline: the network alert).
+        {2, DownloadRequest({unknownFont.get()}, 0, true), Reply(false, true)},
+        {2, DownloadRequest({}, 0, true), Reply(false, true)},
         // Message id 1 without candidates: no, with an empty candidate array.
         {1, Ref(), noWithoutCandidates},
         {1, Dict({{kQZUIPropertyFontName, font.get()}}), noWithoutCandidates},
@@ -114,8 +119,13 @@ TEST_F(DispatchTest, RequestsWithNothingToAskAreAnsweredAtOnceWithoutAWindow) {
         {1, Dict({{kQZUIPropertyCandidateFontURLs, font.get()}}), noWithoutCandidates},
     };
     WindowWatch shown;
+    QZNetworkCheck::SetFlagsSourceForTesting([](QZNetworkReachabilityFlags* flags) {
+        *flags = 0;
+        return true;
+    });
     for (const Case& c : cases)
         EXPECT_EQ(Handle(c.msgid, c.request.get()), c.reply) << c.msgid;
+    QZNetworkCheck::SetFlagsSourceForTesting(nullptr);
     EXPECT_EQ(shown.windowsShown, 0);
     EXPECT_EQ(counts_.back(), 0);
 }

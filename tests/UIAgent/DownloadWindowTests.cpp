@@ -367,23 +367,6 @@ TEST_F(DownloadRoadTest, TheErrorAlertAndTheProgressWindowElideALongFontNameAndT
     EXPECT_EQ(title, "Font Download Failed");
 }
 
-TEST_F(DownloadRoadTest, RegressionARequestWithoutFontsToHaveOpensNoWindowAndAsksNothing) {
-    // Offline: a network question would show an alert.
-    QZNetworkCheck::SetFlagsSourceForTesting([](QZNetworkReachabilityFlags* flags) {
-        *flags = 0;
-        return true;
-    });
-    Ref nameless = Dict({{NSFontFamilyAttribute, Str("DejaVu Sans Mono").get()}});
-    // Neither offered by a catalog nor installed: left out before any window.
-    Ref unknown = RequestedFont("NoSuchFont-Regular");
-    for (CFTypeRef font : {nameless.get(), unknown.get()})
-        EXPECT_EQ(HandleDownloadRequest(DownloadRequest({font}, 0, true).get()),
-                  Reply(false, true));
-    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({}, 0, true).get()), Reply(false, true));
-    EXPECT_EQ(watch_.windowsShown, 0);
-    EXPECT_TRUE(callbacks_.States().empty());
-}
-
 TEST(DownloadWindow, ByteCountsUseDecimalUnitsWithPrecisionGrowingWithTheUnit) {
     EnglishTexts english;
     const std::pair<qint64, const char*> cases[] = {

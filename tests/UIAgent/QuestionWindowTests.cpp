@@ -240,30 +240,6 @@ TEST(AutoActivationAccessibility, CountdownIsAStatusAnnouncedAtMarksAndActionsRe
     EXPECT_TRUE(confirmation.suppressFurtherAlerts());
 }
 
-TEST(AutoActivationAccessibility, TabGoesThroughTheTextsTheCheckboxThenTheButtons) {
-    EnglishTexts english;
-    Ref request = Dict({{kQZUIPropertyApplicationName, Str("Example Writer").get()}});
-    QZAutoActivationConfirmation confirmation(request.as<CFDictionaryRef>());
-    QStringList order;
-    UiScript script({{[&] { return confirmation.alert()->isVisible(); },
-                      [&] {
-                          QWidget* start = confirmation.alert();
-                          for (QWidget* w = start->nextInFocusChain(); w != start;
-                               w = w->nextInFocusChain())
-                              if (w->isVisible() && (w->focusPolicy() & Qt::TabFocus))
-                                  order << (qobject_cast<QAbstractButton*>(w)
-                                                ? static_cast<QAbstractButton*>(w)->text()
-                                                : w->objectName());
-                          confirmation.withdraw();
-                      }}},
-                    [&] { confirmation.withdraw(); });
-    confirmation.showAlert();
-    EXPECT_EQ(order, QStringList({"qt_msgbox_label", "qt_msgbox_informativelabel",
-                                  "Don’t ask again for Example Writer", "Allow",
-                                  "Show in File Manager", "Don’t Allow", "Help"}))
-        << order.join(" | ").toStdString();
-}
-
 TEST(QuestionWindows, LongNamesAreElidedWithTheFullTextsToldAndDoNotWidenThem) {
     EnglishTexts english;
     PrivateDataHome data;
