@@ -150,10 +150,21 @@ private:
     InstalledTable table_{QStringLiteral("en")};
 };
 
+/// For a script's give-up: ends the innermost modal run every 50 ms from now on, until the
+/// application goes, so that a stalled test fails instead of hanging.
+inline void EndEveryModalRun() {
+    auto* timer = new QTimer(QCoreApplication::instance());
+    QObject::connect(timer, &QTimer::timeout, [] {
+        if (QZModalSession* session = QZModalSession::Innermost())
+            session->End(kQZModalResponseAbort);
+    });
+    timer->start(50);
+}
+
 /// Steps carried out from the event loop, in order: each one's action runs once its condition
 /// holds (polled every 10 ms). Meant to answer an alert while its modal run blocks the test.
-/// When the steps are not all done after `patience`, `giveUp` runs (to end the alert) and the
-/// test fails.
+/// When the steps are not all done after `patience`, `giveUp` runs (to end the alert; by default
+/// every modal run) and the test fails.
 class UiScript {
 public:
     struct Step {
@@ -161,8 +172,8 @@ public:
         std::function<void()> action;
     };
 
-    UiScript(std::vector<Step> steps, std::function<void()> giveUp,
-             std::chrono::milliseconds patience = std::chrono::seconds(20))
+    explicit UiScript(std::vector<Step> steps, std::function<void()> giveUp = EndEveryModalRun,
+                      std::chrono::milliseconds patience = std::chrono::seconds(20))
         : steps_(std::move(steps)) {
         QObject::connect(&poll_, &QTimer::timeout, [this] {
             if (next_ < steps_.size() && steps_[next_].when())
@@ -184,17 +195,6 @@ private:
     QTimer poll_;
     QTimer failsafe_;
 };
-
-/// For a script's give-up: ends the innermost modal run every 50 ms from now on, until the
-/// application goes, so that a stalled test fails instead of hanging.
-inline void EndEveryModalRun() {
-    auto* timer = new QTimer(QCoreApplication::instance());
-    QObject::connect(timer, &QTimer::timeout, [] {
-        if (QZModalSession* session = QZModalSession::Innermost())
-            session->End(kQZModalResponseAbort);
-    });
-    timer->start(50);
-}
 
 /// The alert that is up and innermost, or null.
 inline QMessageBox* AlertOnScreen() {
@@ -314,11 +314,15 @@ inline Ref DownloadRequest(std::initializer_list<CFTypeRef> fonts, SInt32 pid = 
                  {kQZUIPropertySuppress, suppress ? kCFBooleanTrue : kCFBooleanFalse}});
 }
 
-/// Sends `request` to the dispatcher as message id 2, flattened as a client sends it; returns
-/// the reply bytes in hex.
-inline std::string HandleDownloadRequest(CFTypeRef request) {
-    Ref reply(QZUIAgentHandleMessage(nullptr, 2, Flattened(request).as<CFDataRef>(), nullptr));
+/// Sends `request` (flattened as a client sends it; null: no bytes) to the dispatcher of
+/// `controller` as message `msgid`; returns the reply bytes in hex.
+inline std::string HandleRequest(SInt32 msgid, CFTypeRef request, void* controller = nullptr) {
+    Ref bytes = request ? Flattened(request) : Ref();
+    Ref reply(QZUIAgentHandleMessage(nullptr, msgid, bytes.as<CFDataRef>(), controller));
     return ToHex(reply.as<CFDataRef>());
+}
+inline std::string HandleDownloadRequest(CFTypeRef request) {
+    return HandleRequest(2, request);
 }
 
 /// The progress window while it is shown, else null.

@@ -63,8 +63,7 @@ TEST_F(AutoActivationTest, SetsUpTextsTheFontSampleButtonsAndTheCheckboxInTabOrd
                                                 ? static_cast<QAbstractButton*>(w)->text()
                                                 : w->objectName());
                           confirmation.withdraw();
-                      }}},
-                    [&] { confirmation.withdraw(); });
+                      }}});
     confirmation.showAlert();
     EXPECT_EQ(order, QStringList({"qt_msgbox_label", "qt_msgbox_informativelabel",
                                   "Don’t ask again for Example Writer", "Allow",
@@ -91,8 +90,7 @@ TEST_F(AutoActivationTest, ShowInFileManagerRevealsEachTimeAndTheTickedCheckboxS
          Click(confirmation, 2002, received(2)),
          {received(4),
           [&] { QTest::mouseClick(confirmation.suppressionCheckBox(), Qt::LeftButton); }},
-         Click(confirmation, 2001)},
-        [&] { confirmation.withdraw(); });
+         Click(confirmation, 2001)});
     confirmation.showAlert();
 
     EXPECT_FALSE(confirmation.shouldActivate());
@@ -119,8 +117,7 @@ TEST_F(AutoActivationTest, InputRestartsTheTimeoutWhichAnswersNoWithTheCheckboxA
                           before = confirmation.remainingTime();
                           QTest::keyClick(confirmation.alert(), Qt::Key_Shift);
                           after = confirmation.remainingTime();
-                      }}},
-                    [&] { confirmation.withdraw(); });
+                      }}});
     confirmation.showAlert();
     EXPECT_GT(after, before);
     EXPECT_FALSE(confirmation.shouldActivate());
@@ -132,7 +129,7 @@ TEST_F(AutoActivationTest, RegressionTimeoutOfAnAnsweredAlertNeverEndsALaterOne)
     Confirmation first(Request().as<CFDictionaryRef>());
     first.setTimeout(300ms);
     // Shown again after the reveal, the alert still answers with its button.
-    UiScript script({Click(first, 2002), Click(first, 2000)}, [&] { first.withdraw(); });
+    UiScript script({Click(first, 2002), Click(first, 2000)});
     first.showAlert();
     ASSERT_TRUE(first.shouldActivate());
 
@@ -164,8 +161,7 @@ TEST_F(AutoActivationTest, WithdrawEndsItsOwnAlertEvenBelowANestedOne) {
                           outerHidden = !outer.alert()->isVisible();
                           innerUp = inner.alert()->isVisible();
                           inner.buttonWithTag(2000)->click();
-                      }}},
-                    EndEveryModalRun);
+                      }}});
     outer.showAlert();
     returned.push_back("outer");
 

@@ -43,12 +43,8 @@ protected:
         });
     }
 
-    /// Handles `request` (a value to flatten, or null for no bytes) as message `msgid`; returns
-    /// the reply in hex.
     std::string Handle(SInt32 msgid, CFTypeRef request) {
-        Ref bytes = request ? Flattened(request) : Ref();
-        Ref reply(QZUIAgentHandleMessage(nullptr, msgid, bytes.as<CFDataRef>(), &controller_));
-        return ToHex(reply.as<CFDataRef>());
+        return HandleRequest(msgid, request, &controller_);
     }
 
     /// A message id 1 request naming the DejaVu Sans file as its one candidate.

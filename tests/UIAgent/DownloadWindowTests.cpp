@@ -188,8 +188,7 @@ TEST_F(DownloadRoadTest, AnAgreedDownloadIsInstalledAndAnsweredYesCancelStopsAnd
                                   afterCancel = Look(window);
                               }
                               callbacks_.Release();
-                          }}},
-                        EndEveryModalRun);
+                          }}});
 
         EXPECT_EQ(HandleDownloadRequest(DownloadRequest({mono_.get()}).get()),
                   Reply(!c.cancel, false));
@@ -267,8 +266,7 @@ TEST_F(DownloadRoadTest, AFailureGoesOnToTheNextFontOrEndsWithNoWhenCancelledOrC
                   look = alert->informativeText() + " | " + alert->defaultButton()->text() + " | " +
                          alert->escapeButton()->text();
                   c.button ? ClickButton(alert, c.button) : void(alert->close());
-              }}},
-            EndEveryModalRun);
+              }}});
 
         EXPECT_EQ(HandleDownloadRequest(DownloadRequest({bold.get(), mono.get()}, 0, true).get()),
                   Reply(c.button && !strcmp(c.button, "Continue Download"), true));
@@ -315,8 +313,7 @@ TEST_F(DownloadRoadTest, RegressionTheRequestingProcessExitEndsTheWindowsOwnRunN
                           otherUpWhenWindowWent = other && other->isVisible();
                           otherSession->End(kQZModalResponseStop);
                           callbacks_.Release();
-                      }}},
-                    EndEveryModalRun);
+                      }}});
 
     EXPECT_EQ(HandleDownloadRequest(DownloadRequest({mono_.get()}, requester.pid()).get()),
               Reply(false, false));
@@ -351,8 +348,7 @@ TEST_F(DownloadRoadTest, TheErrorAlertAndTheProgressWindowElideALongFontNameAndT
                   EXPECT_TRUE(labels[labelName]->toolTip().contains(name));
               }
               ClickButton(AlertOnScreen(), "Cancel");
-          }}},
-        EndEveryModalRun);
+          }}});
     EXPECT_EQ(HandleDownloadRequest(DownloadRequest({font.get()}, 0, true).get()),
               Reply(false, true));
     EXPECT_TRUE(script.done());

@@ -116,8 +116,8 @@ bool InjectOffline(QZNetworkReachabilityFlags* flags) {
     return true;
 }
 
-/// Shows each question window, checks it while it is up, and ends it.
-TEST(QuestionWindows, HaveATitleAFixedSizeTheDialogTypeAndGuardedButtons) {
+/// Shows each question window, checks it while it is up, and ends it; then the progress window.
+TEST(AgentWindows, HaveATitleAFixedSizeTheDialogTypeAndGuardedButtonsOrANamedProgressBar) {
     EnglishTexts english;
     GuardDuration guard(60s);
     Ref request = Dict({{kQZUIPropertyApplicationName, Str("Example Writer").get()},
@@ -160,17 +160,14 @@ TEST(QuestionWindows, HaveATitleAFixedSizeTheDialogTypeAndGuardedButtons) {
         EXPECT_TRUE(seen);
     }
     QZNetworkCheck::SetFlagsSourceForTesting(nullptr);
-}
 
-TEST(ProgressWindow, HasATitleAFixedSizeTheDialogTypeAndANamedProgressBar) {
-    EnglishTexts english;
-    FontDownloadWindowController controller(Array({}).as<CFArrayRef>());
-    QDialog* window = controller.window();
+    FontDownloadWindowController progress(Array({}).as<CFArrayRef>());
+    QDialog* window = progress.window();
     EXPECT_EQ(window->windowTitle(), "Font Download");
     EXPECT_EQ(window->windowType(), Qt::Dialog);
     EXPECT_EQ(window->minimumSize(), window->maximumSize());
     EXPECT_GE(window->width(), 440);
-    EXPECT_EQ(controller.progressIndicator()->accessibleName(), "Download progress");
+    EXPECT_EQ(progress.progressIndicator()->accessibleName(), "Download progress");
 }
 
 TEST(AutoActivationAccessibility, CountdownIsAStatusAnnouncedAtMarksAndActionsRestartTheTimeout) {
@@ -233,8 +230,7 @@ TEST(AutoActivationAccessibility, CountdownIsAStatusAnnouncedAtMarksAndActionsRe
               EXPECT_EQ(help->minimumSize(), help->maximumSize());
               EXPECT_EQ(QAccessible::queryAccessibleInterface(help)->role(), QAccessible::Document);
               confirmation.withdraw();
-          }}},
-        [&] { confirmation.withdraw(); });
+          }}});
     confirmation.showAlert();
     EXPECT_TRUE(script.done());
     EXPECT_TRUE(confirmation.suppressFurtherAlerts());
