@@ -52,7 +52,6 @@ private:
     QZQtRunLoopDriver driver_;
 };
 
-/// The flattened bytes of `value`, as a request carries them.
 inline Ref Flattened(CFTypeRef value) {
     const std::vector<uint8_t> bytes = FlattenedBytes(value);
     return Ref(CFDataCreate(nullptr, bytes.data(), CFIndex(bytes.size())));
@@ -196,7 +195,6 @@ private:
     QTimer failsafe_;
 };
 
-/// The alert that is up and innermost, or null.
 inline QMessageBox* AlertOnScreen() {
     return qobject_cast<QMessageBox*>(QApplication::activeModalWidget());
 }
@@ -227,13 +225,11 @@ inline UiScript::Step PressWhenUp(const char* key) {
             [key] { ClickButton(AlertOnScreen(), key); }};
 }
 
-/// A file URL for `path`.
 inline Ref FileURL(const QString& path) {
     return Ref(CFURLCreateWithFileSystemPath(nullptr, Str(path.toStdString()).as<CFStringRef>(),
                                              kCFURLPOSIXPathStyle, false));
 }
 
-/// Creates the file `path` with `contents`; returns the path.
 inline QString WriteFile(const QString& path, const QByteArray& contents = QByteArray()) {
     QFile file(path);
     EXPECT_TRUE(file.open(QIODevice::WriteOnly)) << path.toStdString();
@@ -325,7 +321,6 @@ inline std::string HandleDownloadRequest(CFTypeRef request) {
     return HandleRequest(2, request);
 }
 
-/// The progress window while it is shown, else null.
 inline QDialog* ProgressWindowOnScreen() {
     for (QWidget* widget : QApplication::topLevelWidgets())
         if (widget->objectName() == QLatin1String("FontDownloadWindow") && widget->isVisible())

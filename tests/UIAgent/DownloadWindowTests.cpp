@@ -38,10 +38,10 @@ public:
             states_.push_back(state);
             if (int(state) != holdAt_ || released_)
                 return;
-            holding_ = true;
+            holding = true;
             changed_.wait_for(lock, 20s, [this] { return released_; });
             released_ = true; // held once, also when nobody came
-            holding_ = false;
+            holding = false;
         };
     }
     /// Forgets the states seen; holds the worker at the first callback of `holdAt` (-1: nowhere).
@@ -51,15 +51,9 @@ public:
         holdAt_ = holdAt;
         released_ = false;
     }
-    bool Holding() const {
-        std::lock_guard<std::mutex> lock(mutex_);
-        return holding_;
-    }
     void Release() {
-        {
-            std::lock_guard<std::mutex> lock(mutex_);
-            released_ = true;
-        }
+        std::lock_guard<std::mutex> lock(mutex_);
+        released_ = true;
         changed_.notify_all();
     }
     /// The states in order, runs of state 5 folded into one.
@@ -77,8 +71,10 @@ private:
     std::condition_variable changed_;
     std::vector<uint32_t> states_;
     int holdAt_ = -1;
-    bool holding_ = false;
     bool released_ = false;
+
+public:
+    std::atomic<bool> holding{false}; ///< the worker waits at the held state
 };
 
 /// What the progress window shows: "status | size line | value/maximum | timer | on top".
@@ -179,7 +175,7 @@ TEST_F(DownloadRoadTest, AnAgreedDownloadIsInstalledAndAnsweredYesCancelStopsAnd
         WindowWatch watch;
         std::string whileDownloading, afterCancel;
         UiScript script({PressWhenUp("Download"),
-                         {[this] { return callbacks_.Holding(); },
+                         {[this] { return callbacks_.holding.load(); },
                           [&] {
                               QDialog* window = ProgressWindowOnScreen();
                               whileDownloading = Look(window);
@@ -295,7 +291,7 @@ TEST_F(DownloadRoadTest, RegressionTheRequestingProcessExitEndsTheWindowsOwnRunN
     QZModalSession* otherSession = nullptr;
     bool otherUpWhenWindowWent = false;
     UiScript script({PressWhenUp("Download"),
-                     {[this] { return callbacks_.Holding() && ProgressWindowOnScreen(); },
+                     {[this] { return callbacks_.holding.load() && ProgressWindowOnScreen(); },
                       [&] {
                           QTimer::singleShot(0, [&] {
                               QMessageBox box;
