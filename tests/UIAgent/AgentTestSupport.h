@@ -52,7 +52,6 @@ private:
     QZQtRunLoopDriver driver_;
 };
 
-/// The flattened bytes of `value`, as a request carries them.
 inline Ref Flattened(CFTypeRef value) {
     const std::vector<uint8_t> bytes = FlattenedBytes(value);
     return Ref(CFDataCreate(nullptr, bytes.data(), CFIndex(bytes.size())));
@@ -150,10 +149,21 @@ private:
     InstalledTable table_{QStringLiteral("en")};
 };
 
+/// For a script's give-up: ends the innermost modal run every 50 ms from now on, until the
+/// application goes, so that a stalled test fails instead of hanging.
+inline void EndEveryModalRun() {
+    auto* timer = new QTimer(QCoreApplication::instance());
+    QObject::connect(timer, &QTimer::timeout, [] {
+        if (QZModalSession* session = QZModalSession::Innermost())
+            session->End(kQZModalResponseAbort);
+    });
+    timer->start(50);
+}
+
 /// Steps carried out from the event loop, in order: each one's action runs once its condition
 /// holds (polled every 10 ms). Meant to answer an alert while its modal run blocks the test.
-/// When the steps are not all done after `patience`, `giveUp` runs (to end the alert) and the
-/// test fails.
+/// When the steps are not all done after `patience`, `giveUp` runs (to end the alert; by default
+/// every modal run) and the test fails.
 class UiScript {
 public:
     struct Step {
@@ -161,8 +171,8 @@ public:
         std::function<void()> action;
     };
 
-    UiScript(std::vector<Step> steps, std::function<void()> giveUp,
-             std::chrono::milliseconds patience = std::chrono::seconds(20))
+    explicit UiScript(std::vector<Step> steps, std::function<void()> giveUp = EndEveryModalRun,
+                      std::chrono::milliseconds patience = std::chrono::seconds(20))
         : steps_(std::move(steps)) {
         QObject::connect(&poll_, &QTimer::timeout, [this] {
             if (next_ < steps_.size() && steps_[next_].when())
@@ -185,18 +195,6 @@ private:
     QTimer failsafe_;
 };
 
-/// For a script's give-up: ends the innermost modal run every 50 ms from now on, until the
-/// application goes, so that a stalled test fails instead of hanging.
-inline void EndEveryModalRun() {
-    auto* timer = new QTimer(QCoreApplication::instance());
-    QObject::connect(timer, &QTimer::timeout, [] {
-        if (QZModalSession* session = QZModalSession::Innermost())
-            session->End(kQZModalResponseAbort);
-    });
-    timer->start(50);
-}
-
-/// The alert that is up and innermost, or null.
 inline QMessageBox* AlertOnScreen() {
     return qobject_cast<QMessageBox*>(QApplication::activeModalWidget());
 }
@@ -227,13 +225,11 @@ inline UiScript::Step PressWhenUp(const char* key) {
             [key] { ClickButton(AlertOnScreen(), key); }};
 }
 
-/// A file URL for `path`.
 inline Ref FileURL(const QString& path) {
     return Ref(CFURLCreateWithFileSystemPath(nullptr, Str(path.toStdString()).as<CFStringRef>(),
                                              kCFURLPOSIXPathStyle, false));
 }
 
-/// Creates the file `path` with `contents`; returns the path.
 inline QString WriteFile(const QString& path, const QByteArray& contents = QByteArray()) {
     QFile file(path);
     EXPECT_TRUE(file.open(QIODevice::WriteOnly)) << path.toStdString();
@@ -314,14 +310,17 @@ inline Ref DownloadRequest(std::initializer_list<CFTypeRef> fonts, SInt32 pid = 
                  {kQZUIPropertySuppress, suppress ? kCFBooleanTrue : kCFBooleanFalse}});
 }
 
-/// Sends `request` to the dispatcher as message id 2, flattened as a client sends it; returns
-/// the reply bytes in hex.
-inline std::string HandleDownloadRequest(CFTypeRef request) {
-    Ref reply(QZUIAgentHandleMessage(nullptr, 2, Flattened(request).as<CFDataRef>(), nullptr));
+/// Sends `request` (flattened as a client sends it; null: no bytes) to the dispatcher of
+/// `controller` as message `msgid`; returns the reply bytes in hex.
+inline std::string HandleRequest(SInt32 msgid, CFTypeRef request, void* controller = nullptr) {
+    Ref bytes = request ? Flattened(request) : Ref();
+    Ref reply(QZUIAgentHandleMessage(nullptr, msgid, bytes.as<CFDataRef>(), controller));
     return ToHex(reply.as<CFDataRef>());
 }
+inline std::string HandleDownloadRequest(CFTypeRef request) {
+    return HandleRequest(2, request);
+}
 
-/// The progress window while it is shown, else null.
 inline QDialog* ProgressWindowOnScreen() {
     for (QWidget* widget : QApplication::topLevelWidgets())
         if (widget->objectName() == QLatin1String("FontDownloadWindow") && widget->isVisible())

@@ -112,22 +112,23 @@ TEST_F(ControllerTest, ATakenNameIsLoggedAndTheAgentRunsOnWithoutAPort) {
 
 TEST_F(ControllerTest, TheIdleTimerIsArmedAndTerminationAnsweredNowOnlyWhenTheCountIsZero) {
     controller_->applicationWillFinishLaunching();
-    EXPECT_EQ(controller_->terminateTimer(), nullptr);
-    EXPECT_EQ(controller_->applicationShouldTerminate(), QZUIController::kTerminateNow);
-    controller_->setAlertCount(1);
-    EXPECT_EQ(controller_->terminateTimer(), nullptr);
-    EXPECT_EQ(controller_->applicationShouldTerminate(), QZUIController::kTerminateLater);
-    controller_->setAlertCount(2);
-    controller_->setAlertCount(1);
-    EXPECT_EQ(controller_->terminateTimer(), nullptr);
-    controller_->setAlertCount(0);
-    ASSERT_NE(controller_->terminateTimer(), nullptr);
-    EXPECT_TRUE(controller_->terminateTimer()->isActive());
-    EXPECT_TRUE(controller_->terminateTimer()->isSingleShot());
-    EXPECT_EQ(controller_->terminateTimer()->interval(), 300);
-    EXPECT_EQ(controller_->applicationShouldTerminate(), QZUIController::kTerminateNow);
-    controller_->setAlertCount(1);
-    EXPECT_EQ(controller_->terminateTimer(), nullptr);
+    // After launch and after each count: the idle timer, and the answer to a termination request.
+    auto state = [this] {
+        const QTimer* timer = controller_->terminateTimer();
+        const bool now = controller_->applicationShouldTerminate() == QZUIController::kTerminateNow;
+        return (timer ? "timer " + std::to_string(timer->interval()) +
+                            (timer->isActive() && timer->isSingleShot() ? " once" : "")
+                      : std::string("no timer")) +
+               (now ? ", now" : ", later");
+    };
+    std::vector<std::string> states{state()};
+    for (qint64 count : {1, 2, 1, 0, 1}) {
+        controller_->setAlertCount(count);
+        states.push_back(state());
+    }
+    EXPECT_EQ(states, (std::vector<std::string>{"no timer, now", "no timer, later",
+                                                "no timer, later", "no timer, later",
+                                                "timer 300 once, now", "no timer, later"}));
     EXPECT_EQ(counts_, (std::vector<qint64>{1, 2, 1, 0, 1}));
 }
 

@@ -3,6 +3,7 @@
 #include <QCheckBox>
 #include <QPointer>
 
+#include "UIAgent/QZNetworkCheck.h"
 #include "UIAgent/QZUIController.h"
 #include "tests/UIAgent/AgentTestSupport.h"
 #include "tests/support/LogCapture.h"
@@ -42,12 +43,8 @@ protected:
         });
     }
 
-    /// Handles `request` (a value to flatten, or null for no bytes) as message `msgid`; returns
-    /// the reply in hex.
     std::string Handle(SInt32 msgid, CFTypeRef request) {
-        Ref bytes = request ? Flattened(request) : Ref();
-        Ref reply(QZUIAgentHandleMessage(nullptr, msgid, bytes.as<CFDataRef>(), &controller_));
-        return ToHex(reply.as<CFDataRef>());
+        return HandleRequest(msgid, request, &controller_);
     }
 
     /// A message id 1 request naming the DejaVu Sans file as its one candidate.
@@ -107,6 +104,10 @@ TEST_F(DispatchTest, RequestsWithNothingToAskAreAnsweredAtOnceWithoutAWindow) {
                {kQZUIPropertyFontProperties, Array({nameless.get()}).get()}}),
          Reply(false, true)},
         {2, Dict({{kQZUIPropertySuppress, one.get()}}), Reply(false, true)},
+        // Regression: not to be asked, with no font that a catalog offers or that is installed,
+        // no window opened and no question was asked (offline: the network alert).
+        {2, DownloadRequest({unknownFont.get()}, 0, true), Reply(false, true)},
+        {2, DownloadRequest({}, 0, true), Reply(false, true)},
         // Message id 1 without candidates: no, with an empty candidate array.
         {1, Ref(), noWithoutCandidates},
         {1, Dict({{kQZUIPropertyFontName, font.get()}}), noWithoutCandidates},
@@ -114,8 +115,21 @@ TEST_F(DispatchTest, RequestsWithNothingToAskAreAnsweredAtOnceWithoutAWindow) {
         {1, Dict({{kQZUIPropertyCandidateFontURLs, font.get()}}), noWithoutCandidates},
     };
     WindowWatch shown;
+    // A question that comes up all the same is closed (and counted), so that the test fails
+    // instead of waiting for an answer.
+    QTimer closer;
+    QObject::connect(&closer, &QTimer::timeout, [] {
+        if (QMessageBox* alert = AlertOnScreen())
+            alert->close();
+    });
+    closer.start(50);
+    QZNetworkCheck::SetFlagsSourceForTesting([](QZNetworkReachabilityFlags* flags) {
+        *flags = 0;
+        return true;
+    });
     for (const Case& c : cases)
         EXPECT_EQ(Handle(c.msgid, c.request.get()), c.reply) << c.msgid;
+    QZNetworkCheck::SetFlagsSourceForTesting(nullptr);
     EXPECT_EQ(shown.windowsShown, 0);
     EXPECT_EQ(counts_.back(), 0);
 }

@@ -47,8 +47,7 @@ TEST_F(DownloadConfirmationTest, DownloadAnswersYesAndReturnOrEscapePressesTheDe
         Confirmation alert(DownloadRequest({regular_.get()}).as<CFDictionaryRef>());
         EXPECT_EQ(alert.buttons().size(), 2);
         EXPECT_EQ(alert.defaultButton(), alert.buttonWithTag(2001));
-        UiScript script({{[&] { return alert.isVisible(); }, [&] { answer(alert); }}},
-                        [&] { alert.withdraw(); });
+        UiScript script({{[&] { return alert.isVisible(); }, [&] { answer(alert); }}});
         alert.showAlert();
         EXPECT_EQ(alert.clickedButton(), alert.buttonWithTag(tag));
         EXPECT_EQ(alert.shouldDownload(), tag == 2000);
@@ -79,8 +78,7 @@ TEST_F(DownloadConfirmationTest, RegressionOnlyTheRequestersExitEndsItsAlertEven
                       [&] {
                           innerUp = inner.isVisible();
                           inner.buttonWithTag(2000)->click();
-                      }}},
-                    EndEveryModalRun);
+                      }}});
     outer.showAlert();
 
     EXPECT_TRUE(script.done());

@@ -113,8 +113,7 @@ TEST_F(NetworkCheckTest, TheCriticalOfflineAlertStopsOnlyOnCancelOrCloseAndRaise
                               activationsWhileAsked = int(std::count(
                                   watch.activated.begin(), watch.activated.end(), &other));
                               c.answer(check);
-                          }}},
-                        EndEveryModalRun);
+                          }}});
         EXPECT_EQ(check.continueDownload(), c.goOn);
         EXPECT_TRUE(script.done());
         EXPECT_EQ(look, "You are not connected to the Internet. Do you want to cancel "
@@ -123,7 +122,7 @@ TEST_F(NetworkCheckTest, TheCriticalOfflineAlertStopsOnlyOnCancelOrCloseAndRaise
         EXPECT_EQ(activationsWhileAsked, 0);
     }
     // The class operation of the download window asks the same question.
-    UiScript again({AnswerOfflineAlert("Cancel")}, EndEveryModalRun);
+    UiScript again({AnswerOfflineAlert("Cancel")});
     EXPECT_FALSE(FontDownloadWindowController::continueDownloadWithNetworkReachabilityCheck());
 }
 
@@ -132,8 +131,7 @@ TEST_F(NetworkCheckTest, OfflineCancelAnswersNoAndContinueRunsTheDownloadWindow)
     Ref font = RequestedFont("DejaVuSans");
     for (const bool goOn : {false, true}) {
         WindowWatch shown;
-        UiScript script({AnswerOfflineAlert(goOn ? "Continue Download" : "Cancel")},
-                        EndEveryModalRun);
+        UiScript script({AnswerOfflineAlert(goOn ? "Continue Download" : "Cancel")});
         EXPECT_EQ(HandleDownloadRequest(DownloadRequest({font.get()}, 0, true).get()),
                   Reply(goOn, true));
         EXPECT_TRUE(script.done());
@@ -150,8 +148,7 @@ TEST_F(NetworkCheckTest, TheRequestingApplicationQuittingEndsTheOfflineAlertAndN
     WindowWatch shown;
     Ref font = RequestedFont("Example-Regular");
     UiScript script({PressWhenUp("Download"),
-                     {[] { return AlertWithText(kOfflineHeadline); }, [&] { requester.Kill(); }}},
-                    EndEveryModalRun);
+                     {[] { return AlertWithText(kOfflineHeadline); }, [&] { requester.Kill(); }}});
     EXPECT_EQ(HandleDownloadRequest(DownloadRequest({font.get()}, requester.pid()).get()),
               Reply(false, false));
     EXPECT_TRUE(script.done());

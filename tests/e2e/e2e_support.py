@@ -1,7 +1,5 @@
-"""Shared pieces of the agent's end-to-end runs: a private work directory whose processes are
-always stopped, waits on conditions with deadlines, a loopback font server that holds its transfer
-until the test releases it, a catalog with a private font setup, a private X server, and the agent
-and the glyphwell tool started in that setup."""
+"""Shared pieces of the agent's end-to-end runs: a private setup whose processes are always
+stopped, waits with deadlines, a font server holding its transfer, and a private X server."""
 import hashlib
 import http.server
 import json
@@ -40,10 +38,8 @@ def check(condition, failure):
 
 
 def require(*programs):
-    """Skips unless every one of `programs` is installed."""
-    for program in programs:
-        if not shutil.which(program):
-            skip(f"{program} is not installed (scripts/install-deps installs it)")
+    for program in (p for p in programs if not shutil.which(p)):
+        skip(f"{program} is not installed (scripts/install-deps installs it)")
 
 
 def skip(reason):
@@ -67,7 +63,7 @@ class FontServer:
 
     def __init__(self, path):
         with open(path, "rb") as f:
-            body = f.read()
+            self.body = body = f.read()
         self.name = os.path.basename(path)
         self.started, self.released = threading.Event(), threading.Event()
         server = self
@@ -109,22 +105,17 @@ class Run:
     process started through it is stopped on exit, and its logs are printed when the run fails."""
 
     def __init__(self, name):
-        self.dir = tempfile.mkdtemp(prefix=f"glyphwell-{name}-")
-        os.chmod(self.dir, 0o700)
-        self.runtime = self.path("runtime")
-        os.makedirs(self.runtime, mode=0o700)
-        for folder in ("home", "cache", "config", "data/glyphwell"):
-            os.makedirs(self.path(folder))
-        self.processes, self.server = [], None
-        self.env = dict(os.environ)
-        for variable in ("http_proxy", "HTTP_PROXY", "all_proxy", "ALL_PROXY"):
-            self.env.pop(variable, None)
-        self.env.update(
-            XDG_RUNTIME_DIR=self.runtime, XDG_DATA_HOME=self.path("home"),
-            XDG_CACHE_HOME=self.path("cache"), XDG_CONFIG_HOME=self.path("config"),
-            XDG_DATA_DIRS=self.path("data") + ":/usr/local/share:/usr/share",
-            FONTCONFIG_FILE=self.path("fonts.conf"), LANGUAGE="en", LC_ALL="C.UTF-8",
-            no_proxy="127.0.0.1")
+        self.dir = tempfile.mkdtemp(prefix=f"glyphwell-{name}-")  # private to its owner
+        for folder in ("runtime", "home", "cache", "config", "data/glyphwell"):
+            os.makedirs(self.path(folder), mode=0o700)
+        self.runtime, self.processes, self.server = self.path("runtime"), [], None
+        self.env = {name: value for name, value in os.environ.items()
+                    if name not in ("http_proxy", "HTTP_PROXY", "all_proxy", "ALL_PROXY")}
+        self.env.update(XDG_RUNTIME_DIR=self.runtime, XDG_DATA_HOME=self.path("home"),
+                        XDG_CACHE_HOME=self.path("cache"), XDG_CONFIG_HOME=self.path("config"),
+                        XDG_DATA_DIRS=self.path("data") + ":/usr/local/share:/usr/share",
+                        FONTCONFIG_FILE=self.path("fonts.conf"), LANGUAGE="en",
+                        LC_ALL="C.UTF-8", no_proxy="127.0.0.1")
         with open(self.path("fonts.conf"), "w") as f:
             f.write('<?xml version="1.0"?>\n<!DOCTYPE fontconfig SYSTEM "fonts.dtd">\n'
                     '<fontconfig><include ignore_missing="yes">/etc/fonts/fonts.conf</include>\n'
@@ -142,11 +133,10 @@ class Run:
             stop(process)
         if self.server:
             self.server.close()
-        if error is not None:
-            for name in sorted(os.listdir(self.dir)):
-                if name.endswith(".log") and os.path.getsize(self.path(name)):
-                    print(f"--- {name} (last 60 lines):", file=sys.stderr)
-                    print("\n".join(self.read(name).splitlines()[-60:]), file=sys.stderr)
+        for name in sorted(os.listdir(self.dir)) if error is not None else []:
+            if name.endswith(".log") and os.path.getsize(self.path(name)):
+                lines = self.read(name).splitlines()[-60:]
+                print(f"--- {name} (last 60 lines):", *lines, sep="\n", file=sys.stderr)
         shutil.rmtree(self.dir, ignore_errors=True)
 
     def read(self, name):
@@ -165,8 +155,7 @@ class Run:
     def serve_download_font(self):
         """Starts the font server and lists its font in the catalog, with a font it lacks."""
         self.server = FontServer(DOWNLOAD_FONT)
-        with open(DOWNLOAD_FONT, "rb") as f:
-            data = f.read()
+        data = self.server.body
         assets = [("DejaVuSerifBold", self.server.url, len(data), hashlib.sha256(data).hexdigest(),
                    DOWNLOAD_NAME, "DejaVu Serif"),
                   ("Missing", self.server.url.replace(self.server.name, "missing.ttf"), 1000,
@@ -183,14 +172,8 @@ class Run:
         in agent.log, and waits until it serves its socket."""
         env = {name: value for name, value in dict(self.env, **variables).items() if value}
         process = self.start("agent", [agent], env=env)
-        socket = os.path.join(self.runtime, PORT_NAME)
-
-        def serving():
-            if process.poll() is not None:
-                raise Failure(f"the agent exited at start with status {process.returncode}")
-            return os.path.exists(socket)
-
-        wait_for("the agent's socket", serving)
+        wait_for("the agent's socket", lambda: check_running(process, "at start") or
+                 os.path.exists(os.path.join(self.runtime, PORT_NAME)))
         return process
 
     def ask(self, tool, name, *arguments):
@@ -208,7 +191,7 @@ class Run:
         try:
             status = process.wait(timeout)
         except subprocess.TimeoutExpired:
-            raise Failure(f"no reply to the {name} request within {timeout} s")
+            raise Failure(f"no reply to the {name} request within {timeout} s") from None
         check(status == 0, f"the {name} request failed ({status}): {self.read(name + '.err')}")
         text = self.read(name + ".reply")
         print(f"{name} reply: {text.strip()}")
@@ -216,10 +199,9 @@ class Run:
                      for key in ("QZUIPropertyResult", "QZUIPropertySuppress"))
 
 
-def check_running(process):
+def check_running(process, when="after its replies"):
     """Fails when the agent ended (it must outlive its replies by 10 s)."""
-    check(process.poll() is None,
-          f"the agent ended with status {process.returncode} after its replies")
+    check(process.poll() is None, f"the agent ended with status {process.returncode} {when}")
 
 
 def stop(process, grace=3.0):

@@ -1,11 +1,8 @@
 #!/usr/bin/python3
-"""End-to-end: the agent on a private headless weston (no X display). The client side of the
-protocol (WAYLAND_DEBUG) must show each window mapped as an xdg toplevel with a title of its own
-(not the program's name nor an untranslated key), the agent's application id, a fixed size and a
-buffer. Both questions are withdrawn (their client killed): the alert goes, the next request is
-served. A download that asks nothing shows the progress window and replies Result 1 once the held
-transfer is released; a font whose file is missing brings the error alert, withdrawn in turn.
-Skipped (77) without weston.
+"""End-to-end: the agent on a private headless weston. Its protocol log (WAYLAND_DEBUG) must show
+each window as a mapped xdg toplevel with a title of its own, the agent's application id and a
+fixed size: both alerts, withdrawn by killing their client; the progress window of an unasked
+download (Result 1); the error alert of a missing font. Skipped (77) without weston.
 
 usage: wayland-windows.py AGENT GLYPHWELL"""
 import os
@@ -21,53 +18,37 @@ REQUEST = re.compile(r"-> (\w+)@(\d+)\.(\w+)\((.*)\)\s*$")
 NEW_ID = re.compile(r"new id (\w+)@(\d+)")
 
 
-class ProtocolLog:
-    """The xdg toplevels that a WAYLAND_DEBUG=client log shows the client creating, in order,
-    read as the log grows: title, application id, minimum and maximum size, whether a buffer was
-    attached to its surface while it lived, and whether it was destroyed."""
-
-    def __init__(self, path):
-        self.path, self.lines_read = path, 0
-        self.shell_surfaces = {}  # xdg_surface id -> wl_surface id
-        self.live = {}  # xdg_toplevel id -> its record
-        self.on_surface = {}  # wl_surface id -> the record of the toplevel living on it
-        self.toplevels = []
-
-    def update(self):
-        """Reads the lines added since the last call; returns every toplevel so far."""
-        with open(self.path, encoding="utf-8", errors="replace") as log:
-            lines = log.read().split("\n")[:-1]  # the last piece may be a partial line
-        for line in lines[self.lines_read:]:
-            match = REQUEST.search(line)
-            if match:
-                self.request(*match.groups())
-        self.lines_read = len(lines)
-        return self.toplevels
-
-    def request(self, interface, object_id, request, arguments):
+def toplevels(path):
+    """The xdg toplevels that a WAYLAND_DEBUG=client log shows the client creating, in order: title,
+    application id, minimum and maximum size, whether a buffer was attached to its surface while it
+    lived, and whether it was destroyed."""
+    shell_surfaces, live, on_surface, found = {}, {}, {}, []  # by xdg_surface, toplevel, surface
+    with open(path, encoding="utf-8", errors="replace") as log:
+        lines = log.read().split("\n")[:-1]  # the last piece may be a partial line
+    for interface, object_id, request, arguments in (
+            match.groups() for match in map(REQUEST.search, lines) if match):
         new = NEW_ID.search(arguments)
         if interface == "xdg_wm_base" and request == "get_xdg_surface" and new:
-            surface = re.search(r"wl_surface@(\d+)", arguments).group(1)
-            self.shell_surfaces[new.group(2)] = surface
+            shell_surfaces[new.group(2)] = re.search(r"wl_surface@(\d+)", arguments).group(1)
         elif interface == "xdg_surface" and request == "get_toplevel" and new:
             record = dict(title=None, app_id=None, min=None, max=None, mapped=False,
-                          destroyed=False, surface=self.shell_surfaces.get(object_id))
-            self.live[new.group(2)] = record
-            self.on_surface[record["surface"]] = record
-            self.toplevels.append(record)
-        elif interface == "xdg_toplevel" and object_id in self.live:
-            record = self.live[object_id]
+                          destroyed=False, surface=shell_surfaces.get(object_id))
+            live[new.group(2)] = on_surface[record["surface"]] = record
+            found.append(record)
+        elif interface == "xdg_toplevel" and object_id in live:
+            record = live[object_id]
             if request in ("set_title", "set_app_id"):
                 record[request[4:]] = arguments[1:-1]  # the quoted string
             elif request in ("set_min_size", "set_max_size"):
                 record[request[4:7]] = tuple(int(n) for n in arguments.split(","))
             elif request == "destroy":
                 record["destroyed"] = True
-                del self.live[object_id]
-                self.on_surface.pop(record["surface"], None)
-        elif interface == "wl_surface" and request == "attach" and object_id in self.on_surface \
+                del live[object_id]
+                on_surface.pop(record["surface"], None)
+        elif interface == "wl_surface" and request == "attach" and object_id in on_surface \
                 and not arguments.startswith("nil"):
-            self.on_surface[object_id]["mapped"] = True
+            on_surface[object_id]["mapped"] = True
+    return found
 
 
 def check_window(record, kind, title=None):
@@ -103,12 +84,10 @@ def test(agent, tool):
                                         WAYLAND_DISPLAY=socket_name, WAYLAND_DEBUG="client")
         server = run.serve_download_font()
 
-        log = ProtocolLog(run.path("agent.log"))
-
         def next_toplevel(seen, done=lambda record: record["mapped"]):
             """Waits for a toplevel beyond the first `seen` ones to satisfy `done`."""
             def ready():
-                found = log.update()
+                found = toplevels(run.path("agent.log"))
                 return len(found) > seen and done(found[seen]) and found
             return wait_for(f"window {seen + 1} to map", ready)
 

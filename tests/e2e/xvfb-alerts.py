@@ -1,8 +1,7 @@
 #!/usr/bin/python3
-"""End-to-end: both questions asked on a private X server and answered with key presses, as a user
-would. Message id 1 (may an application use a font found on disk) is answered with Return, the
-default button Allow: Result 1. Message id 2 (may fonts be downloaded) is answered with Return,
-the default button Skip: Result 0. Skipped (77) without Xvfb or xdotool.
+"""End-to-end: both questions asked on a private X server and answered with Return, as a user
+would: the default buttons Allow (message id 1, Result 1) and Skip (message id 2, Result 0).
+Skipped (77) without Xvfb or xdotool.
 
 usage: xvfb-alerts.py AGENT GLYPHWELL"""
 import os
