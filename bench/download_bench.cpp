@@ -18,7 +18,6 @@
 #include <condition_variable>
 #include <cstdlib>
 #include <filesystem>
-#include <fstream>
 #include <mutex>
 #include <random>
 #include <spawn.h>
@@ -30,21 +29,19 @@
 #include "desktop/QZSHA256.h"
 #include "platform/PropertyValues.h"
 #include "support/LoopbackHTTPServer.h"
+#include "support/PrivateFonts.h"
 
 extern char** environ;
 
 namespace {
 
 namespace fs = std::filesystem;
+using glyphwell::testing::kDejaVu;
 using glyphwell::testing::LoopbackHTTPServer;
+using glyphwell::testing::ReadFile;
+using glyphwell::testing::UsePrivateFonts;
 
 constexpr size_t kLargeAssetSize = 50'000'000;
-const fs::path kDejaVu = "/usr/share/fonts/truetype/dejavu";
-
-std::string ReadFile(const fs::path& path) {
-    std::ifstream stream(path, std::ios::binary);
-    return std::string(std::istreambuf_iterator<char>(stream), {});
-}
 
 /// One font of the ten-font catalog.
 struct SmallFont {
@@ -75,18 +72,9 @@ struct Setup {
     Setup() {
         char pattern[] = "/tmp/glyphwell-download-bench-XXXXXX";
         root = mkdtemp(pattern);
-        fs::create_directories(root / "data/fonts");
-        fs::create_directories(root / "data/glyphwell");
-        std::ofstream(root / "fonts.conf")
-            << "<?xml version=\"1.0\"?>\n<fontconfig>\n  <dir>" << (root / "data/fonts").string()
-            << "</dir>\n  <cachedir>" << (root / "cache").string()
-            << "</cachedir>\n</fontconfig>\n";
-        setenv("XDG_DATA_HOME", (root / "data").c_str(), 1);
-        setenv("XDG_DATA_DIRS", (root / "none").c_str(), 1);
-        setenv("FONTCONFIG_FILE", (root / "fonts.conf").c_str(), 1);
-        QZReloadFontConfiguration();
+        UsePrivateFonts(QString::fromStdString(root.string()));
 
-        largeBody = ReadFile(kDejaVu / "DejaVuSans.ttf");
+        largeBody = ReadFile(kDejaVu + "DejaVuSans.ttf");
         std::mt19937_64 random(20261206);
         while (largeBody.size() < kLargeAssetSize) {
             const uint64_t word = random();
@@ -99,9 +87,9 @@ struct Setup {
         server.Serve("/large", resource);
 
         for (const SmallFont& font : kTenFonts) {
-            resource.body = ReadFile(kDejaVu / font.file);
+            resource.body = ReadFile(kDejaVu + QString::fromStdString(font.file));
             if (resource.body.empty())
-                missing = "no " + (kDejaVu / font.file).string() + " (fonts-dejavu-extra)";
+                missing = "no " + font.file + " (fonts-dejavu-extra)";
             server.Serve("/" + font.file, resource);
         }
     }
@@ -113,16 +101,12 @@ struct Setup {
     /// A catalog entry for the file served at `path`.
     std::string Asset(const std::string& localID, const std::string& path, size_t size,
                       const std::string& sha256, const std::string& postScriptName) {
-        return "{\"LocalID\": \"" + localID + "\", \"url\": \"" + server.URL(path) +
-               "\", \"size\": " + std::to_string(size) + ", \"sha256\": \"" + sha256 +
-               "\", \"fonts\": [{\"postScriptName\": \"" + postScriptName + "\"}]}";
+        return glyphwell::testing::CatalogAsset(localID, server.URL(path), size, sha256,
+                                                postScriptName);
     }
     /// Makes the catalog list `assets` (catalog entries).
     void WriteCatalog(const std::vector<std::string>& assets) {
-        std::string text = "{\"assets\": [";
-        for (size_t i = 0; i < assets.size(); ++i)
-            text += (i ? ", " : "") + assets[i];
-        std::ofstream(root / "data/glyphwell/downloadable-fonts.json") << text << "]}";
+        glyphwell::testing::WriteCatalog(QString::fromStdString((root / "data").string()), assets);
     }
 
     /// Removes every downloaded font and reloads fontconfig, so that nothing is installed.
@@ -240,7 +224,7 @@ void MatchTenFonts(benchmark::State& state) {
     std::vector<std::string> names;
     size_t bytes = 0;
     for (const SmallFont& font : kTenFonts) {
-        const std::string body = ReadFile(kDejaVu / font.file);
+        const std::string body = ReadFile(kDejaVu + QString::fromStdString(font.file));
         bytes += body.size();
         assets.push_back(setup.Asset(font.postScriptName, "/" + font.file, body.size(),
                                      QZSHA256Hex(body), font.postScriptName));

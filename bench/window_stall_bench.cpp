@@ -20,7 +20,6 @@
 #include <benchmark/benchmark.h>
 #include <cstdlib>
 #include <filesystem>
-#include <fstream>
 #include <random>
 #include <time.h>
 
@@ -29,24 +28,22 @@
 #include "desktop/QZSHA256.h"
 #include "platform/PropertyValues.h"
 #include "support/LoopbackHTTPServer.h"
+#include "support/PrivateFonts.h"
 
 namespace {
 
 namespace fs = std::filesystem;
+using glyphwell::testing::kDejaVu;
 using glyphwell::testing::LoopbackHTTPServer;
+using glyphwell::testing::ReadFile;
+using glyphwell::testing::UsePrivateFonts;
 
 constexpr size_t kLargeAssetSize = 50'000'000;
-const fs::path kDejaVu = "/usr/share/fonts/truetype/dejavu";
 const char* const kSixFonts[][2] = {
     {"DejaVuSans.ttf", "DejaVuSans"},         {"DejaVuSans-Bold.ttf", "DejaVuSans-Bold"},
     {"DejaVuSansMono.ttf", "DejaVuSansMono"}, {"DejaVuSansMono-Bold.ttf", "DejaVuSansMono-Bold"},
     {"DejaVuSerif.ttf", "DejaVuSerif"},       {"DejaVuSerif-Bold.ttf", "DejaVuSerif-Bold"},
 };
-
-std::string ReadFile(const fs::path& path) {
-    std::ifstream stream(path, std::ios::binary);
-    return std::string(std::istreambuf_iterator<char>(stream), {});
-}
 
 /// The CPU time of the calling thread, in nanoseconds.
 qint64 ThreadCPUTime() {
@@ -105,18 +102,9 @@ struct Setup {
     Setup() {
         char pattern[] = "/tmp/glyphwell-stall-bench-XXXXXX";
         root = mkdtemp(pattern);
-        fs::create_directories(root / "data/fonts");
-        fs::create_directories(root / "data/glyphwell");
-        std::ofstream(root / "fonts.conf")
-            << "<?xml version=\"1.0\"?>\n<fontconfig>\n  <dir>" << (root / "data/fonts").string()
-            << "</dir>\n  <cachedir>" << (root / "cache").string()
-            << "</cachedir>\n</fontconfig>\n";
-        setenv("XDG_DATA_HOME", (root / "data").c_str(), 1);
-        setenv("XDG_DATA_DIRS", (root / "none").c_str(), 1);
-        setenv("FONTCONFIG_FILE", (root / "fonts.conf").c_str(), 1);
-        QZReloadFontConfiguration();
+        UsePrivateFonts(QString::fromStdString(root.string()));
 
-        std::string large = ReadFile(kDejaVu / "DejaVuSans.ttf");
+        std::string large = ReadFile(kDejaVu + "DejaVuSans.ttf");
         if (large.empty())
             missing = "no DejaVuSans.ttf (fonts-dejavu-core)";
         std::mt19937_64 random(20261206);
@@ -131,7 +119,7 @@ struct Setup {
         server.Serve("/large", resource);
 
         for (const auto& font : kSixFonts) {
-            resource.body = ReadFile(kDejaVu / font[0]);
+            resource.body = ReadFile(kDejaVu + font[0]);
             if (resource.body.empty())
                 missing = std::string("no ") + font[0] + " (fonts-dejavu-core)";
             sixAssets.push_back(Asset(font[1], std::string("/") + font[0], resource.body, font[1]));
@@ -145,16 +133,12 @@ struct Setup {
 
     std::string Asset(const std::string& localID, const std::string& path, const std::string& body,
                       const std::string& postScriptName) {
-        return "{\"LocalID\": \"" + localID + "\", \"url\": \"" + server.URL(path) +
-               "\", \"size\": " + std::to_string(body.size()) + ", \"sha256\": \"" +
-               QZSHA256Hex(body) + "\", \"fonts\": [{\"postScriptName\": \"" + postScriptName +
-               "\"}]}";
+        return glyphwell::testing::CatalogAsset(localID, server.URL(path), body.size(),
+                                                QZSHA256Hex(body), postScriptName);
     }
+    /// Makes the catalog list `assets` (catalog entries).
     void WriteCatalog(const std::vector<std::string>& assets) {
-        std::string text = "{\"assets\": [";
-        for (size_t i = 0; i < assets.size(); ++i)
-            text += (i ? ", " : "") + assets[i];
-        std::ofstream(root / "data/glyphwell/downloadable-fonts.json") << text << "]}";
+        glyphwell::testing::WriteCatalog(QString::fromStdString((root / "data").string()), assets);
     }
     /// Removes every downloaded font and reloads fontconfig, so that nothing is installed.
     void Uninstall() {

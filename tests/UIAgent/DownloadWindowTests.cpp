@@ -125,17 +125,11 @@ protected:
             sha256 = SHA256Of(resource.body);
         const std::string path = "/" + file.toStdString();
         server_.Serve(path, resource);
-        return "{\"LocalID\": \"" + localID + "\", \"url\": \"" + server_.URL(path) +
-               "\", \"size\": " + std::to_string(resource.body.size()) + ", \"sha256\": \"" +
-               sha256 + "\", \"fonts\": [{\"postScriptName\": \"" + postScriptName + "\"}]}";
+        return CatalogAsset(localID, server_.URL(path), resource.body.size(), sha256,
+                            postScriptName);
     }
     void WriteCatalog(const std::vector<std::string>& assets) {
-        std::string text = "{\"assets\": [";
-        for (size_t i = 0; i < assets.size(); ++i)
-            text += (i ? ", " : "") + assets[i];
-        QDir().mkpath(root_.path() + "/data/glyphwell");
-        WriteFile(root_.path() + "/data/glyphwell/downloadable-fonts.json",
-                  QByteArray::fromStdString(text + "]}"));
+        ASSERT_TRUE(glyphwell::testing::WriteCatalog(root_.path() + "/data", assets));
     }
     void ServeMono() {
         WriteCatalog({ServeFont("DejaVuSansMono.ttf", "org.test.Mono", "DejaVuSansMono")});

@@ -177,19 +177,11 @@ protected:
             sha256 = SHA256Of(resource.body);
         const std::string path = "/" + file.toStdString();
         server_.Serve(path, resource);
-        return "{\"LocalID\": \"" + localID + "\", \"url\": \"" + server_.URL(path) +
-               "\", \"size\": " + std::to_string(resource.body.size()) + ", \"sha256\": \"" +
-               sha256 + "\", \"fonts\": [{\"postScriptName\": \"" + postScriptName + "\"}]}";
+        return CatalogAsset(localID, server_.URL(path), resource.body.size(), sha256,
+                            postScriptName);
     }
     void WriteCatalog(const std::vector<std::string>& assets) {
-        std::string text = "{\"assets\": [";
-        for (const std::string& asset : assets)
-            text += (&asset == &assets[0] ? "" : ", ") + asset;
-        text += "]}";
-        QDir().mkpath(root_.path() + "/data/glyphwell");
-        QFile file(root_.path() + "/data/glyphwell/downloadable-fonts.json");
-        ASSERT_TRUE(file.open(QIODevice::WriteOnly));
-        file.write(text.data(), qint64(text.size()));
+        ASSERT_TRUE(glyphwell::testing::WriteCatalog(root_.path() + "/data", assets));
     }
     static Ref Descriptors(std::initializer_list<const char*> names) {
         Ref array(CFArrayCreateMutable(nullptr, 0, &kCFTypeArrayCallBacks));

@@ -8,6 +8,7 @@
 #include <QString>
 #include <cstdio>
 #include <string>
+#include <vector>
 
 #include "desktop/QZFontMatching.h"
 #include "support/SHA256.h"
@@ -42,6 +43,28 @@ inline QString UsePrivateFonts(const QString& root) {
     qputenv("XDG_CACHE_HOME", (root + "/cache").toUtf8());
     qputenv("FONTCONFIG_FILE", (root + "/fonts.conf").toUtf8());
     return QZReloadFontConfiguration() ? fonts : QString();
+}
+
+/// One asset of a download catalog: `size` bytes at `url` with `sha256`, holding the font
+/// `postScriptName`.
+inline std::string CatalogAsset(const std::string& localID, const std::string& url, size_t size,
+                                const std::string& sha256, const std::string& postScriptName) {
+    return "{\"LocalID\": \"" + localID + "\", \"url\": \"" + url +
+           "\", \"size\": " + std::to_string(size) + ", \"sha256\": \"" + sha256 +
+           "\", \"fonts\": [{\"postScriptName\": \"" + postScriptName + "\"}]}";
+}
+
+/// Writes the user's download catalog under the data home `dataHome`, listing `assets`
+/// (CatalogAsset entries). False when it cannot be written.
+inline bool WriteCatalog(const QString& dataHome, const std::vector<std::string>& assets) {
+    std::string text = "{\"assets\": [";
+    for (size_t i = 0; i < assets.size(); ++i)
+        text += (i ? ", " : "") + assets[i];
+    text += "]}";
+    QDir().mkpath(dataHome + "/glyphwell");
+    QFile file(dataHome + "/glyphwell/downloadable-fonts.json");
+    return file.open(QIODevice::WriteOnly) &&
+           file.write(text.data(), qint64(text.size())) == qint64(text.size());
 }
 
 /// Undoes UsePrivateFonts: the process's own environment and font configuration again.
