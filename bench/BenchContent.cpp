@@ -8,6 +8,7 @@
 #include <utility>
 
 #include "serialization/TCFFlattenContext.h"
+#include "serialization/TCFResurrectContext.h"
 #include "support/FlattenedBytes.h"
 
 namespace bench {
@@ -267,6 +268,32 @@ std::vector<unsigned char> Flatten(CFTypeRef value) {
 const std::vector<StreamCase>& StreamCases() {
     static const std::vector<StreamCase> cases = MakeStreamCases();
     return cases;
+}
+
+const StreamCase* FindStreamCase(const std::string& name) {
+    for (const StreamCase& candidate : StreamCases())
+        if (candidate.name == name)
+            return &candidate;
+    return nullptr;
+}
+
+void ReadOnce(const StreamCase& message) {
+    TCFResurrectContext context(message.flattened.data(), message.flattened.size());
+    CFTypeRef value = message.kind == CFDictionaryGetTypeID() ? context.RetrieveCFDictionary()
+                                                              : context.Resurrect(kTCFTypeAny);
+    if (value)
+        CFRelease(value);
+}
+
+void WriteOnce(const StreamCase& message) {
+    CFMutableDataRef data = CFDataCreateMutable(nullptr, 0);
+    {
+        TCFFlattenContext context(data, false);
+        context.Flatten(message.value);
+    }
+    if (CFDataGetLength(data) != CFIndex(message.flattened.size()))
+        std::abort();
+    CFRelease(data);
 }
 
 } // namespace bench

@@ -37,4 +37,15 @@ const std::vector<StreamCase>& StreamCases();
 /// The stream of `value` as TCFFlattenContext writes it into a fresh buffer.
 std::vector<unsigned char> Flatten(CFTypeRef value);
 
+/// The case named `name`, or null.
+const StreamCase* FindStreamCase(const std::string& name);
+
+/// Reads the case's stream once with TCFResurrectContext (Retrieve of the top-level kind) and
+/// releases the value.
+void ReadOnce(const StreamCase& message);
+
+/// Writes the case's value once with TCFFlattenContext into a new buffer; aborts when the
+/// stream differs in length from the case's.
+void WriteOnce(const StreamCase& message);
+
 } // namespace bench

@@ -14,29 +14,8 @@
 #include <string>
 
 #include "BenchContent.h"
-#include "serialization/TCFFlattenContext.h"
-#include "serialization/TCFResurrectContext.h"
 
 namespace {
-
-void Read(const bench::StreamCase& message) {
-    TCFResurrectContext context(message.flattened.data(), message.flattened.size());
-    CFTypeRef value = message.kind == CFDictionaryGetTypeID() ? context.RetrieveCFDictionary()
-                                                              : context.Resurrect(kTCFTypeAny);
-    if (value)
-        CFRelease(value);
-}
-
-void Write(const bench::StreamCase& message) {
-    CFMutableDataRef data = CFDataCreateMutable(nullptr, 0);
-    {
-        TCFFlattenContext context(data, false);
-        context.Flatten(message.value);
-    }
-    if (CFDataGetLength(data) != CFIndex(message.flattened.size()))
-        std::abort();
-    CFRelease(data);
-}
 
 void Unpack(const bench::StreamCase& message) {
     msgpack::object_handle handle = msgpack::unpack(
@@ -58,15 +37,12 @@ int main(int argc, char** argv) {
         return 2;
     }
     const std::string operation = argv[1];
-    void (*run)(const bench::StreamCase&) = operation == "read"     ? Read
-                                            : operation == "write"  ? Write
+    void (*run)(const bench::StreamCase&) = operation == "read"     ? bench::ReadOnce
+                                            : operation == "write"  ? bench::WriteOnce
                                             : operation == "unpack" ? Unpack
                                             : operation == "pack"   ? Pack
                                                                     : nullptr;
-    const bench::StreamCase* message = nullptr;
-    for (const bench::StreamCase& candidate : bench::StreamCases())
-        if (candidate.name == argv[2])
-            message = &candidate;
+    const bench::StreamCase* message = bench::FindStreamCase(argv[2]);
     if (!run || !message) {
         std::fprintf(stderr, "unknown operation or case\n");
         return 2;

@@ -20,8 +20,6 @@
 #include <string>
 
 #include "BenchContent.h"
-#include "serialization/TCFFlattenContext.h"
-#include "serialization/TCFResurrectContext.h"
 
 extern "C" {
 void* __libc_malloc(size_t size);
@@ -63,42 +61,16 @@ void free(void* pointer) {
 }
 }
 
-namespace {
-
-void Read(const bench::StreamCase& message) {
-    TCFResurrectContext context(message.flattened.data(), message.flattened.size());
-    CFTypeRef value = message.kind == CFDictionaryGetTypeID() ? context.RetrieveCFDictionary()
-                                                              : context.Resurrect(kTCFTypeAny);
-    if (value)
-        CFRelease(value);
-}
-
-void Write(const bench::StreamCase& message) {
-    CFMutableDataRef data = CFDataCreateMutable(nullptr, 0);
-    {
-        TCFFlattenContext context(data, false);
-        context.Flatten(message.value);
-    }
-    if (CFDataGetLength(data) != CFIndex(message.flattened.size()))
-        std::abort();
-    CFRelease(data);
-}
-
-} // namespace
-
 int main(int argc, char** argv) {
     if (argc != 4) {
         std::fprintf(stderr, "usage: %s read|write <case> <count>\n", argv[0]);
         return 2;
     }
     const std::string operation = argv[1];
-    void (*run)(const bench::StreamCase&) = operation == "read"    ? Read
-                                            : operation == "write" ? Write
+    void (*run)(const bench::StreamCase&) = operation == "read"    ? bench::ReadOnce
+                                            : operation == "write" ? bench::WriteOnce
                                                                    : nullptr;
-    const bench::StreamCase* message = nullptr;
-    for (const bench::StreamCase& candidate : bench::StreamCases())
-        if (candidate.name == argv[2])
-            message = &candidate;
+    const bench::StreamCase* message = bench::FindStreamCase(argv[2]);
     const long count = std::atol(argv[3]);
     if (!run || !message || count <= 0) {
         std::fprintf(stderr, "unknown operation or case, or a count below 1\n");
