@@ -315,6 +315,20 @@ void EncodeUTF8WithRoom(std::u16string_view units, uint8_t lossByte, uint8_t* bu
     result.bytes = pos;
 }
 
+/// Writes the `length` bytes of one character at `pos` of `buffer` (when there is a buffer) and
+/// advances `pos`; false, with nothing written, when the buffer has no room for all of them, so
+/// that a character is never cut.
+bool PutCharacter(const uint8_t* bytes, size_t length, uint8_t* buffer, size_t capacity,
+                  size_t& pos) {
+    if (buffer) {
+        if (capacity - pos < length)
+            return false;
+        std::memcpy(buffer + pos, bytes, length);
+    }
+    pos += length;
+    return true;
+}
+
 /// UTF-16 to UTF-8 with the CFStringGetBytes rules; ASCII runs are copied in blocks.
 void EncodeUTF8Counted(std::u16string_view units, uint8_t lossByte, uint8_t* buffer,
                        size_t capacity, EncodeResult& result) {
@@ -366,12 +380,8 @@ void EncodeUTF8Counted(std::u16string_view units, uint8_t lossByte, uint8_t* buf
         } else {
             break;
         }
-        if (buffer) {
-            if (capacity - pos < length)
-                break;
-            std::memcpy(buffer + pos, bytes, length);
-        }
-        pos += length;
+        if (!PutCharacter(bytes, length, buffer, capacity, pos))
+            break;
         i += take;
     }
     result.unitsConverted = i;
@@ -450,12 +460,8 @@ void EncodeGeneric(std::u16string_view units, Form form, uint8_t lossByte, bool 
             if (!wide)
                 bytes[0] = lossByte;
         }
-        if (buffer) {
-            if (capacity - pos < length)
-                break;
-            std::memcpy(buffer + pos, bytes, length);
-        }
-        pos += length;
+        if (!PutCharacter(bytes, length, buffer, capacity, pos))
+            break;
         i += take;
     }
     result.unitsConverted = i;
