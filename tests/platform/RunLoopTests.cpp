@@ -1,8 +1,10 @@
 // The poll driver and the per-thread run loop that local ports are served through.
 #include <gtest/gtest.h>
 
+#include <fcntl.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <fstream>
 #include <future>
 #include <string>
@@ -67,6 +69,36 @@ TEST(PollRunLoopDriver, NeverCallsACallbackUnwatchedEarlierInTheSameRound) {
     EXPECT_EQ(newCalls, 0);
     ASSERT_TRUE(driver.RunOnce(1000));
     EXPECT_EQ(newCalls, 1);
+}
+
+TEST(PollRunLoopDriver, ANestedRoundDoesNotReplayItsReadinessInTheOuterOne) {
+    // Each pipe in turn is the trigger: its callback makes the other pipes readable and runs a
+    // nested round, which serves them. Back in the outer round, they must not be called again
+    // from what the nested round saw (whatever the poll order, some trigger comes first).
+    PollRunLoopDriver driver;
+    Pipe pipes[4];
+    int calls[4] = {};
+    for (int p = 0; p < 4; ++p) {
+        ASSERT_EQ(fcntl(pipes[p].read, F_SETFL, O_NONBLOCK), 0);
+        driver.Watch(pipes[p].read, true, false, [&, p](bool, bool) {
+            char byte;
+            ++calls[p];
+            if (read(pipes[p].read, &byte, 1) == 1 && byte == 't') {
+                for (Pipe& other : pipes)
+                    if (&other != &pipes[p] && write(other.write, "o", 1) != 1)
+                        ADD_FAILURE() << "cannot write to a pipe";
+                driver.RunOnce(1000);
+            }
+        });
+    }
+    for (int trigger = 0; trigger < 4; ++trigger) {
+        SCOPED_TRACE(trigger);
+        std::fill(std::begin(calls), std::end(calls), 0);
+        ASSERT_EQ(write(pipes[trigger].write, "t", 1), 1);
+        ASSERT_TRUE(driver.RunOnce(1000));
+        for (int p = 0; p < 4; ++p)
+            EXPECT_EQ(calls[p], 1) << p;
+    }
 }
 
 TEST(PollRunLoopDriver, WakeEndsAWaitFromAnotherThread) {
