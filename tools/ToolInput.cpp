@@ -41,8 +41,10 @@ bool ReadFile(const std::string& path, std::string* text, std::string* error, si
     }
     text->clear();
     char buffer[65536];
+    // Reads at most one byte past the limit, to tell a file of exactly the limit from a larger one.
     while (file && text->size() <= maximumSize) {
-        file.read(buffer, std::streamsize(std::min(sizeof buffer, maximumSize - text->size() + 1)));
+        const size_t room = maximumSize - text->size();
+        file.read(buffer, std::streamsize(room < sizeof buffer ? room + 1 : sizeof buffer));
         text->append(buffer, size_t(file.gcount()));
     }
     if (file.bad()) {

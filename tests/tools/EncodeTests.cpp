@@ -52,18 +52,45 @@ TEST(EncodeCommand, WritesTheDocumentedBytesOfPlainAndTaggedJSON) {
         EXPECT_EQ(Encode(input).out, hex) << input;
 }
 
-TEST(EncodeCommand, WritesRawBytesToAFile) {
+TEST(EncodeCommand, WritesRawBytesToAFileThatDecodeReadsBack) {
     const std::filesystem::path path =
         std::filesystem::temp_directory_path() / ("glyphwell-encode-" + std::to_string(getpid()));
-    const Result result = Encode("\"abc\"", {"-o", path.string()});
+    std::ofstream(path.string() + ".json") << "\"abc\"";
+    const Result result = Encode("", {path.string() + ".json", "-o", path.string()});
     EXPECT_EQ(result.status, 0);
     EXPECT_EQ(result.out, "");
-    std::ifstream file(path, std::ios::binary);
-    const std::string bytes((std::istreambuf_iterator<char>(file)),
-                            std::istreambuf_iterator<char>());
+    std::string bytes, error;
+    EXPECT_TRUE(glyphwell::tools::ReadFile(path.string(), &bytes, &error)) << error;
     EXPECT_EQ(bytes, std::string("\0\0\0\x07\0\0\0\x03"
                                  "abc",
                                  11));
+    const Result decoded = glyphwell::testing::Invoke({"decode", path.string(), "--compact"});
+    EXPECT_EQ(decoded.status, 0) << decoded.err;
+    EXPECT_EQ(decoded.out, "\"abc\"\n");
+    std::filesystem::remove(path);
+    std::filesystem::remove(path.string() + ".json");
+}
+
+TEST(ReadFile, ReadsWholeFilesUpToItsLimitAndNoFurther) {
+    const std::string path =
+        std::filesystem::temp_directory_path() / ("glyphwell-read-" + std::to_string(getpid()));
+    struct Row {
+        size_t size, limit;
+        bool read;
+    } rows[] = {{0, SIZE_MAX, true},  {5, SIZE_MAX, true},   {70000, SIZE_MAX, true},
+                {70000, 70000, true}, {70000, 69999, false}, {65536, 65535, false},
+                {5, 0, false}};
+    for (const Row& row : rows) {
+        SCOPED_TRACE(testing::Message() << row.size << " bytes, limit " << row.limit);
+        const std::string content(row.size, 'x');
+        std::ofstream(path, std::ios::binary) << content;
+        std::string text, error;
+        EXPECT_EQ(glyphwell::tools::ReadFile(path, &text, &error, row.limit), row.read);
+        if (row.read)
+            EXPECT_EQ(text, content);
+        else
+            EXPECT_EQ(error, path + ": larger than " + std::to_string(row.limit) + " bytes");
+    }
     std::filesystem::remove(path);
 }
 
