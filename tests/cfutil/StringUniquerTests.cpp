@@ -21,13 +21,6 @@ CFStringRef Unique(const std::string& bytes) {
     return TCFStringUniquer().GetUniqueString(bytes.c_str(), CFIndex(bytes.size()));
 }
 
-std::string Repeat(const std::string& unit, size_t times) {
-    std::string text;
-    for (size_t i = 0; i < times; ++i)
-        text += unit;
-    return text;
-}
-
 } // namespace
 
 TEST(StringUniquerHash, MixesUnsignedBytesUpToTheFirstZeroAndNeverGivesZero) {

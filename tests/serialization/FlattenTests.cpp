@@ -20,13 +20,6 @@ std::string Flattened(CFTypeRef value) {
 
 const char kStringFailed[] = "ERROR: Quzel::TCFFlattenContext::FlattenCFString failed.";
 
-std::string Repeat(const std::string& unit, size_t times) {
-    std::string text;
-    for (size_t i = 0; i < times; ++i)
-        text += unit;
-    return text;
-}
-
 } // namespace
 
 TEST(FlattenKinds, WritesTheDocumentedBytesForEveryKind) {

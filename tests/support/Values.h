@@ -35,6 +35,15 @@ private:
     CFTypeRef value_ = nullptr;
 };
 
+/// `unit` written `times` times in a row.
+inline std::string Repeat(const std::string& unit, size_t times) {
+    std::string text;
+    text.reserve(unit.size() * times);
+    for (size_t i = 0; i < times; ++i)
+        text += unit;
+    return text;
+}
+
 inline Ref Str(const std::string& utf8) {
     return Ref(CFStringCreateWithBytes(nullptr, reinterpret_cast<const UInt8*>(utf8.data()),
                                        CFIndex(utf8.size()), kCFStringEncodingUTF8, false));
