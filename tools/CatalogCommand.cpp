@@ -286,19 +286,29 @@ void FetchAndCompare(const QZDownloadableFontAsset& asset, bool progress, std::o
     }
 }
 
+/// Reads and parses the catalog of `options` for `verb`; its reader's lines go to `problems`.
+/// False after a message on `err` when the file cannot be read.
+bool LoadCatalog(const char* verb, const ReadOptions& options, std::ostream& err,
+                 QZDownloadableFontCatalog* catalog, std::vector<std::string>* problems) {
+    std::string text, error;
+    if (!ReadCatalogFile(options.catalogPath, &text, &error)) {
+        err << "glyphwell catalog " << verb << ": " << Escaped(error) << "\n";
+        return false;
+    }
+    *catalog = ParseCatalog(text, options.catalogPath, problems);
+    return true;
+}
+
 /// `catalog check`: the reader's problems, then with --fetch those of each download.
 int RunCheck(const std::vector<std::string>& arguments, std::ostream& out, std::ostream& err,
              bool progress) {
     ReadOptions options;
     if (!ParseReadArguments("check", true, arguments, &options, err))
         return 2;
-    std::string text, error;
-    if (!ReadCatalogFile(options.catalogPath, &text, &error)) {
-        err << "glyphwell catalog check: " << Escaped(error) << "\n";
-        return 1;
-    }
+    QZDownloadableFontCatalog catalog;
     std::vector<std::string> problems;
-    const QZDownloadableFontCatalog catalog = ParseCatalog(text, options.catalogPath, &problems);
+    if (!LoadCatalog("check", options, err, &catalog, &problems))
+        return 1;
     for (const std::string& problem : problems)
         out << problem << "\n";
     const size_t readProblems = problems.size();
@@ -323,13 +333,10 @@ int RunList(const std::vector<std::string>& arguments, std::ostream& out, std::o
     ReadOptions options;
     if (!ParseReadArguments("list", false, arguments, &options, err))
         return 2;
-    std::string text, error;
-    if (!ReadCatalogFile(options.catalogPath, &text, &error)) {
-        err << "glyphwell catalog list: " << Escaped(error) << "\n";
-        return 1;
-    }
+    QZDownloadableFontCatalog catalog;
     std::vector<std::string> problems;
-    const QZDownloadableFontCatalog catalog = ParseCatalog(text, options.catalogPath, &problems);
+    if (!LoadCatalog("list", options, err, &catalog, &problems))
+        return 1;
     for (const std::string& problem : problems)
         err << problem << "\n";
     for (const QZDownloadableFontAsset& asset : catalog.assets)
