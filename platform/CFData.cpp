@@ -266,6 +266,39 @@ void CFDataAppendBytes(CFMutableDataRef data, const UInt8* bytes, CFIndex length
     object->Append(bytes, length);
 }
 
+glyphwell::DataTail glyphwell::DataReserveTail(CFMutableDataRef data, CFIndex minimum) {
+    __CFData* object = AsMutableData(data);
+    GW_CHECK_ARGUMENT(minimum >= 0);
+    if (!object || minimum < 0)
+        return {};
+    GW_CHECK_ARGUMENT(minimum <= PTRDIFF_MAX - object->length);
+    if (minimum > PTRDIFF_MAX - object->length)
+        return {};
+    const CFIndex before = object->capacity;
+    object->Reserve(object->length + std::max<CFIndex>(minimum, 1));
+    return {object->bytes + object->length, object->capacity - object->length,
+            object->capacity != before};
+}
+
+void glyphwell::DataCommitTail(CFMutableDataRef data, CFIndex count) {
+    __CFData* object = AsMutableData(data);
+    GW_CHECK_ARGUMENT(count >= 0 && count <= (object ? object->capacity - object->length : 0));
+    if (!object || count < 0 || count > object->capacity - object->length)
+        return;
+    object->length += count;
+}
+
+void glyphwell::DataTrimRoom(CFMutableDataRef data) {
+    __CFData* object = AsMutableData(data);
+    if (!object || object->capacity == object->length || object->length == 0)
+        return;
+    // Shrinking splits the block in place with glibc; should it fail, the block stays as it was.
+    if (void* trimmed = std::realloc(object->bytes, size_t(object->length))) {
+        object->bytes = static_cast<UInt8*>(trimmed);
+        object->capacity = object->length;
+    }
+}
+
 void CFDataReplaceBytes(CFMutableDataRef data, CFRange range, const UInt8* newBytes,
                         CFIndex newLength) {
     __CFData* object = AsMutableData(data);

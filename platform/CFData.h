@@ -41,3 +41,30 @@ void CFDataAppendBytes(CFMutableDataRef data, const UInt8* bytes, CFIndex length
 void CFDataReplaceBytes(CFMutableDataRef data, CFRange range, const UInt8* newBytes,
                         CFIndex newLength);
 void CFDataDeleteBytes(CFMutableDataRef data, CFRange range);
+
+namespace glyphwell {
+
+/// Room after the end of a mutable data object: `bytes` points just past its last byte and
+/// `size` bytes may be written there. They become part of the data only through DataCommitTail;
+/// any other change to the data object may move the room or overwrite it.
+struct DataTail {
+    UInt8* bytes = nullptr;
+    CFIndex size = 0;
+    /// Whether this call enlarged the block (which may also have moved it).
+    bool grown = false;
+};
+
+/// Makes room for at least `minimum` bytes after the end of `data` without changing its length
+/// (the block grows geometrically, as for an append) and returns all of the room there is. For
+/// writers that fill many small pieces in place and then commit them in one call. Bad input
+/// (not mutable data, a negative or overflowing `minimum`) is reported and gives {null, 0}.
+DataTail DataReserveTail(CFMutableDataRef data, CFIndex minimum);
+/// Adds the first `count` bytes of the room after the end of `data` to its length: bytes
+/// written there since DataReserveTail. A `count` beyond the room is reported and nothing
+/// changes.
+void DataCommitTail(CFMutableDataRef data, CFIndex count);
+/// Gives back the room after the end of `data`, so that its block holds its bytes and no more:
+/// for a writer that reserved generously and is done. Bad input is reported.
+void DataTrimRoom(CFMutableDataRef data);
+
+} // namespace glyphwell

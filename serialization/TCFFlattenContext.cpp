@@ -2,12 +2,16 @@
 
 #include <syslog.h>
 
+#include <algorithm>
 #include <bit>
 #include <cstring>
+#include <functional>
+#include <new>
+#include <typeinfo>
+#include <vector>
 
 #include "bitmap/QZBitmapRepresentation.h"
 #include "cfutil/TCFRetained.h"
-#include "cfutil/TStackBuffer.h"
 
 static_assert(std::endian::native == std::endian::little,
               "the writer swaps on a little-endian host");
@@ -24,14 +28,46 @@ void Put32(UInt8* bytes, uint32_t value) {
     std::memcpy(bytes, &value, 4);
 }
 
-/// Appends a type id and the index field after it (the low 32 bits of `index`) in one append:
-/// the head of every value but the error's.
-void StreamOutHead(CFMutableDataRef stream, TCFType type, long index) {
-    UInt8 head[8];
-    Put32(head, type);
-    Put32(head + 4, static_cast<uint32_t>(index));
-    CFDataAppendBytes(stream, head, 8);
+/// memcpy for the short texts most values have: up to 32 bytes in two possibly overlapping
+/// loads and stores without a call, longer ones by memcpy.
+void CopyShort(UInt8* to, const char* from, size_t count) {
+    struct Block16 {
+        unsigned char bytes[16];
+    };
+    if (count > 32) {
+        std::memcpy(to, from, count);
+    } else if (count >= 16) {
+        Block16 head, tail;
+        std::memcpy(&head, from, 16);
+        std::memcpy(&tail, from + count - 16, 16);
+        std::memcpy(to, &head, 16);
+        std::memcpy(to + count - 16, &tail, 16);
+    } else if (count >= 8) {
+        uint64_t head, tail;
+        std::memcpy(&head, from, 8);
+        std::memcpy(&tail, from + count - 8, 8);
+        std::memcpy(to, &head, 8);
+        std::memcpy(to + count - 8, &tail, 8);
+    } else if (count >= 4) {
+        uint32_t head, tail;
+        std::memcpy(&head, from, 4);
+        std::memcpy(&tail, from + count - 4, 4);
+        std::memcpy(to, &head, 4);
+        std::memcpy(to + count - 4, &tail, 4);
+    } else if (count > 0) {
+        to[0] = UInt8(from[0]);
+        to[count / 2] = UInt8(from[count / 2]);
+        to[count - 1] = UInt8(from[count - 1]);
+    }
 }
+
+/// The room asked for when a call first writes: enough for a reply. A call that needs more asks
+/// for kLargeRoom more, enough for most requests, so that their block is copied at most once,
+/// while it is small. A block grown for a call gives back the room left when that is more than
+/// kRoomKept; shrinking costs no copy.
+constexpr CFIndex kFirstRoom = 1024;
+constexpr CFIndex kLargeRoom = 32 * 1024;
+constexpr CFIndex kRoomKept = 4096;
 
 /// The platform's kind ids, fetched once: Flatten compares each value's kind with them in turn.
 struct KindIDs {
@@ -95,33 +131,109 @@ TCFFlattenContext::~TCFFlattenContext() {
     TCFSafeRelease(stream);
 }
 
+/// Marks one public writer call: the outermost one commits what the call wrote and forgets the
+/// room, since the buffer's other holders may change it before the next call.
+class TCFFlattenContext::Scope {
+public:
+    explicit Scope(TCFFlattenContext& context) : context(context) { ++context.depth; }
+    ~Scope() {
+        if (--context.depth == 0) {
+            context.Commit();
+            if (context.grown && context.limit - context.cursor > kRoomKept)
+                glyphwell::DataTrimRoom(context.stream);
+            context.pending = context.cursor = context.limit = nullptr;
+            context.grown = false;
+        }
+    }
+    Scope(const Scope&) = delete;
+    Scope& operator=(const Scope&) = delete;
+
+private:
+    TCFFlattenContext& context;
+};
+
+UInt8* TCFFlattenContext::Grow(CFIndex count) {
+    Commit();
+    const glyphwell::DataTail tail =
+        glyphwell::DataReserveTail(stream, std::max(count, limit ? kLargeRoom : kFirstRoom));
+    if (tail.size < count) // unreachable for valid buffers: reserving throws when memory runs out
+        throw std::bad_alloc();
+    pending = cursor = tail.bytes;
+    limit = tail.bytes + tail.size;
+    grown = grown || tail.grown;
+    return cursor;
+}
+
+void TCFFlattenContext::Commit() const {
+    if (cursor != pending) {
+        glyphwell::DataCommitTail(stream, cursor - pending);
+        pending = cursor;
+    }
+}
+
+/// Appends `count` bytes from `bytes` to the pending bytes.
+inline void TCFFlattenContext::Put(const void* bytes, CFIndex count) {
+    UInt8* const at = Room(count);
+    std::memcpy(at, bytes, size_t(count));
+    cursor = at + count;
+}
+/// Appends a type id and the low 32 bits of `index` after it: the head of most values.
+inline void TCFFlattenContext::PutHead(TCFType type, long index) {
+    UInt8* const at = Room(8);
+    Put32(at, type);
+    Put32(at + 4, static_cast<uint32_t>(index));
+    cursor = at + 8;
+}
+/// Appends a string value of the UTF-8 bytes `text`, head and text with one check for room.
+inline void TCFFlattenContext::PutText(std::string_view text) {
+    const CFIndex count = CFIndex(text.size());
+    UInt8* const at = Room(8 + count);
+    Put32(at, kTCFTypeString);
+    Put32(at + 4, static_cast<uint32_t>(count));
+    CopyShort(at + 8, text.data(), text.size());
+    cursor = at + 8 + count;
+}
+
 __CFData* TCFFlattenContext::GetStream() const {
+    Commit();
     return stream;
 }
 
 const UInt8* TCFFlattenContext::GetBytePtr() const {
+    Commit();
     return stream ? CFDataGetBytePtr(stream) : nullptr;
 }
 
 CFIndex TCFFlattenContext::GetLength() const {
+    Commit();
     return LengthOf(stream);
 }
 
 void TCFFlattenContext::Flatten(void const* value) {
     if (!value || !valid)
         return;
+    const Scope scope(*this);
+    // A context of this very class has no overrides to honour: its containers may then write
+    // their elements without going through the virtual writers.
+    if (depth == 1)
+        direct = typeid(*this) == typeid(TCFFlattenContext);
+    Dispatch(value);
+}
+
+void TCFFlattenContext::Dispatch(void const* value) {
     const CFTypeID kind = CFGetTypeID(value);
     const KindIDs& kinds = Kinds();
+    // Most common first: texts, then the containers that hold them.
     if (kind == kinds.string)
         FlattenCFString(static_cast<CFStringRef>(value));
-    else if (kind == kinds.number)
-        FlattenCFNumber(static_cast<CFNumberRef>(value));
-    else if (kind == kinds.boolean)
-        FlattenCFBoolean(static_cast<CFBooleanRef>(value));
     else if (kind == kinds.dictionary)
         FlattenCFDictionary(static_cast<CFDictionaryRef>(value));
     else if (kind == kinds.array)
         FlattenCFArray(static_cast<CFArrayRef>(value));
+    else if (kind == kinds.number)
+        FlattenCFNumber(static_cast<CFNumberRef>(value));
+    else if (kind == kinds.boolean)
+        FlattenCFBoolean(static_cast<CFBooleanRef>(value));
     else if (kind == kinds.data)
         FlattenCFData(static_cast<CFDataRef>(value));
     else if (kind == kinds.characterSet)
@@ -139,16 +251,29 @@ void TCFFlattenContext::Flatten(void const* value) {
         valid = false;
         failed = true;
         // The job failed as a whole: take back everything it wrote, but nothing from before.
+        cursor = pending;
         CFDataSetLength(stream, startLength);
+        pending = cursor = limit = nullptr;
     }
+}
+
+void TCFFlattenContext::WriteElement(void const* value) {
+    if (!value || !valid)
+        return;
+    // Most elements are texts kept as UTF-8: copied here without a call per value.
+    if (const std::optional<std::string_view> bytes =
+            glyphwell::UTF8Bytes(static_cast<CFStringRef>(value));
+        bytes && CFIndex(bytes->size()) <= kTCFMaxStringLength) {
+        PutText(*bytes);
+        return;
+    }
+    Dispatch(value);
 }
 
 namespace {
 
 /// The most UTF-8 bytes one UTF-16 unit can need (a surrogate pair needs 4 for its 2 units).
 constexpr CFIndex kUTF8BytesPerUnit = 3;
-/// Texts whose head and longest UTF-8 form fit in this many bytes are converted on the stack.
-constexpr CFIndex kShortStringRoom = 128;
 
 /// Converts the whole of `string` (`length` units) to UTF-8 at `text`, which has room for
 /// kUTF8BytesPerUnit bytes per unit, and stores the byte count in `*byteCount`. False when the
@@ -165,66 +290,43 @@ bool ConvertText(CFStringRef string, CFIndex length, UInt8* text, CFIndex* byteC
 } // namespace
 
 void TCFFlattenContext::FlattenCFString(__CFString const* string) {
-    // A string that keeps UTF-8 bytes is copied as it is, head and text in one append when short.
+    const Scope scope(*this);
+    // A string that keeps UTF-8 bytes is copied as it is.
     if (const std::optional<std::string_view> bytes = glyphwell::UTF8Bytes(string)) {
         const CFIndex byteCount = CFIndex(bytes->size());
         if (byteCount <= kTCFMaxStringLength) {
-            if (8 + byteCount <= kShortStringRoom) {
-                UInt8 value[kShortStringRoom];
-                Put32(value, kTCFTypeString);
-                Put32(value + 4, static_cast<uint32_t>(byteCount));
-                std::memcpy(value + 8, bytes->data(), bytes->size());
-                CFDataAppendBytes(stream, value, 8 + byteCount);
-            } else {
-                StreamOutHead(stream, kTCFTypeString, byteCount);
-                CFDataAppendBytes(stream, reinterpret_cast<const UInt8*>(bytes->data()), byteCount);
-            }
+            PutText(*bytes);
             return;
         }
     }
+    // Otherwise the text is converted once, straight into the room behind its head, which is
+    // made for its longest UTF-8 form.
     const CFIndex length = CFStringGetLength(string);
-    // Each text is converted once. A short one is converted on the stack behind its head and
-    // appended in one call; a longer one straight into the buffer, after room is made for its
-    // longest UTF-8 form, which is then cut back to what was written.
     if (length <= kTCFMaxStringLength) {
-        const CFIndex room = 8 + kUTF8BytesPerUnit * length;
+        UInt8* const value = Room(8 + kUTF8BytesPerUnit * length);
         CFIndex byteCount = 0;
-        if (room <= kShortStringRoom) {
-            UInt8 value[kShortStringRoom];
-            if (ConvertText(string, length, value + 8, &byteCount)) {
-                Put32(value, kTCFTypeString);
-                Put32(value + 4, static_cast<uint32_t>(byteCount));
-                CFDataAppendBytes(stream, value, 8 + byteCount);
-                return;
-            }
-        } else {
-            const CFIndex start = CFDataGetLength(stream);
-            CFDataIncreaseLength(stream, room);
-            UInt8* const value = CFDataGetMutableBytePtr(stream) + start;
-            const bool converted = ConvertText(string, length, value + 8, &byteCount);
-            if (converted) {
-                Put32(value, kTCFTypeString);
-                Put32(value + 4, static_cast<uint32_t>(byteCount));
-            }
-            CFDataSetLength(stream, converted ? start + 8 + byteCount : start);
-            if (converted)
-                return;
+        if (ConvertText(string, length, value + 8, &byteCount)) {
+            Put32(value, kTCFTypeString);
+            Put32(value + 4, static_cast<uint32_t>(byteCount));
+            cursor = value + 8 + byteCount;
+            return;
         }
     }
     glyphwell::SystemLog(LOG_ERR, "ERROR: Quzel::TCFFlattenContext::FlattenCFString failed.");
     failed = true;
-    StreamOutHead(stream, kTCFTypeString, 0);
+    PutHead(kTCFTypeString, 0);
 }
 
 void TCFFlattenContext::FlattenCFNumber(__CFNumber const* number) {
+    const Scope scope(*this);
     const CFNumberType type = CFNumberGetType(number);
     CFIndex width = CFNumberGetByteSize(number);
     // The value model has no number wider than 8 bytes; should one appear, its width is written
     // as 0 rather than reading past the value buffer (the reader rejects it either way).
     if (width < 0 || width > 8)
         width = 0;
-    // Type id, type code, width and the value, big-endian, in one append.
-    UInt8 bytes[20] = {};
+    // Type id, type code, width and the value, big-endian.
+    UInt8* const bytes = Room(20);
     Put32(bytes, kTCFTypeNumber);
     Put32(bytes + 4, static_cast<uint32_t>(type));
     Put32(bytes + 8, static_cast<uint32_t>(width));
@@ -234,91 +336,107 @@ void TCFFlattenContext::FlattenCFNumber(__CFNumber const* number) {
         ConvertToBigEndian(value, width);
         std::memcpy(bytes + 12, value, static_cast<size_t>(width));
     }
-    CFDataAppendBytes(stream, bytes, 12 + width);
+    cursor = bytes + 12 + width;
 }
 
 void TCFFlattenContext::FlattenCFBoolean(__CFBoolean const* boolean) {
-    UInt8 bytes[9];
+    const Scope scope(*this);
+    UInt8* const bytes = Room(9);
     Put32(bytes, kTCFTypeBoolean);
     Put32(bytes + 4, 1);
     bytes[8] = CFBooleanGetValue(boolean) ? 1 : 0;
-    CFDataAppendBytes(stream, bytes, 9);
+    cursor = bytes + 9;
 }
 
 void TCFFlattenContext::FlattenCFData(__CFData const* data) {
+    const Scope scope(*this);
+    // The buffer itself may be among the values: it is written with every byte before its head.
+    if (data == stream)
+        Commit();
     const CFIndex length = CFDataGetLength(data);
-    StreamOutHead(stream, kTCFTypeData, length);
+    UInt8* const bytes = Room(8 + length);
+    Put32(bytes, kTCFTypeData);
+    Put32(bytes + 4, static_cast<uint32_t>(length));
+    // Read after making room, which may move the buffer's block.
     if (length > 0)
-        StreamOut(CFDataGetBytePtr(data), 1, length);
+        std::memcpy(bytes + 8, CFDataGetBytePtr(data), size_t(length));
+    cursor = bytes + 8 + length;
 }
 
 void TCFFlattenContext::FlattenCFCharacterSet(__CFCharacterSet const* set) {
-    StreamOutTCFTypeID(kTCFTypeCharacterSet);
+    const Scope scope(*this);
     TCFAdopted<CFDataRef> bitmap(
         CFCharacterSetCreateBitmapRepresentation(kCFAllocatorDefault, set));
     TCFAdopted<CFDataRef> compressed(bitmap ? QZCreateCompressedBitmapRepresentation(
                                                   CFDataGetBytePtr(bitmap), CFDataGetLength(bitmap))
                                             : nullptr);
     const CFIndex length = compressed ? CFDataGetLength(compressed) : 0;
-    StreamOutCFIndex(length);
+    PutHead(kTCFTypeCharacterSet, length);
     if (length > 0)
-        StreamOut(CFDataGetBytePtr(compressed), 1, length);
+        Put(CFDataGetBytePtr(compressed), length);
 }
 
 void TCFFlattenContext::FlattenCFArray(__CFArray const* array) {
+    const Scope scope(*this);
     const CFIndex count = CFArrayGetCount(array);
-    StreamOutHead(stream, kTCFTypeArray, count);
+    PutHead(kTCFTypeArray, count);
     if (count != 0)
-        CFArrayApplyFunction(array, CFRangeMake(0, count), FlattenArrayElement, this);
+        CFArrayApplyFunction(array, CFRangeMake(0, count),
+                             direct ? WriteDirectElement : FlattenArrayElement, this);
 }
 
 void TCFFlattenContext::FlattenCFDictionary(__CFDictionary const* dictionary) {
+    const Scope scope(*this);
     const CFIndex count = CFDictionaryGetCount(dictionary);
-    StreamOutHead(stream, kTCFTypeDictionary, count);
+    PutHead(kTCFTypeDictionary, count);
     if (count != 0)
-        CFDictionaryApplyFunction(dictionary, FlattenDictionaryElement, this);
+        CFDictionaryApplyFunction(dictionary, direct ? WriteDirectPair : FlattenDictionaryElement,
+                                  this);
 }
 
 void TCFFlattenContext::FlattenCFSet(__CFSet const* set) {
+    const Scope scope(*this);
     const CFIndex count = CFSetGetCount(set);
-    StreamOutHead(stream, kTCFTypeSet, count);
+    PutHead(kTCFTypeSet, count);
     if (count != 0)
-        CFSetApplyFunction(set, FlattenSetElement, this);
+        CFSetApplyFunction(set, direct ? WriteDirectElement : FlattenSetElement, this);
 }
 
 void TCFFlattenContext::FlattenCFURL(__CFURL const* url) {
-    StreamOutTCFTypeID(kTCFTypeURL);
+    const Scope scope(*this);
     TCFAdopted<CFURLRef> absolute(CFURLCopyAbsoluteURL(url));
     const CFIndex length = absolute ? CFURLGetBytes(absolute, nullptr, 0) : 0;
     if (length > kTCFMaxStringLength) {
         // The reader rejects longer URLs and with them the rest of the stream: write none.
         glyphwell::SystemLog(LOG_ERR, "ERROR: Quzel::TCFFlattenContext::FlattenCFURL failed.");
         failed = true;
-        StreamOutCFIndex(0);
+        PutHead(kTCFTypeURL, 0);
         return;
     }
     if (length < 1) {
-        StreamOutCFIndex(0);
+        PutHead(kTCFTypeURL, 0);
         return;
     }
-    TStackBuffer<unsigned char, 30> bytes(length);
-    CFURLGetBytes(absolute, bytes.GetBuffer(), length);
-    StreamOutCFIndex(length);
-    StreamOut(bytes.GetBuffer(), 1, length);
+    UInt8* const bytes = Room(8 + length);
+    Put32(bytes, kTCFTypeURL);
+    Put32(bytes + 4, static_cast<uint32_t>(length));
+    CFURLGetBytes(absolute, bytes + 8, length);
+    cursor = bytes + 8 + length;
 }
 
 void TCFFlattenContext::FlattenCFUUID(__CFUUID const* uuid) {
-    StreamOutTCFTypeID(kTCFTypeUUID);
+    const Scope scope(*this);
     if (!uuid) {
-        StreamOutCFIndex(0);
+        PutHead(kTCFTypeUUID, 0);
         return;
     }
     const CFUUIDBytes bytes = CFUUIDGetUUIDBytes(uuid);
-    StreamOutCFIndex(16);
-    StreamOut(&bytes, 1, 16);
+    PutHead(kTCFTypeUUID, 16);
+    Put(&bytes, 16);
 }
 
 void TCFFlattenContext::FlattenCFError(__CFError* error) {
+    const Scope scope(*this);
     StreamOutTCFTypeID(kTCFTypeError);
     if (!error)
         return;
@@ -329,18 +447,28 @@ void TCFFlattenContext::FlattenCFError(__CFError* error) {
 void TCFFlattenContext::StreamOut(void const* bytes, unsigned long size, long count) {
     if (count <= 0 || size == 0)
         return;
-    const CFIndex start = CFDataGetLength(stream);
-    CFDataAppendBytes(stream, static_cast<const UInt8*>(bytes), CFIndex(size * count));
-    if (size > 1) {
-        UInt8* element = CFDataGetMutableBytePtr(stream) + start;
-        for (long i = 0; i < count; ++i, element += size)
-            ConvertToBigEndian(element, long(size));
+    const Scope scope(*this);
+    // Bytes from the buffer itself are copied first: making room may move its block.
+    std::vector<UInt8> own;
+    const UInt8* const begin = CFDataGetBytePtr(stream);
+    const std::less<const void*> before;
+    if (begin && !before(bytes, begin) && before(bytes, limit ? limit : begin + LengthOf(stream))) {
+        own.assign(static_cast<const UInt8*>(bytes),
+                   static_cast<const UInt8*>(bytes) + size * count);
+        bytes = own.data();
     }
+    UInt8* const start = Room(CFIndex(size * count));
+    std::memcpy(start, bytes, size * count);
+    cursor = start + size * count;
+    if (size > 1)
+        for (UInt8* element = start; element != cursor; element += size)
+            ConvertToBigEndian(element, long(size));
 }
 
 void TCFFlattenContext::StreamOut32bitEntity(unsigned int value) {
+    const Scope scope(*this);
     const UInt32 bigEndian = __builtin_bswap32(value);
-    CFDataAppendBytes(stream, reinterpret_cast<const UInt8*>(&bigEndian), 4);
+    Put(&bigEndian, 4);
 }
 
 void TCFFlattenContext::StreamOutTCFTypeID(TCFType type) {
@@ -349,6 +477,16 @@ void TCFFlattenContext::StreamOutTCFTypeID(TCFType type) {
 
 void TCFFlattenContext::StreamOutCFIndex(long index) {
     StreamOut32bitEntity(static_cast<unsigned int>(index));
+}
+
+void TCFFlattenContext::WriteDirectElement(void const* value, void* context) {
+    static_cast<TCFFlattenContext*>(context)->WriteElement(value);
+}
+
+void TCFFlattenContext::WriteDirectPair(void const* key, void const* value, void* context) {
+    auto* self = static_cast<TCFFlattenContext*>(context);
+    self->WriteElement(key);
+    self->WriteElement(value);
 }
 
 void TCFFlattenContext::FlattenArrayElement(void const* value, void* context) {

@@ -5,6 +5,12 @@
 // The per-kind writers are virtual, and containers reach their elements through the virtual
 // Flatten, so a subclass that overrides Flatten or FlattenCFString sees every nested value.
 //
+// The writers fill the room after the buffer's end in place and add what they wrote to the
+// buffer's length once, when the outermost public call returns: one value of any size costs one
+// commit, not one append per string, number and container head. Between public calls the buffer
+// is a plain data object that its other holders may change. Subclasses write through StreamOut
+// and the per-kind writers, never to `stream` directly.
+//
 // Byte layout of each kind (all integers big-endian, counts 32 bits):
 //   string 7, n, n UTF-8 bytes        number 22, type code, width w, w value bytes
 //   boolean 259, 1, one byte           data 18, n, n bytes
@@ -13,6 +19,8 @@
 //   URL 257, n, n bytes of the absolute URL    UUID 258, 16, 16 bytes
 //   error 260, code (low 32 bits), the domain as a complete string value
 #pragma once
+
+#include <string_view>
 
 #include "platform/PropertyValues.h"
 #include "serialization/TCFType.h"
@@ -95,9 +103,44 @@ protected:
     bool failed = false;
 
 private:
+    class Scope;
+
+    /// Calls the per-kind writer for `value`'s kind; an unknown kind fails the job.
+    void Dispatch(void const* value);
+    /// Writes one element of a container when `direct`: an 8-bit text in place, anything else
+    /// through Dispatch.
+    void WriteElement(void const* value);
+    static void WriteDirectElement(void const* value, void* context);
+    static void WriteDirectPair(void const* key, void const* value, void* context);
+
+    /// Appends `count` bytes from `bytes` to the pending bytes.
+    void Put(const void* bytes, CFIndex count);
+    /// Appends a type id and the low 32 bits of `index` after it: the head of most values.
+    void PutHead(TCFType type, long index);
+    /// Appends a string value of the UTF-8 bytes `text`, head and text with one check for room.
+    void PutText(std::string_view text);
+    /// Where the next `count` bytes go; the caller writes them and moves `cursor` past them.
+    UInt8* Room(CFIndex count) { return limit - cursor >= count ? cursor : Grow(count); }
+    /// Commits the pending bytes and reserves room for at least `count` more.
+    UInt8* Grow(CFIndex count);
+    /// Adds the pending bytes to the buffer's length; the room after them stays.
+    void Commit() const;
+
     /// The buffer's length when the context was made: a failed job cuts back to it, so that bytes
     /// a caller wrote before are kept.
     CFIndex startLength;
+    /// Room after the buffer's end: bytes from `pending` to `cursor` are written but not yet
+    /// committed, `limit` ends the room. All null outside a public call.
+    mutable UInt8* pending = nullptr;
+    UInt8* cursor = nullptr;
+    UInt8* limit = nullptr;
+    /// Public writer calls in progress; the outermost one commits.
+    int depth = 0;
+    /// Whether the outermost call enlarged the buffer's block: it then gives back the room left.
+    bool grown = false;
+    /// Set by the outermost Flatten when the context is of this class itself, so that no
+    /// subclass's Flatten or FlattenCFString needs to see the elements of containers.
+    bool direct = false;
 };
 
 /// Reverses the bytes of a 2-, 4- or 8-byte value in place (the host is little-endian); any other

@@ -51,6 +51,30 @@ TEST(Data, CreateCopiesTheBytesAndNoCopyFreesOrLeavesThemAsAsked) {
     CFRelease(borrowed);
 }
 
+TEST(MutableData, BytesWrittenInTheTailCountOnlyOnceCommittedAndTrimmingKeepsThem) {
+    auto data = Own(CFDataCreateMutable(nullptr, 0));
+    CFDataAppendBytes(data.get(), U("ab"), 2);
+    glyphwell::DataTail tail = glyphwell::DataReserveTail(data.get(), 100);
+    ASSERT_GE(tail.size, 100);
+    EXPECT_TRUE(tail.grown);
+    EXPECT_EQ(tail.bytes, CFDataGetMutableBytePtr(data.get()) + 2);
+    std::memcpy(tail.bytes, "cdef", 4);
+    EXPECT_EQ(Bytes(data.get()), "ab");
+    glyphwell::DataCommitTail(data.get(), 3);
+    EXPECT_EQ(Bytes(data.get()), "abcde");
+    // Room that is already there is handed out again without growing.
+    tail = glyphwell::DataReserveTail(data.get(), 10);
+    EXPECT_FALSE(tail.grown);
+    EXPECT_EQ(tail.bytes[0], 'f');
+    glyphwell::DataTrimRoom(data.get());
+    EXPECT_EQ(Bytes(data.get()), "abcde");
+    tail = glyphwell::DataReserveTail(data.get(), 1);
+    EXPECT_TRUE(tail.grown);
+    tail.bytes[0] = 'z';
+    glyphwell::DataCommitTail(data.get(), 1);
+    EXPECT_EQ(Bytes(data.get()), "abcdez");
+}
+
 TEST(MutableData, SetLengthReplaceAndDeleteCutOrGrowInPlaceAlsoWithBytesFromItself) {
     auto owned = Own(CFDataCreateMutable(nullptr, 0));
     CFMutableDataRef data = owned.get();

@@ -185,6 +185,98 @@ TEST(FlattenContext, RetainsOrAdoptsTheBufferAndWritesThroughTheVirtualWriters) 
     CFRelease(buffer);
 }
 
+namespace {
+
+void AppendBigEndian(std::vector<uint8_t>& bytes, uint32_t value) {
+    for (int shift = 24; shift >= 0; shift -= 8)
+        bytes.push_back(uint8_t(value >> shift));
+}
+
+void AppendText(std::vector<uint8_t>& bytes, const std::string& text) {
+    AppendBigEndian(bytes, 7);
+    AppendBigEndian(bytes, uint32_t(text.size()));
+    bytes.insert(bytes.end(), text.begin(), text.end());
+}
+
+std::vector<uint8_t> BytesOf(CFDataRef data) {
+    const UInt8* bytes = CFDataGetBytePtr(data);
+    return std::vector<uint8_t>(bytes, bytes + CFDataGetLength(data));
+}
+
+} // namespace
+
+TEST(FlattenBuffer, TextsOfEveryShortLengthComeOutWholeAsTheBufferGrowsOnEitherPath) {
+    // 3,000 texts of 0 to 70 bytes (every case of the short copy), some held as UTF-16 and some
+    // not ASCII: about 120 kB, so the buffer outgrows its first and its second room.
+    std::vector<Ref> texts;
+    std::vector<const void*> values;
+    std::vector<uint8_t> expected;
+    AppendBigEndian(expected, 17);
+    AppendBigEndian(expected, 3000);
+    for (int i = 0; i < 3000; ++i) {
+        std::string text;
+        std::u16string units;
+        for (int j = 0; j < i % 71; ++j) {
+            text += char('a' + (i + j) % 26);
+            units += char16_t(text.back());
+        }
+        if (i % 13 == 5) {
+            text += "\xC3\xA9";
+            units += u'\u00E9';
+        }
+        if (i % 7 == 3) {
+            texts.emplace_back(CFStringCreateWithCharacters(
+                nullptr, reinterpret_cast<const UniChar*>(units.data()), CFIndex(units.size())));
+        } else {
+            texts.push_back(Str(text));
+        }
+        values.push_back(texts.back().get());
+        AppendText(expected, text);
+    }
+    Ref array(
+        CFArrayCreate(nullptr, values.data(), CFIndex(values.size()), &kCFTypeArrayCallBacks));
+    EXPECT_EQ(FlattenedBytes(array.get()), expected);
+    // A subclass sees every text through its own writer, with the same bytes.
+    Ref buffer(CFDataCreateMutable(nullptr, 0));
+    {
+        StringCountingContext context(const_cast<__CFData*>(buffer.as<CFDataRef>()), false);
+        context.Flatten(array.get());
+        EXPECT_EQ(context.strings, 3000);
+    }
+    EXPECT_EQ(BytesOf(buffer.as<CFDataRef>()), expected);
+}
+
+TEST(FlattenBuffer, CallersMayChangeTheBufferBetweenCallsOrWriteItIntoItself) {
+    Ref buffer(CFDataCreateMutable(nullptr, 0));
+    auto* data = const_cast<__CFData*>(buffer.as<CFDataRef>());
+    // A prefix larger than the first room, so that writing the buffer into itself moves it.
+    const std::vector<uint8_t> prefix(3000, 0xAB);
+    CFDataAppendBytes(data, prefix.data(), CFIndex(prefix.size()));
+    std::vector<uint8_t> expected = prefix;
+    {
+        TCFFlattenContext context(data, false);
+        context.Flatten(Array({buffer.get()}).get());
+        AppendBigEndian(expected, 17);
+        AppendBigEndian(expected, 1);
+        const std::vector<uint8_t> before = expected; // the data holds what was written so far
+        AppendBigEndian(expected, 18);
+        AppendBigEndian(expected, uint32_t(before.size()));
+        expected.insert(expected.end(), before.begin(), before.end());
+        EXPECT_EQ(context.GetLength(), CFIndex(expected.size()));
+
+        const UInt8 mark = 0xCC;
+        CFDataAppendBytes(data, &mark, 1);
+        expected.push_back(mark);
+        context.Flatten(Str("a").get());
+        AppendText(expected, "a");
+        // All of its own bytes again, which needs a larger block.
+        context.StreamOut(CFDataGetBytePtr(data), 1, CFDataGetLength(data));
+        const std::vector<uint8_t> whole = expected;
+        expected.insert(expected.end(), whole.begin(), whole.end());
+    }
+    EXPECT_EQ(BytesOf(buffer.as<CFDataRef>()), expected);
+}
+
 TEST(FlattenEstimates, MatchTheBytesWrittenExceptForStringsAndCharacterSets) {
     Ref a = Str("a");
     const UInt8 bytes[] = {1, 2, 3};
