@@ -275,11 +275,9 @@ __attribute__((noinline)) CFStringRef TCFStringUniquerImp::Enter(const char* byt
 CFStringRef TCFStringUniquerImp::GetUniqueString(CFStringRef string) {
     if (!string)
         return nullptr;
-    if (const std::optional<std::string_view> bytes = glyphwell::UTF8Bytes(string)) {
-        const void* zero = std::memchr(bytes->data(), 0, bytes->size());
-        const size_t length =
-            zero ? size_t(static_cast<const char*>(zero) - bytes->data()) : bytes->size();
-        return length > 0 ? GetUniqueString(bytes->data(), CFIndex(length)) : string;
+    if (const std::string_view bytes = glyphwell::UTF8Bytes(string); bytes.data()) {
+        const size_t length = std::min(bytes.find('\0'), bytes.size());
+        return length > 0 ? GetUniqueString(bytes.data(), CFIndex(length)) : string;
     }
     const CFIndex size =
         CFStringGetMaximumSizeForEncoding(CFStringGetLength(string), kCFStringEncodingUTF8) + 1;

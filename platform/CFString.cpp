@@ -817,9 +817,9 @@ std::optional<std::string> glyphwell::UTF8String(CFStringRef string, UInt8 lossB
     return bytes;
 }
 
-std::optional<std::string_view> glyphwell::UTF8Bytes(CFStringRef string) {
+std::string_view glyphwell::UTF8Bytes(CFStringRef string) {
     const __CFString* object = As<__CFString>(string, kStringKind);
     if (!object || !object->Is8Bit())
-        return std::nullopt;
+        return {};
     return object->Narrow();
 }

@@ -137,8 +137,10 @@ namespace glyphwell {
 std::optional<std::string> UTF8String(CFStringRef string, UInt8 lossByte = 0);
 
 /// The UTF-8 bytes `string` keeps (all of them, zero bytes included) when it was made from ASCII
-/// or UTF-8; nothing for a string held as UTF-16 or for anything but a string. Does not copy;
-/// the view is valid while the string lives. For writers that copy text out without converting.
-std::optional<std::string_view> UTF8Bytes(CFStringRef string);
+/// or UTF-8; a view with null data() for a string held as UTF-16 or for anything but a string (an
+/// empty kept text has non-null data()). Does not copy; the view is valid while the string lives.
+/// For writers that copy text out without converting; returned in registers, not as an optional,
+/// since the writer asks once per text.
+std::string_view UTF8Bytes(CFStringRef string);
 
 } // namespace glyphwell

@@ -261,10 +261,9 @@ void TCFFlattenContext::WriteElement(void const* value) {
     if (!value || !valid)
         return;
     // Most elements are texts kept as UTF-8: copied here without a call per value.
-    if (const std::optional<std::string_view> bytes =
-            glyphwell::UTF8Bytes(static_cast<CFStringRef>(value));
-        bytes && CFIndex(bytes->size()) <= kTCFMaxStringLength) {
-        PutText(*bytes);
+    if (const std::string_view bytes = glyphwell::UTF8Bytes(static_cast<CFStringRef>(value));
+        bytes.data() && CFIndex(bytes.size()) <= kTCFMaxStringLength) {
+        PutText(bytes);
         return;
     }
     Dispatch(value);
@@ -292,12 +291,10 @@ bool ConvertText(CFStringRef string, CFIndex length, UInt8* text, CFIndex* byteC
 void TCFFlattenContext::FlattenCFString(__CFString const* string) {
     const Scope scope(*this);
     // A string that keeps UTF-8 bytes is copied as it is.
-    if (const std::optional<std::string_view> bytes = glyphwell::UTF8Bytes(string)) {
-        const CFIndex byteCount = CFIndex(bytes->size());
-        if (byteCount <= kTCFMaxStringLength) {
-            PutText(*bytes);
-            return;
-        }
+    if (const std::string_view bytes = glyphwell::UTF8Bytes(string);
+        bytes.data() && CFIndex(bytes.size()) <= kTCFMaxStringLength) {
+        PutText(bytes);
+        return;
     }
     // Otherwise the text is converted once, straight into the room behind its head, which is
     // made for its longest UTF-8 form.
