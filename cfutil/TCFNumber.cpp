@@ -25,13 +25,8 @@ template <> CFNumberRef TCFNumber::Create<bool>(bool value) {
 }
 
 CFNumberRef TCFNumber::CreateFromBoolean(bool flag) {
-    // A function-local static is initialised exactly once, even under concurrent first calls.
-    // The pair is trivially destructible, so it outlives every caller and is never released.
-    struct SharedBooleans {
-        CFNumberRef numbers[2];
-    };
-    static const SharedBooleans shared{{Create<bool>(false), Create<bool>(true)}};
-    return TCFSafeRetain(shared.numbers[flag ? 1 : 0]);
+    // The platform shares the numbers 0 and 1: every call returns the same one.
+    return Create<bool>(flag);
 }
 
 namespace {

@@ -25,9 +25,9 @@ public:
     /// Returns a new reference; the caller releases it. Null only when the platform refuses.
     template <class T> static CFNumberRef Create(T value);
 
-    /// The shared number for `flag`: Create<bool>(false) or Create<bool>(true), both made on
-    /// the first call in the process (safe under concurrent first calls) and never destroyed.
-    /// Returns it with one more count, which the caller releases.
+    /// The shared number for `flag`: Create<bool>(false) or Create<bool>(true), which the
+    /// platform makes once in the process and never destroys (CFNumberCreate shares small
+    /// integers). The caller releases it like any other number.
     static CFNumberRef CreateFromBoolean(bool flag);
 
     /// Parses `string` as a base-10 signed 64-bit integer (kCFNumberLongType), or failing that

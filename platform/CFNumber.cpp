@@ -4,6 +4,7 @@
 #include <cmath>
 #include <cstring>
 #include <limits>
+#include <new>
 
 #include "platform/ArgumentChecks.h"
 #include "platform/CFRuntime.h"
@@ -95,8 +96,8 @@ float RoundToFloat(double value) {
 /// A number: integers of every type code are kept as int64, floating point as double (a float
 /// keeps its exact value in a double). `type` is the code it was created with.
 struct __CFNumber final : CFObject {
-    __CFNumber(CFNumberType type, int64_t integer)
-        : CFObject(kNumberKind), type(type), isFloat(false), integer(integer) {}
+    __CFNumber(CFNumberType type, int64_t integer, bool immortal = false)
+        : CFObject(kNumberKind, immortal), type(type), isFloat(false), integer(integer) {}
     __CFNumber(CFNumberType type, double real)
         : CFObject(kNumberKind), type(type), isFloat(true), real(real) {}
 
@@ -215,6 +216,50 @@ template <class T> static T Load(const void* valuePtr) {
     return value;
 }
 
+namespace {
+
+/// Shared numbers for the small integers that most messages carry (results, flags, counts), one
+/// per integer type and value from kSmallestShared to kLargestShared: made once, in static
+/// storage so that making them cannot fail, and never destroyed.
+constexpr int64_t kSmallestShared = -1;
+constexpr int64_t kLargestShared = 15;
+constexpr size_t kSharedPerType = size_t(kLargestShared - kSmallestShared + 1);
+
+class SmallIntegers {
+public:
+    SmallIntegers() {
+        for (CFNumberType type = 1; type <= kCFNumberMaxType; ++type)
+            if (!IsFloatType(type))
+                for (int64_t value = kSmallestShared; value <= kLargestShared; ++value)
+                    new (Slot(type, value)) __CFNumber(type, value, true);
+    }
+    SmallIntegers(const SmallIntegers&) = delete;
+    SmallIntegers& operator=(const SmallIntegers&) = delete;
+
+    const __CFNumber* Find(CFNumberType type, int64_t value) {
+        return value >= kSmallestShared && value <= kLargestShared
+                   ? std::launder(reinterpret_cast<const __CFNumber*>(Slot(type, value)))
+                   : nullptr;
+    }
+
+private:
+    void* Slot(CFNumberType type, int64_t value) {
+        return storage[size_t(type - 1)][size_t(value - kSmallestShared)];
+    }
+
+    alignas(__CFNumber) unsigned char storage[kCFNumberMaxType][kSharedPerType][sizeof(__CFNumber)];
+};
+
+/// The shared number for `integer` of integer type `type`, or null when it has none.
+const __CFNumber* SharedSmallInteger(CFNumberType type, int64_t integer) {
+    if (integer < kSmallestShared || integer > kLargestShared)
+        return nullptr;
+    static SmallIntegers shared;
+    return shared.Find(type, integer);
+}
+
+} // namespace
+
 CFNumberRef CFNumberCreate(CFAllocatorRef, CFNumberType type, const void* valuePtr) {
     if (!GW_CHECK_ARGUMENT(IsValidType(type)) || !GW_CHECK_ARGUMENT(valuePtr != nullptr))
         return nullptr;
@@ -238,6 +283,8 @@ CFNumberRef CFNumberCreate(CFAllocatorRef, CFNumberType type, const void* valueP
         integer = Load<int64_t>(valuePtr);
         break;
     }
+    if (const __CFNumber* shared = SharedSmallInteger(type, integer))
+        return shared;
     return new __CFNumber(type, integer);
 }
 

@@ -32,7 +32,10 @@ enum : CFNumberType {
 CFTypeID CFNumberGetTypeID();
 
 /// A new number of type `type` from the value at `valuePtr`, read in that type's C
-/// representation (host order). Null for a type outside 1-16 or a null pointer.
+/// representation (host order). Null for a type outside 1-16 or a null pointer. An integer from
+/// -1 to 15 of an integer type comes back as a shared constant (one per type and value, like the
+/// booleans): CFRetain and CFRelease do not count it and CFGetRetainCount reports the largest
+/// index.
 CFNumberRef CFNumberCreate(CFAllocatorRef allocator, CFNumberType type, const void* valuePtr);
 /// The type code the number was created with.
 CFNumberType CFNumberGetType(CFNumberRef number);

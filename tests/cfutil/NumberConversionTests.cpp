@@ -77,20 +77,13 @@ TEST(NumberCreate, EachNativeTypeKeepsItsPlatformNumberType) {
                                  {kCFNumberIntType, 4, 0}}));
 }
 
-TEST(SharedBooleanNumbers, EachCallReturnsTheSameIntegerNumberWithOneMoreCount) {
-    CFNumberRef first = TCFNumber::CreateFromBoolean(true);
-    CFIndex count = CFGetRetainCount(first);
-    CFNumberRef second = TCFNumber::CreateFromBoolean(true);
-    EXPECT_EQ(first, second);
-    EXPECT_EQ(CFGetRetainCount(first), count + 1);
-    EXPECT_NE(static_cast<CFTypeRef>(first), kCFBooleanTrue);
-    EXPECT_EQ(CFNumberGetType(first), kCFNumberIntType);
-    EXPECT_EQ(LongOf(first), 1);
-    CFRelease(first);
-    CFRelease(second);
-    EXPECT_EQ(CFGetRetainCount(first), count - 1); // the shared count stays
+TEST(SharedBooleanNumbers, EachCallReturnsTheSameIntegerNumber) {
+    Ref yes(TCFNumber::CreateFromBoolean(true)), again(TCFNumber::CreateFromBoolean(true));
     Ref no(TCFNumber::CreateFromBoolean(false));
-    EXPECT_EQ((std::pair{no.get() != first, LongOf(no.get())}), std::pair(true, 0L));
+    EXPECT_EQ(yes.get(), again.get());
+    EXPECT_NE(yes.get(), kCFBooleanTrue);
+    EXPECT_EQ(CFNumberGetType(yes.as<CFNumberRef>()), kCFNumberIntType);
+    EXPECT_EQ((std::vector<long>{LongOf(yes.get()), LongOf(no.get())}), (std::vector<long>{1, 0}));
 }
 
 TEST(NumberFromString, WholeNumbersBecomeLongsAndOthersDoubles) {

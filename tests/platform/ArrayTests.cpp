@@ -42,7 +42,7 @@ Tokens TokensOf(CFArrayRef array) {
 } // namespace
 
 TEST(CFArray, RetainsWhatItHoldsAndCopiesAreIndependent) {
-    auto one = MakeInt(1), two = MakeInt(2);
+    auto one = MakeInt(101), two = MakeInt(102);
     auto array = Own(CFArrayCreateMutable(nullptr, 0, &kCFTypeArrayCallBacks));
     CFArrayAppendValue(array.get(), one.get());
     CFArrayInsertValueAtIndex(array.get(), 0, one.get());
@@ -71,7 +71,7 @@ TEST(CFArray, RetainsWhatItHoldsAndCopiesAreIndependent) {
 }
 
 TEST(CFArray, NullCallbacksKeepCountsAndCompareByPointer) {
-    auto five = MakeInt(5), otherFive = MakeInt(5);
+    auto five = MakeInt(105), otherFive = MakeInt(105);
     const void* values[] = {five.get(), nullptr};
     auto array = Own(CFArrayCreate(nullptr, values, 2, nullptr));
     EXPECT_EQ(CFGetRetainCount(five.get()), 1);

@@ -45,7 +45,7 @@ Pairs pairsOf(CFDictionaryRef dictionary) {
 
 TEST(CFDictionary, RetainsKeysAndValuesAndGivesThemBack) {
     auto key = MakeText("key");
-    auto first = MakeInt(1), second = MakeInt(2);
+    auto first = MakeInt(101), second = MakeInt(102);
     auto dictionary = makeMutable();
     CFDictionarySetValue(dictionary.get(), key.get(), first.get());
     EXPECT_EQ(RetainCounts({key.get(), first.get()}), (Counts{2, 2}));
@@ -65,7 +65,7 @@ TEST(CFDictionary, RetainsKeysAndValuesAndGivesThemBack) {
 
 TEST(CFDictionary, CreateWithRepeatedKeyKeepsLastValueInFirstPlace) {
     auto a = MakeText("a"), b = MakeText("b"), alsoA = MakeText("a");
-    auto v1 = MakeInt(1), v2 = MakeInt(2), v3 = MakeInt(3);
+    auto v1 = MakeInt(101), v2 = MakeInt(102), v3 = MakeInt(103);
     auto dictionary =
         makeDictionary({{a.get(), v1.get()}, {b.get(), v2.get()}, {alsoA.get(), v3.get()}});
     EXPECT_EQ(pairsOf(dictionary.get()), (Pairs{{a.get(), v3.get()}, {b.get(), v2.get()}}));
@@ -74,7 +74,7 @@ TEST(CFDictionary, CreateWithRepeatedKeyKeepsLastValueInFirstPlace) {
 
 TEST(CFDictionary, ReplacingAndRemovingKeepOrder) {
     auto a = MakeText("a"), b = MakeText("b"), c = MakeText("c"), d = MakeText("d");
-    auto one = MakeInt(1), two = MakeInt(2);
+    auto one = MakeInt(101), two = MakeInt(102);
     auto dictionary = makeMutable();
     for (CFStringRef key : {a.get(), b.get(), c.get()})
         CFDictionaryAddValue(dictionary.get(), key, one.get());
@@ -131,7 +131,7 @@ TEST(CFDictionary, EqualKeysAreOneKeyNumbersAndArraysAlike) {
 }
 
 TEST(CFDictionary, NullCallbacksTakeNullAndLeaveCounts) {
-    auto five = MakeInt(5), otherFive = MakeInt(5);
+    auto five = MakeInt(105), otherFive = MakeInt(105);
     auto dictionary = makeDictionary({{five.get(), nullptr}, {nullptr, Token(7)}}, false);
     EXPECT_EQ(CFGetRetainCount(five.get()), 1);
     const void* value = Token(1);
@@ -188,7 +188,7 @@ TEST(CFDictionary, LookupsHoldWhileGrowingAndShrinkingAcrossEightPairs) {
     const int keyCount = 20;
     std::vector<Owned<CFNumberRef>> keys;
     for (int i = 0; i < keyCount; ++i)
-        keys.push_back(MakeInt(i));
+        keys.push_back(MakeInt(100 + i));
     auto dictionary = makeMutable();
     std::vector<bool> present(keyCount, false);
     uint32_t state = 12345;
@@ -206,7 +206,7 @@ TEST(CFDictionary, LookupsHoldWhileGrowingAndShrinkingAcrossEightPairs) {
         }
         CFIndex expected = 0;
         for (int i = 0; i < keyCount; ++i) {
-            auto probe = MakeInt(i); // an equal key, not the same object
+            auto probe = MakeInt(100 + i); // an equal key, not the same object
             ASSERT_EQ(CFDictionaryContainsKey(dictionary.get(), probe.get()), present[size_t(i)])
                 << "step " << step << ", key " << i;
             expected += present[size_t(i)];

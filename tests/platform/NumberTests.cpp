@@ -73,6 +73,23 @@ TEST(Number, KeepsTypeCodeByteSizeAndFloatnessAndRefusesUnknownCodes) {
     EXPECT_EQ(out, -1);
 }
 
+TEST(Number, SmallIntegersOfEachIntegerTypeAreSharedConstantsThatKeepTheirType) {
+    for (CFNumberType type = 1; type <= 16; ++type) {
+        for (const int64_t value : {-2, -1, 0, 15, 16}) {
+            SCOPED_TRACE(::testing::Message() << "type " << type << ", value " << value);
+            const bool shared = !IsFloatCode(type) && value >= -1 && value <= 15;
+            Ref first = Make(type, value), second = Make(type, value);
+            EXPECT_EQ(first.get() == second.get(), shared);
+            EXPECT_EQ(CFGetRetainCount(first.get()),
+                      shared ? std::numeric_limits<CFIndex>::max() : 1);
+            EXPECT_EQ(CFNumberGetType(first.as<CFNumberRef>()), type);
+            int64_t out = 99;
+            CFNumberGetValue(first.as<CFNumberRef>(), S64, &out);
+            EXPECT_EQ(out, value);
+        }
+    }
+}
+
 // Narrowing keeps the low bits; float to integer truncates toward zero and saturates (NaN: 0);
 // integer to float is exact only when representable; double to float rounds. The result says
 // whether the value came through exactly.

@@ -25,8 +25,8 @@ std::vector<const void*> membersOf(CFSetRef set) {
 } // namespace
 
 TEST(CFSet, CreateKeepsFirstOfEqualValues) {
-    auto five = MakeInt(5), wideFive = MakeNumber(kCFNumberSInt64Type, int64_t(5));
-    auto realFive = MakeNumber(kCFNumberFloat32Type, 5.0f), six = MakeInt(6);
+    auto five = MakeInt(105), wideFive = MakeNumber(kCFNumberSInt64Type, int64_t(105));
+    auto realFive = MakeNumber(kCFNumberFloat32Type, 105.0f), six = MakeInt(106);
     auto set = makeSet({five.get(), wideFive.get(), six.get(), realFive.get()});
     EXPECT_EQ(CFSetGetCount(set.get()), 2);
     EXPECT_EQ(CFSetGetValue(set.get(), realFive.get()), five.get());
@@ -37,8 +37,8 @@ TEST(CFSet, CreateKeepsFirstOfEqualValues) {
 }
 
 TEST(CFSet, AddSetAndReplaceTreatEqualMembersDifferently) {
-    auto one = MakeInt(1), otherOne = MakeNumber(kCFNumberSInt8Type, int8_t(1));
-    auto two = MakeInt(2), three = MakeInt(3);
+    auto one = MakeInt(101), otherOne = MakeNumber(kCFNumberSInt8Type, int8_t(101));
+    auto two = MakeInt(102), three = MakeInt(103);
     auto set = Own(CFSetCreateMutable(nullptr, 0, &kCFTypeSetCallBacks));
     CFSetAddValue(set.get(), one.get());
     CFSetAddValue(set.get(), two.get());
@@ -83,7 +83,7 @@ TEST(CFSet, EnumeratesInInsertionOrderAfterRemovalAndReleases) {
 }
 
 TEST(CFSet, NullCallbacksUsePointerIdentity) {
-    auto five = MakeInt(5), otherFive = MakeInt(5);
+    auto five = MakeInt(105), otherFive = MakeInt(105);
     auto set = makeSet({five.get(), otherFive.get(), nullptr, five.get()}, nullptr);
     EXPECT_EQ(CFSetGetCount(set.get()), 3);
     EXPECT_TRUE(CFSetContainsValue(set.get(), nullptr));
