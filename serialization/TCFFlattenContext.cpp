@@ -28,32 +28,28 @@ void Put32(UInt8* bytes, uint32_t value) {
     std::memcpy(bytes, &value, 4);
 }
 
-/// memcpy for the short texts most values have: up to 32 bytes in two possibly overlapping
-/// loads and stores without a call, longer ones by memcpy.
+/// Copies `count` bytes, `size` <= `count` <= 2 × `size`, as two blocks of `size` bytes that meet
+/// or overlap in the middle: no loop and no call.
+template <size_t size> void CopyEnds(UInt8* to, const char* from, size_t count) {
+    struct Block {
+        unsigned char bytes[size];
+    } head, tail;
+    std::memcpy(&head, from, size);
+    std::memcpy(&tail, from + count - size, size);
+    std::memcpy(to, &head, size);
+    std::memcpy(to + count - size, &tail, size);
+}
+
+/// memcpy for the short texts most values have: up to 32 bytes without a call.
 void CopyShort(UInt8* to, const char* from, size_t count) {
-    struct Block16 {
-        unsigned char bytes[16];
-    };
     if (count > 32) {
         std::memcpy(to, from, count);
     } else if (count >= 16) {
-        Block16 head, tail;
-        std::memcpy(&head, from, 16);
-        std::memcpy(&tail, from + count - 16, 16);
-        std::memcpy(to, &head, 16);
-        std::memcpy(to + count - 16, &tail, 16);
+        CopyEnds<16>(to, from, count);
     } else if (count >= 8) {
-        uint64_t head, tail;
-        std::memcpy(&head, from, 8);
-        std::memcpy(&tail, from + count - 8, 8);
-        std::memcpy(to, &head, 8);
-        std::memcpy(to + count - 8, &tail, 8);
+        CopyEnds<8>(to, from, count);
     } else if (count >= 4) {
-        uint32_t head, tail;
-        std::memcpy(&head, from, 4);
-        std::memcpy(&tail, from + count - 4, 4);
-        std::memcpy(to, &head, 4);
-        std::memcpy(to + count - 4, &tail, 4);
+        CopyEnds<4>(to, from, count);
     } else if (count > 0) {
         to[0] = UInt8(from[0]);
         to[count / 2] = UInt8(from[count / 2]);
