@@ -1,6 +1,5 @@
-// URL and file utilities on real files in a temporary directory: normalised paths, ancestor
-// URLs, symbolic links, whole-file reads and writes, resource properties, type conformance
-// against a MIME database of the test's own, and the per-user configuration directories.
+// URL and file utilities on real files in a temporary directory, type conformance against a
+// MIME database of the test's own, and the per-user configuration directories.
 #include <cerrno>
 #include <fcntl.h>
 #include <string>
@@ -36,7 +35,12 @@ std::string Contents(const TCFBlob& data) {
     return std::string(reinterpret_cast<const char*>(data.GetPtr()), size_t(data.GetLength()));
 }
 
+std::string DirectoryURL(confstr_path_t name) {
+    return TextOf(Ref(TCFURL::CopyConfigurationDirectoryURL(name)).get());
+}
+
 class FileUtilities : public TemporaryDirectoryTest {};
+class ConfigurationDirectory : public TemporaryDirectoryTest {};
 
 } // namespace
 
@@ -191,9 +195,7 @@ TEST_F(FileUtilities, SymlinkTargetResolvesLinksAndDotsElseGivesTheInput) {
 
 TEST_F(FileUtilities, DataFromURLReadsWholeFilesAndIsNullForOtherItems) {
     for (size_t size : {10, 1000}) { // inside and beyond the reader's stack buffer
-        std::string contents;
-        for (size_t i = 0; i < size; ++i)
-            contents += char('0' + i % 10);
+        const std::string contents = Repeat("0123456789", size / 10);
         Ref url(NewFileURL(WriteFile("file" + std::to_string(size), contents)));
         EXPECT_EQ(Contents(TCFData(url.as<CFURLRef>())), contents);
     }
@@ -361,18 +363,6 @@ TEST_F(TypeConformance, ConformanceFollowsTheSubclassChain) {
     TCFURL missing(NewFileURL(PathOf("missing.ttf")), kAdopted);
     EXPECT_FALSE(missing.ConformsToUTI(CFSTR("font/ttf")));
 }
-
-namespace {
-
-class ConfigurationDirectory : public TemporaryDirectoryTest {
-protected:
-    std::string DirectoryURL(confstr_path_t name) {
-        Ref url(TCFURL::CopyConfigurationDirectoryURL(name));
-        return TextOf(url.get());
-    }
-};
-
-} // namespace
 
 TEST_F(ConfigurationDirectory, ComesFromTheEnvironmentAndIsCreatedWithMode0700) {
     WriteFile("occupied", "x");
