@@ -4,6 +4,7 @@
 #include <cstdio>
 #include <string>
 #include <sys/stat.h>
+#include <tuple>
 #include <vector>
 
 #include <gtest/gtest.h>
@@ -36,6 +37,17 @@ Ref DataOf(const std::vector<uint8_t>& bytes) {
 Ref PropertiesOf(const std::vector<uint8_t>& bytes) {
     Ref data = DataOf(bytes);
     return Ref(TCFBookmark::CopyPropertiesFromBookmarkData(data.as<CFDataRef>(), nullptr));
+}
+
+using Resolution = std::tuple<std::string, bool, CFIndex>; ///< URL, stale, error code (0: none)
+
+Resolution Resolve(CFTypeRef bookmark) {
+    Boolean stale = true;
+    CFErrorRef error = nullptr;
+    Ref url(TCFBookmark::CreateURLByResolvingBookmarkData(static_cast<CFDataRef>(bookmark), &stale,
+                                                          nullptr, nullptr, 0, &error));
+    Ref owned(error);
+    return {TextOf(url.get()), stale, error ? CFErrorGetCode(error) : 0};
 }
 
 class Bookmarks : public TemporaryDirectoryTest {
@@ -106,15 +118,7 @@ TEST(BookmarkRecord, MalformedFieldsAreRejected) {
 TEST(BookmarkRecord, NullAndNonDataInputsYieldNull) {
     EXPECT_EQ(TCFBookmark::CopyPropertiesFromBookmarkData(nullptr, nullptr), nullptr);
     EXPECT_EQ(TCFBookmark::CopyPropertyFromBookmarkData(nullptr, CFSTR("k")), nullptr);
-    CFErrorRef error = nullptr;
-    Boolean stale = true;
-    EXPECT_EQ(
-        TCFBookmark::CreateURLByResolvingBookmarkData(nullptr, &stale, nullptr, nullptr, 0, &error),
-        nullptr);
-    Ref owned(error);
-    EXPECT_FALSE(stale);
-    ASSERT_NE(error, nullptr);
-    EXPECT_EQ(CFErrorGetCode(error), EINVAL);
+    EXPECT_EQ(Resolve(nullptr), (Resolution{"<null>", false, EINVAL}));
 }
 
 TEST_F(Bookmarks, RecordsPathIdentityAndPropertiesReadWithoutTouchingTheFile) {
@@ -163,35 +167,18 @@ TEST_F(Bookmarks, RecordsPathIdentityAndPropertiesReadWithoutTouchingTheFile) {
 TEST_F(Bookmarks, ResolvesByPathAndReportsAReplacedItemAsStale) {
     std::string path = WriteFile("font.ttf", "first");
     Ref bookmark = Bookmark(path, nullptr);
-    ASSERT_TRUE(bookmark);
-
-    Boolean stale = true;
-    CFErrorRef error = nullptr;
-    Ref url(TCFBookmark::CreateURLByResolvingBookmarkData(bookmark.as<CFDataRef>(), &stale, nullptr,
-                                                          nullptr, 0, &error));
-    EXPECT_EQ(TextOf(url.get()), "file://" + path);
-    EXPECT_FALSE(stale);
-    EXPECT_EQ(error, nullptr);
-
+    EXPECT_EQ(Resolve(bookmark.get()), (Resolution{"file://" + path, false, 0}));
     // The replacement exists before the original goes, so it cannot reuse its inode.
     std::string replacement = WriteFile("replacement", "second");
     ASSERT_EQ(rename(replacement.c_str(), path.c_str()), 0);
-    Ref again(TCFBookmark::CreateURLByResolvingBookmarkData(bookmark.as<CFDataRef>(), &stale,
-                                                            nullptr, nullptr, 0, &error));
-    EXPECT_EQ(TextOf(again.get()), "file://" + path);
-    EXPECT_TRUE(stale);
-
+    EXPECT_EQ(Resolve(bookmark.get()), (Resolution{"file://" + path, true, 0}));
     ASSERT_EQ(remove(path.c_str()), 0);
-    EXPECT_EQ(TCFBookmark::CreateURLByResolvingBookmarkData(bookmark.as<CFDataRef>(), &stale,
-                                                            nullptr, nullptr, 0, &error),
-              nullptr);
-    ASSERT_NE(error, nullptr);
-    EXPECT_EQ(CFErrorGetCode(error), ENOENT);
-    CFRelease(error);
+    EXPECT_EQ(Resolve(bookmark.get()), (Resolution{"<null>", false, ENOENT}));
 }
 
 TEST_F(Bookmarks, DirectoryResolvesToADirectoryURLAndMissingOrNonFileItemsHaveNone) {
     Ref bookmark = Bookmark(directory_, nullptr, true);
+    // Without places for staleness and error.
     Ref url(TCFBookmark::CreateURLByResolvingBookmarkData(bookmark.as<CFDataRef>(), nullptr,
                                                           nullptr, nullptr, 0, nullptr));
     EXPECT_EQ(TextOf(url.get()), "file://" + directory_ + "/");

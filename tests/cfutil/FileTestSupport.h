@@ -5,7 +5,6 @@
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
-#include <optional>
 #include <string>
 
 #include <gtest/gtest.h>
@@ -51,7 +50,6 @@ protected:
     void TearDown() override {
         std::error_code ignored;
         std::filesystem::remove_all(directory_, ignored);
-        environment_.reset();
     }
 
     /// The path of `name` inside the temporary directory.
@@ -65,17 +63,8 @@ protected:
         return path;
     }
 
-    /// Sets (or, with null, unsets) an environment variable until the end of the test.
-    void SetEnvironment(const std::string& name, const char* value) {
-        if (!environment_)
-            environment_.emplace();
-        environment_->Set(name, value);
-    }
-
     std::string directory_;
-
-private:
-    std::optional<ScopedEnvironment> environment_;
+    ScopedEnvironment environment_; ///< variables a test sets, put back after it
 };
 
 } // namespace glyphwell::testing

@@ -49,14 +49,6 @@ TEST(StringUniquerCallbacks, CompareKeyBytesAndDescribeInBrackets) {
     EXPECT_EQ(Units(description.as<CFStringRef>()), u"[café]");
 }
 
-TEST(StringUniquer, NullAndEmptyInputsYieldNull) {
-    const TCFStringUniquer uniquer;
-    EXPECT_EQ(uniquer.GetUniqueString(static_cast<const char*>(nullptr), 3), nullptr);
-    EXPECT_EQ(uniquer.GetUniqueString("null-empty", 0), nullptr);
-    EXPECT_EQ(uniquer.GetUniqueString("null-negative", -1), nullptr);
-    EXPECT_EQ(uniquer.GetUniqueString(static_cast<CFStringRef>(nullptr)), nullptr);
-}
-
 TEST(StringUniquer, EqualTextsShareOneStringWhateverFormTheyComeIn) {
     const std::string first = "shared-text \xC3\xA9", second = first;
     CFStringRef unique = Unique(first);
@@ -136,39 +128,35 @@ TEST(StringUniquer, InvalidUtf8IsLoggedEveryTimeAndNotEntered) {
     EXPECT_TRUE(log.Texts().empty());
 }
 
-TEST(StringUniquer, StringWithoutUtf8FormOrTextIsReturnedUnchanged) {
+TEST(StringUniquer, NoTextGivesNullAndAStringWithoutUTF8FormOrTextComesBackUnchanged) {
+    const TCFStringUniquer uniquer;
+    EXPECT_EQ((std::vector{uniquer.GetUniqueString(static_cast<const char*>(nullptr), 3),
+                           uniquer.GetUniqueString("null-empty", 0),
+                           uniquer.GetUniqueString("null-negative", -1),
+                           uniquer.GetUniqueString(static_cast<CFStringRef>(nullptr))}),
+              std::vector<CFStringRef>(4, nullptr));
     const UniChar loneSurrogate[] = {u'a', 0xD800};
-    Ref unconvertible(CFStringCreateWithCharacters(nullptr, loneSurrogate, 2));
-    EXPECT_EQ(TCFStringUniquer().GetUniqueString(unconvertible.as<CFStringRef>()),
-              unconvertible.get());
-
-    Ref empty = Str("");
-    EXPECT_EQ(TCFStringUniquer().GetUniqueString(empty.as<CFStringRef>()), empty.get());
+    Ref unconvertible(CFStringCreateWithCharacters(nullptr, loneSurrogate, 2)), empty = Str("");
+    EXPECT_EQ(uniquer.GetUniqueString(unconvertible.as<CFStringRef>()), unconvertible.get());
+    EXPECT_EQ(uniquer.GetUniqueString(empty.as<CFStringRef>()), empty.get());
 }
 
 TEST(StringUniquer, ConcurrentCallersGetTheSameStringForEachNewText) {
     constexpr int kTexts = 10000;
-    constexpr int kThreads = 4;
-    std::vector<std::vector<CFStringRef>> results(kThreads);
+    std::vector<std::vector<CFStringRef>> results(4, std::vector<CFStringRef>(kTexts));
     std::vector<std::thread> threads;
-    for (int t = 0; t < kThreads; ++t) {
+    for (int t = 0; t < 4; ++t) {
+        // Half the threads go forwards, half backwards, so that they meet in the middle.
         threads.emplace_back([t, &results] {
-            const TCFStringUniquer uniquer;
-            std::vector<CFStringRef>& mine = results[size_t(t)];
-            mine.resize(kTexts);
-            // Half the threads go forwards, half backwards, so that they meet in the middle.
             for (int i = 0; i < kTexts; ++i) {
                 const int n = t % 2 ? kTexts - 1 - i : i;
-                const std::string text = "concurrent-" + std::to_string(n);
-                mine[size_t(n)] = uniquer.GetUniqueString(text.c_str(), CFIndex(text.size()));
+                results[size_t(t)][size_t(n)] = Unique("concurrent-" + std::to_string(n));
             }
         });
     }
     for (std::thread& thread : threads)
         thread.join();
-
-    for (int t = 1; t < kThreads; ++t)
-        ASSERT_EQ(results[size_t(t)], results[0]) << t;
+    EXPECT_EQ(std::vector(3, results[0]), std::vector(results.begin() + 1, results.end()));
     EXPECT_EQ(std::count(results[0].begin(), results[0].end(), nullptr), 0);
     EXPECT_EQ(Units(results[0][1234]), u"concurrent-1234");
     EXPECT_EQ(Unique("concurrent-9999"), results[0][9999]);

@@ -1,6 +1,5 @@
-// URL and file utilities on real files in a temporary directory: normalised paths, ancestor
-// URLs, symbolic links, whole-file reads and writes, resource properties, type conformance
-// against a MIME database of the test's own, and the per-user configuration directories.
+// URL and file utilities on real files in a temporary directory, type conformance against a
+// MIME database of the test's own, and the per-user configuration directories.
 #include <cerrno>
 #include <fcntl.h>
 #include <string>
@@ -36,7 +35,12 @@ std::string Contents(const TCFBlob& data) {
     return std::string(reinterpret_cast<const char*>(data.GetPtr()), size_t(data.GetLength()));
 }
 
+std::string DirectoryURL(confstr_path_t name) {
+    return TextOf(Ref(TCFURL::CopyConfigurationDirectoryURL(name)).get());
+}
+
 class FileUtilities : public TemporaryDirectoryTest {};
+class ConfigurationDirectory : public TemporaryDirectoryTest {};
 
 } // namespace
 
@@ -191,9 +195,7 @@ TEST_F(FileUtilities, SymlinkTargetResolvesLinksAndDotsElseGivesTheInput) {
 
 TEST_F(FileUtilities, DataFromURLReadsWholeFilesAndIsNullForOtherItems) {
     for (size_t size : {10, 1000}) { // inside and beyond the reader's stack buffer
-        std::string contents;
-        for (size_t i = 0; i < size; ++i)
-            contents += char('0' + i % 10);
+        const std::string contents = Repeat("0123456789", size / 10);
         Ref url(NewFileURL(WriteFile("file" + std::to_string(size), contents)));
         EXPECT_EQ(Contents(TCFData(url.as<CFURLRef>())), contents);
     }
@@ -294,8 +296,8 @@ protected:
                                             "font/ttf font/sfnt\n"
                                             "font/sfnt font/otf\n"); // a cycle must end
         std::filesystem::create_directories(PathOf("user"));
-        SetEnvironment("XDG_DATA_HOME", PathOf("user").c_str());
-        SetEnvironment("XDG_DATA_DIRS", ("relative/ignored:" + PathOf("system")).c_str());
+        environment_.Set("XDG_DATA_HOME", PathOf("user").c_str());
+        environment_.Set("XDG_DATA_DIRS", ("relative/ignored:" + PathOf("system")).c_str());
     }
 
     /// The URL of `name`, a file written now or (ending in a slash) a directory.
@@ -313,9 +315,10 @@ protected:
 
 } // namespace
 
-TEST_F(TypeConformance, TypeComesFromTheBestMatchingGlob) {
+TEST_F(TypeConformance, TypeComesFromTheBestMatchingGlobAndConformanceFollowsTheSubclassChain) {
     std::filesystem::create_directories(PathOf("folder.ttf"));
-    const std::pair<const char*, const char*> rows[] = {
+    std::filesystem::create_directories(PathOf("folder"));
+    const std::pair<const char*, const char*> types[] = {
         {"a.ttf", "font/ttf"},
         {"B.TTF", "font/ttf"},
         {"main.C", "text/x-c++src"},
@@ -325,19 +328,9 @@ TEST_F(TypeConformance, TypeComesFromTheBestMatchingGlob) {
         {"folder.ttf/", "inode/directory"},
         {"x.special.ttf", "application/x-special-font"},
     };
-    for (const auto& [name, type] : rows)
+    for (const auto& [name, type] : types)
         EXPECT_EQ(TypeOf(name), type) << name;
 
-    WriteFile("user/mime/globs2", "50:font/ttf:*.truetype\n"
-                                  "50:font/otf:__NOGLOBS__\n");
-    // The user's list replaces the system's, type by type.
-    EXPECT_EQ((Strings{TypeOf("a.truetype"), TypeOf("b.ttf"), TypeOf("b.otf"), TypeOf("b.ttc")}),
-              (Strings{"font/ttf", "application/octet-stream", "application/octet-stream",
-                       "font/collection"}));
-}
-
-TEST_F(TypeConformance, ConformanceFollowsTheSubclassChain) {
-    std::filesystem::create_directories(PathOf("folder"));
     const struct {
         const char* name;
         CFStringRef type;
@@ -360,22 +353,24 @@ TEST_F(TypeConformance, ConformanceFollowsTheSubclassChain) {
             << row.name << " " << TextOf(row.type);
     TCFURL missing(NewFileURL(PathOf("missing.ttf")), kAdopted);
     EXPECT_FALSE(missing.ConformsToUTI(CFSTR("font/ttf")));
+
+    WriteFile("user/mime/globs2", "50:font/ttf:*.truetype\n"
+                                  "50:font/otf:__NOGLOBS__\n");
+    // The user's list replaces the system's, type by type.
+    EXPECT_EQ((Strings{TypeOf("a.truetype"), TypeOf("b.ttf"), TypeOf("b.otf"), TypeOf("b.ttc")}),
+              (Strings{"font/ttf", "application/octet-stream", "application/octet-stream",
+                       "font/collection"}));
 }
 
-namespace {
-
-class ConfigurationDirectory : public TemporaryDirectoryTest {
-protected:
-    std::string DirectoryURL(confstr_path_t name) {
-        Ref url(TCFURL::CopyConfigurationDirectoryURL(name));
-        return TextOf(url.get());
-    }
-};
-
-} // namespace
-
-TEST_F(ConfigurationDirectory, ComesFromTheEnvironmentAndIsCreatedWithMode0700) {
+TEST_F(ConfigurationDirectory, ComesFromTheEnvironmentIsCreatedWithMode0700AndFitsIn1024Bytes) {
     WriteFile("occupied", "x");
+    // The path must fit in 1024 bytes with its terminator; nested 200-byte names make it long.
+    std::string parent = directory_;
+    while (parent.size() < 1023 - 201 - 10)
+        parent += "/" + std::string(200, 'd');
+    std::filesystem::create_directories(parent);
+    const std::string fits = parent + "/" + std::string(1023 - parent.size() - 1, 'f');
+    const std::string tooLong = fits.substr(0, 1022) + "gg";
     const struct {
         const char* variable;
         std::string value; // "-": unset
@@ -392,33 +387,19 @@ TEST_F(ConfigurationDirectory, ComesFromTheEnvironmentAndIsCreatedWithMode0700) 
         {"XDG_RUNTIME_DIR", "-", kUserRuntimeDirectory, "<null>"},
         {"XDG_RUNTIME_DIR", "relative/run", kUserRuntimeDirectory, "<null>"},
         {"XDG_RUNTIME_DIR", PathOf("no/parent"), kUserRuntimeDirectory, "<null>"},
+        {"XDG_CACHE_HOME", tooLong, kUserCacheDirectory, "<null>"},
+        {"XDG_CACHE_HOME", fits, kUserCacheDirectory, "file://" + fits + "/"},
     };
     for (const auto& row : rows) {
-        SetEnvironment(row.variable, row.value == "-" ? nullptr : row.value.c_str());
+        environment_.Set(row.variable, row.value == "-" ? nullptr : row.value.c_str());
         EXPECT_EQ(DirectoryURL(row.name), row.expected) << row.variable << "=" << row.value;
     }
     struct stat status;
     ASSERT_EQ(stat(PathOf("run").c_str(), &status), 0);
     EXPECT_TRUE(S_ISDIR(status.st_mode));
     EXPECT_EQ(status.st_mode & 0777, 0700u);
-}
-
-TEST_F(ConfigurationDirectory, PathMustFitIn1024BytesWithItsTerminator) {
-    // Nested 200-byte names bring the path to the lengths under test.
-    std::string parent = directory_;
-    while (parent.size() < 1023 - 201 - 10)
-        parent += "/" + std::string(200, 'd');
-    std::filesystem::create_directories(parent);
-    std::string fits = parent + "/" + std::string(1023 - parent.size() - 1, 'f');
-    ASSERT_EQ(fits.size(), 1023u);
-    std::string tooLong = fits + "g";
-
-    SetEnvironment("XDG_CACHE_HOME", tooLong.c_str());
-    EXPECT_EQ(DirectoryURL(kUserCacheDirectory), "<null>");
-    EXPECT_FALSE(std::filesystem::exists(tooLong));
-    EXPECT_FALSE(std::filesystem::exists(fits)); // not even the cut-short path
-
-    SetEnvironment("XDG_CACHE_HOME", fits.c_str());
-    EXPECT_EQ(DirectoryURL(kUserCacheDirectory), "file://" + fits + "/");
+    EXPECT_EQ(fits.size(), 1023u);
     EXPECT_TRUE(std::filesystem::is_directory(fits));
+    EXPECT_FALSE(std::filesystem::exists(tooLong));
+    EXPECT_FALSE(std::filesystem::exists(tooLong.substr(0, 1023))); // not even cut short
 }

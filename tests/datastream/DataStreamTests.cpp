@@ -40,16 +40,13 @@ Fields HeaderAt(QZDataStreamRef stream, CFIndex position) {
     return {h.segmentID, h.start, h.length, h.position, h.parent, h.count};
 }
 
-struct StreamFree {
-    void operator()(QZDataStreamRef stream) const { QZDataStreamFree(stream); }
-};
-using Stream = std::unique_ptr<QZDataStream, StreamFree>;
+using Stream = std::unique_ptr<QZDataStream, decltype(&QZDataStreamFree)>;
 
 /// A stream over a copy of `bytes`, as another process would receive a buffer.
 Stream WithBytes(const Bytes& bytes) {
     CFMutableDataRef data = CFDataCreateMutable(kCFAllocatorDefault, 0);
     CFDataAppendBytes(data, bytes.data(), CFIndex(bytes.size()));
-    Stream stream(QZDataStreamWithData(data));
+    Stream stream(QZDataStreamWithData(data), QZDataStreamFree);
     CFRelease(data);
     return stream;
 }
