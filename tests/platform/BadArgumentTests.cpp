@@ -42,6 +42,8 @@ TEST(BadArguments, CallsGiveNullChangeNothingAndNameThePublicFunction) {
     static const int value = 1;
     const CFStringRef text = CFSTR("abc");
     CFMutableStringRef immutable = const_cast<CFMutableStringRef>(CFSTR("abc"));
+    auto edited = Own(CFStringCreateMutableCopy(nullptr, 0, text));
+    CFIndex used = -1;
     const void* tokens[] = {Token(1), Token(2)};
     auto array = Own(const_cast<CFMutableArrayRef>(CFArrayCreate(nullptr, tokens, 2, nullptr)));
     auto dictionary = Own(const_cast<CFMutableDictionaryRef>(
@@ -96,6 +98,14 @@ TEST(BadArguments, CallsGiveNullChangeNothingAndNameThePublicFunction) {
         {"CFURLCopyAbsoluteURL", [] { return CFURLCopyAbsoluteURL(nullptr); }},
         {"CFStringGetLength", [] { return CFStringGetLength(nullptr) ? kCFNull : nullptr; }},
         {"CFStringAppend", Void([&] { CFStringAppend(immutable, CFSTR("d")); })},
+        {"CFStringDelete", Void([&] { CFStringDelete(edited.get(), CFRangeMake(2, 5)); })},
+        {"CFStringGetBytes",
+         [&] {
+             return CFStringGetBytes(text, CFRangeMake(2, 2), kCFStringEncodingUTF8, 0, false,
+                                     nullptr, 0, &used)
+                        ? kCFNull
+                        : nullptr;
+         }},
         {"CFURLGetString", [] { return CFTypeRef(CFURLGetString(nullptr)); }},
         {"CFCharacterSetIsLongCharacterMember",
          [] { return CFCharacterSetIsLongCharacterMember(nullptr, 'a') ? kCFNull : nullptr; }},
@@ -170,9 +180,10 @@ TEST(BadArguments, CallsGiveNullChangeNothingAndNameThePublicFunction) {
                                 size_t(CFDataGetLength(data.get())));
     EXPECT_EQ(std::make_tuple(CFArrayGetCount(array.get()), CFDictionaryGetCount(dictionary.get()),
                               CFSetGetCount(set.get()), CFDataGetLength(frozen.get()), dataBytes,
-                              buffer[0], number, destroyed, CFStringGetLength(immutable),
+                              buffer[0], number, destroyed, CFStringGetLength(immutable), used,
+                              CFStringGetLength(edited.get()),
                               bool(CFCharacterSetIsCharacterMember(characters.get(), 'z'))),
-              std::make_tuple(2, 0, 1, 1, "abc", '-', 7, 1, 3, false));
+              std::make_tuple(2, 0, 1, 1, "abc", '-', 7, 1, 3, 0, 3, false));
 }
 
 } // namespace
