@@ -36,6 +36,8 @@ TEST(CFSet, CreateKeepsFirstOfEqualValues) {
     EXPECT_EQ(RetainCounts({five.get(), six.get()}), (Counts{1, 1}));
 }
 
+// Order after removal and releases are the hashed table's, tested with dictionaries; a set adds
+// its own modes of storing a member equal to one it holds.
 TEST(CFSet, AddSetAndReplaceTreatEqualMembersDifferently) {
     auto one = MakeInt(101), otherOne = MakeNumber(kCFNumberSInt8Type, int8_t(101));
     auto two = MakeInt(102), three = MakeInt(103);
@@ -53,21 +55,8 @@ TEST(CFSet, AddSetAndReplaceTreatEqualMembersDifferently) {
     CFSetReplaceValue(set.get(), three.get()); // absent: nothing
     CFSetReplaceValue(set.get(), one.get());
     CFSetSetValue(set.get(), three.get()); // absent: added
-    EXPECT_EQ(membersOf(set.get()), (std::vector<const void*>{one.get(), two.get(), three.get()}));
-    EXPECT_EQ(CFGetRetainCount(otherOne.get()), 1);
-}
-
-TEST(CFSet, EnumeratesInInsertionOrderAfterRemovalAndReleases) {
-    auto a = MakeText("a"), b = MakeText("b"), c = MakeText("c"), d = MakeText("d");
-    auto set = Own(CFSetCreateMutable(nullptr, 0, &kCFTypeSetCallBacks));
-    for (CFStringRef member : {a.get(), b.get(), c.get(), d.get()})
-        CFSetAddValue(set.get(), member);
-    auto alsoB = MakeText("b");
-    CFSetRemoveValue(set.get(), alsoB.get());
-    CFSetRemoveValue(set.get(), alsoB.get());
-    EXPECT_EQ(CFGetRetainCount(b.get()), 1);
-    EXPECT_FALSE(CFSetContainsValue(set.get(), b.get()));
-    CFSetAddValue(set.get(), b.get());
+    CFSetRemoveValue(set.get(), two.get());
+    CFSetAddValue(set.get(), two.get());
     std::vector<const void*> visited;
     CFSetApplyFunction(
         set.get(),
@@ -75,11 +64,12 @@ TEST(CFSet, EnumeratesInInsertionOrderAfterRemovalAndReleases) {
             static_cast<std::vector<const void*>*>(context)->push_back(value);
         },
         &visited);
-    EXPECT_EQ(visited, (std::vector<const void*>{a.get(), c.get(), d.get(), b.get()}));
+    EXPECT_EQ(visited, (std::vector<const void*>{one.get(), three.get(), two.get()}));
     EXPECT_EQ(membersOf(set.get()), visited);
+    EXPECT_EQ(CFGetRetainCount(otherOne.get()), 1);
     CFSetRemoveAllValues(set.get());
     EXPECT_EQ(CFSetGetCount(set.get()), 0);
-    EXPECT_EQ(RetainCounts({a.get(), b.get()}), (Counts{1, 1}));
+    EXPECT_EQ(RetainCounts({one.get(), two.get(), three.get()}), (Counts{1, 1, 1}));
 }
 
 TEST(CFSet, NullCallbacksUsePointerIdentity) {
