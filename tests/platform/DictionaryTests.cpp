@@ -44,8 +44,8 @@ Pairs pairsOf(CFDictionaryRef dictionary) {
 } // namespace
 
 TEST(CFDictionary, RetainsKeysAndValuesAndGivesThemBack) {
-    auto key = MakeText("key");
-    auto first = MakeInt(101), second = MakeInt(102);
+    auto key = Str("key");
+    auto first = Num(kCFNumberIntType, 101), second = Num(kCFNumberIntType, 102);
     auto dictionary = makeMutable();
     CFDictionarySetValue(dictionary.get(), key.get(), first.get());
     EXPECT_EQ(RetainCounts({key.get(), first.get()}), (Counts{2, 2}));
@@ -64,8 +64,9 @@ TEST(CFDictionary, RetainsKeysAndValuesAndGivesThemBack) {
 }
 
 TEST(CFDictionary, CreateWithRepeatedKeyKeepsLastValueInFirstPlace) {
-    auto a = MakeText("a"), b = MakeText("b"), alsoA = MakeText("a");
-    auto v1 = MakeInt(101), v2 = MakeInt(102), v3 = MakeInt(103);
+    auto a = Str("a"), b = Str("b"), alsoA = Str("a");
+    auto v1 = Num(kCFNumberIntType, 101), v2 = Num(kCFNumberIntType, 102),
+         v3 = Num(kCFNumberIntType, 103);
     auto dictionary =
         makeDictionary({{a.get(), v1.get()}, {b.get(), v2.get()}, {alsoA.get(), v3.get()}});
     EXPECT_EQ(pairsOf(dictionary.get()), (Pairs{{a.get(), v3.get()}, {b.get(), v2.get()}}));
@@ -73,10 +74,10 @@ TEST(CFDictionary, CreateWithRepeatedKeyKeepsLastValueInFirstPlace) {
 }
 
 TEST(CFDictionary, ReplacingAndRemovingKeepOrder) {
-    auto a = MakeText("a"), b = MakeText("b"), c = MakeText("c"), d = MakeText("d");
-    auto one = MakeInt(101), two = MakeInt(102);
+    auto a = Str("a"), b = Str("b"), c = Str("c"), d = Str("d");
+    auto one = Num(kCFNumberIntType, 101), two = Num(kCFNumberIntType, 102);
     auto dictionary = makeMutable();
-    for (CFStringRef key : {a.get(), b.get(), c.get()})
+    for (CFTypeRef key : {a.get(), b.get(), c.get()})
         CFDictionaryAddValue(dictionary.get(), key, one.get());
     CFDictionarySetValue(dictionary.get(), a.get(), two.get());
     CFDictionaryReplaceValue(dictionary.get(), b.get(), two.get());
@@ -108,10 +109,10 @@ TEST(CFDictionary, ReplacingAndRemovingKeepOrder) {
 }
 
 TEST(CFDictionary, EqualKeysAreOneKeyNumbersAndArraysAlike) {
-    auto byteOne = MakeNumber(kCFNumberSInt8Type, int8_t(1));
-    auto doubleOne = MakeNumber(kCFNumberFloat64Type, 1.0);
-    auto longOne = MakeNumber(kCFNumberLongType, 1L);
-    auto half = MakeNumber(kCFNumberFloat32Type, 0.5f);
+    auto byteOne = Num(kCFNumberSInt8Type, int8_t(1));
+    auto doubleOne = Num(kCFNumberFloat64Type, 1.0);
+    auto longOne = Num(kCFNumberLongType, 1L);
+    auto half = Num(kCFNumberFloat32Type, 0.5f);
     auto dictionary = makeMutable();
     CFDictionarySetValue(dictionary.get(), byteOne.get(), CFSTR("first"));
     CFDictionarySetValue(dictionary.get(), half.get(), CFSTR("half"));
@@ -131,7 +132,7 @@ TEST(CFDictionary, EqualKeysAreOneKeyNumbersAndArraysAlike) {
 }
 
 TEST(CFDictionary, NullCallbacksTakeNullAndLeaveCounts) {
-    auto five = MakeInt(105), otherFive = MakeInt(105);
+    auto five = Num(kCFNumberIntType, 105), otherFive = Num(kCFNumberIntType, 105);
     auto dictionary = makeDictionary({{five.get(), nullptr}, {nullptr, Token(7)}}, false);
     EXPECT_EQ(CFGetRetainCount(five.get()), 1);
     const void* value = Token(1);
@@ -153,15 +154,15 @@ TEST(CFDictionary, NullCallbacksTakeNullAndLeaveCounts) {
 // adding them back (in reverse) gives an equal dictionary.
 TEST(CFDictionary, LargeDictionaryFindsEveryKey) {
     const int count = 100000;
-    std::vector<Owned<CFStringRef>> owned;
+    std::vector<Ref> owned;
     std::vector<const void*> keys;
     for (int i = 0; i < count; ++i) {
-        owned.push_back(MakeText(("key" + std::to_string(i)).c_str()));
+        owned.push_back(Str("key" + std::to_string(i)));
         keys.push_back(owned.back().get());
     }
     auto dictionary = Own(CFDictionaryCreate(nullptr, keys.data(), keys.data(), count,
                                              &kCFTypeDictionaryKeyCallBacks, nullptr));
-    EXPECT_EQ(CFDictionaryGetValue(dictionary.get(), MakeText("key4242").get()), keys[4242]);
+    EXPECT_EQ(CFDictionaryGetValue(dictionary.get(), Str("key4242").get()), keys[4242]);
     auto edited = Own(CFDictionaryCreateMutableCopy(nullptr, 0, dictionary.get()));
     for (int i = 0; i < count; i += 3)
         CFDictionaryRemoveValue(edited.get(), keys[size_t(i)]);
@@ -186,9 +187,9 @@ TEST(CFDictionary, LookupsHoldWhileGrowingAndShrinkingAcrossEightPairs) {
     // past eight pairs (removed pairs count until compacted); every lookup must agree with a
     // plain model throughout.
     const int keyCount = 20;
-    std::vector<Owned<CFNumberRef>> keys;
+    std::vector<Ref> keys;
     for (int i = 0; i < keyCount; ++i)
-        keys.push_back(MakeInt(100 + i));
+        keys.push_back(Num(kCFNumberIntType, 100 + i));
     auto dictionary = makeMutable();
     std::vector<bool> present(keyCount, false);
     uint32_t state = 12345;
@@ -206,7 +207,7 @@ TEST(CFDictionary, LookupsHoldWhileGrowingAndShrinkingAcrossEightPairs) {
         }
         CFIndex expected = 0;
         for (int i = 0; i < keyCount; ++i) {
-            auto probe = MakeInt(100 + i); // an equal key, not the same object
+            auto probe = Num(kCFNumberIntType, 100 + i); // an equal key, not the same object
             ASSERT_EQ(CFDictionaryContainsKey(dictionary.get(), probe.get()), present[size_t(i)])
                 << "step " << step << ", key " << i;
             expected += present[size_t(i)];

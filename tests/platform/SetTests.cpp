@@ -6,6 +6,7 @@
 #include "platform/PropertyValues.h"
 #include "support/LogCapture.h"
 #include "tests/platform/ContainerTestSupport.h"
+#include "tests/support/Values.h"
 
 using namespace glyphwell::testing;
 
@@ -25,8 +26,8 @@ std::vector<const void*> membersOf(CFSetRef set) {
 } // namespace
 
 TEST(CFSet, CreateKeepsFirstOfEqualValues) {
-    auto five = MakeInt(105), wideFive = MakeNumber(kCFNumberSInt64Type, int64_t(105));
-    auto realFive = MakeNumber(kCFNumberFloat32Type, 105.0f), six = MakeInt(106);
+    auto five = Num(kCFNumberIntType, 105), wideFive = Num(kCFNumberSInt64Type, int64_t(105));
+    auto realFive = Num(kCFNumberFloat32Type, 105.0f), six = Num(kCFNumberIntType, 106);
     auto set = makeSet({five.get(), wideFive.get(), six.get(), realFive.get()});
     EXPECT_EQ(CFSetGetCount(set.get()), 2);
     EXPECT_EQ(CFSetGetValue(set.get(), realFive.get()), five.get());
@@ -39,8 +40,8 @@ TEST(CFSet, CreateKeepsFirstOfEqualValues) {
 // Order after removal and releases are the hashed table's, tested with dictionaries; a set adds
 // its own modes of storing a member equal to one it holds.
 TEST(CFSet, AddSetAndReplaceTreatEqualMembersDifferently) {
-    auto one = MakeInt(101), otherOne = MakeNumber(kCFNumberSInt8Type, int8_t(101));
-    auto two = MakeInt(102), three = MakeInt(103);
+    auto one = Num(kCFNumberIntType, 101), otherOne = Num(kCFNumberSInt8Type, int8_t(101));
+    auto two = Num(kCFNumberIntType, 102), three = Num(kCFNumberIntType, 103);
     auto set = Own(CFSetCreateMutable(nullptr, 0, &kCFTypeSetCallBacks));
     CFSetAddValue(set.get(), one.get());
     CFSetAddValue(set.get(), two.get());
@@ -73,7 +74,7 @@ TEST(CFSet, AddSetAndReplaceTreatEqualMembersDifferently) {
 }
 
 TEST(CFSet, NullCallbacksUsePointerIdentity) {
-    auto five = MakeInt(105), otherFive = MakeInt(105);
+    auto five = Num(kCFNumberIntType, 105), otherFive = Num(kCFNumberIntType, 105);
     auto set = makeSet({five.get(), otherFive.get(), nullptr, five.get()}, nullptr);
     EXPECT_EQ(CFSetGetCount(set.get()), 3);
     EXPECT_TRUE(CFSetContainsValue(set.get(), nullptr));
