@@ -15,17 +15,6 @@ namespace {
 
 using Pairs = std::vector<std::pair<const void*, const void*>>;
 
-Owned<CFDictionaryRef> makeDictionary(const Pairs& pairs, bool standardCallBacks = true) {
-    std::vector<const void*> keys, values;
-    for (const auto& [key, value] : pairs) {
-        keys.push_back(key);
-        values.push_back(value);
-    }
-    return Own(CFDictionaryCreate(nullptr, keys.data(), values.data(), CFIndex(keys.size()),
-                                  standardCallBacks ? &kCFTypeDictionaryKeyCallBacks : nullptr,
-                                  standardCallBacks ? &kCFTypeDictionaryValueCallBacks : nullptr));
-}
-
 Owned<CFMutableDictionaryRef> makeMutable() {
     return Own(CFDictionaryCreateMutable(nullptr, 0, &kCFTypeDictionaryKeyCallBacks,
                                          &kCFTypeDictionaryValueCallBacks));
@@ -67,9 +56,9 @@ TEST(CFDictionary, CreateWithRepeatedKeyKeepsLastValueInFirstPlace) {
     auto a = Str("a"), b = Str("b"), alsoA = Str("a");
     auto v1 = Num(kCFNumberIntType, 101), v2 = Num(kCFNumberIntType, 102),
          v3 = Num(kCFNumberIntType, 103);
-    auto dictionary =
-        makeDictionary({{a.get(), v1.get()}, {b.get(), v2.get()}, {alsoA.get(), v3.get()}});
-    EXPECT_EQ(pairsOf(dictionary.get()), (Pairs{{a.get(), v3.get()}, {b.get(), v2.get()}}));
+    Ref dictionary = Dict({{a.get(), v1.get()}, {b.get(), v2.get()}, {alsoA.get(), v3.get()}});
+    EXPECT_EQ(pairsOf(dictionary.as<CFDictionaryRef>()),
+              (Pairs{{a.get(), v3.get()}, {b.get(), v2.get()}}));
     EXPECT_EQ(RetainCounts({v1.get(), alsoA.get()}), (Counts{1, 1}));
 }
 
@@ -133,7 +122,8 @@ TEST(CFDictionary, EqualKeysAreOneKeyNumbersAndArraysAlike) {
 
 TEST(CFDictionary, NullCallbacksTakeNullAndLeaveCounts) {
     auto five = Num(kCFNumberIntType, 105), otherFive = Num(kCFNumberIntType, 105);
-    auto dictionary = makeDictionary({{five.get(), nullptr}, {nullptr, Token(7)}}, false);
+    const void *created[] = {five.get(), nullptr}, *values[] = {nullptr, Token(7)};
+    auto dictionary = Own(CFDictionaryCreate(nullptr, created, values, 2, nullptr, nullptr));
     EXPECT_EQ(CFGetRetainCount(five.get()), 1);
     const void* value = Token(1);
     EXPECT_TRUE(CFDictionaryGetValueIfPresent(dictionary.get(), five.get(), &value));
