@@ -168,13 +168,14 @@ TEST(StringGetBytes, ConvertsWholeUnitsIntoTheBufferAndReportsHowFarItGot) {
 }
 
 TEST(StringSizes, MaximumSizesPerEncodingAndFileSystemRepresentation) {
-    EXPECT_EQ(
-        (std::vector<CFIndex>{CFStringGetMaximumSizeForEncoding(10, kCFStringEncodingUTF8),
-                              CFStringGetMaximumSizeForEncoding(10, kCFStringEncodingUTF16),
-                              CFStringGetMaximumSizeForEncoding(10, kCFStringEncodingUTF32LE),
-                              CFStringGetMaximumSizeForEncoding(10, kCFStringEncodingMacRoman),
-                              CFStringGetMaximumSizeForEncoding(10, kCFStringEncodingInvalidId)}),
-        (std::vector<CFIndex>{30, 20, 40, 10, kCFNotFound}));
+    const std::pair<CFStringEncoding, CFIndex> sizes[] = {
+        {kCFStringEncodingUTF8, 30},
+        {kCFStringEncodingUTF16, 20},
+        {kCFStringEncodingUTF32LE, 40},
+        {kCFStringEncodingMacRoman, 10},
+        {kCFStringEncodingInvalidId, kCFNotFound}};
+    for (const auto& [encoding, size] : sizes)
+        EXPECT_EQ(CFStringGetMaximumSizeForEncoding(10, encoding), size) << encoding;
     auto path = FromBytes("/tmp/\xC3\xA9", kCFStringEncodingUTF8);
     EXPECT_EQ(CFStringGetMaximumSizeOfFileSystemRepresentation(path.get()), 19);
     char exact[8];
@@ -231,17 +232,15 @@ TEST(StringCompare, OrdersByUnitsFoldsOnlyASCIILettersAndFindsWithOptions) {
         CFStringRef find;
         CFOptionFlags options;
         CFIndex location, length;
-    } finds[] = {
-        {CFSTR("bc"), 0, 1, 2},
-        {CFSTR("bc"), back, 4, 2},
-        {CFSTR("bc"), anchored, -1, 0},
-        {CFSTR("ab"), anchored, 0, 2},
-        {CFSTR("bc"), anchored | back, 4, 2},
-        {CFSTR("BC"), fold, 1, 2},
-        {CFSTR("BC"), 0, -1, 0},
-        {CFSTR(""), 0, -1, 0},
-        {CFSTR("abcabcd"), 0, -1, 0},
-    };
+    } finds[] = {{CFSTR("bc"), 0, 1, 2},
+                 {CFSTR("bc"), back, 4, 2},
+                 {CFSTR("bc"), anchored, -1, 0},
+                 {CFSTR("ab"), anchored, 0, 2},
+                 {CFSTR("bc"), anchored | back, 4, 2},
+                 {CFSTR("BC"), fold, 1, 2},
+                 {CFSTR("BC"), 0, -1, 0},
+                 {CFSTR(""), 0, -1, 0},
+                 {CFSTR("abcabcd"), 0, -1, 0}};
     CFStringRef text = CFSTR("abcabc");
     for (const auto& row : finds) {
         const CFRange range = CFStringFind(text, row.find, row.options);
