@@ -6,6 +6,7 @@
 #include "platform/PropertyValues.h"
 #include "support/LogCapture.h"
 #include "tests/platform/ContainerTestSupport.h"
+#include "tests/support/Values.h"
 
 using namespace glyphwell::testing;
 using Tokens = std::vector<intptr_t>;
@@ -42,7 +43,7 @@ Tokens TokensOf(CFArrayRef array) {
 } // namespace
 
 TEST(CFArray, RetainsWhatItHoldsAndCopiesAreIndependent) {
-    auto one = MakeInt(101), two = MakeInt(102);
+    auto one = Num(kCFNumberIntType, 101), two = Num(kCFNumberIntType, 102);
     auto array = Own(CFArrayCreateMutable(nullptr, 0, &kCFTypeArrayCallBacks));
     CFArrayAppendValue(array.get(), one.get());
     CFArrayInsertValueAtIndex(array.get(), 0, one.get());
@@ -71,7 +72,7 @@ TEST(CFArray, RetainsWhatItHoldsAndCopiesAreIndependent) {
 }
 
 TEST(CFArray, NullCallbacksKeepCountsAndCompareByPointer) {
-    auto five = MakeInt(105), otherFive = MakeInt(105);
+    auto five = Num(kCFNumberIntType, 105), otherFive = Num(kCFNumberIntType, 105);
     const void* values[] = {five.get(), nullptr};
     auto array = Own(CFArrayCreate(nullptr, values, 2, nullptr));
     EXPECT_EQ(CFGetRetainCount(five.get()), 1);
@@ -85,7 +86,7 @@ TEST(CFArray, NullCallbacksKeepCountsAndCompareByPointer) {
 }
 
 TEST(CFArray, FindsCountsAndVisitsValuesWithinRange) {
-    auto x = MakeText("x"), y = MakeText("y"), alsoX = MakeText("x");
+    auto x = Str("x"), y = Str("y"), alsoX = Str("x");
     const void* values[] = {x.get(), y.get(), x.get(), y.get(), x.get()};
     auto array = Own(CFArrayCreate(nullptr, values, 5, &kCFTypeArrayCallBacks));
     EXPECT_EQ(CFArrayGetCountOfValue(array.get(), CFRangeMake(0, 5), alsoX.get()), 3);

@@ -17,13 +17,13 @@ using glyphwell::testing::Token;
 
 struct BadCall {
     const char* function; ///< the public function the report must name
-    std::function<CFTypeRef()> call;
+    std::function<const void*()> call;
     const char* condition = nullptr; ///< what the report's second line names (null: not checked)
 };
 
 /// A call that gives nothing, as a row's call.
-template <class F> std::function<CFTypeRef()> Void(F call) {
-    return [call] { return call(), CFTypeRef(); };
+template <class F> std::function<const void*()> Void(F call) {
+    return [call] { return call(), nullptr; };
 }
 
 struct Counting : CFKindPayload {
@@ -42,6 +42,8 @@ TEST(BadArguments, CallsGiveNullChangeNothingAndNameThePublicFunction) {
     static const int value = 1;
     const CFStringRef text = CFSTR("abc");
     CFMutableStringRef immutable = const_cast<CFMutableStringRef>(CFSTR("abc"));
+    auto edited = Own(CFStringCreateMutableCopy(nullptr, 0, text));
+    CFIndex used = -1;
     const void* tokens[] = {Token(1), Token(2)};
     auto array = Own(const_cast<CFMutableArrayRef>(CFArrayCreate(nullptr, tokens, 2, nullptr)));
     auto dictionary = Own(const_cast<CFMutableDictionaryRef>(
@@ -94,19 +96,23 @@ TEST(BadArguments, CallsGiveNullChangeNothingAndNameThePublicFunction) {
         {"CFNumberCreate", [] { return CFNumberCreate(nullptr, kCFNumberIntType, nullptr); }},
         {"CFURLCreateWithString", [] { return CFURLCreateWithString(nullptr, nullptr, nullptr); }},
         {"CFURLCopyAbsoluteURL", [] { return CFURLCopyAbsoluteURL(nullptr); }},
-        {"CFStringGetLength", [] { return CFStringGetLength(nullptr) ? kCFNull : nullptr; }},
+        {"CFStringGetLength", [] { return Token(intptr_t(CFStringGetLength(nullptr))); }},
         {"CFStringAppend", Void([&] { CFStringAppend(immutable, CFSTR("d")); })},
+        {"CFStringDelete", Void([&] { CFStringDelete(edited.get(), CFRangeMake(2, 5)); })},
+        {"CFStringGetBytes",
+         [&] {
+             return Token(intptr_t(CFStringGetBytes(text, CFRangeMake(2, 2), kCFStringEncodingUTF8,
+                                                    0, false, nullptr, 0, &used)));
+         }},
         {"CFURLGetString", [] { return CFTypeRef(CFURLGetString(nullptr)); }},
         {"CFCharacterSetIsLongCharacterMember",
-         [] { return CFCharacterSetIsLongCharacterMember(nullptr, 'a') ? kCFNull : nullptr; }},
+         [] { return Token(intptr_t(CFCharacterSetIsLongCharacterMember(nullptr, 'a'))); }},
         {"CFCharacterSetAddCharactersInRange",
          Void([&] { CFCharacterSetAddCharactersInRange(characters.get(), CFRangeMake('z', 1)); })},
         {"CFNumberGetValue",
          [&] {
-             return CFNumberGetValue(reinterpret_cast<CFNumberRef>(kCFBooleanTrue),
-                                     kCFNumberSInt32Type, &number)
-                        ? kCFNull
-                        : nullptr;
+             return Token(intptr_t(CFNumberGetValue(reinterpret_cast<CFNumberRef>(kCFBooleanTrue),
+                                                    kCFNumberSInt32Type, &number)));
          },
          "object != nullptr"},
         {"CFArrayAppendValue", Void([&] { CFArrayAppendValue(array.get(), Token(3)); }),
@@ -116,8 +122,8 @@ TEST(BadArguments, CallsGiveNullChangeNothingAndNameThePublicFunction) {
         {"CFArrayGetValueAtIndex", [&] { return CFArrayGetValueAtIndex(array.get(), -1); }},
         {"CFArrayGetCountOfValue",
          [&] {
-             return CFArrayGetCountOfValue(array.get(), CFRangeMake(1, 2), tokens[1]) ? kCFNull
-                                                                                      : nullptr;
+             return Token(
+                 intptr_t(CFArrayGetCountOfValue(array.get(), CFRangeMake(1, 2), tokens[1])));
          },
          "range lies inside the collection"},
         {"CFDictionarySetValue",
@@ -146,7 +152,7 @@ TEST(BadArguments, CallsGiveNullChangeNothingAndNameThePublicFunction) {
         {"DataReserveTail",
          [&] { return CFTypeRef(glyphwell::DataReserveTail(data.get(), -1).bytes); }},
         {"DataCommitTail", Void([&] { glyphwell::DataCommitTail(data.get(), CFIndex(1) << 40); })},
-        {"CFKindRegister", [] { return CFKindRegister("", nullptr) ? kCFNull : nullptr; }},
+        {"CFKindRegister", [] { return Token(intptr_t(CFKindRegister("", nullptr))); }},
         {"CFKindCreateValue",
          [&] { return CFKindCreateValue(3, std::make_unique<Counting>(&destroyed)); }},
         {"CFKindCreateValue",
@@ -170,9 +176,10 @@ TEST(BadArguments, CallsGiveNullChangeNothingAndNameThePublicFunction) {
                                 size_t(CFDataGetLength(data.get())));
     EXPECT_EQ(std::make_tuple(CFArrayGetCount(array.get()), CFDictionaryGetCount(dictionary.get()),
                               CFSetGetCount(set.get()), CFDataGetLength(frozen.get()), dataBytes,
-                              buffer[0], number, destroyed, CFStringGetLength(immutable),
+                              buffer[0], number, destroyed, CFStringGetLength(immutable), used,
+                              CFStringGetLength(edited.get()),
                               bool(CFCharacterSetIsCharacterMember(characters.get(), 'z'))),
-              std::make_tuple(2, 0, 1, 1, "abc", '-', 7, 1, 3, false));
+              std::make_tuple(2, 0, 1, 1, "abc", '-', 7, 1, 3, 0, 3, false));
 }
 
 } // namespace

@@ -21,18 +21,6 @@ template <class Ref> Owned<Ref> Own(Ref value) {
     return Owned<Ref>(value);
 }
 
-/// A new number of type `type` holding `value` converted to that type.
-template <class T> Owned<CFNumberRef> MakeNumber(CFNumberType type, T value) {
-    return Own(CFNumberCreate(nullptr, type, &value));
-}
-inline Owned<CFNumberRef> MakeInt(int value) {
-    return MakeNumber(kCFNumberIntType, value);
-}
-
-inline Owned<CFStringRef> MakeText(const char* text) {
-    return Own(CFStringCreateWithCString(nullptr, text, kCFStringEncodingUTF8));
-}
-
 using Counts = std::vector<CFIndex>;
 
 /// The retain counts of `values`, in order, for one-line checks.

@@ -2,12 +2,14 @@
 
 #include <cstdlib>
 #include <cstring>
+#include <functional>
 #include <string>
 #include <vector>
 
 #include "platform/CFData.h"
 #include "platform/Log.h"
 #include "tests/platform/ContainerTestSupport.h"
+#include "tests/support/Values.h"
 
 namespace {
 
@@ -82,41 +84,33 @@ TEST(MutableData, SetLengthReplaceAndDeleteCutOrGrowInPlaceAlsoWithBytesFromItse
         CFDataSetLength(data, 0);
         CFDataAppendBytes(data, U(text), CFIndex(std::strlen(text)));
     };
+    const std::pair<std::function<void()>, std::string> steps[] = {
+        {[&] { CFDataSetLength(data, 2); }, "ab"},
+        {[&] { CFDataSetLength(data, 5); }, std::string("ab\0\0\0", 5)},
+        {[&] { CFDataIncreaseLength(data, 2); }, std::string("ab\0\0\0\0\0", 7)},
+        {[&] { CFDataGetMutableBytePtr(data)[6] = 'z'; }, std::string("ab\0\0\0\0z", 7)},
+        // Replacing grows or shrinks the range.
+        {[&] { CFDataReplaceBytes(data, CFRangeMake(0, 7), U("abcdef"), 6); }, "abcdef"},
+        {[&] { CFDataReplaceBytes(data, CFRangeMake(1, 2), U("XYZW"), 4); }, "aXYZWdef"},
+        {[&] { CFDataReplaceBytes(data, CFRangeMake(0, 5), U("-"), 1); }, "-def"},
+        {[&] { CFDataReplaceBytes(data, CFRangeMake(4, 0), U("!"), 1); }, "-def!"},
+        {[&] { CFDataDeleteBytes(data, CFRangeMake(1, 3)); }, "-!"},
+        {[&] { CFDataDeleteBytes(data, CFRangeMake(0, 2)); }, ""},
+    };
     Fill("abcdef");
-    CFDataSetLength(data, 2);
-    EXPECT_EQ(Bytes(data), "ab");
-    CFDataSetLength(data, 5);
-    EXPECT_EQ(Bytes(data), std::string("ab\0\0\0", 5));
-    CFDataIncreaseLength(data, 2);
-    EXPECT_EQ(Bytes(data), std::string("ab\0\0\0\0\0", 7));
-    CFDataGetMutableBytePtr(data)[6] = 'z';
-    EXPECT_EQ(Bytes(data), std::string("ab\0\0\0\0z", 7));
-
-    Fill("abcdef"); // replacing grows or shrinks the range
-
-    CFDataReplaceBytes(data, CFRangeMake(1, 2), U("XYZW"), 4);
-    EXPECT_EQ(Bytes(data), "aXYZWdef");
-    CFDataReplaceBytes(data, CFRangeMake(0, 5), U("-"), 1);
-    EXPECT_EQ(Bytes(data), "-def");
-    CFDataReplaceBytes(data, CFRangeMake(4, 0), U("!"), 1);
-    EXPECT_EQ(Bytes(data), "-def!");
-    CFDataDeleteBytes(data, CFRangeMake(1, 3));
-    EXPECT_EQ(Bytes(data), "-!");
-    CFDataDeleteBytes(data, CFRangeMake(0, 2));
-    EXPECT_EQ(CFDataGetLength(data), 0);
+    for (const auto& [step, expected] : steps) {
+        step();
+        EXPECT_EQ(Bytes(data), expected);
+    }
 
     // Bytes taken from the data itself survive overlap and growth.
     Fill("abcdef");
     CFDataReplaceBytes(data, CFRangeMake(0, 2), CFDataGetBytePtr(data) + 1, 4);
     EXPECT_EQ(Bytes(data), "bcdecdef");
-
     Fill("abc");
     for (int i = 0; i < 6; ++i) // each append doubles the data and eventually moves the block
         CFDataAppendBytes(data, CFDataGetBytePtr(data), CFDataGetLength(data));
-    std::string expected;
-    for (int i = 0; i < 64; ++i)
-        expected += "abc";
-    EXPECT_EQ(Bytes(data), expected);
+    EXPECT_EQ(Bytes(data), glyphwell::testing::Repeat("abc", 64));
 }
 
 } // namespace

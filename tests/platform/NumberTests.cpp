@@ -43,18 +43,26 @@ Ref Make(CFNumberType type, long double value) {
     return Ref(CFNumberCreate(nullptr, type, bytes));
 }
 
-TEST(Number, KeepsTypeCodeByteSizeAndFloatnessAndRefusesUnknownCodes) {
+// Integers from -1 to 15 are shared constants, one per integer type code and value.
+TEST(Number, KeepsTypeCodeByteSizeFloatnessAndSmallIntegersSharedAndRefusesUnknownCodes) {
     const CFIndex sizes[17] = {0, 1, 2, 4, 8, 4, 8, 1, 2, 4, 8, 8, 4, 8, 8, 8, 8};
-    unsigned char zeros[8] = {};
     for (CFNumberType type = 1; type <= 16; ++type) {
-        SCOPED_TRACE(type);
-        Ref number(CFNumberCreate(nullptr, type, zeros));
-        ASSERT_TRUE(number);
-        EXPECT_EQ(CFGetTypeID(number.get()), CFNumberGetTypeID());
-        EXPECT_EQ(CFNumberGetType(number.as<CFNumberRef>()), type);
-        EXPECT_EQ(CFNumberGetByteSize(number.as<CFNumberRef>()), sizes[type]);
-        EXPECT_EQ(CFNumberTypeByteSize(type), sizes[type]);
-        EXPECT_EQ(bool(CFNumberIsFloatType(number.as<CFNumberRef>())), IsFloatCode(type));
+        EXPECT_EQ(CFNumberTypeByteSize(type), sizes[type]) << type;
+        for (const int64_t value : {-2, -1, 0, 15, 16}) {
+            SCOPED_TRACE(::testing::Message() << "type " << type << ", value " << value);
+            const bool shared = !IsFloatCode(type) && value >= -1 && value <= 15;
+            Ref first = Make(type, value), second = Make(type, value);
+            ASSERT_TRUE(first);
+            EXPECT_EQ(first.get() == second.get(), shared);
+            EXPECT_EQ(CFGetRetainCount(first.get()),
+                      shared ? std::numeric_limits<CFIndex>::max() : 1);
+            EXPECT_EQ(CFNumberGetType(first.as<CFNumberRef>()), type);
+            EXPECT_EQ(CFNumberGetByteSize(first.as<CFNumberRef>()), sizes[type]);
+            EXPECT_EQ(bool(CFNumberIsFloatType(first.as<CFNumberRef>())), IsFloatCode(type));
+            int64_t out = 99;
+            CFNumberGetValue(first.as<CFNumberRef>(), S64, &out);
+            EXPECT_EQ(out, value);
+        }
     }
     int64_t value = 1;
     EXPECT_EQ(CFNumberCreate(nullptr, 0, &value), nullptr);
@@ -71,23 +79,6 @@ TEST(Number, KeepsTypeCodeByteSizeAndFloatnessAndRefusesUnknownCodes) {
     Ref narrow(CFNumberCreate(nullptr, kCFNumberCharType, bytes));
     EXPECT_TRUE(CFNumberGetValue(narrow.as<CFNumberRef>(), S64, &out));
     EXPECT_EQ(out, -1);
-}
-
-TEST(Number, SmallIntegersOfEachIntegerTypeAreSharedConstantsThatKeepTheirType) {
-    for (CFNumberType type = 1; type <= 16; ++type) {
-        for (const int64_t value : {-2, -1, 0, 15, 16}) {
-            SCOPED_TRACE(::testing::Message() << "type " << type << ", value " << value);
-            const bool shared = !IsFloatCode(type) && value >= -1 && value <= 15;
-            Ref first = Make(type, value), second = Make(type, value);
-            EXPECT_EQ(first.get() == second.get(), shared);
-            EXPECT_EQ(CFGetRetainCount(first.get()),
-                      shared ? std::numeric_limits<CFIndex>::max() : 1);
-            EXPECT_EQ(CFNumberGetType(first.as<CFNumberRef>()), type);
-            int64_t out = 99;
-            CFNumberGetValue(first.as<CFNumberRef>(), S64, &out);
-            EXPECT_EQ(out, value);
-        }
-    }
 }
 
 // Narrowing keeps the low bits; float to integer truncates toward zero and saturates (NaN: 0);

@@ -159,13 +159,11 @@ TEST(FrameAssembler, RefusesALengthOverItsCapForGood) {
     const uint8_t over[] = {0, 0, 0, 17, 'x'};
     FrameAssembler accepting(FrameAssembler::Kind::Reply, 16);
     EXPECT_TRUE(accepting.Append(atCap, sizeof atCap));
-    EXPECT_TRUE(accepting.IsMidFrame());
-    EXPECT_FALSE(accepting.Failed());
+    EXPECT_EQ(std::pair(accepting.IsMidFrame(), accepting.Failed()), std::pair(true, false));
     FrameAssembler refusing(FrameAssembler::Kind::Reply, 16);
     EXPECT_FALSE(refusing.Append(over, sizeof over));
-    EXPECT_TRUE(refusing.Failed());
-    EXPECT_EQ(refusing.RefusedLength(), 17u);
-    EXPECT_EQ(refusing.BufferedBytes(), 0u);
+    EXPECT_EQ(std::tuple(refusing.Failed(), refusing.RefusedLength(), refusing.BufferedBytes()),
+              std::tuple(true, size_t(17), size_t(0)));
     EXPECT_FALSE(refusing.Append(atCap, sizeof atCap));
     EXPECT_FALSE(refusing.HasFrame());
 }

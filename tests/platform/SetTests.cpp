@@ -6,6 +6,7 @@
 #include "platform/PropertyValues.h"
 #include "support/LogCapture.h"
 #include "tests/platform/ContainerTestSupport.h"
+#include "tests/support/Values.h"
 
 using namespace glyphwell::testing;
 
@@ -25,8 +26,8 @@ std::vector<const void*> membersOf(CFSetRef set) {
 } // namespace
 
 TEST(CFSet, CreateKeepsFirstOfEqualValues) {
-    auto five = MakeInt(105), wideFive = MakeNumber(kCFNumberSInt64Type, int64_t(105));
-    auto realFive = MakeNumber(kCFNumberFloat32Type, 105.0f), six = MakeInt(106);
+    auto five = Num(kCFNumberIntType, 105), wideFive = Num(kCFNumberSInt64Type, int64_t(105));
+    auto realFive = Num(kCFNumberFloat32Type, 105.0f), six = Num(kCFNumberIntType, 106);
     auto set = makeSet({five.get(), wideFive.get(), six.get(), realFive.get()});
     EXPECT_EQ(CFSetGetCount(set.get()), 2);
     EXPECT_EQ(CFSetGetValue(set.get(), realFive.get()), five.get());
@@ -36,9 +37,11 @@ TEST(CFSet, CreateKeepsFirstOfEqualValues) {
     EXPECT_EQ(RetainCounts({five.get(), six.get()}), (Counts{1, 1}));
 }
 
+// Order after removal and releases are the hashed table's, tested with dictionaries; a set adds
+// its own modes of storing a member equal to one it holds.
 TEST(CFSet, AddSetAndReplaceTreatEqualMembersDifferently) {
-    auto one = MakeInt(101), otherOne = MakeNumber(kCFNumberSInt8Type, int8_t(101));
-    auto two = MakeInt(102), three = MakeInt(103);
+    auto one = Num(kCFNumberIntType, 101), otherOne = Num(kCFNumberSInt8Type, int8_t(101));
+    auto two = Num(kCFNumberIntType, 102), three = Num(kCFNumberIntType, 103);
     auto set = Own(CFSetCreateMutable(nullptr, 0, &kCFTypeSetCallBacks));
     CFSetAddValue(set.get(), one.get());
     CFSetAddValue(set.get(), two.get());
@@ -53,21 +56,9 @@ TEST(CFSet, AddSetAndReplaceTreatEqualMembersDifferently) {
     CFSetReplaceValue(set.get(), three.get()); // absent: nothing
     CFSetReplaceValue(set.get(), one.get());
     CFSetSetValue(set.get(), three.get()); // absent: added
-    EXPECT_EQ(membersOf(set.get()), (std::vector<const void*>{one.get(), two.get(), three.get()}));
-    EXPECT_EQ(CFGetRetainCount(otherOne.get()), 1);
-}
-
-TEST(CFSet, EnumeratesInInsertionOrderAfterRemovalAndReleases) {
-    auto a = MakeText("a"), b = MakeText("b"), c = MakeText("c"), d = MakeText("d");
-    auto set = Own(CFSetCreateMutable(nullptr, 0, &kCFTypeSetCallBacks));
-    for (CFStringRef member : {a.get(), b.get(), c.get(), d.get()})
-        CFSetAddValue(set.get(), member);
-    auto alsoB = MakeText("b");
-    CFSetRemoveValue(set.get(), alsoB.get());
-    CFSetRemoveValue(set.get(), alsoB.get());
-    EXPECT_EQ(CFGetRetainCount(b.get()), 1);
-    EXPECT_FALSE(CFSetContainsValue(set.get(), b.get()));
-    CFSetAddValue(set.get(), b.get());
+    for (int i = 0; i < 2; ++i)            // by an equal member; then absent
+        CFSetRemoveValue(set.get(), Num(kCFNumberSInt64Type, int64_t(102)).get());
+    CFSetAddValue(set.get(), two.get());
     std::vector<const void*> visited;
     CFSetApplyFunction(
         set.get(),
@@ -75,15 +66,16 @@ TEST(CFSet, EnumeratesInInsertionOrderAfterRemovalAndReleases) {
             static_cast<std::vector<const void*>*>(context)->push_back(value);
         },
         &visited);
-    EXPECT_EQ(visited, (std::vector<const void*>{a.get(), c.get(), d.get(), b.get()}));
+    EXPECT_EQ(visited, (std::vector<const void*>{one.get(), three.get(), two.get()}));
     EXPECT_EQ(membersOf(set.get()), visited);
+    EXPECT_EQ(CFGetRetainCount(otherOne.get()), 1);
     CFSetRemoveAllValues(set.get());
     EXPECT_EQ(CFSetGetCount(set.get()), 0);
-    EXPECT_EQ(RetainCounts({a.get(), b.get()}), (Counts{1, 1}));
+    EXPECT_EQ(RetainCounts({one.get(), two.get(), three.get()}), (Counts{1, 1, 1}));
 }
 
 TEST(CFSet, NullCallbacksUsePointerIdentity) {
-    auto five = MakeInt(105), otherFive = MakeInt(105);
+    auto five = Num(kCFNumberIntType, 105), otherFive = Num(kCFNumberIntType, 105);
     auto set = makeSet({five.get(), otherFive.get(), nullptr, five.get()}, nullptr);
     EXPECT_EQ(CFSetGetCount(set.get()), 3);
     EXPECT_TRUE(CFSetContainsValue(set.get(), nullptr));

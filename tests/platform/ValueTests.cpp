@@ -14,6 +14,13 @@
 
 namespace {
 
+using glyphwell::testing::Array;
+using glyphwell::testing::Dict;
+using glyphwell::testing::Num;
+using glyphwell::testing::Ref;
+using glyphwell::testing::Set;
+using glyphwell::testing::Str;
+
 /// Counts its own destruction, so a test sees when the value let go of it.
 struct CountingPayload : CFKindPayload {
     explicit CountingPayload(int* destroyed) : destroyed(destroyed) {}
@@ -30,9 +37,8 @@ TEST(Kind, RegistryNamesDistinctIdsAndValuesOwnTheirPayloadAndEqualOnlyThemselve
     static const CFTypeID described = CFKindRegister("TestKindDescribed", DescribeCounting);
     EXPECT_GE(kind, 256u) << "after the built-in kinds";
     EXPECT_NE(kind, described);
-    CFStringRef name = CFCopyTypeIDDescription(described);
-    EXPECT_EQ(glyphwell::Describe(name), "TestKindDescribed");
-    CFRelease(name);
+    EXPECT_EQ(glyphwell::Describe(Ref(CFCopyTypeIDDescription(described)).get()),
+              "TestKindDescribed");
     EXPECT_EQ(CFCopyTypeIDDescription(described + 1000), nullptr);
     int destroyed = 0;
     CFTypeRef a = CFKindCreateValue(kind, std::make_unique<CountingPayload>(&destroyed));
@@ -66,13 +72,6 @@ TEST(Kind, SharedValueIgnoresRetainAndRelease) {
     CFRelease(text);
     EXPECT_EQ(glyphwell::Describe(text), "shared");
 }
-
-using glyphwell::testing::Array;
-using glyphwell::testing::Dict;
-using glyphwell::testing::Num;
-using glyphwell::testing::Ref;
-using glyphwell::testing::Set;
-using glyphwell::testing::Str;
 
 Ref Bytes(const std::string& bytes) {
     return Ref(
