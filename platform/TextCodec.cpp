@@ -136,6 +136,24 @@ size_t DecodeSequence(const uint8_t* p, size_t available, uint32_t& c) {
     return 0;
 }
 
+/// Copies 16 code units from `from` to `to`, widened or narrowed to the type of `to`, when all 16
+/// are ASCII; false, with nothing written, otherwise. The fixed-size loops compile to vector
+/// instructions.
+template <class From, class To> bool CopyASCIIBlock(const From* from, To* to) {
+    From block[16];
+    std::memcpy(block, from, sizeof block);
+    From any = 0;
+    for (From unit : block)
+        any |= unit;
+    if (any >= 0x80)
+        return false;
+    To converted[16];
+    for (int k = 0; k < 16; ++k)
+        converted[k] = To(block[k]);
+    std::memcpy(to, converted, sizeof converted);
+    return true;
+}
+
 bool DecodeUTF8(const uint8_t* p, size_t n, std::u16string& out, bool lenient) {
     // Never more units than bytes: write into the grown string, then trim.
     size_t start = out.size();
@@ -143,18 +161,7 @@ bool DecodeUTF8(const uint8_t* p, size_t n, std::u16string& out, bool lenient) {
     char16_t* dst = out.data() + start;
     size_t i = 0;
     while (i < n) {
-        while (i + 16 <= n) { // ASCII in blocks of 16 bytes, widened with vector instructions
-            uint8_t block[16];
-            std::memcpy(block, p + i, sizeof block);
-            uint8_t any = 0;
-            for (uint8_t byte : block)
-                any |= byte;
-            if (any >= 0x80)
-                break;
-            char16_t wide[16];
-            for (int k = 0; k < 16; ++k)
-                wide[k] = block[k];
-            std::memcpy(dst, wide, sizeof wide);
+        while (i + 16 <= n && CopyASCIIBlock(p + i, dst)) { // ASCII 16 bytes at a time
             dst += 16;
             i += 16;
         }
@@ -272,18 +279,7 @@ void EncodeUTF8WithRoom(std::u16string_view units, uint8_t lossByte, uint8_t* bu
     while (i < n) {
         // ASCII in blocks of 16 units (the fixed-size loops compile to vector instructions),
         // then of 4 units within a 64-bit word.
-        while (i + 16 <= n) {
-            char16_t block[16];
-            std::memcpy(block, src + i, sizeof block);
-            char16_t any = 0;
-            for (char16_t unit : block)
-                any |= unit;
-            if (any >= 0x80)
-                break;
-            uint8_t narrow[16];
-            for (int j = 0; j < 16; ++j)
-                narrow[j] = uint8_t(block[j]);
-            std::memcpy(buffer + pos, narrow, sizeof narrow);
+        while (i + 16 <= n && CopyASCIIBlock(src + i, buffer + pos)) {
             i += 16;
             pos += 16;
         }
