@@ -1,6 +1,5 @@
-// `glyphwell catalog` on the installed DejaVu fonts and a font collection, checked offline and
-// against a loopback HTTP server. The verb exists when the tool is built with the agent's
-// libraries.
+// `glyphwell catalog` on installed fonts, offline and against a loopback HTTP server (the verb
+// exists when the tool is built with the agent's libraries).
 #ifdef GLYPHWELL_CATALOG_TOOL
 #include <gtest/gtest.h>
 
@@ -21,15 +20,6 @@ using Result = glyphwell::testing::ToolResult;
 
 const std::string kDejaVu = "/usr/share/fonts/truetype/dejavu/";
 const std::string kCollection = "/usr/share/fonts/truetype/wqy/wqy-microhei.ttc";
-
-/// A resource with `body`, or redirected to `redirect`.
-glyphwell::testing::LoopbackHTTPServer::Resource Served(std::string body,
-                                                        std::string redirect = {}) {
-    glyphwell::testing::LoopbackHTTPServer::Resource resource;
-    resource.body = std::move(body);
-    resource.redirectTo = std::move(redirect);
-    return resource;
-}
 
 std::string Contents(const std::string& path) {
     std::ifstream file(path, std::ios::binary);
@@ -172,7 +162,7 @@ TEST_F(CatalogCommandTest, FetchComparesEveryAssetWithTheCatalog) {
             .status,
         0);
     EXPECT_EQ(Run({"check", catalog_}).status, 0);
-    server.Serve("/fonts/DejaVuSans-Bold.ttf", Served(sans));
+    server.Serve("/fonts/DejaVuSans-Bold.ttf", {.body = sans});
 
     std::string changed = serif;
     changed[1000] ^= 1;
@@ -196,7 +186,8 @@ TEST_F(CatalogCommandTest, FetchComparesEveryAssetWithTheCatalog) {
         {"missing", false, "", "asset DejaVuSerif: cannot download "},
     };
     for (const Case& c : cases) {
-        server.Serve("/fonts/DejaVuSerif.ttf", c.serve ? Served(c.body) : Served("", "/gone"));
+        server.Serve("/fonts/DejaVuSerif.ttf",
+                     {.body = c.body, .redirectTo = c.serve ? "" : "/gone"});
         const Result result = Run({"check", catalog_, "--fetch"});
         EXPECT_EQ(result.status, c.problem.empty() ? 0 : 1) << c.what;
         const std::string summary = catalog_ + ": 2 assets, 2 fonts, downloaded; " +

@@ -12,8 +12,7 @@ namespace {
 
 const char kName[] = "org.glyphwell.Test.Tool";
 
-/// A server that replies with the request's own bytes (or the bytes set) and remembers the last
-/// request.
+/// Replies with the request's own bytes (or `reply`) and remembers the last request.
 class EchoServer {
 public:
     EchoServer()
@@ -44,9 +43,9 @@ protected:
 } // namespace
 
 TEST_F(SendCommandTest, PrintsTheReplyOrSaysWhyThereIsNone) {
-    ToolResult result = Invoke({"send", "--msgid", "1", "--name", kName}, "{}");
-    EXPECT_EQ(result.status, 1);
-    EXPECT_EQ(result.err, "glyphwell send: nothing answers on the port org.glyphwell.Test.Tool\n");
+    EXPECT_EQ(Invoke({"send", "--msgid", "1", "--name", kName}, "{}"),
+              (ToolResult{
+                  1, "", "glyphwell send: nothing answers on the port org.glyphwell.Test.Tool\n"}));
 
     EchoServer server;
     ASSERT_TRUE(server.Started());
@@ -71,10 +70,7 @@ TEST_F(SendCommandTest, PrintsTheReplyOrSaysWhyThereIsNone) {
         server.reply = c.reply;
         std::vector<std::string> arguments = {"send", "--name", kName, "--msgid"};
         arguments.insert(arguments.end(), c.options.begin(), c.options.end());
-        result = Invoke(arguments, c.input);
-        EXPECT_EQ(result.status, c.status);
-        EXPECT_EQ(result.out, c.out);
-        EXPECT_EQ(result.err, c.err);
+        EXPECT_EQ(Invoke(arguments, c.input), (ToolResult{c.status, c.out, c.err}));
         EXPECT_EQ(server.lastMsgid, std::stoi(c.options[0]));
         if (c.input.empty()) {
             EXPECT_EQ(server.lastRequest, "");
