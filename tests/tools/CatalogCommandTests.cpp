@@ -126,26 +126,18 @@ TEST_F(CatalogCommandTest, RefusesBadInputAndLeavesTheCatalogAlone) {
     }
 }
 
+// The reader's own lines are checked with the reader; the verb prints each and counts them.
 TEST_F(CatalogCommandTest, ReportsADamagedEntryWithItsPlace) {
     const std::string good = R"({"LocalID": "A", "url": "http://h/a.ttf", "size": 3,
         "sha256": ")" + std::string(64, 'a') +
                              R"(", "fonts": [{"postScriptName": "A"}]})";
-    struct Case {
-        std::string text;
-        std::string line;
-    } cases[] = {
-        {R"({"assets": [)" + good + "," + good + "]}",
-         "Skipping asset 1 of the downloadable font catalog " + catalog_ +
-             ": duplicate \"LocalID\" A"},
-        {"{\"assets\": 5}", "Cannot parse the downloadable font catalog " + catalog_},
-    };
-    for (const Case& c : cases) {
-        Write(c.text);
-        const Result result = Run({"check", catalog_});
-        EXPECT_EQ(result.status, 1) << c.text;
-        EXPECT_EQ(result.out.find(c.line), 0u) << result.out;
-        EXPECT_NE(result.out.find("; 1 problem\n"), std::string::npos) << result.out;
-    }
+    Write(R"({"assets": [)" + good + "," + good + "]}");
+    EXPECT_EQ(
+        Run({"check", catalog_}),
+        (Result{1,
+                "Skipping asset 1 of the downloadable font catalog " + catalog_ +
+                    ": duplicate \"LocalID\" A\n" + catalog_ + ": 1 assets, 1 fonts; 1 problem\n",
+                ""}));
     Write(R"({"assets": [)" + good + "]}");
     EXPECT_EQ(Run({"check", catalog_}).out, catalog_ + ": 1 assets, 1 fonts; 0 problems\n");
 }
