@@ -106,10 +106,11 @@ TEST_F(SendCommandTest, AskDownloadSendsTheMessageId2Request) {
     const ToolResult result = Invoke({"ask-download", "--name", kName, "--compact", "--font",
                                       "ExampleSans-Regular:Example Sans", "Other-Bold", "--app",
                                       "Writer", "--pid", "4242", "--suppress"});
-    ASSERT_EQ(result.status, 0) << result.err;
+    EXPECT_EQ(result, (ToolResult{0,
+                                  "{\"QZUIPropertyResult\":{\"$number\":1,\"$type\":7},"
+                                  "\"QZUIPropertySuppress\":{\"$number\":0,\"$type\":7}}\n",
+                                  ""}));
     EXPECT_EQ(server.lastMsgid, 2);
-    EXPECT_EQ(result.out, "{\"QZUIPropertyResult\":{\"$number\":1,\"$type\":7},"
-                          "\"QZUIPropertySuppress\":{\"$number\":0,\"$type\":7}}\n");
     const ToolResult request = Invoke({"decode", "--compact"}, server.lastRequest);
     ASSERT_EQ(request.status, 0) << request.err;
     EXPECT_EQ(nlohmann::json::parse(request.out), nlohmann::json::parse(R"({
