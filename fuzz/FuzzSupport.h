@@ -8,11 +8,8 @@ namespace fuzz {
 
 /// Sends the log lines nowhere from the first call on: hostile inputs log at every turn.
 inline void Quiet() {
-    static const bool once = [] {
-        glyphwell::SetLogSink([](const glyphwell::LogRecord&) {});
-        return true;
-    }();
-    (void)once;
+    [[maybe_unused]] static const bool once =
+        (glyphwell::SetLogSink([](const glyphwell::LogRecord&) {}), true);
 }
 
 /// Crashes, which libFuzzer records as a finding, when `condition` does not hold.

@@ -1,10 +1,6 @@
-// libFuzzer target for the segmented data stream's readers over untrusted buffers.
-//
-// Input: a little-endian 16-bit buffer length N, then N bytes of buffer (fewer when the input
-// ends first), then a program: one byte per reader operation, some followed by an argument byte.
-// The buffer goes through QZDataStreamWithData, which pads it to a root header; every pointer the
-// readers hand out must then lie inside the buffer. Run with -close_fd_mask=2: the dump and the
-// unterminated-string warning write to stderr.
+// The segmented data stream's readers over untrusted buffers. Input: a little-endian 16-bit length
+// N, N bytes of buffer (padded to a root header), then one byte per reader operation, some with an
+// argument byte. Every pointer handed out must lie inside the buffer. Run with -close_fd_mask=2.
 #include <cstddef>
 #include <cstdint>
 #include <cstdio>
@@ -93,8 +89,7 @@ void run(QZDataStreamRef stream, const uint8_t* program, size_t size) {
 
 } // namespace
 
-// The readers' stderr lines go to a closed descriptor under -close_fd_mask=2; buffering them
-// saves a system call per line. Sanitizer reports do not use stdio and are not delayed.
+// Buffered: the readers' stderr lines go to a closed descriptor (sanitizer reports bypass stdio).
 extern "C" int LLVMFuzzerInitialize(int*, char***) {
     static char buffer[1 << 16];
     setvbuf(stderr, buffer, _IOFBF, sizeof buffer);

@@ -1,10 +1,7 @@
-// libFuzzer target for the message port's frame reassembly over untrusted socket bytes.
-//
-// Input: a mode byte (bit 0: request frames, else replies; bit 1: the real 64 MiB cap, else a
-// cap of 64 bytes), a piece size byte (0 counts as 1), then the stream. The stream is fed in
-// pieces of that size, alternately through Append and, when a body is in progress, received in
-// place through BodyRoom/CommitBody, as the port does. Every frame handed out must respect the
-// cap, and the byte count held must match what went in and came out.
+// The message port's frame reassembly over untrusted bytes. Input: a mode byte (bit 0: requests,
+// else replies; bit 1: the 64 MiB cap, else 64 bytes), a piece size byte (0 counts as 1), then the
+// stream, fed in pieces alternately through Append and in place through BodyRoom/CommitBody.
+// Every frame must respect the cap, and the bytes held must match what went in and came out.
 #include <algorithm>
 #include <cstddef>
 #include <cstdint>

@@ -1,5 +1,5 @@
-// The client library against real sockets: a scripted server on the port's socket path that
-// reads one request frame and answers with exact bytes, and the platform's own port server.
+// The client library against real sockets: a scripted server answering exact bytes, and the
+// platform's own port server.
 #include <gtest/gtest.h>
 #include <poll.h>
 
@@ -21,11 +21,10 @@ uint32_t Length(const std::string& big32) {
     const auto* b = reinterpret_cast<const unsigned char*>(big32.data());
     return uint32_t(b[0]) << 24 | b[1] << 16 | b[2] << 8 | b[3];
 }
-/// A flattened string value.
 std::string String(const std::string& text) {
     return Big32(7) + Big32(uint32_t(text.size())) + text;
 }
-/// A flattened number of type 7 (one byte).
+/// A number of type 7 (one byte).
 std::string Answer(char value) {
     return Big32(0x16) + Big32(7) + Big32(1) + std::string(1, value);
 }
@@ -201,8 +200,8 @@ TEST_F(ClientTest, SendsTheFlattenedRequestAndReadsTheAnswers) {
     const void* bytes = nullptr;
     size_t length = 0;
     ASSERT_EQ(glyphwell_request_get_bytes(request.get(), &bytes, &length), GLYPHWELL_OK);
-    EXPECT_EQ(server.request, Big32(1) + Big32(uint32_t(length)) +
-                                  std::string(static_cast<const char*>(bytes), length));
+    EXPECT_EQ(server.request,
+              RequestFrame(1, std::string(static_cast<const char*>(bytes), length)));
 }
 
 // A main loop's view: poll the descriptor for the events asked, dispatch, until the answer; the

@@ -1,8 +1,6 @@
 #!/usr/bin/env bash
-# Installs the client library's components into a temporary root, builds the C example with the
-# installed pkg-config file and a CMake project with find_package(GlyphwellClient), checks the
-# exported symbols, and runs the example against the agent on a private runtime directory.
-#
+# Installs the client library into a temporary root, builds the C example through pkg-config and
+# find_package(GlyphwellClient), checks the exported symbols, and runs it against the agent.
 # usage: installed-example.sh BUILD-DIR EXAMPLE.c "EXTRA-CFLAGS" [AGENT]
 set -uo pipefail
 
@@ -74,8 +72,7 @@ if [ -z "$agent" ] || [ ! -x "$agent" ]; then
     echo "SKIP: the agent is not built; the example was built and checked without it"
     exit 77
 fi
-# A private font setup without a catalog: nothing can be downloaded, so the request is answered
-# at once, without a window (Result 0, Suppress 0).
+# Without a catalog nothing can be downloaded: the answer comes at once, without a window.
 export XDG_DATA_HOME=$work/data XDG_CONFIG_HOME=$work/config XDG_CACHE_HOME=$work/cache
 export XDG_DATA_DIRS=$work/data QT_QPA_PLATFORM=offscreen
 "$agent" >"$work/agent.log" 2>&1 &

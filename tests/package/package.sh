@@ -1,10 +1,7 @@
 #!/usr/bin/env bash
-# The Debian package, built and used as a user gets it: a Release build with Debian's hardening
-# flags, `cpack -G DEB`, lintian (no errors), then the package's own files, extracted into a
-# temporary root: their contents and dependencies, the unit files, the desktop entry, the manual
-# page against the tool's usage, the maintainer scripts (on that root), and the extracted agent
-# started by its socket, answering a request and exiting when idle.
-#
+# The Debian package as a user gets it: a hardened Release build, `cpack -G DEB`, lintian, then
+# the extracted files (contents, dependencies, units, desktop entry, manual pages, maintainer
+# scripts) and the extracted agent started by its socket, answering and exiting when idle.
 # usage: package.sh SOURCE_DIR WORK_DIR   (WORK_DIR keeps the Release build between runs)
 set -uo pipefail
 
@@ -68,8 +65,7 @@ for file in usr/lib/systemd/user/$unit usr/lib/systemd/user/glyphwell-ui-agent.s
     usr/share/doc/glyphwell/changelog.Debian.gz usr/share/doc/glyphwell/help/index.html; do
     [ -s "$root/$file" ] || fail "/$file is missing"
 done
-# The client library, once built, is in the package with its development files, a shlibs file
-# for packages built against it, and the ldconfig trigger.
+# The client library, once built, comes with its development files, a shlibs file and ldconfig.
 multiarch=$(dpkg-architecture -qDEB_HOST_MULTIARCH)
 if compgen -G "$build/client/libglyphwell-client.so.*" >/dev/null; then
     for file in usr/lib/$multiarch/libglyphwell-client.so.0 usr/include/glyphwell/client.h \
@@ -97,9 +93,8 @@ desktop-file-validate "$desktop" || fail "desktop-file-validate rejects the desk
 for line in Name=Glyphwell NoDisplay=true Icon=$app_id; do
     grep -qx "$line" "$desktop" || fail "the desktop entry lacks $line"
 done
-# systemd-analyze verify checks the units as the user manager would load them; it needs a runtime
-# directory, and it checks that ExecStart and the Documentation page exist: a copy of the service
-# names the extracted agent, and the manual pages are looked up in the extracted root.
+# systemd-analyze verify checks that ExecStart and the Documentation page exist: a copy of the
+# service names the extracted agent, and the manual pages are looked up in the extracted root.
 mkdir -p "$tmp/units" "$tmp/runtime" && chmod 700 "$tmp/runtime"
 cp "$root/usr/lib/systemd/user/$unit" "$tmp/units/"
 sed "s|^ExecStart=|ExecStart=$root|" "$root/usr/lib/systemd/user/glyphwell-ui-agent.service" \
@@ -133,9 +128,8 @@ for word in $verbs $(grep -oE -- '(^|[ [])-(-[a-z][a-z-]*|o)\b' "$tmp/usage" | t
         fail "glyphwell.1 does not describe $word"
 done
 
-# --- Maintainer scripts on the extracted root, as dpkg runs them: the socket enabled for every
-# user on installation, masked on removal and enabled again on reinstallation, an
-# administrator's disable kept across an upgrade, nothing left after a purge.
+# --- Maintainer scripts on the extracted root: the socket enabled on installation, masked on
+# removal, enabled on reinstallation, an administrator's disable kept, nothing left after a purge.
 link="$root/etc/systemd/user/sockets.target.wants/$unit"
 mask="$root/etc/systemd/user/$unit"
 unit_file="$root/usr/lib/systemd/user/$unit"

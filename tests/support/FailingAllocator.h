@@ -1,6 +1,5 @@
-// Allocation failure on demand: replaces the global operator new and delete of a test program so
-// that the Nth allocation of the calling thread fails (std::bad_alloc, or null for the nothrow
-// form). Include it in exactly ONE file of a test program: it defines the replacements.
+// Replaces operator new/delete so that the Nth allocation of the calling thread fails (bad_alloc,
+// or null when nothrow). Include it in exactly ONE file of a test program.
 #pragma once
 
 #include <cstdlib>
@@ -8,8 +7,7 @@
 
 namespace glyphwell::testing {
 
-/// Allocations left on this thread before the one that fails; negative: none fails. Set back to
-/// -1 when the failure has happened, so a test can tell whether it did.
+/// Allocations on this thread before the one that fails (negative: none); -1 once it failed.
 inline thread_local long gAllocationsBeforeFailure = -1;
 
 /// True when the next allocation of this thread is to fail (and arms no further failure).

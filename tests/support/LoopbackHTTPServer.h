@@ -1,8 +1,6 @@
-// A small HTTP/1.1 server on 127.0.0.1 for tests and benchmarks: serves byte strings by path with
-// a Content-Length, and on demand drips them slowly, drops the connection part-way, never
-// answers at all, or redirects.
-// Each connection gets its own thread and is closed after one response. Not a general server:
-// it reads the request line only and answers GET and HEAD alike (HEAD without a body).
+// A small HTTP/1.1 server on 127.0.0.1 for tests and benchmarks: serves byte strings by path, and
+// on demand drips them, drops the connection part-way, never answers, or redirects. One thread and
+// one response per connection; it reads the request line only (HEAD gets no body).
 #pragma once
 
 #include <arpa/inet.h>
@@ -25,15 +23,14 @@ namespace glyphwell::testing {
 class LoopbackHTTPServer {
 public:
     struct Resource {
-        std::string body;
+        std::string body = {};
         /// Bytes sent per write, and the pause after each write but the last.
         size_t chunkSize = 1 << 20;
         std::chrono::milliseconds pauseBetweenChunks{0};
-        /// Close the connection once this many body bytes were sent (the full Content-Length is
-        /// announced all the same).
+        /// Close the connection after this many body bytes (the full Content-Length announced).
         size_t dropAfter = std::string::npos;
         /// When set: answer "302 Found" with this Location instead of the body.
-        std::string redirectTo;
+        std::string redirectTo = {};
         /// Read the request, then send nothing until the server stops.
         bool neverAnswer = false;
     };
@@ -155,10 +152,14 @@ private:
             if (entry != resources_.end())
                 shared = entry->second;
         }
+        const auto sendHeader = [fd](const std::string& status, size_t length) {
+            const std::string header = "HTTP/1.1 " + status +
+                                       "\r\nContent-Length: " + std::to_string(length) +
+                                       "\r\nConnection: close\r\n\r\n";
+            return SendAll(fd, header.data(), header.size());
+        };
         if (!shared) {
-            const std::string notFound = "HTTP/1.1 404 Not Found\r\nContent-Length: 0\r\n"
-                                         "Connection: close\r\n\r\n";
-            SendAll(fd, notFound.data(), notFound.size());
+            sendHeader("404 Not Found", 0);
             return;
         }
         const Resource& resource = *shared;
@@ -168,16 +169,11 @@ private:
             return;
         }
         if (!resource.redirectTo.empty()) {
-            const std::string redirect = "HTTP/1.1 302 Found\r\nLocation: " + resource.redirectTo +
-                                         "\r\nContent-Length: 0\r\nConnection: close\r\n\r\n";
-            SendAll(fd, redirect.data(), redirect.size());
+            sendHeader("302 Found\r\nLocation: " + resource.redirectTo, 0);
             return;
         }
-        const std::string header = "HTTP/1.1 200 OK\r\nContent-Type: application/octet-stream\r\n"
-                                   "Content-Length: " +
-                                   std::to_string(resource.body.size()) +
-                                   "\r\nConnection: close\r\n\r\n";
-        if (!SendAll(fd, header.data(), header.size()) || head)
+        if (!sendHeader("200 OK\r\nContent-Type: application/octet-stream", resource.body.size()) ||
+            head)
             return;
         const size_t end = std::min(resource.body.size(), resource.dropAfter);
         for (size_t offset = 0; offset < end;) {

@@ -1,5 +1,4 @@
-// Test helpers for message ports: a private runtime directory per test, a local port served on
-// its own thread, and raw socket clients that write exact frames.
+// Message port helpers: a private runtime directory, a port served on a thread, raw sockets.
 #pragma once
 
 #include <poll.h>
@@ -64,8 +63,7 @@ inline std::string BytesOf(CFDataRef data) {
                        size_t(CFDataGetLength(data)));
 }
 
-/// A local port named `name`, served on its own thread by a PollRunLoopDriver. The handler runs
-/// on that thread and returns the reply (a new reference, or null for an empty reply).
+/// A local port served on its own thread; the handler returns the reply (owned, or null: empty).
 class PortServer {
 public:
     using Handler = std::function<CFDataRef(SInt32 msgid, CFDataRef data)>;
@@ -139,8 +137,7 @@ private:
     PollRunLoopDriver* driver_ = nullptr;
 };
 
-/// A blocking stream socket at `path`: connected to it, or else bound and listening there (no
-/// server behind it); -1 when that fails.
+/// A blocking socket connected to `path`, or listening there (no server behind it); -1 on failure.
 inline int RawSocket(const std::string& path, bool listening) {
     sockaddr_un address{};
     address.sun_family = AF_UNIX;
@@ -197,8 +194,7 @@ inline std::string RawRead(int descriptor, size_t count, int timeoutMs = 5000) {
     return bytes;
 }
 
-/// True when the peer closed the connection (end of stream or reset) within `timeoutMs`,
-/// without sending anything first.
+/// True when the peer closed (end of stream or reset) within `timeoutMs`, sending nothing first.
 inline bool RawSeesClose(int descriptor, int timeoutMs = 5000) {
     pollfd entry{descriptor, POLLIN, 0};
     if (poll(&entry, 1, timeoutMs) <= 0)

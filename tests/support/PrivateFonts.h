@@ -1,6 +1,5 @@
-// Test helper for the font download tests: the installed DejaVu files as download material, and a
-// private font setup (XDG directories and a fontconfig configuration under a temporary root) so
-// that no font the tests download is installed before they run.
+// Font download helpers: DejaVu files as material, and private XDG and fontconfig settings under a
+// temporary root so that no font a test downloads is installed before it runs.
 #pragma once
 
 #include <QDir>
@@ -12,6 +11,7 @@
 
 #include "desktop/QZFontMatching.h"
 #include "support/SHA256.h"
+#include "support/Values.h"
 
 namespace glyphwell::testing {
 
@@ -22,9 +22,7 @@ inline std::string ReadFile(const QString& path) {
     return file.open(QIODevice::ReadOnly) ? file.readAll().toStdString() : std::string();
 }
 
-/// Points the XDG directories and fontconfig at `root`: the user font directory is
-/// `root`/data/fonts (returned), the system data directory `root`/system, the caches under
-/// `root`/cache. Returns an empty string when the configuration cannot be written or loaded.
+/// Points XDG and fontconfig at `root`; the user font folder (`root`/data/fonts), empty on failure.
 inline QString UsePrivateFonts(const QString& root) {
     const QString fonts = root + "/data/fonts";
     QDir().mkpath(fonts);
@@ -45,8 +43,7 @@ inline QString UsePrivateFonts(const QString& root) {
     return QZReloadFontConfiguration() ? fonts : QString();
 }
 
-/// One asset of a download catalog: `size` bytes at `url` with `sha256`, holding the font
-/// `postScriptName`.
+/// One catalog asset: `size` bytes at `url` with `sha256`, holding the font `postScriptName`.
 inline std::string CatalogAsset(const std::string& localID, const std::string& url, size_t size,
                                 const std::string& sha256, const std::string& postScriptName) {
     return "{\"LocalID\": \"" + localID + "\", \"url\": \"" + url +
@@ -54,8 +51,7 @@ inline std::string CatalogAsset(const std::string& localID, const std::string& u
            "\", \"fonts\": [{\"postScriptName\": \"" + postScriptName + "\"}]}";
 }
 
-/// Writes the user's download catalog under the data home `dataHome`, listing `assets`
-/// (CatalogAsset entries). False when it cannot be written.
+/// Writes the user's catalog under `dataHome` listing `assets`; false when it cannot.
 inline bool WriteCatalog(const QString& dataHome, const std::vector<std::string>& assets) {
     std::string text = "{\"assets\": [";
     for (size_t i = 0; i < assets.size(); ++i)
@@ -65,6 +61,15 @@ inline bool WriteCatalog(const QString& dataHome, const std::vector<std::string>
     QFile file(dataHome + "/glyphwell/downloadable-fonts.json");
     return file.open(QIODevice::WriteOnly) &&
            file.write(text.data(), qint64(text.size())) == qint64(text.size());
+}
+
+/// An array of descriptors that each name one font, as a request for those fonts.
+inline Ref FontNameDescriptors(std::initializer_list<const char*> names) {
+    Ref array(CFArrayCreateMutable(nullptr, 0, &kCFTypeArrayCallBacks));
+    for (const char* name : names)
+        CFArrayAppendValue(array.as<CFMutableArrayRef>(),
+                           Dict({{CFSTR("NSFontNameAttribute"), Str(name).get()}}).get());
+    return array;
 }
 
 /// Undoes UsePrivateFonts: the process's own environment and font configuration again.

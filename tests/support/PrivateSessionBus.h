@@ -1,6 +1,5 @@
-// Test helpers for D-Bus: a private session bus (a dbus-daemon of our own, pointed to by
-// DBUS_SESSION_BUS_ADDRESS while it lives) and a stand-in file manager on it that records the
-// calls it receives. Needs a QCoreApplication; the recorded calls arrive through its event loop.
+// D-Bus helpers: a private session bus (our own dbus-daemon, in DBUS_SESSION_BUS_ADDRESS while it
+// lives) and a stand-in file manager that records its calls through the Qt event loop.
 #pragma once
 
 #include <QDBusConnection>
@@ -71,9 +70,8 @@ private:
     ScopedEnvironment environment_;
 };
 
-/// Owns org.freedesktop.FileManager1 on the bus at `address` over a connection of its own, and
-/// records every call to /org/freedesktop/FileManager1, answering Introspect with a minimal
-/// description and ShowItems with an empty reply.
+/// Owns org.freedesktop.FileManager1 on the bus at `address` and records every call to its
+/// object, answering Introspect with a minimal description and ShowItems with an empty reply.
 class FileManagerStandIn : public QDBusVirtualObject {
 public:
     struct Call {

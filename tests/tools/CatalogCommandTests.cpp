@@ -1,6 +1,5 @@
-// `glyphwell catalog` on the installed DejaVu fonts and a font collection, checked offline and
-// against a loopback HTTP server. The verb exists when the tool is built with the agent's
-// libraries.
+// `glyphwell catalog` on installed fonts, offline and against a loopback HTTP server (the verb
+// exists when the tool is built with the agent's libraries).
 #ifdef GLYPHWELL_CATALOG_TOOL
 #include <gtest/gtest.h>
 
@@ -21,15 +20,6 @@ using Result = glyphwell::testing::ToolResult;
 
 const std::string kDejaVu = "/usr/share/fonts/truetype/dejavu/";
 const std::string kCollection = "/usr/share/fonts/truetype/wqy/wqy-microhei.ttc";
-
-/// A resource with `body`, or redirected to `redirect`.
-glyphwell::testing::LoopbackHTTPServer::Resource Served(std::string body,
-                                                        std::string redirect = {}) {
-    glyphwell::testing::LoopbackHTTPServer::Resource resource;
-    resource.body = std::move(body);
-    resource.redirectTo = std::move(redirect);
-    return resource;
-}
 
 std::string Contents(const std::string& path) {
     std::ifstream file(path, std::ios::binary);
@@ -136,28 +126,18 @@ TEST_F(CatalogCommandTest, RefusesBadInputAndLeavesTheCatalogAlone) {
     }
 }
 
+// The reader's own lines are checked with the reader; the verb prints each and counts them.
 TEST_F(CatalogCommandTest, ReportsADamagedEntryWithItsPlace) {
     const std::string good = R"({"LocalID": "A", "url": "http://h/a.ttf", "size": 3,
         "sha256": ")" + std::string(64, 'a') +
                              R"(", "fonts": [{"postScriptName": "A"}]})";
-    struct Case {
-        std::string text;
-        std::string line;
-    } cases[] = {
-        {R"({"assets": [)" + good + R"(, {"LocalID": "B", "url": "u", "size": 1, "fonts": []}]})",
-         "Skipping asset 1 of the downloadable font catalog " + catalog_ + ": "},
-        {R"({"assets": [)" + good + "," + good + "]}",
-         "Skipping asset 1 of the downloadable font catalog " + catalog_ +
-             ": duplicate \"LocalID\" A"},
-        {"{\"assets\": 5}", "Cannot parse the downloadable font catalog " + catalog_},
-    };
-    for (const Case& c : cases) {
-        Write(c.text);
-        const Result result = Run({"check", catalog_});
-        EXPECT_EQ(result.status, 1) << c.text;
-        EXPECT_EQ(result.out.find(c.line), 0u) << result.out;
-        EXPECT_NE(result.out.find("; 1 problem\n"), std::string::npos) << result.out;
-    }
+    Write(R"({"assets": [)" + good + "," + good + "]}");
+    EXPECT_EQ(
+        Run({"check", catalog_}),
+        (Result{1,
+                "Skipping asset 1 of the downloadable font catalog " + catalog_ +
+                    ": duplicate \"LocalID\" A\n" + catalog_ + ": 1 assets, 1 fonts; 1 problem\n",
+                ""}));
     Write(R"({"assets": [)" + good + "]}");
     EXPECT_EQ(Run({"check", catalog_}).out, catalog_ + ": 1 assets, 1 fonts; 0 problems\n");
 }
@@ -172,7 +152,7 @@ TEST_F(CatalogCommandTest, FetchComparesEveryAssetWithTheCatalog) {
             .status,
         0);
     EXPECT_EQ(Run({"check", catalog_}).status, 0);
-    server.Serve("/fonts/DejaVuSans-Bold.ttf", Served(sans));
+    server.Serve("/fonts/DejaVuSans-Bold.ttf", {.body = sans});
 
     std::string changed = serif;
     changed[1000] ^= 1;
@@ -196,7 +176,8 @@ TEST_F(CatalogCommandTest, FetchComparesEveryAssetWithTheCatalog) {
         {"missing", false, "", "asset DejaVuSerif: cannot download "},
     };
     for (const Case& c : cases) {
-        server.Serve("/fonts/DejaVuSerif.ttf", c.serve ? Served(c.body) : Served("", "/gone"));
+        server.Serve("/fonts/DejaVuSerif.ttf",
+                     {.body = c.body, .redirectTo = c.serve ? "" : "/gone"});
         const Result result = Run({"check", catalog_, "--fetch"});
         EXPECT_EQ(result.status, c.problem.empty() ? 0 : 1) << c.what;
         const std::string summary = catalog_ + ": 2 assets, 2 fonts, downloaded; " +

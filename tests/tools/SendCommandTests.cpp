@@ -12,8 +12,7 @@ namespace {
 
 const char kName[] = "org.glyphwell.Test.Tool";
 
-/// A server that replies with the request's own bytes (or the bytes set) and remembers the last
-/// request.
+/// Replies with the request's own bytes (or `reply`) and remembers the last request.
 class EchoServer {
 public:
     EchoServer()
@@ -44,9 +43,9 @@ protected:
 } // namespace
 
 TEST_F(SendCommandTest, PrintsTheReplyOrSaysWhyThereIsNone) {
-    ToolResult result = Invoke({"send", "--msgid", "1", "--name", kName}, "{}");
-    EXPECT_EQ(result.status, 1);
-    EXPECT_EQ(result.err, "glyphwell send: nothing answers on the port org.glyphwell.Test.Tool\n");
+    EXPECT_EQ(Invoke({"send", "--msgid", "1", "--name", kName}, "{}"),
+              (ToolResult{
+                  1, "", "glyphwell send: nothing answers on the port org.glyphwell.Test.Tool\n"}));
 
     EchoServer server;
     ASSERT_TRUE(server.Started());
@@ -71,10 +70,7 @@ TEST_F(SendCommandTest, PrintsTheReplyOrSaysWhyThereIsNone) {
         server.reply = c.reply;
         std::vector<std::string> arguments = {"send", "--name", kName, "--msgid"};
         arguments.insert(arguments.end(), c.options.begin(), c.options.end());
-        result = Invoke(arguments, c.input);
-        EXPECT_EQ(result.status, c.status);
-        EXPECT_EQ(result.out, c.out);
-        EXPECT_EQ(result.err, c.err);
+        EXPECT_EQ(Invoke(arguments, c.input), (ToolResult{c.status, c.out, c.err}));
         EXPECT_EQ(server.lastMsgid, std::stoi(c.options[0]));
         if (c.input.empty()) {
             EXPECT_EQ(server.lastRequest, "");
@@ -110,10 +106,11 @@ TEST_F(SendCommandTest, AskDownloadSendsTheMessageId2Request) {
     const ToolResult result = Invoke({"ask-download", "--name", kName, "--compact", "--font",
                                       "ExampleSans-Regular:Example Sans", "Other-Bold", "--app",
                                       "Writer", "--pid", "4242", "--suppress"});
-    ASSERT_EQ(result.status, 0) << result.err;
+    EXPECT_EQ(result, (ToolResult{0,
+                                  "{\"QZUIPropertyResult\":{\"$number\":1,\"$type\":7},"
+                                  "\"QZUIPropertySuppress\":{\"$number\":0,\"$type\":7}}\n",
+                                  ""}));
     EXPECT_EQ(server.lastMsgid, 2);
-    EXPECT_EQ(result.out, "{\"QZUIPropertyResult\":{\"$number\":1,\"$type\":7},"
-                          "\"QZUIPropertySuppress\":{\"$number\":0,\"$type\":7}}\n");
     const ToolResult request = Invoke({"decode", "--compact"}, server.lastRequest);
     ASSERT_EQ(request.status, 0) << request.err;
     EXPECT_EQ(nlohmann::json::parse(request.out), nlohmann::json::parse(R"({

@@ -13,6 +13,10 @@ struct ToolResult {
     int status;
     std::string out;
     std::string err;
+    bool operator==(const ToolResult&) const = default;
+    friend std::ostream& operator<<(std::ostream& stream, const ToolResult& result) {
+        return stream << result.status << " [" << result.out << "] [" << result.err << "]";
+    }
 };
 
 inline ToolResult Invoke(const std::vector<std::string>& arguments, const std::string& input = "") {
