@@ -209,20 +209,6 @@ TEST_F(DownloadRoadTest, AnAgreedDownloadIsInstalledAndAnsweredYesCancelStopsAnd
                 ReadFile(kDejaVu + "DejaVuSansMono.ttf"));
 }
 
-TEST_F(DownloadRoadTest, AnInstalledFontIsMatchedWithoutDownloading) {
-    ASSERT_TRUE(QFile::copy(kDejaVu + "DejaVuSansMono.ttf", fonts_ + "/DejaVuSansMono.ttf"));
-    ASSERT_TRUE(QZReloadFontConfiguration());
-    ServeMono();
-    // Nothing to download means nothing to confirm: only a request that says not to ask gets
-    // this far. Unasked, the window still shows the display name.
-    EXPECT_EQ(HandleDownloadRequest(DownloadRequest({mono_.get()}, 0, true).get()),
-              Reply(true, true));
-    EXPECT_EQ(watch_.statusWhenHidden, "Preparing to download “DejaVu Sans Mono”…");
-    EXPECT_EQ(callbacks_.States(), (std::vector<uint32_t>{0, 2, 7, 1}));
-    EXPECT_EQ(server_.RequestCount("/DejaVuSansMono.ttf"), 0);
-    EXPECT_TRUE(DownloadFolder().isEmpty());
-}
-
 TEST_F(DownloadRoadTest, AFailureGoesOnToTheNextFontOrEndsWithNoWhenCancelledOrClosed) {
     struct Case {
         const char* button; ///< the error alert's button pressed; null: its close button

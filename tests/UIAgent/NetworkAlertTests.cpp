@@ -127,7 +127,8 @@ TEST_F(NetworkCheckTest, TheCriticalOfflineAlertStopsOnlyOnCancelOrCloseAndRaise
 }
 
 TEST_F(NetworkCheckTest, OfflineCancelAnswersNoAndContinueRunsTheDownloadWindow) {
-    // DejaVu Sans is installed: a download that goes on matches it.
+    // DejaVu Sans is installed: a download that goes on matches it without downloading (there
+    // is no catalog), and the unasked window still names the font.
     Ref font = RequestedFont("DejaVuSans");
     for (const bool goOn : {false, true}) {
         WindowWatch shown;
@@ -136,6 +137,7 @@ TEST_F(NetworkCheckTest, OfflineCancelAnswersNoAndContinueRunsTheDownloadWindow)
                   Reply(goOn, true));
         EXPECT_TRUE(script.done());
         EXPECT_EQ(shown.progressWindowsShown, goOn ? 1 : 0);
+        EXPECT_EQ(shown.statusWhenHidden, goOn ? "Preparing to download “DejaVuSans”…" : "");
     }
 }
 
