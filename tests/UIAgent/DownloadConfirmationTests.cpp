@@ -1,6 +1,5 @@
-// The font download confirmation, driven by its real buttons on the offscreen platform: the
-// answers, withdrawal when the requesting process dies, display names by preferred language, the
-// download size counted once per asset, and validity.
+// The font download confirmation: answers, withdrawal when the requester dies, display names by
+// preferred language, the download size counted once per asset, and validity.
 #include <QTest>
 
 #include "UIAgent/QZFontDownloadConfirmation.h"

@@ -1,7 +1,5 @@
-// The network check before a download: which reachability flags let the download go on without
-// a word, the offline alert's texts and buttons, its answers, and what the dispatcher makes of
-// them. The flags are injected; reading them from the routing table is tested with the desktop
-// services.
+// The network check before a download: which (injected) reachability flags go on without a word,
+// the offline alert's texts, buttons and answers, and what the dispatcher makes of them.
 #include <QTest>
 #include <algorithm>
 

@@ -116,7 +116,7 @@ def test(agent, tool):
         client = run.ask(tool, "failure", "ask-download", "--font", MISSING_NAME, "--suppress",
                          "--app", "Demo")
         found = next_toplevel(len(found) + 1)
-        check_window(found[-1], "download error alert")
+        check_window(found[-1], "download error alert", "Font Download Failed")
         stop(client)
         next_toplevel(len(found) - 1, lambda record: record["destroyed"])
         check_running(agent_process)
