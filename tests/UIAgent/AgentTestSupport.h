@@ -145,8 +145,7 @@ private:
     InstalledTable table_{QStringLiteral("en")};
 };
 
-/// A script's give-up: ends the innermost modal run every 50 ms from now on, so that a stalled
-/// test fails instead of hanging.
+/// A script's give-up: ends the innermost modal run every 50 ms from now on.
 inline void EndEveryModalRun() {
     auto* timer = new QTimer(QCoreApplication::instance());
     QObject::connect(timer, &QTimer::timeout, [] {
@@ -271,8 +270,7 @@ private:
     pid_t pid_;
 };
 
-/// One requested font: its PostScript name, and its family and the family's names by language
-/// when given.
+/// One requested font: its PostScript name, and its family and names by language when given.
 inline Ref
 RequestedFont(const char* postScriptName, const char* family = nullptr,
               std::initializer_list<std::pair<const char*, const char*>> localized = {}) {
@@ -294,8 +292,7 @@ RequestedFont(const char* postScriptName, const char* family = nullptr,
     return attributes;
 }
 
-/// A message id 2 request from "Example Writer" (process `pid`) for `fonts`; with `suppress`,
-/// the request says not to ask.
+/// A message id 2 request from "Example Writer" (process `pid`) for `fonts`, maybe not to ask.
 inline Ref DownloadRequest(std::initializer_list<CFTypeRef> fonts, SInt32 pid = 0,
                            bool suppress = false) {
     return Dict({{kQZUIPropertyApplicationName, Str("Example Writer").get()},
@@ -304,8 +301,7 @@ inline Ref DownloadRequest(std::initializer_list<CFTypeRef> fonts, SInt32 pid = 
                  {kQZUIPropertySuppress, suppress ? kCFBooleanTrue : kCFBooleanFalse}});
 }
 
-/// Sends `request` (flattened as a client sends it; null: no bytes) to the dispatcher of
-/// `controller` as message `msgid`; returns the reply bytes in hex.
+/// The dispatcher's reply in hex to `request` (null: no bytes) as message `msgid`.
 inline std::string HandleRequest(SInt32 msgid, CFTypeRef request, void* controller = nullptr) {
     Ref bytes = request ? Flattened(request) : Ref();
     Ref reply(QZUIAgentHandleMessage(nullptr, msgid, bytes.as<CFDataRef>(), controller));
@@ -322,9 +318,8 @@ inline QDialog* ProgressWindowOnScreen() {
     return nullptr;
 }
 
-/// Watches the agent's windows from the event loop while it lives: how many were shown (and how
-/// many progress windows), which were activated, the progress bar after each change of its value,
-/// and the progress window when it was first hidden.
+/// Watches the agent's windows while it lives: how many were shown (and progress windows), which
+/// were activated, the progress bar after each change, the progress window when first hidden.
 class WindowWatch : public QObject {
 public:
     WindowWatch() { QCoreApplication::instance()->installEventFilter(this); }

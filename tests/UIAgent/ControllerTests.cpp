@@ -35,17 +35,6 @@ protected:
                          [this](qint64 count) { counts_.push_back(count); });
     }
 
-    /// Handles one request of an unknown message id, as the port would.
-    void SendUnknownRequest() {
-        CFRelease(QZUIAgentHandleMessage(nullptr, 3, nullptr, controller_.get()));
-    }
-    /// Another port under the agent's name, as a second agent would hold it.
-    static CFMessagePortRef TakeTheName() {
-        CFMessagePortContext context = {0, nullptr, nullptr, nullptr, nullptr};
-        return CFMessagePortCreateLocal(nullptr, kQZUIAgentPortName, QZUIAgentHandleMessage,
-                                        &context, nullptr);
-    }
-
     AgentPortEnvironment environment_;
     std::unique_ptr<QZUIController> controller_;
     QElapsedTimer clock_;
@@ -85,7 +74,9 @@ TEST_F(ControllerTest, LaunchingServesThePortAndSetsTheSharedControllerOnce) {
 }
 
 TEST_F(ControllerTest, ATakenNameIsLoggedAndTheAgentRunsOnWithoutAPort) {
-    Ref other(TakeTheName());
+    CFMessagePortContext context = {0, nullptr, nullptr, nullptr, nullptr};
+    Ref other(CFMessagePortCreateLocal(nullptr, kQZUIAgentPortName, QZUIAgentHandleMessage,
+                                       &context, nullptr)); // as a second agent would hold it
     ASSERT_TRUE(other);
     LogCapture log;
     controller_->applicationWillFinishLaunching();
@@ -125,7 +116,7 @@ TEST_F(ControllerTest, NoIdleExitBeforeTheFirstRequestNorWhileOneIsStillBeingRec
     controller_->applicationWillFinishLaunching();
     SpinUntil([] { return false; }, 3 * kShortIdleDelay);
     EXPECT_EQ(terminations_, 0);
-    SendUnknownRequest();
+    CFRelease(QZUIAgentHandleMessage(nullptr, 3, nullptr, controller_.get()));
     // A client that has sent the first bytes of a frame and is still sending.
     const int client = RawConnect(glyphwell::port::SocketPathForName(QZ_UI_AGENT_PORT_NAME));
     ASSERT_GE(client, 0);

@@ -221,8 +221,7 @@ TEST_F(DownloadRoadTest, AFailureGoesOnToTheNextFontOrEndsWithNoWhenCancelledOrC
         SCOPED_TRACE(c.button ? c.button : "close button");
         LoopbackHTTPServer::Resource resource;
         resource.dropAfter = c.damaged ? std::string::npos : 100000;
-        // Another identifier for the damaged file, so that the catalog changes size and is read
-        // again.
+        // Another identifier for the damaged file, so that the catalog changes size and is reread.
         WriteCatalog(
             {ServeFont("DejaVuSansMono-Bold.ttf",
                        c.damaged ? "org.test.DamagedBold" : "org.test.MonoBold",
