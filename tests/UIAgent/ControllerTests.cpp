@@ -43,7 +43,7 @@ protected:
     std::vector<qint64> counts_;
 };
 
-TEST_F(ControllerTest, LaunchingServesThePortAndSetsTheSharedControllerOnce) {
+TEST_F(ControllerTest, LaunchingOpensThePortAndSetsTheSharedControllerOnceGoingUndoesBoth) {
     EXPECT_EQ(QZUIController::sharedController(), nullptr);
     controller_->applicationWillFinishLaunching();
     EXPECT_EQ(QZUIController::sharedController(), controller_.get());
