@@ -1,7 +1,5 @@
-// Helpers of the agent's tests: a private socket directory with the agent's run-loop driver,
-// requests flattened as clients send them and the exact bytes of the replies, a client on another
-// thread, the English texts, a script of UI steps run while a modal alert blocks the test, a child
-// process standing for the requesting application, and a watch on the windows shown.
+// Helpers of the agent's tests: requests and the exact bytes of replies, a socket client, the
+// English texts, scripted UI steps under a modal alert, a stand-in requester, a window watch.
 #pragma once
 
 #include <QAbstractButton>
@@ -40,8 +38,7 @@
 
 namespace glyphwell::testing {
 
-/// A private XDG_RUNTIME_DIR (the agent's port never meets a real agent or another test) and the
-/// agent's run-loop driver, while it lives.
+/// A private XDG_RUNTIME_DIR and the agent's run-loop driver while it lives.
 class AgentPortEnvironment {
 public:
     AgentPortEnvironment() { SetRunLoopDriver(&driver_); }
@@ -68,8 +65,8 @@ inline std::vector<uint8_t> Join(std::initializer_list<std::vector<uint8_t>> pie
     return all;
 }
 
-/// A reply in hex, as the clients read it: {Result, Suppress} as numbers of type 7 (signed char,
-/// one byte); with `candidates` (the array's bytes), the message id 1 reply that also holds them.
+/// A reply in hex: {Result, Suppress} as one-byte numbers (type 7), with `candidates` (the
+/// array's bytes) the message id 1 reply that also holds them.
 inline std::string Reply(bool result, bool suppress,
                          std::optional<std::vector<uint8_t>> candidates = {}) {
     auto flag = [](bool on) {
@@ -86,8 +83,7 @@ inline std::string Reply(bool result, bool suppress,
     return ToHex(bytes);
 }
 
-/// Sends `request` (flattened; null: no bytes) as message `msgid` through the agent's socket from
-/// a thread of its own; the destructor joins it.
+/// Sends `request` (null: no bytes) as message `msgid` through the agent's socket from a thread.
 class SocketClient {
 public:
     SocketClient(SInt32 msgid, CFTypeRef request, CFTimeInterval receiveTimeout = 5)
@@ -149,8 +145,7 @@ private:
     InstalledTable table_{QStringLiteral("en")};
 };
 
-/// For a script's give-up: ends the innermost modal run every 50 ms from now on, until the
-/// application goes, so that a stalled test fails instead of hanging.
+/// A script's give-up: ends the innermost modal run every 50 ms from now on.
 inline void EndEveryModalRun() {
     auto* timer = new QTimer(QCoreApplication::instance());
     QObject::connect(timer, &QTimer::timeout, [] {
@@ -160,10 +155,9 @@ inline void EndEveryModalRun() {
     timer->start(50);
 }
 
-/// Steps carried out from the event loop, in order: each one's action runs once its condition
-/// holds (polled every 10 ms). Meant to answer an alert while its modal run blocks the test.
-/// When the steps are not all done after `patience`, `giveUp` runs (to end the alert; by default
-/// every modal run) and the test fails.
+/// Steps run from the event loop in order, each once its condition holds (polled every 10 ms),
+/// to answer an alert while its modal run blocks the test. Not done after `patience`: the test
+/// fails and `giveUp` runs.
 class UiScript {
 public:
     struct Step {
@@ -237,8 +231,7 @@ inline QString WriteFile(const QString& path, const QByteArray& contents = QByte
     return path;
 }
 
-/// A temporary data home (XDG_DATA_HOME, and no other data directory) while it lives, where the
-/// downloadable-font catalog is written.
+/// A temporary data home (and no other data directory) for the download catalog while it lives.
 class PrivateDataHome {
 public:
     PrivateDataHome() {
@@ -277,8 +270,7 @@ private:
     pid_t pid_;
 };
 
-/// One requested font: its PostScript name, and its family and the family's names by language
-/// when given.
+/// One requested font: its PostScript name, and its family and names by language when given.
 inline Ref
 RequestedFont(const char* postScriptName, const char* family = nullptr,
               std::initializer_list<std::pair<const char*, const char*>> localized = {}) {
@@ -300,8 +292,7 @@ RequestedFont(const char* postScriptName, const char* family = nullptr,
     return attributes;
 }
 
-/// A message id 2 request from "Example Writer" (process `pid`) for `fonts`; with `suppress`,
-/// the request says not to ask.
+/// A message id 2 request from "Example Writer" (process `pid`) for `fonts`, maybe not to ask.
 inline Ref DownloadRequest(std::initializer_list<CFTypeRef> fonts, SInt32 pid = 0,
                            bool suppress = false) {
     return Dict({{kQZUIPropertyApplicationName, Str("Example Writer").get()},
@@ -310,8 +301,7 @@ inline Ref DownloadRequest(std::initializer_list<CFTypeRef> fonts, SInt32 pid = 
                  {kQZUIPropertySuppress, suppress ? kCFBooleanTrue : kCFBooleanFalse}});
 }
 
-/// Sends `request` (flattened as a client sends it; null: no bytes) to the dispatcher of
-/// `controller` as message `msgid`; returns the reply bytes in hex.
+/// The dispatcher's reply in hex to `request` (null: no bytes) as message `msgid`.
 inline std::string HandleRequest(SInt32 msgid, CFTypeRef request, void* controller = nullptr) {
     Ref bytes = request ? Flattened(request) : Ref();
     Ref reply(QZUIAgentHandleMessage(nullptr, msgid, bytes.as<CFDataRef>(), controller));
@@ -328,9 +318,8 @@ inline QDialog* ProgressWindowOnScreen() {
     return nullptr;
 }
 
-/// Watches the agent's windows from the event loop while it lives: how many were shown (and how
-/// many progress windows), which were activated, the progress bar after each change of its value,
-/// and the progress window when it was first hidden.
+/// Watches the agent's windows while it lives: how many were shown (and progress windows), which
+/// were activated, the progress bar after each change, the progress window when first hidden.
 class WindowWatch : public QObject {
 public:
     WindowWatch() { QCoreApplication::instance()->installEventFilter(this); }

@@ -143,35 +143,6 @@ TEST_F(AutoActivationTest, RegressionTimeoutOfAnAnsweredAlertNeverEndsALaterOne)
     EXPECT_TRUE(laterUpAfterEarlierDeadlines);
 }
 
-TEST_F(AutoActivationTest, WithdrawEndsItsOwnAlertEvenBelowANestedOne) {
-    Confirmation outer(Request().as<CFDictionaryRef>());
-    Confirmation inner(Request().as<CFDictionaryRef>());
-    std::vector<std::string> returned;
-    bool innerUp = false, outerHidden = false;
-    UiScript script({{[&] { return outer.alert()->isVisible(); },
-                      [&] {
-                          QTimer::singleShot(0, outer.alert(), [&] {
-                              inner.showAlert();
-                              returned.push_back("inner");
-                          });
-                      }},
-                     {[&] { return inner.alert()->isVisible(); },
-                      [&] {
-                          outer.withdraw();
-                          outerHidden = !outer.alert()->isVisible();
-                          innerUp = inner.alert()->isVisible();
-                          inner.buttonWithTag(2000)->click();
-                      }}});
-    outer.showAlert();
-    returned.push_back("outer");
-
-    EXPECT_EQ(returned, (std::vector<std::string>{"inner", "outer"}));
-    EXPECT_TRUE(outerHidden);
-    EXPECT_TRUE(innerUp);
-    EXPECT_TRUE(inner.shouldActivate());
-    EXPECT_FALSE(outer.shouldActivate());
-}
-
 TEST_F(AutoActivationTest, NamesFallBackToTheBundleThenTheCandidateFile) {
     const QString entry = WriteFile(directory_.filePath("writer.desktop"),
                                     "[Desktop Entry]\nName=Writer\nName[de]=Schreiber\n");

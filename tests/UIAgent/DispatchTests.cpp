@@ -68,11 +68,7 @@ TEST_F(DispatchTest, UnknownIdsAreLoggedSignWidenedAndAnsweredWithNoBytes) {
     EXPECT_EQ(Handle(3, request.get()), "");
     EXPECT_EQ(Handle(-1, nullptr), "");
     EXPECT_EQ(Handle(INT32_MIN, nullptr), "");
-    std::vector<std::string> unknownLines;
-    for (const std::string& line : log.Texts())
-        if (line.rfind("unknown msgid", 0) == 0)
-            unknownLines.push_back(line);
-    EXPECT_EQ(unknownLines,
+    EXPECT_EQ(log.Texts(),
               (std::vector<std::string>{"unknown msgid: 3", "unknown msgid: 18446744073709551615",
                                         "unknown msgid: 18446744071562067968"}));
     // Every request, known or not, is counted and restarts the idle period.
@@ -97,15 +93,13 @@ TEST_F(DispatchTest, RequestsWithNothingToAskAreAnsweredAtOnceWithoutAWindow) {
         // Nothing any catalog offers: no confirmation.
         {2, Dict({{kQZUIPropertyFontProperties, Array({unknownFont.get()}).get()}}),
          Reply(false, false)},
-        // Not to be asked, with no font named (or a number that answers true as the flag):
-        // nothing is downloaded or matched, and the flag is passed back.
+        // Not to be asked (a number answers true as the flag): the flag is passed back.
         {2,
          Dict({{kQZUIPropertySuppress, kCFBooleanTrue},
                {kQZUIPropertyFontProperties, Array({nameless.get()}).get()}}),
          Reply(false, true)},
         {2, Dict({{kQZUIPropertySuppress, one.get()}}), Reply(false, true)},
-        // Regression: not to be asked, with no font that a catalog offers or that is installed,
-        // no window opened and no question was asked (offline: the network alert).
+        // Regression: unasked, with no font offered or installed, no (offline) question came up.
         {2, DownloadRequest({unknownFont.get()}, 0, true), Reply(false, true)},
         {2, DownloadRequest({}, 0, true), Reply(false, true)},
         // Message id 1 without candidates: no, with an empty candidate array.
@@ -115,8 +109,7 @@ TEST_F(DispatchTest, RequestsWithNothingToAskAreAnsweredAtOnceWithoutAWindow) {
         {1, Dict({{kQZUIPropertyCandidateFontURLs, font.get()}}), noWithoutCandidates},
     };
     WindowWatch shown;
-    // A question that comes up all the same is closed (and counted), so that the test fails
-    // instead of waiting for an answer.
+    // A question that comes up all the same is closed (and counted) instead of awaited.
     QTimer closer;
     QObject::connect(&closer, &QTimer::timeout, [] {
         if (QMessageBox* alert = AlertOnScreen())
@@ -185,7 +178,6 @@ TEST_F(DispatchTest, AClientThatGivesUpWithdrawsItsQuestionAndTheOthersGoOn) {
     Ref outerRequest = ActivationRequest("Impatient Application");
     Ref innerRequest = ActivationRequest("Patient Application");
 
-    // Requests are handled inside whatever loop runs, so the test acts from the event loop.
     std::unique_ptr<SocketClient> patient;
     QPointer<QMessageBox> outerAlert;
     bool innerUpWhenOuterWent = false;
@@ -194,7 +186,7 @@ TEST_F(DispatchTest, AClientThatGivesUpWithdrawsItsQuestionAndTheOthersGoOn) {
         outerAlert = outer;
         patient = std::make_unique<SocketClient>(1, innerRequest.get(), kCFMessagePortWaitForever);
         WhenAlertAppears(outer, [&](QMessageBox* inner) {
-            // The impatient client gives up: its alert goes at once, the other one stays.
+            // The impatient client gives up: its alert goes, the other one stays.
             ASSERT_TRUE(SpinUntil([&] { return !outerAlert || !outerAlert->isVisible(); }, 20s));
             innerUpWhenOuterWent = inner->isVisible();
             countWhenOuterWent = controller_.alertCount();

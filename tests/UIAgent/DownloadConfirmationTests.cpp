@@ -1,6 +1,5 @@
-// The font download confirmation, driven by its real buttons on the offscreen platform: the
-// answers, withdrawal when the requesting process dies, display names by preferred language, the
-// download size counted once per asset, and validity.
+// The font download confirmation: answers, withdrawal when the requester dies, display names by
+// preferred language, the download size counted once per asset, and validity.
 #include <QTest>
 
 #include "UIAgent/QZFontDownloadConfirmation.h"
@@ -110,7 +109,7 @@ TEST_F(DownloadConfirmationTest, OneDisplayNameIsNamedAndEachAssetIsCountedOnce)
               "The download is 3.2 MB in total. Do you want to download the fonts?");
 }
 
-TEST_F(DownloadConfirmationTest, NothingToDownloadIsNotValid) {
+TEST_F(DownloadConfirmationTest, NothingToDownloadIsNotValidAndTheApplicationNameFallsBack) {
     Ref mono = RequestedFont("Mono", "Mono");
     Ref unknown = RequestedFont("Unknown");
     EXPECT_FALSE(
@@ -120,6 +119,14 @@ TEST_F(DownloadConfirmationTest, NothingToDownloadIsNotValid) {
     EXPECT_FALSE(empty.valid());
     EXPECT_EQ(empty.applicationName(), "The current application");
     EXPECT_EQ(CFDictionaryGetCount(empty.localizedFontNamesDict()), 0);
+    // Without a name in the request: the desktop entry's, in the user's language.
+    const QString entry = WriteFile(data_.FilePath("writer.desktop"),
+                                    "[Desktop Entry]\nName=Writer\nName[de]=Schreiber\n");
+    QZSetPreferredLanguagesForTesting({"de-DE"});
+    EXPECT_EQ(
+        Confirmation(Dict({{kQZUIPropertyBundleURL, FileURL(entry).get()}}).as<CFDictionaryRef>())
+            .applicationName(),
+        "Schreiber");
 }
 
 TEST_F(DownloadConfirmationTest, TheUsersLanguagesInTurnPickTheLongestMatchingKey) {
@@ -189,15 +196,6 @@ TEST_F(DownloadConfirmationTest, TheCatalogsNamesStandInForThoseTheRequestLacks)
     Confirmation french(DownloadRequest({regular_.get()}).as<CFDictionaryRef>());
     EXPECT_EQ(french.informativeText(),
               "The font “Example Sans” is 757 kB. Do you want to download it?");
-}
-
-TEST_F(DownloadConfirmationTest, ApplicationNameFallsBackToTheLocalizedDesktopEntry) {
-    const QString entry = WriteFile(data_.FilePath("writer.desktop"),
-                                    "[Desktop Entry]\nName=Writer\nName[de]=Schreiber\n");
-    QZSetPreferredLanguagesForTesting({"de-DE"});
-    Confirmation confirmation(
-        Dict({{kQZUIPropertyBundleURL, FileURL(entry).get()}}).as<CFDictionaryRef>());
-    EXPECT_EQ(confirmation.applicationName(), "Schreiber");
 }
 
 } // namespace

@@ -11,32 +11,25 @@
 
 namespace {
 
-TEST(ModalSession, RunShowsTheWindowAndReturnsTheCodeGivenToEnd) {
+TEST(ModalSession, RunShowsTheWindowUntilEndedRunsAgainAndClosingCancels) {
     QWidget window;
     QZModalSession session(&window);
+    session.End(kQZModalResponseStop); // outside a run: nothing
     bool visibleWhileRunning = false;
     int depthWhileRunning = 0;
     QTimer::singleShot(0, [&] {
         visibleWhileRunning = window.isVisible();
         depthWhileRunning = QZModalSession::Depth();
         EXPECT_EQ(QZModalSession::Innermost(), &session);
-        session.End(2001);
+        session.End(1000);
     });
-    EXPECT_EQ(session.Run(), 2001);
+    EXPECT_EQ(session.Run(), 1000);
     EXPECT_TRUE(visibleWhileRunning);
     EXPECT_EQ(depthWhileRunning, 1);
     EXPECT_FALSE(window.isVisible());
     EXPECT_FALSE(session.IsRunning());
     EXPECT_EQ(QZModalSession::Depth(), 0);
     EXPECT_EQ(QZModalSession::Innermost(), nullptr);
-}
-
-TEST(ModalSession, EndOutsideARunDoesNothingASessionRunsAgainAndClosingCancels) {
-    QWidget window;
-    QZModalSession session(&window);
-    session.End(kQZModalResponseStop);
-    QTimer::singleShot(0, [&] { session.End(1000); });
-    EXPECT_EQ(session.Run(), 1000);
     // Shown again, as an alert is after its Show-in-file-manager button.
     QTimer::singleShot(0, [&] {
         session.End(kQZModalResponseStop);

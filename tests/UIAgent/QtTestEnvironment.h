@@ -1,12 +1,6 @@
-// The one QApplication of the agent's test executable. Widgets need an application object, and a
-// process may hold only one, so every test file of tests/UIAgent includes this header: the
-// environment is registered once (an inline variable, whatever the number of files including
-// it), creates the application before the first test and destroys it after the last.
-//
-// The tests run on Qt's offscreen platform (the test registration sets QT_QPA_PLATFORM; the
-// environment sets it too when the executable is started by hand). The questions' input guard is
-// off (GLYPHWELL_INPUT_GUARD_MS=0) unless the environment says otherwise, so that tests may press
-// a button as soon as its window is up; the guard's own tests turn it on.
+// The one QApplication of the agent's test executable, registered once (an inline variable) and
+// made before the first test, on Qt's offscreen platform. The questions' input guard is off unless
+// the environment says otherwise, so that tests may press a button as soon as its window is up.
 #pragma once
 
 #include <QApplication>
@@ -29,7 +23,6 @@ public:
         static char name[] = "uiagent_tests";
         static char* argv[] = {name, nullptr};
         application_ = new QApplication(argc, argv);
-        // The agent's windows closing must not end anything: tests run many of them.
         QApplication::setQuitOnLastWindowClosed(false);
     }
     void TearDown() override {

@@ -1,5 +1,5 @@
 // What every question window shares: the input guard after each showing, the window's properties,
-// and what assistive technologies are told. Driven on the offscreen platform.
+// long names elided, and what assistive technologies are told. Driven on the offscreen platform.
 #include <QAccessible>
 #include <QCheckBox>
 #include <QDialog>
@@ -116,14 +116,21 @@ bool InjectOffline(QZNetworkReachabilityFlags* flags) {
     return true;
 }
 
-/// Shows each question window, checks it while it is up, and ends it; then the progress window.
-TEST(AgentWindows, HaveATitleAFixedSizeTheDialogTypeAndGuardedButtonsOrANamedProgressBar) {
+/// Shows each question window (with over-long names where it names anything), checks it while it
+/// is up, and ends it; then the progress window.
+TEST(AgentWindows, HaveATitleAFixedSizeTheDialogTypeGuardedButtonsAndElidedNamesToldInFull) {
     EnglishTexts english;
     GuardDuration guard(60s);
-    Ref request = Dict({{kQZUIPropertyApplicationName, Str("Example Writer").get()},
-                        {kQZUIPropertyFontName, Str("Example Sans").get()}});
+    PrivateDataHome data;
+    data.WriteCatalog(R"({"assets": [{"LocalID": "A", "url": "https://f/A", "size": 1000,
+        "sha256": "%1", "fonts": [{"postScriptName": "Sans-Regular"}]}]})");
+    const QString font(100, u'W'), application = "Writer" + QString(200, u'X');
+    Ref fonts = Array({RequestedFont("Sans-Regular", font.toUtf8().constData()).get()});
+    Ref request = Dict({{kQZUIPropertyApplicationName, Str(application.toStdString()).get()},
+                        {kQZUIPropertyFontName, Str(font.toStdString()).get()},
+                        {kQZUIPropertyFontProperties, fonts.get()}});
     QZAutoActivationConfirmation activation(request.as<CFDictionaryRef>());
-    QZFontDownloadConfirmation download(nullptr);
+    QZFontDownloadConfirmation download(request.as<CFDictionaryRef>());
     download.setTargetAppPID(0);
     QZNetworkCheck::SetFlagsSourceForTesting(&InjectOffline);
     QZNetworkCheck network;
@@ -151,8 +158,18 @@ TEST(AgentWindows, HaveATitleAFixedSizeTheDialogTypeAndGuardedButtonsOrANamedPro
                               EXPECT_EQ(box->windowTitle(), row.title);
                               EXPECT_EQ(box->windowType(), Qt::Dialog);
                               EXPECT_EQ(box->minimumSize(), box->maximumSize());
+                              EXPECT_LT(box->width(), 800);
                               for (QAbstractButton* button : box->buttons())
                                   EXPECT_FALSE(button->isEnabled()) << button->text().toStdString();
+                              auto* headline = box->findChild<QLabel*>("qt_msgbox_label");
+                              if (box != network.alert()) {
+                                  EXPECT_FALSE(box->text().contains(font) ||
+                                               box->text().contains(application));
+                                  EXPECT_TRUE(box->text().contains(u'…'));
+                                  EXPECT_TRUE(headline->toolTip().contains(font) &&
+                                              headline->toolTip().contains(application));
+                                  EXPECT_EQ(headline->accessibleDescription(), headline->toolTip());
+                              }
                               row.end();
                           }}},
                         row.end);
@@ -160,6 +177,8 @@ TEST(AgentWindows, HaveATitleAFixedSizeTheDialogTypeAndGuardedButtonsOrANamedPro
         EXPECT_TRUE(seen);
     }
     QZNetworkCheck::SetFlagsSourceForTesting(nullptr);
+    EXPECT_FALSE(activation.suppressionCheckBox()->text().contains(application));
+    EXPECT_TRUE(activation.suppressionCheckBox()->toolTip().contains(application));
 
     FontDownloadWindowController progress(Array({}).as<CFArrayRef>());
     QDialog* window = progress.window();
@@ -234,36 +253,6 @@ TEST(AutoActivationAccessibility, CountdownIsAStatusAnnouncedAtMarksAndActionsRe
     confirmation.showAlert();
     EXPECT_TRUE(script.done());
     EXPECT_TRUE(confirmation.suppressFurtherAlerts());
-}
-
-TEST(QuestionWindows, LongNamesAreElidedWithTheFullTextsToldAndDoNotWidenThem) {
-    EnglishTexts english;
-    PrivateDataHome data;
-    data.WriteCatalog(R"({"assets": [{"LocalID": "A", "url": "https://f/A", "size": 1000,
-        "sha256": "%1", "fonts": [{"postScriptName": "Sans-Regular"}]}]})");
-    const QString font(100, u'W'), application = "Writer" + QString(200, u'X');
-    Ref fonts = Array({RequestedFont("Sans-Regular", font.toUtf8().constData()).get()});
-    Ref request = Dict({{kQZUIPropertyApplicationName, Str(application.toStdString()).get()},
-                        {kQZUIPropertyFontName, Str(font.toStdString()).get()},
-                        {kQZUIPropertyFontProperties, fonts.get()}});
-    QZAutoActivationConfirmation activation(request.as<CFDictionaryRef>());
-    QZFontDownloadConfirmation download(request.as<CFDictionaryRef>());
-    for (QMessageBox* alert : {activation.alert(), static_cast<QMessageBox*>(&download)}) {
-        SCOPED_TRACE(alert->windowTitle().toStdString());
-        EXPECT_FALSE(alert->text().contains(font) || alert->text().contains(application));
-        EXPECT_TRUE(alert->text().contains(u'…'));
-        auto* headline = alert->findChild<QLabel*>(QStringLiteral("qt_msgbox_label"));
-        ASSERT_TRUE(headline);
-        EXPECT_TRUE(headline->toolTip().contains(font) &&
-                    headline->toolTip().contains(application));
-        EXPECT_EQ(headline->accessibleDescription(), headline->toolTip());
-        alert->show();
-        EXPECT_LT(alert->width(), 800);
-        alert->hide();
-    }
-    QCheckBox* box = activation.suppressionCheckBox();
-    EXPECT_FALSE(box->text().contains(application));
-    EXPECT_TRUE(box->toolTip().contains(application));
 }
 
 } // namespace

@@ -20,8 +20,7 @@ PRIVATE_BUS = "GLYPHWELL_E2E_PRIVATE_BUS"
 
 
 class Tree:
-    """Finders over the accessible tree of the application with process id `pid`. A window that
-    goes away while it is walked makes a finder return None: the caller waits and asks again."""
+    """Finders over the accessible tree of process `pid`; None when a window went while walked."""
 
     def __init__(self, pyatspi, pid):
         from gi.repository import GLib
@@ -31,8 +30,7 @@ class Tree:
         return node is not None and node.getState().contains(self.atspi.STATE_SHOWING)
 
     def window(self, roles=None, containing=None):
-        """A showing top-level window with one of `roles` (any role when None), holding a
-        showing descendant with the role `containing` when that is given."""
+        """A showing top-level window with one of `roles` (None: any) holding `containing`."""
         try:
             if self.app is None:
                 self.app = next((app for app in self.atspi.Registry.getDesktop(0)
@@ -46,7 +44,6 @@ class Tree:
         return None
 
     def find(self, role, name=None, within=None):
-        """The first showing descendant of the window `within` with `role` (and `name`)."""
         try:
             return self.atspi.findDescendant(within, lambda n: n is not None and (
                 n.getRole() == role and (name is None or n.name == name) and self.showing(n)))
@@ -54,13 +51,11 @@ class Tree:
             return None
 
     def press(self, name, within):
-        """Presses the button `name` of the window `within` once it shows and is enabled."""
         self.act(wait_for(f"the {name} button",
                           lambda: self.find(self.atspi.ROLE_PUSH_BUTTON, name, within)), "Press")
 
     def texts(self, window):
-        """The names of the labels in `window`; fails when any name in it is a bare translation
-        key (a text that no table covers)."""
+        """The labels' names in `window`; fails on a bare translation key anywhere in it."""
         try:
             nodes = [window, *self.atspi.findAllDescendants(window, lambda n: n is not None)]
             names = [(node.getRole(), node.name) for node in nodes]
@@ -71,7 +66,6 @@ class Tree:
         return [name for role, name in names if role == self.atspi.ROLE_LABEL]
 
     def act(self, node, action):
-        """Waits until `node` is enabled and sensitive, then does its action named `action`."""
         wait_for(f"{node.name!r} to be enabled", lambda: all(
             node.getState().contains(state)
             for state in (self.atspi.STATE_ENABLED, self.atspi.STATE_SENSITIVE)), timeout=10)

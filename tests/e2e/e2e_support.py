@@ -1,5 +1,4 @@
-"""Shared pieces of the agent's end-to-end runs: a private setup whose processes are always
-stopped, waits with deadlines, a font server holding its transfer, and a private X server."""
+"""Shared pieces of the agent's end-to-end runs: private set-up, waits, font server, X server."""
 import hashlib
 import http.server
 import json
@@ -19,8 +18,7 @@ DOWNLOAD_FONT = "/usr/share/fonts/truetype/dejavu/DejaVuSerif-Bold.ttf"
 DOWNLOAD_NAME = "DejaVuSerif-Bold"
 # A font that the catalog offers from a file that the server does not have: its download fails.
 MISSING_NAME = "GlyphwellMissing-Regular"
-# The two questions as the glyphwell tool puts them: may an application use a font found on disk,
-# may it download a font.
+# The two questions: may an application use a font found on disk, may it download a font.
 QUESTIONS = [
     ("activation", ["ask-activation", "--candidate", CANDIDATE_FONT, "--app", "Demo"]),
     ("download", ["ask-download", "--font", f"{DOWNLOAD_NAME}:DejaVu Serif", "--app", "Demo"]),
@@ -32,7 +30,6 @@ class Failure(Exception):
 
 
 def check(condition, failure):
-    """Fails with the text `failure` unless `condition` holds."""
     if not condition:
         raise Failure(failure)
 
@@ -101,8 +98,8 @@ class FontServer:
 
 
 class Run:
-    """A private work directory, runtime directory, data and cache homes and font setup; every
-    process started through it is stopped on exit, and its logs are printed when the run fails."""
+    """Private directories and font setup; its processes are stopped on exit, their logs printed
+    when the run fails."""
 
     def __init__(self, name):
         self.dir = tempfile.mkdtemp(prefix=f"glyphwell-{name}-")  # private to its owner
@@ -144,11 +141,9 @@ class Run:
             return f.read()
 
     def start(self, name, argv, env=None, **options):
-        """Starts `argv` with its standard output and error in NAME.log."""
         with open(self.path(name + ".log"), "wb") as log:
-            process = subprocess.Popen(
-                argv, env=env or self.env, stdout=log, stderr=subprocess.STDOUT, **options
-            )
+            process = subprocess.Popen(argv, env=env or self.env, stdout=log,
+                                       stderr=subprocess.STDOUT, **options)
         self.processes.append(process)
         return process
 
@@ -168,8 +163,7 @@ class Run:
         return self.server
 
     def start_agent(self, agent, **variables):
-        """Starts the agent with `variables` changed in its environment (None: removed), its log
-        in agent.log, and waits until it serves its socket."""
+        """Starts the agent with `variables` changed (None: removed); waits for its socket."""
         env = {name: value for name, value in dict(self.env, **variables).items() if value}
         process = self.start("agent", [agent], env=env)
         wait_for("the agent's socket", lambda: check_running(process, "at start") or
@@ -177,8 +171,7 @@ class Run:
         return process
 
     def ask(self, tool, name, *arguments):
-        """Sends a request with the glyphwell tool in the background: its reply goes to
-        NAME.reply, its errors to NAME.err."""
+        """Sends a request with the glyphwell tool in the background (NAME.reply, NAME.err)."""
         with open(self.path(name + ".reply"), "wb") as out, \
                 open(self.path(name + ".err"), "wb") as err:
             process = subprocess.Popen([tool, *arguments, "--compact", "--timeout", "60"],
@@ -216,8 +209,7 @@ def stop(process, grace=3.0):
 
 
 def start_xvfb(run):
-    """Starts a private X server (its log: xvfb.log) and returns its display, once it accepts
-    connections: Xvfb picks a free display and writes its number then."""
+    """Starts a private X server and returns its display once Xvfb writes it (then it accepts)."""
     display_read, display_write = os.pipe()
     run.start("xvfb", ["Xvfb", "-displayfd", str(display_write), "-screen", "0", "1024x768x24",
                        "-nolisten", "tcp"], pass_fds=(display_write,))
@@ -230,8 +222,7 @@ def start_xvfb(run):
 
 
 def main(test, usage):
-    """Runs `test(AGENT, GLYPHWELL)` from the command line, printing PASS, or FAIL with the reason
-    (exit status 1); `usage` (the script's doc) ends with its usage line."""
+    """Runs `test(AGENT, GLYPHWELL)`: PASS, or FAIL with the reason (status 1)."""
     if len(sys.argv) != 3:
         sys.exit(usage.splitlines()[-1])
     try:

@@ -19,9 +19,8 @@ NEW_ID = re.compile(r"new id (\w+)@(\d+)")
 
 
 def toplevels(path):
-    """The xdg toplevels that a WAYLAND_DEBUG=client log shows the client creating, in order: title,
-    application id, minimum and maximum size, whether a buffer was attached to its surface while it
-    lived, and whether it was destroyed."""
+    """The xdg toplevels of a WAYLAND_DEBUG=client log in order: title, application id, minimum
+    and maximum size, whether its surface got a buffer while it lived, whether it was destroyed."""
     shell_surfaces, live, on_surface, found = {}, {}, {}, []  # by xdg_surface, toplevel, surface
     with open(path, encoding="utf-8", errors="replace") as log:
         lines = log.read().split("\n")[:-1]  # the last piece may be a partial line
@@ -53,7 +52,7 @@ def toplevels(path):
 
 def check_window(record, kind, title=None):
     """Fails unless the toplevel has its own title (`title` when given; Qt may append the
-    application's display name after a dash), the agent's application id and a fixed size."""
+    application's name after a dash), the agent's application id and a fixed size."""
     print(f"{kind}: {record}")
     check(record["mapped"], f"the {kind} was never given a buffer")
     own = (record["title"] or "").split(" \u2014 ")[0]
@@ -85,7 +84,6 @@ def test(agent, tool):
         server = run.serve_download_font()
 
         def next_toplevel(seen, done=lambda record: record["mapped"]):
-            """Waits for a toplevel beyond the first `seen` ones to satisfy `done`."""
             def ready():
                 found = toplevels(run.path("agent.log"))
                 return len(found) > seen and done(found[seen]) and found
@@ -118,7 +116,7 @@ def test(agent, tool):
         client = run.ask(tool, "failure", "ask-download", "--font", MISSING_NAME, "--suppress",
                          "--app", "Demo")
         found = next_toplevel(len(found) + 1)
-        check_window(found[-1], "download error alert")
+        check_window(found[-1], "download error alert", "Font Download Failed")
         stop(client)
         next_toplevel(len(found) - 1, lambda record: record["destroyed"])
         check_running(agent_process)
