@@ -138,7 +138,7 @@ public:
             if (context.grown && context.limit - context.cursor > kRoomKept)
                 glyphwell::DataTrimRoom(context.stream);
             context.pending = context.cursor = context.limit = nullptr;
-            context.grown = false;
+            context.grown = context.discarding = false;
         }
     }
     Scope(const Scope&) = delete;
@@ -152,8 +152,17 @@ UInt8* TCFFlattenContext::Grow(CFIndex count) {
     Commit();
     const glyphwell::DataTail tail =
         glyphwell::DataReserveTail(stream, std::max(count, limit ? kLargeRoom : kFirstRoom));
-    if (tail.size < count) // unreachable for valid buffers: reserving throws when memory runs out
-        throw std::bad_alloc();
+    if (!tail.bytes || tail.size < count) {
+        // Not a mutable data object (reported by the platform): the job fails, and what the
+        // writers still write goes to a scratch block that is never committed.
+        valid = false;
+        failed = true;
+        discarding = true;
+        scratch.resize(std::max(scratch.size(), size_t(count)));
+        pending = cursor = scratch.data();
+        limit = scratch.data() + scratch.size();
+        return cursor;
+    }
     pending = cursor = tail.bytes;
     limit = tail.bytes + tail.size;
     grown = grown || tail.grown;
@@ -162,7 +171,8 @@ UInt8* TCFFlattenContext::Grow(CFIndex count) {
 
 void TCFFlattenContext::Commit() const {
     if (cursor != pending) {
-        glyphwell::DataCommitTail(stream, cursor - pending);
+        if (!discarding)
+            glyphwell::DataCommitTail(stream, cursor - pending);
         pending = cursor;
     }
 }

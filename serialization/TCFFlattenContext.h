@@ -21,6 +21,7 @@
 #pragma once
 
 #include <string_view>
+#include <vector>
 
 #include "platform/PropertyValues.h"
 #include "serialization/TCFType.h"
@@ -28,8 +29,8 @@
 class TCFFlattenContext {
 public:
     /// Writes into `stream`. With `adopt` the context takes over the caller's reference;
-    /// otherwise it retains the buffer. A null buffer is kept as is (Flatten must then not be
-    /// called).
+    /// otherwise it retains the buffer. A null or immutable buffer is reported when first written
+    /// to; the job then fails (HasFailed) and nothing is written.
     TCFFlattenContext(__CFData* stream, bool adopt);
     /// Releases the buffer; its bytes stay for whoever else holds it.
     virtual ~TCFFlattenContext();
@@ -138,6 +139,9 @@ private:
     int depth = 0;
     /// Whether the outermost call enlarged the buffer's block: it then gives back the room left.
     bool grown = false;
+    /// Set when the buffer cannot take bytes (null or not mutable): the room is `scratch`.
+    bool discarding = false;
+    std::vector<UInt8> scratch;
     /// Set by the outermost Flatten when the context is of this class itself, so that no
     /// subclass's Flatten or FlattenCFString needs to see the elements of containers.
     bool direct = false;

@@ -277,6 +277,25 @@ TEST(FlattenBuffer, CallersMayChangeTheBufferBetweenCallsOrWriteItIntoItself) {
     EXPECT_EQ(BytesOf(buffer.as<CFDataRef>()), expected);
 }
 
+TEST(FlattenBuffer, ABufferThatCannotTakeBytesFailsTheJobWithoutWritingAnywhere) {
+    const UInt8 bytes[] = {0xAA};
+    Ref frozen(CFDataCreate(nullptr, bytes, 1));
+    for (__CFData* buffer : {const_cast<__CFData*>(frozen.as<CFDataRef>()), (__CFData*)nullptr}) {
+        LogCapture log;
+        TCFFlattenContext context(buffer, false);
+        context.Flatten(Array({Str("a").get(), Str(Repeat("b", 5000)).get()}).get());
+        context.StreamOutCFIndex(7);
+        EXPECT_TRUE(context.HasFailed());
+        // Reported by the platform once per public call, and nothing else is tried.
+        const Lines lines = log.Texts();
+        ASSERT_EQ(lines.size(), 4u);
+        EXPECT_EQ(lines[0].rfind("*** Assertion failure in DataReserveTail, ", 0), 0u);
+        EXPECT_EQ(lines[3],
+                  "Invalid parameter not satisfying: object != nullptr && object->isMutable");
+    }
+    EXPECT_EQ(ToHex(frozen.as<CFDataRef>()), "AA");
+}
+
 TEST(FlattenEstimates, MatchTheBytesWrittenExceptForStringsAndCharacterSets) {
     Ref a = Str("a");
     const UInt8 bytes[] = {1, 2, 3};
