@@ -53,11 +53,6 @@ bool IsUTF8(const char* text) {
     return string != nullptr;
 }
 
-CFStringRef CreateString(const std::string& text) {
-    return CFStringCreateWithBytes(kCFAllocatorDefault, reinterpret_cast<const UInt8*>(text.data()),
-                                   CFIndex(text.size()), kCFStringEncodingUTF8, false);
-}
-
 /// A new file URL of an absolute path (a directory URL when the path names a directory).
 CFURLRef CreateFileURL(const std::string& path) {
     std::error_code error;
@@ -112,9 +107,9 @@ CFArrayRef CreateArray(std::vector<TCFRetained<CFTypeRef>> values) {
 /// The font attribute dictionary {NSFontNameAttribute, NSFontFamilyAttribute when given}.
 CFDictionaryRef CreateFontAttributes(const Font& font) {
     DictionaryBuilder attributes;
-    attributes.Add(NSFontNameAttribute, CreateString(font.postScriptName));
+    attributes.Add(NSFontNameAttribute, glyphwell::CreateString(font.postScriptName));
     if (!font.family.empty())
-        attributes.Add(NSFontFamilyAttribute, CreateString(font.family));
+        attributes.Add(NSFontFamilyAttribute, glyphwell::CreateString(font.family));
     return attributes.Create();
 }
 
@@ -159,12 +154,13 @@ struct glyphwell_request {
 CFDictionaryRef glyphwell_request::CreateDictionary() const {
     DictionaryBuilder request;
     if (!applicationName.empty())
-        request.Add(kQZUIPropertyApplicationName, CreateString(applicationName));
+        request.Add(kQZUIPropertyApplicationName, glyphwell::CreateString(applicationName));
     if (!bundlePath.empty())
         request.Add(kQZUIPropertyBundleURL, CreateFileURL(bundlePath));
     if (question == GLYPHWELL_ASK_ACTIVATION) {
         if (!fonts.empty()) {
-            request.Add(kQZUIPropertyFontName, CreateString(fonts.front().postScriptName));
+            request.Add(kQZUIPropertyFontName,
+                        glyphwell::CreateString(fonts.front().postScriptName));
             request.Add(kQZUIPropertyRequestDictionary, CreateFontAttributes(fonts.front()));
         }
         std::vector<TCFRetained<CFTypeRef>> urls;
