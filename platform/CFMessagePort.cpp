@@ -35,12 +35,14 @@
 #include "platform/HomeDirectory.h"
 #include "platform/Log.h"
 #include "platform/LogEscape.h"
-#include "platform/MessagePortWire.h"
+#include "platform/PlatformTesting.h"
+#include "protocol/MessagePortWire.h"
 
 using glyphwell::AppLog;
 using glyphwell::LogEscape;
 using glyphwell::RunLoopDriver;
 using glyphwell::port::FrameAssembler;
+using glyphwell::port::ReceiveInto;
 using glyphwell::runtime::CFObject;
 using glyphwell::runtime::kMessagePortKind;
 
@@ -73,34 +75,6 @@ CFDataRef CreateDataAdopting(glyphwell::port::FrameBody& body) {
         return CFDataCreate(kCFAllocatorDefault, nullptr, 0);
     return CFDataCreateWithBytesNoCopy(kCFAllocatorDefault, bytes, CFIndex(length),
                                        kCFAllocatorMalloc);
-}
-
-/// Receives into `assembler`: straight into the body in progress when there is one, else
-/// through `buffer`. Returns what recv returned (errno set when negative; 0 is the end of the
-/// stream); `*drained` tells that fewer bytes came than there was room for, so that the socket
-/// had nothing more at that moment. A refused frame leaves `assembler` Failed(). `blocking`
-/// waits for bytes (on a blocking socket); otherwise the call returns at once.
-ssize_t ReceiveInto(int descriptor, FrameAssembler& assembler, std::vector<uint8_t>& buffer,
-                    bool* drained, bool blocking = false) {
-    *drained = false;
-    size_t room = 0;
-    uint8_t* target = assembler.BodyRoom(&room);
-    if (assembler.Failed())
-        return 1;
-    const bool direct = target != nullptr;
-    if (!direct) {
-        target = buffer.data();
-        room = buffer.size();
-    }
-    const ssize_t got = recv(descriptor, target, room, blocking ? 0 : MSG_DONTWAIT);
-    if (got > 0) {
-        *drained = size_t(got) < room;
-        if (direct)
-            assembler.CommitBody(size_t(got));
-        else
-            assembler.Append(buffer.data(), size_t(got));
-    }
-    return got;
 }
 
 std::string ErrorText(int error) {
@@ -1408,8 +1382,7 @@ SInt32 __CFMessagePort::Exchange(SInt32 msgid, CFDataRef data, CFTimeInterval se
     const size_t bodyLength = data ? size_t(CFDataGetLength(data)) : 0;
     const UInt8* body = data && bodyLength ? CFDataGetBytePtr(data) : nullptr;
     uint8_t header[glyphwell::port::kRequestHeaderSize];
-    glyphwell::port::StoreBigEndian32(uint32_t(msgid), header);
-    glyphwell::port::StoreBigEndian32(uint32_t(bodyLength), header + 4);
+    glyphwell::port::StoreRequestHeader(msgid, uint32_t(bodyLength), header);
 
     int connection = -1;
     SInt32 status = kCFMessagePortSuccess;

@@ -16,7 +16,8 @@
 
 #include "platform/CFMessagePort.h"
 #include "platform/CFRunLoop.h"
-#include "platform/MessagePortWire.h"
+#include "platform/PlatformTesting.h"
+#include "protocol/MessagePortWire.h"
 #include "support/LogCapture.h"
 #include "support/PortTestSupport.h"
 #include "support/ScopedEnvironment.h"
@@ -498,17 +499,8 @@ TEST_F(MessagePortTest, ReportsEachWayAServerCanFail) {
     ASSERT_GE(listener, 0);
     Ref remote = Remote(kName);
     ASSERT_TRUE(remote);
-
-    // A server that reads the request and closes without replying.
-    std::thread server([listener] {
-        const int connection = accept(listener, nullptr, nullptr);
-        RawRead(connection, 9);
-        close(connection);
-    });
-    EXPECT_EQ(Request(remote, 1, "x", 1, kCFMessagePortWaitForever).status,
-              kCFMessagePortBecameInvalidError);
-    server.join();
-    EXPECT_TRUE(CFMessagePortIsValid(remote.as<CFMessagePortRef>()));
+    // How replies fail (none, cut short, too long) is the client tests' table, for this port's
+    // client and the client library alike.
 
     // A server that never reads: a request too large for the socket buffers cannot be sent.
     EXPECT_EQ(Request(remote, 1, std::string(16u << 20, 'x'), 0.1, 1).status,

@@ -12,7 +12,7 @@
 
 #include "platform/CFMessagePort.h"
 #include "platform/CFRunLoop.h"
-#include "platform/MessagePortWire.h"
+#include "protocol/MessagePortWire.h"
 #include "support/PortTestSupport.h"
 #include "support/Values.h"
 
