@@ -1,7 +1,7 @@
 // Request dispatch: replies byte for byte, the unknown-id line, the count around every request,
-// nesting of a request inside a running alert, and withdrawal when a client goes away.
+// and nesting of a request inside a running alert. (A client that goes away: the port's tests
+// withdraw its request, the question windows' tests their alerts, the Wayland run both.)
 #include <QCheckBox>
-#include <QPointer>
 
 #include "UIAgent/QZNetworkCheck.h"
 #include "UIAgent/QZUIController.h"
@@ -116,13 +116,13 @@ TEST_F(DispatchTest, RequestsWithNothingToAskAreAnsweredAtOnceWithoutAWindow) {
             alert->close();
     });
     closer.start(50);
-    QZNetworkCheck::SetFlagsSourceForTesting([](QZNetworkReachabilityFlags* flags) {
+    QZSetNetworkFlagsSourceForTesting([](QZNetworkReachabilityFlags* flags) {
         *flags = 0;
         return true;
     });
     for (const Case& c : cases)
         EXPECT_EQ(Handle(c.msgid, c.request.get()), c.reply) << c.msgid;
-    QZNetworkCheck::SetFlagsSourceForTesting(nullptr);
+    QZSetNetworkFlagsSourceForTesting(nullptr);
     EXPECT_EQ(shown.windowsShown, 0);
     EXPECT_EQ(counts_.back(), 0);
 }
@@ -170,44 +170,6 @@ TEST_F(DispatchTest, FontDescriptorsCarryOnlyTheNameAndSkipElementsWithoutOne) {
     EXPECT_TRUE(CFEqual(descriptors.get(), Array({regularOnly.get(), plain.get()}).get()));
     Ref none(QZCreateFontDescriptors(nullptr));
     EXPECT_EQ(CFArrayGetCount(none.as<CFArrayRef>()), 0);
-}
-
-TEST_F(DispatchTest, AClientThatGivesUpWithdrawsItsQuestionAndTheOthersGoOn) {
-    controller_.applicationWillFinishLaunching();
-    ASSERT_NE(controller_.messagePort(), nullptr);
-    Ref outerRequest = ActivationRequest("Impatient Application");
-    Ref innerRequest = ActivationRequest("Patient Application");
-
-    std::unique_ptr<SocketClient> patient;
-    QPointer<QMessageBox> outerAlert;
-    bool innerUpWhenOuterWent = false;
-    qint64 countWhenOuterWent = 0;
-    WhenAlertAppears(nullptr, [&](QMessageBox* outer) {
-        outerAlert = outer;
-        patient = std::make_unique<SocketClient>(1, innerRequest.get(), kCFMessagePortWaitForever);
-        WhenAlertAppears(outer, [&](QMessageBox* inner) {
-            // The impatient client gives up: its alert goes, the other one stays.
-            ASSERT_TRUE(SpinUntil([&] { return !outerAlert || !outerAlert->isVisible(); }, 20s));
-            innerUpWhenOuterWent = inner->isVisible();
-            countWhenOuterWent = controller_.alertCount();
-            ClickButton(inner, "QZ_BUTTON_ALLOW");
-        });
-    });
-    // The impatient client waits 1.5 s for its answer, then closes its connection.
-    SocketClient impatient(1, outerRequest.get(), 1.5);
-    ASSERT_TRUE(SpinUntil(
-        [&] {
-            return impatient.Done() && patient && patient->Done() && controller_.alertCount() == 0;
-        },
-        20s));
-
-    EXPECT_TRUE(innerUpWhenOuterWent);
-    EXPECT_EQ(countWhenOuterWent, 2);
-    EXPECT_EQ(impatient.Status(), kCFMessagePortReceiveTimeout);
-    EXPECT_EQ(patient->Status(), kCFMessagePortSuccess);
-    ASSERT_NE(patient->Reply(), nullptr);
-    EXPECT_EQ(ToHex(patient->Reply()), Reply(true, false, kOneFontURL));
-    EXPECT_EQ(counts_, (std::vector<qint64>{1, 2, 1, 0}));
 }
 
 } // namespace

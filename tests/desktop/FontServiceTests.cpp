@@ -13,6 +13,7 @@
 #include <thread>
 #include <unistd.h>
 
+#include "desktop/DesktopTesting.h"
 #include "desktop/QZFontDownloader.h"
 #include "desktop/QZFontFileWriter.h"
 #include "desktop/QZFontMatching.h"
