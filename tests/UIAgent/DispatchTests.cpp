@@ -1,6 +1,7 @@
-// Request dispatch: replies byte for byte, the unknown-id line, the count around every request,
-// and nesting of a request inside a running alert. (A client that goes away: the port's tests
-// withdraw its request, the question windows' tests their alerts, the Wayland run both.)
+// Request dispatch: replies byte for byte, the unknown-id line and the count around every
+// request. A request arriving inside a running alert is the port's test (served nested, answered
+// first) and the modal sessions' (the alert above); a client that goes away is the port's test
+// (withdrawn) and the question windows' (the alert withdrawn), and the Wayland run does both.
 #include <QCheckBox>
 
 #include "UIAgent/QZNetworkCheck.h"
@@ -127,33 +128,15 @@ TEST_F(DispatchTest, RequestsWithNothingToAskAreAnsweredAtOnceWithoutAWindow) {
     EXPECT_EQ(counts_.back(), 0);
 }
 
-TEST_F(DispatchTest, ARequestArrivingWhileAnAlertIsUpIsHandledInsideItAndAnsweredFirst) {
-    Ref outerRequest = ActivationRequest("Outer Application");
-    Ref innerRequest = ActivationRequest("Inner Application");
-    std::vector<std::string> events;
-    std::string innerReply;
-    WhenAlertAppears(nullptr, [&](QMessageBox* outer) {
-        WhenAlertAppears(outer, [&](QMessageBox* inner) {
-            events.push_back("inner alert up at count " + std::to_string(controller_.alertCount()));
-            ASSERT_NE(inner->checkBox(), nullptr);
-            inner->checkBox()->setChecked(true);
-            ClickButton(inner, "QZ_BUTTON_ALLOW");
-        });
-        innerReply = Handle(1, innerRequest.get());
-        events.push_back("inner reply");
-        EXPECT_EQ(AlertOnScreen(), outer);
-        ClickButton(outer, "QZ_BUTTON_DISALLOW");
+TEST_F(DispatchTest, AnActivationReplyCarriesTheChoiceTheCheckboxAndTheCandidates) {
+    Ref request = ActivationRequest("Example Application");
+    WhenAlertAppears(nullptr, [&](QMessageBox* alert) {
+        ASSERT_NE(alert->checkBox(), nullptr);
+        alert->checkBox()->setChecked(true);
+        ClickButton(alert, "QZ_BUTTON_ALLOW");
     });
-    const std::string outerReply = Handle(1, outerRequest.get());
-    events.push_back("outer reply");
-
-    EXPECT_EQ(events, (std::vector<std::string>{"inner alert up at count 2", "inner reply",
-                                                "outer reply"}));
-    // The answer carries the choice, the checkbox and the candidates.
-    EXPECT_EQ(innerReply, Reply(true, true, kOneFontURL));
-    EXPECT_EQ(outerReply, Reply(false, false, kOneFontURL));
-    EXPECT_EQ(counts_, (std::vector<qint64>{1, 2, 1, 0}));
-    EXPECT_EQ(timerArmed_, (std::vector<bool>{false, false, false, true}));
+    EXPECT_EQ(Handle(1, request.get()), Reply(true, true, kOneFontURL));
+    EXPECT_EQ(counts_, (std::vector<qint64>{1, 0}));
 }
 
 TEST_F(DispatchTest, FontDescriptorsCarryOnlyTheNameAndSkipElementsWithoutOne) {
