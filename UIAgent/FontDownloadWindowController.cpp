@@ -18,6 +18,7 @@
 #include <mutex>
 #include <utility>
 
+#include "UIAgent/AgentTesting.h"
 #include "UIAgent/QZDictionaryValue.h"
 #include "UIAgent/QZLocalizedString.h"
 #include "UIAgent/QZModalSession.h"
@@ -40,8 +41,8 @@ std::mutex& TapMutex() {
     return mutex;
 }
 
-FontDownloadWindowController::ProgressTap& Tap() {
-    static FontDownloadWindowController::ProgressTap tap;
+QZDownloadProgressTap& Tap() {
+    static QZDownloadProgressTap tap;
     return tap;
 }
 
@@ -145,7 +146,7 @@ struct FontDownloadWindowController::Link : std::enable_shared_from_this<Link> {
 
     // Written before the matching starts, then read by the callback only.
     TCFRetained<CFDictionaryRef> names;
-    ProgressTap tap;
+    QZDownloadProgressTap tap;
 
     // The callback's own: one call at a time.
     bool timerRequested = false;
@@ -521,7 +522,7 @@ bool FontDownloadWindowController::continueDownloadWithNetworkReachabilityCheck(
     return check.continueDownload();
 }
 
-void FontDownloadWindowController::SetProgressTapForTesting(ProgressTap tap) {
+void QZSetDownloadProgressTapForTesting(QZDownloadProgressTap tap) {
     std::lock_guard<std::mutex> lock(TapMutex());
     Tap() = std::move(tap);
 }

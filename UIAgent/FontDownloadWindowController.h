@@ -113,10 +113,6 @@ public:
     /// Whether the download may begin: the network check with its offline alert (QZNetworkCheck).
     static bool continueDownloadWithNetworkReachabilityCheck();
 
-    /// Called on the worker thread at the start of every progress callback of the matchings
-    /// started from now on (for tests: the states in order); empty to remove.
-    using ProgressTap = std::function<void(QZFontDescriptorMatchingState, CFDictionaryRef)>;
-    static void SetProgressTapForTesting(ProgressTap tap);
     /// Matchings started by controllers whose last callback has not returned yet (or whose
     /// controller still exists).
     static int MatchingRunsInProgress();

@@ -7,6 +7,7 @@
 #include <atomic>
 #include <cstdlib>
 
+#include "UIAgent/AgentTesting.h"
 #include "platform/Log.h"
 
 namespace {
@@ -55,7 +56,7 @@ std::chrono::milliseconds QZInputGuard::Duration() {
     return override >= 0 ? std::chrono::milliseconds(override) : fromEnvironment;
 }
 
-void QZInputGuard::SetDurationForTesting(std::chrono::milliseconds duration) {
+void QZSetInputGuardDurationForTesting(std::chrono::milliseconds duration) {
     gDurationOverrideMs.store(duration.count() >= 0 ? duration.count() : -1);
 }
 

@@ -35,11 +35,9 @@ public:
     /// True while the window's buttons are held disabled.
     bool isGuarding() const { return timer_.isActive(); }
 
-    /// The guard time of the windows shown from now on: the test override when set, else the
-    /// environment's value, else kDefaultDuration.
+    /// The guard time of the windows shown from now on: the test override when set
+    /// (UIAgent/AgentTesting.h), else the environment's value, else kDefaultDuration.
     static std::chrono::milliseconds Duration();
-    /// Overrides Duration (a negative value goes back to the environment's).
-    static void SetDurationForTesting(std::chrono::milliseconds duration);
 
 protected:
     bool eventFilter(QObject* watched, QEvent* event) override;

@@ -14,6 +14,8 @@
 #include <algorithm>
 #include <vector>
 
+#include "UIAgent/AgentTesting.h"
+
 QString QZLocalizedString(const char* key) {
     // translate() answers the source text, that is the key, when no table holds it.
     return QCoreApplication::translate("Localized", key);

@@ -32,10 +32,8 @@ void QZInstallTranslations();
 void QZApplyLayoutDirection();
 
 /// The user's languages, most preferred first, as BCP 47 tags (QLocale::uiLanguages(), or the
-/// list set with QZSetPreferredLanguagesForTesting).
+/// list a test set, UIAgent/AgentTesting.h).
 QStringList QZPreferredLanguages();
-/// Makes QZPreferredLanguages answer `languages`; an empty list restores the user's.
-void QZSetPreferredLanguagesForTesting(const QStringList& languages);
 
 /// `tag` with the script subtag its language is most likely written in, when it has none:
 /// "zh-CN" -> "zh-Hans-CN", "zh-TW" and "zh-HK" -> "zh-Hant-...", "ja" -> "ja-Jpan". A tag that

@@ -5,12 +5,13 @@
 #include <QPushButton>
 #include <atomic>
 
+#include "UIAgent/AgentTesting.h"
 #include "UIAgent/QZLocalizedString.h"
 #include "UIAgent/QZModalSession.h"
 
 namespace {
 
-std::atomic<QZNetworkCheck::FlagsSource> gFlagsSource{nullptr};
+std::atomic<QZNetworkFlagsSource> gFlagsSource{nullptr};
 
 } // namespace
 
@@ -22,13 +23,13 @@ QZNetworkCheck::~QZNetworkCheck() {
 }
 
 bool QZNetworkCheck::IsConnected() {
-    const FlagsSource source = gFlagsSource.load();
+    const QZNetworkFlagsSource source = gFlagsSource.load();
     QZNetworkReachabilityFlags flags = 0;
     const bool known = source ? source(&flags) : QZGetDefaultRouteReachabilityFlags(&flags);
     return known && QZNetworkFlagsAllowConnection(flags);
 }
 
-void QZNetworkCheck::SetFlagsSourceForTesting(FlagsSource source) {
+void QZSetNetworkFlagsSourceForTesting(QZNetworkFlagsSource source) {
     gFlagsSource.store(source);
 }
 

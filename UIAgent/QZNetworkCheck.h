@@ -39,15 +39,9 @@ public:
     /// The offline alert while it is up, else null.
     QMessageBox* alert() const { return alert_.get(); }
 
-    /// Whether the network counts as connected: the reachability flags could be read and pass
-    /// QZNetworkFlagsAllowConnection.
+    /// Whether the network counts as connected: the reachability flags could be read (from the
+    /// routing table, QZGetDefaultRouteReachabilityFlags) and pass QZNetworkFlagsAllowConnection.
     static bool IsConnected();
-
-    /// Where the flags come from: by default the routing table
-    /// (QZGetDefaultRouteReachabilityFlags).
-    using FlagsSource = bool (*)(QZNetworkReachabilityFlags* flags);
-    /// Makes IsConnected read its flags from `source`; null restores the routing table.
-    static void SetFlagsSourceForTesting(FlagsSource source);
 
 private:
     std::unique_ptr<QMessageBox> alert_;

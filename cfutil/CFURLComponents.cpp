@@ -27,14 +27,9 @@ bool IsScheme(std::string_view text) {
     return true;
 }
 
-CFStringRef CreateString(std::string_view text) {
-    return CFStringCreateWithBytes(kCFAllocatorDefault, reinterpret_cast<const UInt8*>(text.data()),
-                                   CFIndex(text.size()), kCFStringEncodingUTF8, false);
-}
-
 /// Replaces `*field` with a new string of `text`; false when the string cannot be made.
 bool SetString(CFStringRef* field, std::string_view text) {
-    CFStringRef string = CreateString(text);
+    CFStringRef string = glyphwell::CreateString(text);
     TCFSafeRelease(*field);
     *field = string;
     return string != nullptr;
@@ -93,7 +88,7 @@ bool SplitPath(std::string_view path, TCFURLComponentsRFC2396* components) {
         return true;
     for (;;) {
         size_t slash = path.find('/');
-        TCFAdopted<CFStringRef> component(CreateString(path.substr(0, slash)));
+        TCFAdopted<CFStringRef> component(glyphwell::CreateString(path.substr(0, slash)));
         if (!component)
             return false;
         CFArrayAppendValue(array, component);

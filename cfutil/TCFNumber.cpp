@@ -25,8 +25,17 @@ template <> CFNumberRef TCFNumber::Create<bool>(bool value) {
 }
 
 CFNumberRef TCFNumber::CreateFromBoolean(bool flag) {
-    // The platform shares the numbers 0 and 1: every call returns the same one.
-    return Create<bool>(flag);
+    // The pair is made once (the static's guard makes concurrent first calls safe) and holds
+    // one count of each number for the rest of the process, so a count handed out never frees it.
+    static const struct BooleanPair {
+        CFNumberRef numbers[2];
+        BooleanPair() {
+            for (SInt32 value : {0, 1})
+                numbers[value] =
+                    CFNumberCreateCounted(kCFAllocatorDefault, kCFNumberIntType, &value);
+        }
+    } pair;
+    return static_cast<CFNumberRef>(CFRetain(pair.numbers[flag ? 1 : 0]));
 }
 
 namespace {

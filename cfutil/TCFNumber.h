@@ -25,9 +25,9 @@ public:
     /// Returns a new reference; the caller releases it. Null only when the platform refuses.
     template <class T> static CFNumberRef Create(T value);
 
-    /// The shared number for `flag`: Create<bool>(false) or Create<bool>(true), which the
-    /// platform makes once in the process and never destroys (CFNumberCreate shares small
-    /// integers). The caller releases it like any other number.
+    /// The shared number for `flag`, an integer of the Create<bool> kind, with one more count
+    /// that the caller owns and releases. The pair is made once in the process and never
+    /// destroyed; unlike the platform's shared small integers, its counts are kept.
     static CFNumberRef CreateFromBoolean(bool flag);
 
     /// Parses `string` as a base-10 signed 64-bit integer (kCFNumberLongType), or failing that

@@ -1,8 +1,7 @@
 // The client library: requests built as property values and flattened, one connection per call
 // to the agent's socket, written and read without blocking, the reply read back and checked.
-//
-// Frames, integers big-endian: request = int32 message id, uint32 length, bytes; reply = uint32
-// length, bytes. A call uses its connection for one request only.
+// Frames are made and reassembled by the port's codec (protocol/MessagePortWire.h); a call uses
+// its connection for one request only.
 #include "glyphwell/client.h"
 
 #include <poll.h>
@@ -26,6 +25,7 @@
 #include "cfutil/CFStringUtilities.h"
 #include "cfutil/TCFRetained.h"
 #include "platform/CFMessagePort.h"
+#include "protocol/MessagePortWire.h"
 #include "protocol/QZUIProtocol.h"
 #include "serialization/TCFFlattenContext.h"
 #include "serialization/TCFResurrectContext.h"
@@ -51,11 +51,6 @@ bool IsUTF8(const char* text) {
         CFStringCreateWithBytes(kCFAllocatorDefault, reinterpret_cast<const UInt8*>(text),
                                 CFIndex(std::strlen(text)), kCFStringEncodingUTF8, false));
     return string != nullptr;
-}
-
-CFStringRef CreateString(const std::string& text) {
-    return CFStringCreateWithBytes(kCFAllocatorDefault, reinterpret_cast<const UInt8*>(text.data()),
-                                   CFIndex(text.size()), kCFStringEncodingUTF8, false);
 }
 
 /// A new file URL of an absolute path (a directory URL when the path names a directory).
@@ -112,9 +107,9 @@ CFArrayRef CreateArray(std::vector<TCFRetained<CFTypeRef>> values) {
 /// The font attribute dictionary {NSFontNameAttribute, NSFontFamilyAttribute when given}.
 CFDictionaryRef CreateFontAttributes(const Font& font) {
     DictionaryBuilder attributes;
-    attributes.Add(NSFontNameAttribute, CreateString(font.postScriptName));
+    attributes.Add(NSFontNameAttribute, glyphwell::CreateString(font.postScriptName));
     if (!font.family.empty())
-        attributes.Add(NSFontFamilyAttribute, CreateString(font.family));
+        attributes.Add(NSFontFamilyAttribute, glyphwell::CreateString(font.family));
     return attributes.Create();
 }
 
@@ -126,11 +121,6 @@ long long NowMilliseconds() {
     timespec now{};
     clock_gettime(CLOCK_MONOTONIC, &now);
     return static_cast<long long>(now.tv_sec) * 1000 + now.tv_nsec / 1000000;
-}
-
-void PutBigEndian32(std::string* bytes, uint32_t value) {
-    for (int shift = 24; shift >= 0; shift -= 8)
-        bytes->push_back(static_cast<char>((value >> shift) & 0xFF));
 }
 
 } // namespace
@@ -159,12 +149,13 @@ struct glyphwell_request {
 CFDictionaryRef glyphwell_request::CreateDictionary() const {
     DictionaryBuilder request;
     if (!applicationName.empty())
-        request.Add(kQZUIPropertyApplicationName, CreateString(applicationName));
+        request.Add(kQZUIPropertyApplicationName, glyphwell::CreateString(applicationName));
     if (!bundlePath.empty())
         request.Add(kQZUIPropertyBundleURL, CreateFileURL(bundlePath));
     if (question == GLYPHWELL_ASK_ACTIVATION) {
         if (!fonts.empty()) {
-            request.Add(kQZUIPropertyFontName, CreateString(fonts.front().postScriptName));
+            request.Add(kQZUIPropertyFontName,
+                        glyphwell::CreateString(fonts.front().postScriptName));
             request.Add(kQZUIPropertyRequestDictionary, CreateFontAttributes(fonts.front()));
         }
         std::vector<TCFRetained<CFTypeRef>> urls;
@@ -229,10 +220,10 @@ std::optional<int> ReadAnswer(CFDictionaryRef reply, CFStringRef key) {
 
 /// Reads the reply bytes of `question` into `*reply`; GLYPHWELL_ERROR_MALFORMED_REPLY when they
 /// do not hold an intact dictionary with Result and Suppress.
-int ParseReply(int question, std::string bytes, glyphwell_reply* reply) {
-    if (bytes.empty())
+int ParseReply(int question, const glyphwell::port::FrameBody& bytes, glyphwell_reply* reply) {
+    if (bytes.Size() == 0)
         return GLYPHWELL_ERROR_MALFORMED_REPLY;
-    TCFResurrectContext context(reinterpret_cast<const unsigned char*>(bytes.data()), bytes.size());
+    TCFResurrectContext context(bytes.Data(), bytes.Size());
     TCFAdopted<CFDictionaryRef> dictionary(context.RetrieveCFDictionary());
     if (!dictionary || context.IsCorrupted())
         return GLYPHWELL_ERROR_MALFORMED_REPLY;
@@ -254,7 +245,7 @@ int ParseReply(int question, std::string bytes, glyphwell_reply* reply) {
                 reply->candidateURLs.push_back(std::move(text));
         }
     }
-    reply->bytes = std::move(bytes);
+    reply->bytes.assign(reinterpret_cast<const char*>(bytes.Data()), bytes.Size());
     return GLYPHWELL_OK;
 }
 
@@ -269,7 +260,9 @@ struct glyphwell_call {
     int outcome = GLYPHWELL_IN_PROGRESS;
     std::string output; ///< the request frame
     size_t written = 0;
-    std::string input; ///< the reply frame read so far
+    glyphwell::port::FrameAssembler input{glyphwell::port::FrameAssembler::Kind::Reply,
+                                          kMessagePortMaxFrame}; ///< the reply frame
+    std::vector<uint8_t> receiveBuffer;                          ///< for the reply's header
 
     ~glyphwell_call() { Close(); }
     void Close() {
@@ -347,44 +340,37 @@ int glyphwell_call::Write() {
 }
 
 int glyphwell_call::Read(glyphwell_reply** reply) {
-    char chunk[16384];
+    receiveBuffer.resize(glyphwell::port::kReplyHeaderSize);
     for (;;) {
-        size_t wanted = sizeof chunk;
-        if (input.size() >= 4) {
-            const auto* head = reinterpret_cast<const unsigned char*>(input.data());
-            const uint32_t length = uint32_t(head[0]) << 24 | uint32_t(head[1]) << 16 |
-                                    uint32_t(head[2]) << 8 | uint32_t(head[3]);
-            if (length > kMessagePortMaxFrame)
-                return Finish(GLYPHWELL_ERROR_MALFORMED_REPLY);
-            const size_t total = 4 + size_t(length);
-            if (input.size() == total) {
-                auto* made = new (std::nothrow) glyphwell_reply;
-                if (!made)
-                    return Finish(GLYPHWELL_ERROR_NO_MEMORY);
-                const int status = ParseReply(question, input.substr(4), made);
-                if (status != GLYPHWELL_OK) {
-                    delete made;
-                    return Finish(status);
-                }
-                *reply = made;
-                return Finish(GLYPHWELL_OK);
+        if (input.HasFrame()) {
+            auto* made = new (std::nothrow) glyphwell_reply;
+            if (!made)
+                return Finish(GLYPHWELL_ERROR_NO_MEMORY);
+            const int status = ParseReply(question, input.TakeFrame().body, made);
+            if (status != GLYPHWELL_OK) {
+                delete made;
+                return Finish(status);
             }
-            wanted = std::min(wanted, total - input.size());
-        } else {
-            wanted = 4 - input.size();
+            *reply = made;
+            return Finish(GLYPHWELL_OK);
         }
-        const ssize_t got = recv(fd, chunk, wanted, 0);
+        // Only the header goes through the buffer (its size), so nothing past the reply is read.
+        bool drained = false;
+        const ssize_t got = glyphwell::port::ReceiveInto(fd, input, receiveBuffer, &drained);
+        if (got > 0 && input.Failed())
+            return Finish(input.RefusedLength() > kMessagePortMaxFrame
+                              ? GLYPHWELL_ERROR_MALFORMED_REPLY
+                              : GLYPHWELL_ERROR_NO_MEMORY);
+        if (got > 0)
+            continue;
         if (got == 0)
             return Finish(GLYPHWELL_ERROR_DISCONNECTED);
-        if (got < 0) {
-            if (errno == EINTR)
-                continue;
-            if (errno == EAGAIN || errno == EWOULDBLOCK)
-                return GLYPHWELL_IN_PROGRESS;
-            return Finish(errno == ECONNRESET ? GLYPHWELL_ERROR_DISCONNECTED
-                                              : GLYPHWELL_ERROR_TRANSPORT);
-        }
-        input.append(chunk, size_t(got));
+        if (errno == EINTR)
+            continue;
+        if (errno == EAGAIN || errno == EWOULDBLOCK)
+            return GLYPHWELL_IN_PROGRESS;
+        return Finish(errno == ECONNRESET ? GLYPHWELL_ERROR_DISCONNECTED
+                                          : GLYPHWELL_ERROR_TRANSPORT);
     }
 }
 
@@ -522,8 +508,10 @@ int glyphwell_call_start(glyphwell_request* request, const char* port_name, glyp
         if (!made)
             return GLYPHWELL_ERROR_NO_MEMORY;
         made->question = request->question;
-        PutBigEndian32(&made->output, uint32_t(request->question));
-        PutBigEndian32(&made->output, uint32_t(request->bytes.size()));
+        uint8_t header[glyphwell::port::kRequestHeaderSize];
+        glyphwell::port::StoreRequestHeader(request->question, uint32_t(request->bytes.size()),
+                                            header);
+        made->output.assign(reinterpret_cast<const char*>(header), sizeof header);
         made->output += request->bytes;
         const int status = made->Connect(port_name);
         if (status < 0) {

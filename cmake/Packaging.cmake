@@ -1,7 +1,8 @@
-# The Debian package: `cpack -G DEB` in a build configured with -DCMAKE_INSTALL_PREFIX=/usr makes
-# glyphwell_<version>_<arch>.deb of everything the project installs, every install component
-# included (the agent, the tool, the client library and its development files, the user units,
-# the desktop entry, icon, manual page and documents): one package.
+# The Debian package: `cpack -G DEB` in a build configured with -DCMAKE_INSTALL_PREFIX=/usr
+# -DCMAKE_INSTALL_SYSCONFDIR=/etc makes glyphwell_<version>_<arch>.deb of everything the project
+# installs, every install component included (the agent, the tool, the client library and its
+# development files, the user units, the desktop entry, icon, manual page and documents): one
+# package.
 #
 # The version comes from the top entry of resources/debian/changelog, which must name the
 # project's version; its Debian revision is the part after the last "-".
@@ -17,9 +18,10 @@ if(NOT CMAKE_MATCH_1 STREQUAL PROJECT_VERSION)
 endif()
 set(CPACK_DEBIAN_PACKAGE_RELEASE ${CMAKE_MATCH_2})
 
-if(NOT CMAKE_INSTALL_PREFIX STREQUAL "/usr")
-    message(STATUS "Packaging: the install prefix is ${CMAKE_INSTALL_PREFIX}; a Debian package "
-                   "needs -DCMAKE_INSTALL_PREFIX=/usr")
+if(NOT CMAKE_INSTALL_PREFIX STREQUAL "/usr" OR NOT CMAKE_INSTALL_SYSCONFDIR STREQUAL "/etc")
+    message(STATUS "Packaging: the install prefix is ${CMAKE_INSTALL_PREFIX} and the "
+                   "configuration directory ${CMAKE_INSTALL_SYSCONFDIR}; a Debian package needs "
+                   "-DCMAKE_INSTALL_PREFIX=/usr -DCMAKE_INSTALL_SYSCONFDIR=/etc")
 endif()
 
 set(GLYPHWELL_PACKAGE_MAINTAINER "Glyphwell developers <developers@glyphwell.org>"
@@ -33,7 +35,7 @@ set(CPACK_PACKAGE_CONTACT ${GLYPHWELL_PACKAGE_MAINTAINER})
 # The package installs where the build was configured to install, so that the paths written into
 # the service's ExecStart and the desktop entry's Exec are those of the files in the package.
 set(CPACK_PACKAGING_INSTALL_PREFIX ${CMAKE_INSTALL_PREFIX})
-# Absolute destinations (the user unit directory may be set to one) land in the package too.
+# Absolute destinations (CMAKE_INSTALL_SYSCONFDIR=/etc) land in the package too.
 set(CPACK_SET_DESTDIR ON)
 set(CPACK_STRIP_FILES ON)
 set(CPACK_DEB_COMPONENT_INSTALL OFF)

@@ -82,18 +82,13 @@ QZDownloadableFontCatalog LoadCatalog(const FileState& state) {
     return catalog;
 }
 
-CFStringRef CreateString(std::string_view utf8) {
-    return CFStringCreateWithBytes(kCFAllocatorDefault, reinterpret_cast<const UInt8*>(utf8.data()),
-                                   CFIndex(utf8.size()), kCFStringEncodingUTF8, false);
-}
-
 /// The dictionary that describes `asset` for the font `font` it holds. The caller releases it.
 CFDictionaryRef CreateAssetDictionary(const QZDownloadableFontAsset& asset,
                                       const QZDownloadableFont& font) {
     CFMutableDictionaryRef dictionary = CFDictionaryCreateMutable(
         kCFAllocatorDefault, 0, &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks);
     auto setString = [dictionary](CFStringRef key, std::string_view utf8) {
-        TCFRetained<CFStringRef> value(CreateString(utf8), kAdopted);
+        TCFRetained<CFStringRef> value(glyphwell::CreateString(utf8), kAdopted);
         if (value)
             CFDictionarySetValue(dictionary, key, value);
     };
@@ -113,8 +108,8 @@ CFDictionaryRef CreateAssetDictionary(const QZDownloadableFontAsset& asset,
                                       &kCFTypeDictionaryValueCallBacks),
             kAdopted);
         for (const auto& [language, name] : font.localizedFamilyNames) {
-            TCFRetained<CFStringRef> key(CreateString(language), kAdopted);
-            TCFRetained<CFStringRef> value(CreateString(name), kAdopted);
+            TCFRetained<CFStringRef> key(glyphwell::CreateString(language), kAdopted);
+            TCFRetained<CFStringRef> value(glyphwell::CreateString(name), kAdopted);
             if (key && value)
                 CFDictionarySetValue(names, key, value);
         }

@@ -10,6 +10,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include "desktop/DesktopTesting.h"
 #include "platform/Log.h"
 #include "platform/LogEscape.h"
 

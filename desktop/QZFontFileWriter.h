@@ -10,13 +10,6 @@
 
 #include <string>
 
-/// The file operations of the installer whose failure tests inject.
-enum class QZFontFileOperation { Write, Sync, Link, Rename, Lock };
-
-/// For tests: makes every later call of `operation` by any writer fail with `error` (an errno
-/// value, e.g. ENOSPC for a full disk), until it is called again with 0. Thread-safe.
-void QZInjectFontFileFault(QZFontFileOperation operation, int error);
-
 /// Removes the hidden temporaries of `directory` whose writer is gone. Never removes a file that
 /// a live writer holds, nor anything that is not a regular file of the temporaries' name shape.
 void QZRemoveStaleFontTemporaries(const std::string& directory);

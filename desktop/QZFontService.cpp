@@ -44,10 +44,6 @@ QString Text(const char* sourceText) {
     return QCoreApplication::translate("QZFontService", sourceText);
 }
 
-CFStringRef CreateString(const std::string& utf8) {
-    return QZCreateCFString(QString::fromStdString(utf8));
-}
-
 /// The PostScript name of a descriptor; empty when it has none.
 std::string PostScriptName(const void* descriptor) {
     if (!descriptor || CFGetTypeID(descriptor) != CFDictionaryGetTypeID())
@@ -61,10 +57,10 @@ std::string PostScriptName(const void* descriptor) {
 CFDictionaryRef CreateMatchedDescriptor(const QZInstalledFont& font) {
     CFMutableDictionaryRef descriptor = CFDictionaryCreateMutable(
         kCFAllocatorDefault, 0, &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks);
-    TCFRetained<CFStringRef> name(CreateString(font.postScriptName), kAdopted);
+    TCFRetained<CFStringRef> name(glyphwell::CreateString(font.postScriptName), kAdopted);
     CFDictionarySetValue(descriptor, NSFontNameAttribute, name);
     if (!font.family.empty()) {
-        TCFRetained<CFStringRef> family(CreateString(font.family), kAdopted);
+        TCFRetained<CFStringRef> family(glyphwell::CreateString(font.family), kAdopted);
         CFDictionarySetValue(descriptor, NSFontFamilyAttribute, family);
     }
     return descriptor;
@@ -165,7 +161,7 @@ bool MatchingRun::ReportFailure(CFTypeRef concerned, const std::string& postScri
         QZCreateCFString(Text("The font “%1” cannot be downloaded.")
                              .arg(QString::fromStdString(postScriptName))),
         kAdopted);
-    TCFRetained<CFStringRef> failureReason(CreateString(reason), kAdopted);
+    TCFRetained<CFStringRef> failureReason(glyphwell::CreateString(reason), kAdopted);
     const void* keys[] = {kCFErrorLocalizedDescriptionKey, kCFErrorLocalizedFailureReasonKey};
     const void* values[] = {description, failureReason};
     TCFRetained<CFDictionaryRef> userInfo(CFDictionaryCreate(kCFAllocatorDefault, keys, values, 2,

@@ -9,7 +9,7 @@
 
 #include "FuzzSupport.h"
 #include "platform/CFMessagePort.h"
-#include "platform/MessagePortWire.h"
+#include "protocol/MessagePortWire.h"
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     using glyphwell::port::FrameAssembler;

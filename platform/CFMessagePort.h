@@ -2,9 +2,8 @@
 // socket named after the port.
 //
 // Socket: <directory>/<name>, the directory being $XDG_RUNTIME_DIR, or without it ~/.glyphwell
-// (see SocketDirectory). Frames, integers big-endian: request = int32 msgid, uint32 length,
-// length bytes; reply = uint32 length, length bytes. One connection carries any number of
-// requests, one at a time. Frames longer than kMessagePortMaxFrame close the connection.
+// (see SocketDirectory). The frames are those of protocol/MessagePortWire.h; frames longer than
+// kMessagePortMaxFrame close the connection.
 //
 // Local ports accept connections only from peers of the same user id (SO_PEERCRED). Creating a
 // local port whose name a live server answers on fails (null, nothing logged: the caller says

@@ -260,9 +260,11 @@ const __CFNumber* SharedSmallInteger(CFNumberType type, int64_t integer) {
 
 } // namespace
 
-CFNumberRef CFNumberCreate(CFAllocatorRef, CFNumberType type, const void* valuePtr) {
-    if (!GW_CHECK_ARGUMENT(IsValidType(type)) || !GW_CHECK_ARGUMENT(valuePtr != nullptr))
-        return nullptr;
+namespace {
+
+/// CFNumberCreate and CFNumberCreateCounted after their argument checks: `share` hands out the
+/// shared small integers.
+CFNumberRef CreateNumber(CFNumberType type, const void* valuePtr, bool share) {
     if (IsFloatType(type)) {
         double real = CFNumberTypeByteSize(type) == 4 ? double(Load<float>(valuePtr))
                                                       : Load<double>(valuePtr);
@@ -283,9 +285,23 @@ CFNumberRef CFNumberCreate(CFAllocatorRef, CFNumberType type, const void* valueP
         integer = Load<int64_t>(valuePtr);
         break;
     }
-    if (const __CFNumber* shared = SharedSmallInteger(type, integer))
+    if (const __CFNumber* shared = share ? SharedSmallInteger(type, integer) : nullptr)
         return shared;
     return new __CFNumber(type, integer);
+}
+
+} // namespace
+
+CFNumberRef CFNumberCreate(CFAllocatorRef, CFNumberType type, const void* valuePtr) {
+    if (!GW_CHECK_ARGUMENT(IsValidType(type)) || !GW_CHECK_ARGUMENT(valuePtr != nullptr))
+        return nullptr;
+    return CreateNumber(type, valuePtr, true);
+}
+
+CFNumberRef CFNumberCreateCounted(CFAllocatorRef, CFNumberType type, const void* valuePtr) {
+    if (!GW_CHECK_ARGUMENT(IsValidType(type)) || !GW_CHECK_ARGUMENT(valuePtr != nullptr))
+        return nullptr;
+    return CreateNumber(type, valuePtr, false);
 }
 
 CFNumberType CFNumberGetType(CFNumberRef number) {

@@ -37,6 +37,10 @@ CFTypeID CFNumberGetTypeID();
 /// booleans): CFRetain and CFRelease do not count it and CFGetRetainCount reports the largest
 /// index.
 CFNumberRef CFNumberCreate(CFAllocatorRef allocator, CFNumberType type, const void* valuePtr);
+/// Like CFNumberCreate, but always a new number whose retains are counted, small integers
+/// included: for a number that its maker hands out with one more count each time.
+CFNumberRef CFNumberCreateCounted(CFAllocatorRef allocator, CFNumberType type,
+                                  const void* valuePtr);
 /// The type code the number was created with.
 CFNumberType CFNumberGetType(CFNumberRef number);
 /// The byte size of that type: 1, 2, 4 or 8.

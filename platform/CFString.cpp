@@ -796,6 +796,11 @@ Boolean CFStringHasSuffix(CFStringRef string, CFStringRef suffix) {
                                    kCFCompareAnchored | kCFCompareBackwards, nullptr);
 }
 
+CFStringRef glyphwell::CreateString(std::string_view utf8) {
+    return CFStringCreateWithBytes(kCFAllocatorDefault, reinterpret_cast<const UInt8*>(utf8.data()),
+                                   CFIndex(utf8.size()), kCFStringEncodingUTF8, false);
+}
+
 std::optional<std::string> glyphwell::UTF8String(CFStringRef string, UInt8 lossByte) {
     if (!string)
         return std::nullopt;

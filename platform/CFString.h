@@ -131,6 +131,10 @@ Boolean CFStringHasSuffix(CFStringRef string, CFStringRef suffix);
 
 namespace glyphwell {
 
+/// A new string of the UTF-8 bytes `utf8` (a zero byte stays U+0000); null when they are not
+/// UTF-8. Returns a new reference; the caller releases it.
+CFStringRef CreateString(std::string_view utf8);
+
 /// The UTF-8 bytes of `string` (a U+0000 in it stays a zero byte). Empty for a null string, and,
 /// when `lossByte` is 0, for a string holding a lone surrogate, which has no UTF-8 form; otherwise
 /// `lossByte` stands in for each lone surrogate.

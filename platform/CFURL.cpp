@@ -203,11 +203,6 @@ CFStringRef CreateDecodedString(std::string_view s) {
                                    CFIndex(decoded.size()), kCFStringEncodingUTF8, false);
 }
 
-CFStringRef CreateString(std::string_view s) {
-    return CFStringCreateWithBytes(kCFAllocatorDefault, reinterpret_cast<const UInt8*>(s.data()),
-                                   CFIndex(s.size()), kCFStringEncodingUTF8, false);
-}
-
 /// The UTF-8 form of `string`; false for null or an unpaired surrogate.
 bool UTF8Of(CFStringRef string, std::string& out,
             const glyphwell::runtime::SourceLocation& where =
@@ -269,7 +264,7 @@ struct __CFURL final : public CFObject {
     __CFURL(std::string text, CFURLRef base)
         : CFObject(kURLKind), text(std::move(text)), parts(Split(this->text)),
           base(base ? static_cast<CFURLRef>(CFRetain(base)) : nullptr),
-          string(CreateString(this->text)) {}
+          string(glyphwell::CreateString(this->text)) {}
     ~__CFURL() override {
         if (base)
             CFRelease(base);
@@ -426,7 +421,7 @@ CFStringRef CopyEscapedPart(const __CFURL* url, const Part& part,
                             CFStringRef charactersToLeaveEscaped) {
     if (!part.present)
         return nullptr;
-    CFStringRef raw = CreateString(url->Slice(part));
+    CFStringRef raw = glyphwell::CreateString(url->Slice(part));
     if (!charactersToLeaveEscaped || !raw)
         return raw;
     CFStringRef decoded = CFURLCreateStringByReplacingPercentEscapes(kCFAllocatorDefault, raw,
@@ -533,7 +528,7 @@ CFStringRef CFURLCopyScheme(CFURLRef url) {
         return nullptr;
     std::string absolute = AbsoluteText(object);
     Parts parts = Split(absolute);
-    return parts.scheme.present ? CreateString(PartOf(absolute, parts.scheme)) : nullptr;
+    return parts.scheme.present ? glyphwell::CreateString(PartOf(absolute, parts.scheme)) : nullptr;
 }
 
 CFStringRef CFURLCopyHostName(CFURLRef url) {
@@ -555,7 +550,7 @@ CFStringRef CFURLCopyHostName(CFURLRef url) {
     if (host.empty())
         return nullptr;
     CFStringRef decoded = CreateDecodedString(host);
-    return decoded ? decoded : CreateString(host);
+    return decoded ? decoded : glyphwell::CreateString(host);
 }
 
 CFStringRef CFURLCopyFileSystemPath(CFURLRef url, CFURLPathStyle style) {
@@ -564,12 +559,12 @@ CFStringRef CFURLCopyFileSystemPath(CFURLRef url, CFURLPathStyle style) {
     std::string path;
     if (!object || style != kCFURLPOSIXPathStyle || !FileSystemPathOf(AbsoluteText(object), path))
         return nullptr;
-    return CreateString(path); // null when the path is not UTF-8
+    return glyphwell::CreateString(path); // null when the path is not UTF-8
 }
 
 CFStringRef CFURLCopyPath(CFURLRef url) {
     const __CFURL* object = Get(url);
-    return object ? CreateString(object->Slice(object->parts.path)) : nullptr;
+    return object ? glyphwell::CreateString(object->Slice(object->parts.path)) : nullptr;
 }
 
 CFStringRef CFURLCopyLastPathComponent(CFURLRef url) {
@@ -583,7 +578,7 @@ CFStringRef CFURLCopyLastPathComponent(CFURLRef url) {
     if (path != "/")
         path = path.substr(path.rfind('/') + 1); // npos + 1 is 0: the whole path
     CFStringRef decoded = CreateDecodedString(path);
-    return decoded ? decoded : CreateString(path);
+    return decoded ? decoded : glyphwell::CreateString(path);
 }
 
 CFStringRef CFURLCopyQueryString(CFURLRef url, CFStringRef charactersToLeaveEscaped) {
@@ -720,5 +715,5 @@ CFStringRef CFURLCreateStringByReplacingPercentEscapes(CFAllocatorRef, CFStringR
         out += keepEscaped ? in.substr(i, next - i) : bytes;
         i = next;
     }
-    return CreateString(out); // null when the decoded bytes are not UTF-8
+    return glyphwell::CreateString(out); // null when the decoded bytes are not UTF-8
 }

@@ -57,12 +57,6 @@ std::string Child(const std::string& where, size_t index) {
     return Child(where, std::to_string(index));
 }
 
-/// A new string of UTF-8 `text`, or null when it is not UTF-8.
-CFStringRef CreateString(const std::string& text) {
-    return CFStringCreateWithBytes(kCFAllocatorDefault, reinterpret_cast<const UInt8*>(text.data()),
-                                   CFIndex(text.size()), kCFStringEncodingUTF8, false);
-}
-
 /// The property value of `json` at `where`; throws InputError.
 CFTypeRef Create(const Json& json, const std::string& where);
 
@@ -212,7 +206,7 @@ CFTypeRef CreateError(const Json& error, const std::string& where) {
         throw InputError{where, "\"$error\" must be {\"domain\": string, \"code\": integer}"};
     if (error["code"].is_number_unsigned() && error["code"].get<uint64_t>() > uint64_t(INT64_MAX))
         throw InputError{Child(where, "code"), "integer out of range"};
-    TCFAdopted<CFStringRef> domain(CreateString(error["domain"].get<std::string>()));
+    TCFAdopted<CFStringRef> domain(glyphwell::CreateString(error["domain"].get<std::string>()));
     if (!domain)
         throw InputError{Child(where, "domain"), "not valid UTF-8"};
     return CFErrorCreate(kCFAllocatorDefault, domain, error["code"].get<int64_t>(), nullptr);
@@ -279,7 +273,7 @@ CFTypeRef Create(const Json& json, const std::string& where) {
     case Json::value_t::boolean:
         return CFRetain(json.get<bool>() ? kCFBooleanTrue : kCFBooleanFalse);
     case Json::value_t::string: {
-        TCFAdopted<CFStringRef> string(CreateString(json.get_ref<const std::string&>()));
+        TCFAdopted<CFStringRef> string(glyphwell::CreateString(json.get_ref<const std::string&>()));
         if (!string)
             throw InputError{where, "string is not valid UTF-8"};
         // The stream carries texts up to this many UTF-8 bytes (and so UTF-16 units); the writer

@@ -25,6 +25,7 @@
 #include <unistd.h>
 #include <vector>
 
+#include "UIAgent/AgentTesting.h"
 #include "UIAgent/QZLocalizedString.h"
 #include "UIAgent/QZModalSession.h"
 #include "UIAgent/QZQtRunLoopDriver.h"
@@ -82,39 +83,6 @@ inline std::string Reply(bool result, bool suppress,
                       Ascii("QZUIPropertyCandidateFontURLs"), *candidates});
     return ToHex(bytes);
 }
-
-/// Sends `request` (null: no bytes) as message `msgid` through the agent's socket from a thread.
-class SocketClient {
-public:
-    SocketClient(SInt32 msgid, CFTypeRef request, CFTimeInterval receiveTimeout = 5)
-        : bytes_(request ? Flattened(request) : Ref()) {
-        thread_ = std::thread([this, msgid, receiveTimeout] {
-            CFMessagePortRef remote = CFMessagePortCreateRemote(nullptr, kQZUIAgentPortName);
-            if (remote) {
-                status_ = CFMessagePortSendRequest(remote, msgid, bytes_.as<CFDataRef>(), 5,
-                                                   receiveTimeout, kCFRunLoopDefaultMode, &reply_);
-                CFMessagePortInvalidate(remote);
-                CFRelease(remote);
-            }
-            done_ = true;
-        });
-    }
-    ~SocketClient() {
-        thread_.join();
-        if (reply_)
-            CFRelease(reply_);
-    }
-    bool Done() const { return done_; }
-    SInt32 Status() const { return status_; }
-    CFDataRef Reply() const { return reply_; }
-
-private:
-    Ref bytes_;
-    std::thread thread_;
-    std::atomic<bool> done_{false};
-    SInt32 status_ = 1;
-    CFDataRef reply_ = nullptr;
-};
 
 /// The embedded "Localized" table of `language` installed while it lives.
 class InstalledTable {

@@ -1,7 +1,8 @@
-// Request dispatch: replies byte for byte, the unknown-id line, the count around every request,
-// nesting of a request inside a running alert, and withdrawal when a client goes away.
+// Request dispatch: replies byte for byte, the unknown-id line and the count around every
+// request. A request arriving inside a running alert is the port's test (served nested, answered
+// first) and the modal sessions' (the alert above); a client that goes away is the port's test
+// (withdrawn) and the question windows' (the alert withdrawn), and the Wayland run does both.
 #include <QCheckBox>
-#include <QPointer>
 
 #include "UIAgent/QZNetworkCheck.h"
 #include "UIAgent/QZUIController.h"
@@ -116,44 +117,26 @@ TEST_F(DispatchTest, RequestsWithNothingToAskAreAnsweredAtOnceWithoutAWindow) {
             alert->close();
     });
     closer.start(50);
-    QZNetworkCheck::SetFlagsSourceForTesting([](QZNetworkReachabilityFlags* flags) {
+    QZSetNetworkFlagsSourceForTesting([](QZNetworkReachabilityFlags* flags) {
         *flags = 0;
         return true;
     });
     for (const Case& c : cases)
         EXPECT_EQ(Handle(c.msgid, c.request.get()), c.reply) << c.msgid;
-    QZNetworkCheck::SetFlagsSourceForTesting(nullptr);
+    QZSetNetworkFlagsSourceForTesting(nullptr);
     EXPECT_EQ(shown.windowsShown, 0);
     EXPECT_EQ(counts_.back(), 0);
 }
 
-TEST_F(DispatchTest, ARequestArrivingWhileAnAlertIsUpIsHandledInsideItAndAnsweredFirst) {
-    Ref outerRequest = ActivationRequest("Outer Application");
-    Ref innerRequest = ActivationRequest("Inner Application");
-    std::vector<std::string> events;
-    std::string innerReply;
-    WhenAlertAppears(nullptr, [&](QMessageBox* outer) {
-        WhenAlertAppears(outer, [&](QMessageBox* inner) {
-            events.push_back("inner alert up at count " + std::to_string(controller_.alertCount()));
-            ASSERT_NE(inner->checkBox(), nullptr);
-            inner->checkBox()->setChecked(true);
-            ClickButton(inner, "QZ_BUTTON_ALLOW");
-        });
-        innerReply = Handle(1, innerRequest.get());
-        events.push_back("inner reply");
-        EXPECT_EQ(AlertOnScreen(), outer);
-        ClickButton(outer, "QZ_BUTTON_DISALLOW");
+TEST_F(DispatchTest, AnActivationReplyCarriesTheChoiceTheCheckboxAndTheCandidates) {
+    Ref request = ActivationRequest("Example Application");
+    WhenAlertAppears(nullptr, [&](QMessageBox* alert) {
+        ASSERT_NE(alert->checkBox(), nullptr);
+        alert->checkBox()->setChecked(true);
+        ClickButton(alert, "QZ_BUTTON_ALLOW");
     });
-    const std::string outerReply = Handle(1, outerRequest.get());
-    events.push_back("outer reply");
-
-    EXPECT_EQ(events, (std::vector<std::string>{"inner alert up at count 2", "inner reply",
-                                                "outer reply"}));
-    // The answer carries the choice, the checkbox and the candidates.
-    EXPECT_EQ(innerReply, Reply(true, true, kOneFontURL));
-    EXPECT_EQ(outerReply, Reply(false, false, kOneFontURL));
-    EXPECT_EQ(counts_, (std::vector<qint64>{1, 2, 1, 0}));
-    EXPECT_EQ(timerArmed_, (std::vector<bool>{false, false, false, true}));
+    EXPECT_EQ(Handle(1, request.get()), Reply(true, true, kOneFontURL));
+    EXPECT_EQ(counts_, (std::vector<qint64>{1, 0}));
 }
 
 TEST_F(DispatchTest, FontDescriptorsCarryOnlyTheNameAndSkipElementsWithoutOne) {
@@ -170,44 +153,6 @@ TEST_F(DispatchTest, FontDescriptorsCarryOnlyTheNameAndSkipElementsWithoutOne) {
     EXPECT_TRUE(CFEqual(descriptors.get(), Array({regularOnly.get(), plain.get()}).get()));
     Ref none(QZCreateFontDescriptors(nullptr));
     EXPECT_EQ(CFArrayGetCount(none.as<CFArrayRef>()), 0);
-}
-
-TEST_F(DispatchTest, AClientThatGivesUpWithdrawsItsQuestionAndTheOthersGoOn) {
-    controller_.applicationWillFinishLaunching();
-    ASSERT_NE(controller_.messagePort(), nullptr);
-    Ref outerRequest = ActivationRequest("Impatient Application");
-    Ref innerRequest = ActivationRequest("Patient Application");
-
-    std::unique_ptr<SocketClient> patient;
-    QPointer<QMessageBox> outerAlert;
-    bool innerUpWhenOuterWent = false;
-    qint64 countWhenOuterWent = 0;
-    WhenAlertAppears(nullptr, [&](QMessageBox* outer) {
-        outerAlert = outer;
-        patient = std::make_unique<SocketClient>(1, innerRequest.get(), kCFMessagePortWaitForever);
-        WhenAlertAppears(outer, [&](QMessageBox* inner) {
-            // The impatient client gives up: its alert goes, the other one stays.
-            ASSERT_TRUE(SpinUntil([&] { return !outerAlert || !outerAlert->isVisible(); }, 20s));
-            innerUpWhenOuterWent = inner->isVisible();
-            countWhenOuterWent = controller_.alertCount();
-            ClickButton(inner, "QZ_BUTTON_ALLOW");
-        });
-    });
-    // The impatient client waits 1.5 s for its answer, then closes its connection.
-    SocketClient impatient(1, outerRequest.get(), 1.5);
-    ASSERT_TRUE(SpinUntil(
-        [&] {
-            return impatient.Done() && patient && patient->Done() && controller_.alertCount() == 0;
-        },
-        20s));
-
-    EXPECT_TRUE(innerUpWhenOuterWent);
-    EXPECT_EQ(countWhenOuterWent, 2);
-    EXPECT_EQ(impatient.Status(), kCFMessagePortReceiveTimeout);
-    EXPECT_EQ(patient->Status(), kCFMessagePortSuccess);
-    ASSERT_NE(patient->Reply(), nullptr);
-    EXPECT_EQ(ToHex(patient->Reply()), Reply(true, false, kOneFontURL));
-    EXPECT_EQ(counts_, (std::vector<qint64>{1, 2, 1, 0}));
 }
 
 } // namespace

@@ -27,7 +27,7 @@ using Controller = FontDownloadWindowController;
 /// The matching's states as the tap sees them, and a gate holding the worker at one state.
 class Callbacks {
 public:
-    Controller::ProgressTap Tap() {
+    QZDownloadProgressTap Tap() {
         return [this](QZFontDescriptorMatchingState state, CFDictionaryRef) {
             std::unique_lock<std::mutex> lock(mutex_);
             states_.push_back(state);
@@ -92,19 +92,19 @@ protected:
         fonts_ = UsePrivateFonts(root_.path());
         ASSERT_FALSE(fonts_.isEmpty());
         ASSERT_FALSE(QZIsFontInstalled("DejaVuSansMono"));
-        QZNetworkCheck::SetFlagsSourceForTesting([](QZNetworkReachabilityFlags* flags) {
+        QZSetNetworkFlagsSourceForTesting([](QZNetworkReachabilityFlags* flags) {
             *flags = kQZNetworkReachabilityFlagsReachable;
             return true;
         });
         QZSetPreferredLanguagesForTesting({"en-US"});
-        Controller::SetProgressTapForTesting(callbacks_.Tap());
+        QZSetDownloadProgressTapForTesting(callbacks_.Tap());
     }
     void TearDown() override {
         // A matching whose window has gone ends at its next callback; wait for its thread.
         callbacks_.Release();
         EXPECT_TRUE(WaitForTheMatchingToEnd());
-        Controller::SetProgressTapForTesting({});
-        QZNetworkCheck::SetFlagsSourceForTesting(nullptr);
+        QZSetDownloadProgressTapForTesting({});
+        QZSetNetworkFlagsSourceForTesting(nullptr);
         QZSetPreferredLanguagesForTesting({});
         StopUsingPrivateFonts();
     }

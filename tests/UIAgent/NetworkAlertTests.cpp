@@ -33,12 +33,12 @@ protected:
     void SetUp() override {
         gFlags = 0;
         gFlagsReadable = true;
-        QZNetworkCheck::SetFlagsSourceForTesting(&InjectedFlags);
+        QZSetNetworkFlagsSourceForTesting(&InjectedFlags);
     }
     void TearDown() override {
         EXPECT_TRUE(
             SpinUntil([] { return FontDownloadWindowController::MatchingRunsInProgress() == 0; }));
-        QZNetworkCheck::SetFlagsSourceForTesting(nullptr);
+        QZSetNetworkFlagsSourceForTesting(nullptr);
     }
 
     EnglishTexts english_;

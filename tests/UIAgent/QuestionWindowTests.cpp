@@ -30,9 +30,9 @@ using namespace glyphwell::testing;
 /// The guard at `duration` while it lives (the suite runs with it off).
 struct GuardDuration {
     explicit GuardDuration(std::chrono::milliseconds duration) {
-        QZInputGuard::SetDurationForTesting(duration);
+        QZSetInputGuardDurationForTesting(duration);
     }
-    ~GuardDuration() { QZInputGuard::SetDurationForTesting(-1ms); }
+    ~GuardDuration() { QZSetInputGuardDurationForTesting(-1ms); }
 };
 
 TEST(InputGuard, DropsButtonInputForASecondAfterEachShowingAndAutoRepeatAlways) {
@@ -132,7 +132,7 @@ TEST(AgentWindows, HaveATitleAFixedSizeTheDialogTypeGuardedButtonsAndElidedNames
     QZAutoActivationConfirmation activation(request.as<CFDictionaryRef>());
     QZFontDownloadConfirmation download(request.as<CFDictionaryRef>());
     download.setTargetAppPID(0);
-    QZNetworkCheck::SetFlagsSourceForTesting(&InjectOffline);
+    QZSetNetworkFlagsSourceForTesting(&InjectOffline);
     QZNetworkCheck network;
 
     struct Row {
@@ -176,7 +176,7 @@ TEST(AgentWindows, HaveATitleAFixedSizeTheDialogTypeGuardedButtonsAndElidedNames
         row.run();
         EXPECT_TRUE(seen);
     }
-    QZNetworkCheck::SetFlagsSourceForTesting(nullptr);
+    QZSetNetworkFlagsSourceForTesting(nullptr);
     EXPECT_FALSE(activation.suppressionCheckBox()->text().contains(application));
     EXPECT_TRUE(activation.suppressionCheckBox()->toolTip().contains(application));
 

@@ -42,7 +42,7 @@ TEST(NumberCreate, EachNativeTypeKeepsItsPlatformNumberType) {
     TCFAdopted<CFNumberRef> character(TCFNumber::Create<SInt8>(-5));
     TCFAdopted<CFNumberRef> integer(TCFNumber::Create<SInt64>(LONG_MIN));
     TCFAdopted<CFNumberRef> real(TCFNumber::Create<double>(2.25));
-    // The boolean numbers are the platform's shared integers 1 and 0, not its boolean values.
+    // The boolean numbers are integers 1 and 0, not the platform's boolean values.
     TCFAdopted<CFNumberRef> yes(TCFNumber::CreateFromBoolean(true));
     TCFAdopted<CFNumberRef> no(TCFNumber::CreateFromBoolean(false));
     using Kind = std::tuple<CFNumberType, CFIndex, double>;
@@ -55,6 +55,12 @@ TEST(NumberCreate, EachNativeTypeKeepsItsPlatformNumberType) {
                                  {kCFNumberDoubleType, 8, 2.25},
                                  {kCFNumberIntType, 4, 1},
                                  {kCFNumberIntType, 4, 0}}));
+
+    // Each call hands out the same number with one more count, which the caller owns.
+    const CFIndex count = CFGetRetainCount(yes);
+    TCFAdopted<CFNumberRef> again(TCFNumber::CreateFromBoolean(true));
+    EXPECT_EQ(again.Get(), yes.Get());
+    EXPECT_EQ(CFGetRetainCount(again), count + 1);
 }
 
 TEST(NumberFromString, WholeNumbersBecomeLongsAndOthersDoubles) {

@@ -5,7 +5,11 @@
 
 #include <thread>
 
+#include "cfutil/TCFRetained.h"
 #include "glyphwell/client.h"
+#include "platform/CFData.h"
+#include "platform/CFMessagePort.h"
+#include "platform/CFRunLoop.h"
 #include "support/PortTestSupport.h"
 
 using namespace glyphwell::testing;
@@ -119,34 +123,62 @@ TEST_F(ClientTest, RefusesRequestsTheirQuestionDoesNotTake) {
 }
 
 TEST_F(ClientTest, ReportsEachFailureOfTheExchange) {
+    // Both clients of the wire codec, the library and the platform's remote port, meet each
+    // server; the port hands any whole reply out without reading it.
     struct Case {
         const char* what;
         bool server;
         std::string answer;
         bool hold;
         int status;
+        SInt32 portStatus;
     } cases[] = {
-        {"nothing listens", false, "", false, GLYPHWELL_ERROR_NOT_RUNNING},
-        {"no reply in time", true, "", true, GLYPHWELL_ERROR_TIMED_OUT},
-        {"closed before replying", true, "", false, GLYPHWELL_ERROR_DISCONNECTED},
-        {"closed inside the reply", true, Big32(10) + "abc", false, GLYPHWELL_ERROR_DISCONNECTED},
-        {"empty reply", true, Big32(0), false, GLYPHWELL_ERROR_MALFORMED_REPLY},
-        {"not a value", true, Big32(3) + "xyz", false, GLYPHWELL_ERROR_MALFORMED_REPLY},
-        {"frame over the limit", true, Big32(0xFFFFFFFF), true, GLYPHWELL_ERROR_MALFORMED_REPLY},
+        {"nothing listens", false, "", false, GLYPHWELL_ERROR_NOT_RUNNING, 0},
+        {"no reply in time", true, "", true, GLYPHWELL_ERROR_TIMED_OUT,
+         kCFMessagePortReceiveTimeout},
+        {"closed before replying", true, "", false, GLYPHWELL_ERROR_DISCONNECTED,
+         kCFMessagePortBecameInvalidError},
+        {"closed inside the reply", true, Big32(10) + "abc", false, GLYPHWELL_ERROR_DISCONNECTED,
+         kCFMessagePortBecameInvalidError},
+        {"empty reply", true, Big32(0), false, GLYPHWELL_ERROR_MALFORMED_REPLY,
+         kCFMessagePortSuccess},
+        {"not a value", true, Big32(3) + "xyz", false, GLYPHWELL_ERROR_MALFORMED_REPLY,
+         kCFMessagePortSuccess},
+        {"frame over the limit", true, Big32(0xFFFFFFFF), true, GLYPHWELL_ERROR_MALFORMED_REPLY,
+         kCFMessagePortTransportError},
         {"no Result", true, Big32(8) + Big32(0x10) + Big32(0), false,
-         GLYPHWELL_ERROR_MALFORMED_REPLY},
+         GLYPHWELL_ERROR_MALFORMED_REPLY, kCFMessagePortSuccess},
         {"a dictionary cut short", true, Big32(12) + Reply(1, 0).substr(0, 12), false,
-         GLYPHWELL_ERROR_MALFORMED_REPLY},
+         GLYPHWELL_ERROR_MALFORMED_REPLY, kCFMessagePortSuccess},
     };
     for (const Case& c : cases) {
+        SCOPED_TRACE(c.what);
         std::optional<ScriptedServer> server;
         if (c.server)
             server.emplace(c.answer, c.hold);
         Request request = DownloadRequest();
         glyphwell_reply* reply = nullptr;
-        EXPECT_EQ(glyphwell_request_send(request.get(), kName, 300, &reply), c.status) << c.what;
-        EXPECT_EQ(reply, nullptr) << c.what;
+        EXPECT_EQ(glyphwell_request_send(request.get(), kName, 300, &reply), c.status);
+        EXPECT_EQ(reply, nullptr);
         EXPECT_STRNE(glyphwell_status_text(c.status), "unknown status");
+
+        if (c.server)
+            server.emplace(c.answer, c.hold);
+        TCFAdopted<CFMessagePortRef> port(
+            CFMessagePortCreateRemote(kCFAllocatorDefault, CFSTR("org.glyphwell.Test.Client")));
+        EXPECT_EQ(bool(port.Get()), c.server);
+        CFDataRef data = nullptr;
+        if (port.Get())
+            EXPECT_EQ(
+                CFMessagePortSendRequest(port, 9, nullptr, 1, 0.3, kCFRunLoopDefaultMode, &data),
+                c.portStatus);
+        TCFAdopted<CFDataRef> owned(data);
+        std::string body = "<none>";
+        if (data)
+            body.assign(reinterpret_cast<const char*>(CFDataGetBytePtr(data)),
+                        size_t(CFDataGetLength(data)));
+        const bool answered = c.server && c.portStatus == kCFMessagePortSuccess;
+        EXPECT_EQ(body, answered ? c.answer.substr(4) : "<none>");
     }
 }
 

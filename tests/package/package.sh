@@ -32,13 +32,23 @@ root="$tmp/root"
         DEB_CXXFLAGS_MAINT_STRIP=-g dpkg-buildflags --export=sh)"
     export CFLAGS="$CFLAGS $CPPFLAGS" CXXFLAGS="$CXXFLAGS $CPPFLAGS"
     cmake -S "$source_dir" -B "$build" -G Ninja -DCMAKE_BUILD_TYPE=Release \
-        -DCMAKE_INSTALL_PREFIX=/usr -DGLYPHWELL_TESTS=OFF -DGLYPHWELL_SANITIZE=OFF \
-        -DGLYPHWELL_BENCH=OFF -DGLYPHWELL_FUZZ=OFF >"$work/configure.log" 2>&1 ||
+        -DCMAKE_INSTALL_PREFIX=/usr -DCMAKE_INSTALL_SYSCONFDIR=/etc -DGLYPHWELL_TESTS=OFF \
+        -DGLYPHWELL_SANITIZE=OFF -DGLYPHWELL_BENCH=OFF -DGLYPHWELL_FUZZ=OFF \
+        >"$work/configure.log" 2>&1 ||
         { cat "$work/configure.log" >&2; exit 1; }
     cmake --build "$build" -j 2 >"$work/build.log" 2>&1 || { tail -50 "$work/build.log" >&2; exit 1; }
     rm -f "$build"/*.deb
     (cd "$build" && cpack -G DEB) >"$work/cpack.log" 2>&1 || { cat "$work/cpack.log" >&2; exit 1; }
 ) || fail "the package could not be built"
+
+# --- Destinations: an install into another prefix writes only below it, but for the /etc files
+# that the package build (like Debian's cmake helper) asks for; DESTDIR keeps those in $tmp too.
+DESTDIR="$tmp/destdir" cmake --install "$build" --prefix "$tmp/prefix" >"$work/install.log" 2>&1 ||
+    { cat "$work/install.log" >&2; fail "cmake --install into a temporary prefix failed"; }
+outside=$(grep -v -e "^$tmp/prefix/" -e "^/etc/" "$build/install_manifest.txt")
+[ -z "$outside" ] || fail "installed outside the prefix: $outside"
+grep -q "^$tmp/prefix/lib/systemd/user/$unit\$" "$build/install_manifest.txt" ||
+    fail "the install manifest lacks the socket unit"
 
 version=$(sed -n '1s/^glyphwell (\([^)]*\)).*/\1/p' "$source_dir/resources/debian/changelog")
 deb="$build/glyphwell_${version}_$(dpkg --print-architecture).deb"

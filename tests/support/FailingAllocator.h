@@ -39,3 +39,7 @@ void operator delete(void* memory) noexcept {
 void operator delete(void* memory, std::size_t) noexcept {
     std::free(memory);
 }
+/// Frees what a nothrow new gave when the constructor that followed it threw.
+void operator delete(void* memory, const std::nothrow_t&) noexcept {
+    std::free(memory);
+}

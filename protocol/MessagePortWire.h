@@ -1,19 +1,28 @@
-// The message port's frames on the socket (internal to platform/). Requests are `int32 msgid,
-// uint32 length, length bytes`; replies `uint32 length, length bytes`; integers big-endian.
+// The message port's frames on the socket, the one codec of the agent's wire format, used by the
+// port (platform/) and the client library (client/). It needs nothing else in the tree.
+//
+// The wire format: a Unix-domain stream socket carries requests from the client and replies from
+// the server, all integers big-endian.
+//   request = int32 msgid, uint32 length, `length` bytes
+//   reply   = uint32 length, `length` bytes
+// A connection carries any number of requests, one at a time: each request is answered by one
+// reply before the next is read. The bytes are a flattened property value (a dictionary for the
+// agent's two questions), or nothing. A frame whose length is over the receiver's cap (the port's
+// kMessagePortMaxFrame, 64 MiB) breaks the connection.
 //
 // FrameAssembler turns bytes received in pieces of any size back into whole frames. It never
 // trusts a length before checking it against its cap, and it allocates only for bytes that have
 // arrived (at most twice those, at least 64 KiB), so a header announcing a large body costs
 // little until the body comes. Bodies live in malloc'd memory that a data object can adopt
-// without a copy, and large bodies can be received straight into place (BodyRoom).
+// without a copy, and large bodies can be received straight into place (BodyRoom, ReceiveInto).
 #pragma once
 
-#include <sys/socket.h>
 #include <sys/types.h>
 
 #include <cstddef>
 #include <cstdint>
 #include <deque>
+#include <vector>
 
 namespace glyphwell::port {
 
@@ -29,6 +38,12 @@ inline void StoreBigEndian32(uint32_t value, uint8_t* out) {
 
 inline uint32_t LoadBigEndian32(const uint8_t* in) {
     return uint32_t(in[0]) << 24 | uint32_t(in[1]) << 16 | uint32_t(in[2]) << 8 | uint32_t(in[3]);
+}
+
+/// Writes the header of a request frame with `msgid` and a body of `length` bytes.
+inline void StoreRequestHeader(int32_t msgid, uint32_t length, uint8_t out[kRequestHeaderSize]) {
+    StoreBigEndian32(uint32_t(msgid), out);
+    StoreBigEndian32(length, out + 4);
 }
 
 /// A frame's body in malloc'd memory.
@@ -125,16 +140,12 @@ private:
     uint32_t refusedLength_ = 0;
 };
 
-/// How local ports write replies: sendmsg(2) unless a test installs a hook (null restores it).
-/// The hook is process-wide and must be installed while no port writes.
-using ReplySendFunction = ssize_t (*)(int descriptor, const msghdr* message, int flags);
-void SetReplySendFunctionForTesting(ReplySendFunction function);
-ReplySendFunction ReplySend();
-
-/// How local ports accept connections: accept4(2) unless a test installs a hook (null restores
-/// it). The hook is process-wide and must be installed while no port accepts.
-using AcceptFunction = int (*)(int descriptor, sockaddr* address, socklen_t* length, int flags);
-void SetAcceptFunctionForTesting(AcceptFunction function);
-AcceptFunction AcceptConnection();
+/// Receives from `descriptor` into `assembler`: straight into the body in progress when there is
+/// one, else through `buffer` (not empty). Returns what recv returned (errno set when negative; 0
+/// is the end of the stream); `*drained` tells that fewer bytes came than there was room for, so
+/// that the socket had nothing more at that moment. A refused frame leaves `assembler` Failed().
+/// `blocking` waits for bytes (on a blocking socket); otherwise the call returns at once.
+ssize_t ReceiveInto(int descriptor, FrameAssembler& assembler, std::vector<uint8_t>& buffer,
+                    bool* drained, bool blocking = false);
 
 } // namespace glyphwell::port

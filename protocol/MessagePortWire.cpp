@@ -1,7 +1,8 @@
-#include "platform/MessagePortWire.h"
+#include "protocol/MessagePortWire.h"
+
+#include <sys/socket.h>
 
 #include <algorithm>
-#include <atomic>
 #include <cstdlib>
 #include <cstring>
 #include <utility>
@@ -174,29 +175,27 @@ void FrameAssembler::Clear() {
     buffered_ = 0;
 }
 
-namespace {
-
-std::atomic<ReplySendFunction> replySendFunction{nullptr};
-std::atomic<AcceptFunction> acceptFunction{nullptr};
-
-} // namespace
-
-void SetReplySendFunctionForTesting(ReplySendFunction function) {
-    replySendFunction = function;
-}
-
-ReplySendFunction ReplySend() {
-    ReplySendFunction function = replySendFunction;
-    return function ? function : &sendmsg;
-}
-
-void SetAcceptFunctionForTesting(AcceptFunction function) {
-    acceptFunction = function;
-}
-
-AcceptFunction AcceptConnection() {
-    AcceptFunction function = acceptFunction;
-    return function ? function : &accept4;
+ssize_t ReceiveInto(int descriptor, FrameAssembler& assembler, std::vector<uint8_t>& buffer,
+                    bool* drained, bool blocking) {
+    *drained = false;
+    size_t room = 0;
+    uint8_t* target = assembler.BodyRoom(&room);
+    if (assembler.Failed())
+        return 1;
+    const bool direct = target != nullptr;
+    if (!direct) {
+        target = buffer.data();
+        room = buffer.size();
+    }
+    const ssize_t got = recv(descriptor, target, room, blocking ? 0 : MSG_DONTWAIT);
+    if (got > 0) {
+        *drained = size_t(got) < room;
+        if (direct)
+            assembler.CommitBody(size_t(got));
+        else
+            assembler.Append(buffer.data(), size_t(got));
+    }
+    return got;
 }
 
 } // namespace glyphwell::port
