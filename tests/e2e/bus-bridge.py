@@ -46,7 +46,7 @@ GLib.MainLoop().run()
 
 
 def test(agent, tool, bridge):
-    require("Xvfb", "xdotool", "dbus-daemon", "gdbus")
+    require("Xvfb", "xdotool", "dbus-daemon", "gdbus", "zenity")
     if subprocess.run(["/usr/bin/python3", "-c", "import gi"]).returncode:
         from e2e_support import skip
         skip("python3-gi is not installed (scripts/install-deps installs it)")
@@ -190,10 +190,17 @@ def test(agent, tool, bridge):
         gtk.kill()
         wait_for("the question to be withdrawn", lambda: not windows(), timeout=15)
         check(run.read("bridge.log").count(asking) == 2, "a burst made two questions")
-        # Download installs the font, which the application's fontconfig then finds.
-        client("async", "", "[':lang=ja']")
+        # A real GTK application with the font-install module: Download installs the font, which
+        # the application's fontconfig then finds.
+        zenity = run.start("zenity", ["zenity", "--info", "--text", "日本語のテキスト"],
+                           env=dict(run.env, GTK_MODULES="pk-gtk-module", NO_AT_BRIDGE="1",
+                                    # GTK's MIME data; fonts.conf names no XDG font folder
+                                    XDG_DATA_DIRS=run.path("data") + ":/usr/share",
+                                    # Pango tags CJK text "ja" only under a known language
+                                    LC_ALL="de_DE.UTF-8"))
         answer(["shift+Tab", "space"])
-        bridge_logs("Installed WenQuanYi Micro Hei for python3")
+        bridge_logs(f"Installed WenQuanYi Micro Hei for zenity")
+        check(zenity.poll() is None, "zenity ended")
         check(fc_list().startswith(fonts + "/"), f"fc-list :lang=ja finds {fc_list()!r}")
 
         bridge_process.terminate()
