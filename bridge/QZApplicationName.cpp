@@ -1,9 +1,10 @@
 #include "bridge/QZApplicationName.h"
 
 #include <algorithm>
+#include <cerrno>
 #include <climits>
 #include <cstdlib>
-#include <fstream>
+#include <fcntl.h>
 #include <unistd.h>
 #include <vector>
 
@@ -68,19 +69,44 @@ std::string QZDesktopEntryPath(std::string_view desktopID) {
     return {};
 }
 
+bool QZReadFileStart(const std::string& path, size_t limit, std::string* text) {
+    const int fd = open(path.c_str(), O_RDONLY | O_CLOEXEC);
+    if (fd < 0)
+        return false;
+    text->assign(limit, '\0');
+    size_t used = 0;
+    while (used < limit) {
+        const ssize_t count = read(fd, text->data() + used, limit - used);
+        if (count < 0 && errno == EINTR)
+            continue;
+        if (count <= 0) {
+            if (count < 0)
+                used = SIZE_MAX;
+            break;
+        }
+        used += size_t(count);
+    }
+    close(fd);
+    if (used == SIZE_MAX)
+        return false;
+    text->resize(used);
+    return true;
+}
+
 std::string QZDesktopEntryName(const std::string& path) {
-    std::ifstream file(path, std::ios::binary);
-    if (!file)
+    std::string text;
+    if (!QZReadFileStart(path, kMaximumEntrySize + 1, &text) || text.size() > kMaximumEntrySize)
         return {};
     const std::vector<std::string> keys = LocaleKeys();
     std::string name;
     size_t nameRank = SIZE_MAX; ///< index in `keys` of the name found; keys.size() for `Name`
     bool inEntry = false;
-    size_t total = 0;
-    for (std::string line; std::getline(file, line);) {
-        total += line.size() + 1;
-        if (total > kMaximumEntrySize)
-            return {};
+    for (size_t start = 0; start < text.size();) {
+        size_t end = text.find('\n', start);
+        if (end == std::string::npos)
+            end = text.size();
+        const std::string line = text.substr(start, end - start);
+        start = end + 1;
         if (line.starts_with('[')) {
             if (inEntry)
                 break; // the group is over
@@ -123,8 +149,8 @@ std::string QZExecutableName(pid_t pid) {
             path.erase(path.size() - 10);
         return path.substr(path.rfind('/') + 1);
     }
-    std::ifstream comm(process + "/comm");
     std::string name;
-    std::getline(comm, name);
-    return name;
+    if (!QZReadFileStart(process + "/comm", 64, &name))
+        return {};
+    return name.substr(0, name.find('\n'));
 }

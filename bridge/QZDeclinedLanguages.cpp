@@ -1,10 +1,13 @@
 #include "bridge/QZDeclinedLanguages.h"
 
+#include <cerrno>
 #include <cstdio>
 #include <cstdlib>
-#include <fstream>
+#include <fcntl.h>
 #include <sys/stat.h>
 #include <unistd.h>
+
+#include "bridge/QZApplicationName.h"
 
 #include "platform/HomeDirectory.h"
 
@@ -44,11 +47,15 @@ std::string QZDeclinedLanguages::DefaultPath() {
 
 std::vector<QZDeclinedLanguages::Entry> QZDeclinedLanguages::Read(time_t now) const {
     std::vector<Entry> entries;
-    std::ifstream file(path_, std::ios::binary);
-    size_t total = 0;
-    for (std::string line; file && std::getline(file, line);) {
-        if ((total += line.size() + 1) > kMaximumFileSize)
-            break;
+    std::string text;
+    if (!QZReadFileStart(path_, kMaximumFileSize, &text))
+        return entries;
+    for (size_t start = 0; start < text.size();) {
+        const size_t lineEnd = text.find('\n', start);
+        if (lineEnd == std::string::npos)
+            break; // a line cut short by the size limit or a crash
+        const std::string line = text.substr(start, lineEnd - start);
+        start = lineEnd + 1;
         const size_t first = line.find('\t');
         const size_t second = first == std::string::npos ? first : line.find('\t', first + 1);
         if (second == std::string::npos)
@@ -85,17 +92,20 @@ bool QZDeclinedLanguages::Record(const std::string& application,
         entries.erase(entries.begin(), entries.end() - kMaximumEntries);
     MakeDirectories(path_.substr(0, path_.rfind('/')));
     const std::string temporary = path_ + ".new";
-    {
-        std::ofstream file(temporary, std::ios::binary | std::ios::trunc);
-        for (const Entry& entry : entries)
-            file << entry.time << '\t' << entry.language << '\t' << entry.application << '\n';
-        file.flush();
-        if (!file) {
-            unlink(temporary.c_str());
-            return false;
-        }
+    std::string text;
+    for (const Entry& entry : entries)
+        text +=
+            std::to_string(entry.time) + '\t' + entry.language + '\t' + entry.application + '\n';
+    const int fd = open(temporary.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0600);
+    bool written = fd >= 0;
+    for (size_t done = 0; written && done < text.size();) {
+        const ssize_t count = write(fd, text.data() + done, text.size() - done);
+        written = count > 0 || (count < 0 && errno == EINTR);
+        done += count > 0 ? size_t(count) : 0;
     }
-    if (std::rename(temporary.c_str(), path_.c_str()) != 0) {
+    if (fd >= 0 && close(fd) != 0)
+        written = false;
+    if (!written || std::rename(temporary.c_str(), path_.c_str()) != 0) {
         unlink(temporary.c_str());
         return false;
     }

@@ -13,7 +13,6 @@
 #include <systemd/sd-event.h>
 #include <unistd.h>
 
-#include <fstream>
 #include <set>
 
 #include "bridge/QZApplicationName.h"
@@ -50,9 +49,9 @@ std::string Escaped(std::string_view text) {
 
 /// Whether process `pid` runs: it exists and is not a zombie waiting for its parent.
 bool ProcessExists(pid_t pid) {
-    std::ifstream file("/proc/" + std::to_string(pid) + "/stat");
     std::string stat;
-    std::getline(file, stat);
+    if (!QZReadFileStart("/proc/" + std::to_string(pid) + "/stat", 1024, &stat))
+        return false;
     const size_t end = stat.rfind(')');
     return end != std::string::npos && end + 2 < stat.size() && stat[end + 2] != 'Z' &&
            stat[end + 2] != 'X';

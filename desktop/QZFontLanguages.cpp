@@ -1,5 +1,6 @@
 #include "desktop/QZFontLanguages.h"
 
+#include <dlfcn.h>
 #include <fontconfig/fontconfig.h>
 
 #include <algorithm>
@@ -103,36 +104,81 @@ bool QZFontLanguageServes(std::string_view tag, std::string_view wanted) {
            (tag.find('-') == std::string_view::npos || wanted.find('-') == std::string_view::npos);
 }
 
-QZInstalledFontView::QZInstalledFontView() : config_(FcInitLoadConfigAndFonts()) {}
+/// The fontconfig functions the view calls. When the process has not loaded fontconfig, the view
+/// loads it and, once done, ends and unloads it (FcFini, dlclose): a long-running process that
+/// asks now and then, such as the bus bridge, then keeps none of it mapped in between.
+struct QZInstalledFontView::Library {
+    void* handle = nullptr;
+    bool loadedHere = false;
+#define GLYPHWELL_FONTCONFIG_FUNCTIONS(X)                                                          \
+    X(FcInitLoadConfigAndFonts)                                                                    \
+    X(FcConfigDestroy)                                                                             \
+    X(FcPatternCreate) X(FcPatternDestroy) X(FcObjectSetBuild) X(FcObjectSetDestroy)               \
+        X(FcLangSetCreate) X(FcLangSetAdd) X(FcLangSetDestroy) X(FcPatternAddLangSet)              \
+            X(FcPatternAddString) X(FcFontList) X(FcFontSetDestroy) X(FcFini)
+#define GLYPHWELL_DECLARE(name) decltype(&::name) name = nullptr;
+    GLYPHWELL_FONTCONFIG_FUNCTIONS(GLYPHWELL_DECLARE)
+#undef GLYPHWELL_DECLARE
+
+    bool Load() {
+        handle = dlopen("libfontconfig.so.1", RTLD_NOW | RTLD_LOCAL | RTLD_NOLOAD);
+        loadedHere = !handle;
+        if (!handle)
+            handle = dlopen("libfontconfig.so.1", RTLD_NOW | RTLD_LOCAL);
+        if (!handle)
+            return false;
+        bool complete = true;
+#define GLYPHWELL_RESOLVE(name)                                                                    \
+    name = reinterpret_cast<decltype(name)>(dlsym(handle, #name));                                 \
+    complete = complete && name;
+        GLYPHWELL_FONTCONFIG_FUNCTIONS(GLYPHWELL_RESOLVE)
+#undef GLYPHWELL_RESOLVE
+        return complete;
+    }
+    ~Library() {
+        if (!handle)
+            return;
+        if (loadedHere && FcFini)
+            FcFini();
+        dlclose(handle);
+    }
+};
+
+QZInstalledFontView::QZInstalledFontView() : library_(std::make_unique<Library>()) {
+    if (library_->Load())
+        config_ = library_->FcInitLoadConfigAndFonts();
+}
 
 QZInstalledFontView::~QZInstalledFontView() {
     if (config_)
-        FcConfigDestroy(config_);
+        library_->FcConfigDestroy(config_);
 }
 
 bool QZInstalledFontView::Lists(const char* object, const std::string& value) const {
     if (!config_)
         return false;
-    std::unique_ptr<FcPattern, decltype(&FcPatternDestroy)> pattern(FcPatternCreate(),
-                                                                    FcPatternDestroy);
-    std::unique_ptr<FcObjectSet, decltype(&FcObjectSetDestroy)> objects(
-        FcObjectSetBuild(FC_FAMILY, nullptr), FcObjectSetDestroy);
+    const Library& fc = *library_;
+    std::unique_ptr<FcPattern, decltype(fc.FcPatternDestroy)> pattern(fc.FcPatternCreate(),
+                                                                      fc.FcPatternDestroy);
+    std::unique_ptr<FcObjectSet, decltype(fc.FcObjectSetDestroy)> objects(
+        fc.FcObjectSetBuild(FC_FAMILY, nullptr), fc.FcObjectSetDestroy);
     if (!pattern || !objects)
         return false;
     if (object == std::string_view(FC_LANG)) {
-        FcLangSet* languages = FcLangSetCreate();
+        FcLangSet* languages = fc.FcLangSetCreate();
         if (!languages)
             return false;
-        FcLangSetAdd(languages, reinterpret_cast<const FcChar8*>(value.c_str()));
-        FcPatternAddLangSet(pattern.get(), FC_LANG, languages);
-        FcLangSetDestroy(languages);
+        fc.FcLangSetAdd(languages, reinterpret_cast<const FcChar8*>(value.c_str()));
+        fc.FcPatternAddLangSet(pattern.get(), FC_LANG, languages);
+        fc.FcLangSetDestroy(languages);
     } else {
-        FcPatternAddString(pattern.get(), object, reinterpret_cast<const FcChar8*>(value.c_str()));
+        fc.FcPatternAddString(pattern.get(), object,
+                              reinterpret_cast<const FcChar8*>(value.c_str()));
     }
-    FcFontSet* set = FcFontList(config_, pattern.get(), objects.get());
+    FcFontSet* set = fc.FcFontList(config_, pattern.get(), objects.get());
     const bool found = set && set->nfont > 0;
     if (set)
-        FcFontSetDestroy(set);
+        fc.FcFontSetDestroy(set);
     return found;
 }
 

@@ -6,6 +6,7 @@
 // "-" (`ja`, `zh-cn`, `und-zsye`).
 #pragma once
 
+#include <memory>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -25,8 +26,9 @@ bool QZFontLanguageServes(std::string_view tag, std::string_view wanted);
 
 /// The installed fonts as fontconfig sees them, loaded when made (the user's configuration and
 /// font directories, as applications load them) and released when destroyed. The process's
-/// default fontconfig configuration is not touched. Not thread-safe; make one per task and keep
-/// it only as long as the task, since a loaded configuration costs megabytes.
+/// default fontconfig configuration is not touched. A process that has not loaded fontconfig
+/// gets it loaded for the view's life only (one view at a time, then). Not thread-safe; make one
+/// per task and keep it only as long as the task, since a loaded configuration costs megabytes.
 class QZInstalledFontView {
 public:
     QZInstalledFontView();
@@ -42,7 +44,9 @@ public:
     bool HasFamily(const std::string& family) const;
 
 private:
+    struct Library;
     bool Lists(const char* object, const std::string& value) const;
+    std::unique_ptr<Library> library_;
     _FcConfig* config_ = nullptr;
 };
 
