@@ -65,8 +65,12 @@ bool ReadResources(sd_bus_message* message, QZFontResourceWants& wants) {
     return true;
 }
 
-/// Sends the success reply first, then reads the request: callers never wait for the work.
+/// Sends the success reply first, then reads the request: callers never wait for the work. The
+/// caller's pid is asked of the bus before the reply goes, while the caller is surely connected.
 void Serve(sd_bus_message* message, bool hasDesktopID) {
+    const char* sender = sd_bus_message_get_sender(message);
+    if (gAsker && sender)
+        gAsker->Open(sender);
     sd_bus_reply_method_return(message, nullptr);
     if (!hasDesktopID)
         sd_bus_message_skip(message, "u"); // Modify's window id: nothing to place a window on
@@ -78,7 +82,6 @@ void Serve(sd_bus_message* message, bool hasDesktopID) {
         return;
     if (hasDesktopID)
         sd_bus_message_read_basic(message, SD_BUS_TYPE_STRING, &desktopID);
-    const char* sender = sd_bus_message_get_sender(message);
     if (gAsker && sender)
         gAsker->Add(sender, desktopID ? desktopID : "", wants);
 }

@@ -74,16 +74,9 @@ QZFontAsker::~QZFontAsker() {
     glyphwell_call_free(call_);
 }
 
-void QZFontAsker::Add(const std::string& sender, const std::string& desktopID,
-                      const QZFontResourceWants& wants) {
-    if (wants.Empty())
+void QZFontAsker::Open(const std::string& sender) {
+    if (open_.count(sender))
         return;
-    if (const auto open = open_.find(sender); open != open_.end()) {
-        open->second->wants.Merge(wants);
-        if (open->second->desktopID.empty())
-            open->second->desktopID = desktopID;
-        return;
-    }
     if (open_.size() + waiting_.size() >= kMaximumBursts) {
         glyphwell::AppLog("Dropping the font request of %s: %zu requests are waiting already",
                           Escaped(sender).c_str(), open_.size() + waiting_.size());
@@ -92,8 +85,6 @@ void QZFontAsker::Add(const std::string& sender, const std::string& desktopID,
     auto burst = std::make_unique<Burst>();
     burst->asker = this;
     burst->sender = sender;
-    burst->desktopID = desktopID;
-    burst->wants.Merge(wants);
     sd_bus_call_method_async(bus_, &burst->pidQuery, "org.freedesktop.DBus",
                              "/org/freedesktop/DBus", "org.freedesktop.DBus",
                              "GetConnectionUnixProcessID", OnProcessID, burst.get(), "s",
@@ -104,6 +95,16 @@ void QZFontAsker::Add(const std::string& sender, const std::string& desktopID,
         return;
     }
     open_.emplace(sender, std::move(burst));
+}
+
+void QZFontAsker::Add(const std::string& sender, const std::string& desktopID,
+                      const QZFontResourceWants& wants) {
+    const auto open = open_.find(sender);
+    if (open == open_.end())
+        return;
+    open->second->wants.Merge(wants);
+    if (open->second->desktopID.empty())
+        open->second->desktopID = desktopID;
 }
 
 int QZFontAsker::OnProcessID(sd_bus_message* reply, void* data, sd_bus_error*) {
@@ -123,7 +124,9 @@ int QZFontAsker::OnBurstEnd(sd_event_source*, uint64_t, void* data) {
     const auto open = asker.open_.find(burst->sender);
     if (open == asker.open_.end())
         return 0;
-    asker.waiting_.push_back(std::move(open->second));
+    // A burst of requests that asked for nothing servable ends here.
+    if (!burst->wants.Empty())
+        asker.waiting_.push_back(std::move(open->second));
     asker.open_.erase(open);
     asker.Next();
     return 0;

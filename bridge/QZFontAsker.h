@@ -32,8 +32,12 @@ public:
     QZFontAsker(const QZFontAsker&) = delete;
     QZFontAsker& operator=(const QZFontAsker&) = delete;
 
-    /// Adds what the bus client `sender` (its unique name) asked for, with the desktop file id
-    /// it gave (may be empty), to its open burst, or opens one.
+    /// Opens a burst for the bus client `sender` (its unique name) unless one is open, and asks
+    /// the bus for its pid. Call it before replying to the request: a client may close its
+    /// connection once it has the reply, and the bus then no longer knows its pid.
+    void Open(const std::string& sender);
+    /// Adds what `sender` asked for, with the desktop file id it gave (may be empty), to its
+    /// open burst; nothing when none is open (the queue was full).
     void Add(const std::string& sender, const std::string& desktopID,
              const QZFontResourceWants& wants);
 
