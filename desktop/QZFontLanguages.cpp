@@ -110,30 +110,43 @@ bool QZFontLanguageServes(std::string_view tag, std::string_view wanted) {
 struct QZInstalledFontView::Library {
     void* handle = nullptr;
     bool loadedHere = false;
-#define GLYPHWELL_FONTCONFIG_FUNCTIONS(X)                                                          \
-    X(FcInitLoadConfigAndFonts)                                                                    \
-    X(FcConfigDestroy)                                                                             \
-    X(FcPatternCreate) X(FcPatternDestroy) X(FcObjectSetBuild) X(FcObjectSetDestroy)               \
-        X(FcLangSetCreate) X(FcLangSetAdd) X(FcLangSetDestroy) X(FcPatternAddLangSet)              \
-            X(FcPatternAddString) X(FcFontList) X(FcFontSetDestroy) X(FcFini)
-#define GLYPHWELL_DECLARE(name) decltype(&::name) name = nullptr;
-    GLYPHWELL_FONTCONFIG_FUNCTIONS(GLYPHWELL_DECLARE)
-#undef GLYPHWELL_DECLARE
+    decltype(&::FcInitLoadConfigAndFonts) FcInitLoadConfigAndFonts = nullptr;
+    decltype(&::FcConfigDestroy) FcConfigDestroy = nullptr;
+    decltype(&::FcPatternCreate) FcPatternCreate = nullptr;
+    decltype(&::FcPatternDestroy) FcPatternDestroy = nullptr;
+    decltype(&::FcObjectSetBuild) FcObjectSetBuild = nullptr;
+    decltype(&::FcObjectSetDestroy) FcObjectSetDestroy = nullptr;
+    decltype(&::FcLangSetCreate) FcLangSetCreate = nullptr;
+    decltype(&::FcLangSetAdd) FcLangSetAdd = nullptr;
+    decltype(&::FcLangSetDestroy) FcLangSetDestroy = nullptr;
+    decltype(&::FcPatternAddLangSet) FcPatternAddLangSet = nullptr;
+    decltype(&::FcPatternAddString) FcPatternAddString = nullptr;
+    decltype(&::FcFontList) FcFontList = nullptr;
+    decltype(&::FcFontSetDestroy) FcFontSetDestroy = nullptr;
+    decltype(&::FcFini) FcFini = nullptr;
 
+    template <typename Function> bool Resolve(Function& function, const char* name) {
+        function = reinterpret_cast<Function>(dlsym(handle, name));
+        return function != nullptr;
+    }
     bool Load() {
         handle = dlopen("libfontconfig.so.1", RTLD_NOW | RTLD_LOCAL | RTLD_NOLOAD);
         loadedHere = !handle;
         if (!handle)
             handle = dlopen("libfontconfig.so.1", RTLD_NOW | RTLD_LOCAL);
-        if (!handle)
-            return false;
-        bool complete = true;
-#define GLYPHWELL_RESOLVE(name)                                                                    \
-    name = reinterpret_cast<decltype(name)>(dlsym(handle, #name));                                 \
-    complete = complete && name;
-        GLYPHWELL_FONTCONFIG_FUNCTIONS(GLYPHWELL_RESOLVE)
-#undef GLYPHWELL_RESOLVE
-        return complete;
+        return handle && Resolve(FcInitLoadConfigAndFonts, "FcInitLoadConfigAndFonts") &&
+               Resolve(FcConfigDestroy, "FcConfigDestroy") &&
+               Resolve(FcPatternCreate, "FcPatternCreate") &&
+               Resolve(FcPatternDestroy, "FcPatternDestroy") &&
+               Resolve(FcObjectSetBuild, "FcObjectSetBuild") &&
+               Resolve(FcObjectSetDestroy, "FcObjectSetDestroy") &&
+               Resolve(FcLangSetCreate, "FcLangSetCreate") &&
+               Resolve(FcLangSetAdd, "FcLangSetAdd") &&
+               Resolve(FcLangSetDestroy, "FcLangSetDestroy") &&
+               Resolve(FcPatternAddLangSet, "FcPatternAddLangSet") &&
+               Resolve(FcPatternAddString, "FcPatternAddString") &&
+               Resolve(FcFontList, "FcFontList") && Resolve(FcFontSetDestroy, "FcFontSetDestroy") &&
+               Resolve(FcFini, "FcFini");
     }
     ~Library() {
         if (!handle)
