@@ -22,17 +22,22 @@ MODIFY2 = NAME + ".Modify2"
 JAPANESE_FONT = "/usr/share/fonts/truetype/wqy/wqy-microhei.ttc"
 APP_ID = "org.example.Reader.desktop"
 # A GDBus client that stays alive after its calls, as applications do: argv[1] is "sync" (GetAll,
-# then blocking calls, as LibreOffice does) or "async" (one connection, calls not waited for, as
-# the GTK module does), argv[2] the desktop id, the rest one call's resources each, as a Python
-# expression (lists too long for a command line).
+# then blocking calls, as LibreOffice does), "async" (one connection, calls not waited for, as
+# the GTK module does) or "many:N" (as async, from each of N connections), argv[2] the desktop id,
+# the rest one call's resources each, as a Python expression (lists too long for a command line).
 CLIENT = f"""
 import sys
 from gi.repository import Gio, GLib
-bus = Gio.bus_get_sync(Gio.BusType.SESSION)
+address = Gio.dbus_address_get_for_bus_sync(Gio.BusType.SESSION, None)
+flags = (Gio.DBusConnectionFlags.AUTHENTICATION_CLIENT |
+         Gio.DBusConnectionFlags.MESSAGE_BUS_CONNECTION)
+buses = [Gio.DBusConnection.new_for_address_sync(address, flags, None, None)
+         for _ in range(int(sys.argv[1][5:]) if sys.argv[1].startswith("many:") else 1)]
 def call(method, args, sync):
-    run = bus.call_sync if sync else bus.call
-    run("{NAME}", "{PATH}", method.rsplit(".", 1)[0], method.rsplit(".", 1)[1], args, None,
-        Gio.DBusCallFlags.NONE, 25000, None, *([] if sync else [None]))
+    for bus in buses:
+        run = bus.call_sync if sync else bus.call
+        run("{NAME}", "{PATH}", method.rsplit(".", 1)[0], method.rsplit(".", 1)[1], args, None,
+            Gio.DBusCallFlags.NONE, 25000, None, *([] if sync else [None]))
 sync = sys.argv[1] == "sync"
 if sync:
     call("org.freedesktop.DBus.Properties.GetAll", GLib.Variant("(s)", ("{MODIFY2}",)), True)
@@ -117,6 +122,10 @@ def test(agent, tool, bridge):
         bridge_exits_leaving_the_name(
             "bridge-second", f"{NAME} is owned by another connection; leaving it to that provider")
 
+        def bridge_logs(line, count=1):
+            wait_for(f"the bridge to log {line!r}", lambda: run.read("bridge.log").count(line)
+                     >= count, timeout=20)
+
         def client(mode, app, *resources):
             process = run.start(f"client-{len(run.processes)}", ["/usr/bin/python3", "-c",
                                                                   CLIENT, mode, app, *resources])
@@ -151,6 +160,14 @@ def test(agent, tool, bridge):
                      "Cannot serve the font resource " + "a" * 128 + "... from "]:
             check(line in log, f"the bridge did not log {line[:60]!r}: {log[-2000:]}")
 
+        # Without the agent, one line per burst; more callers at once than the queue holds.
+        client("async", "", "[':lang=ja']")
+        bridge_logs("Cannot ask the agent about the fonts for python3")
+        client("many:70", "", "[':lang=ko']")
+        bridge_logs("Cannot ask the agent about the fonts for python3", 65)
+        check(run.read("bridge.log").count(": 64 requests are waiting already") == 6,
+              "not 6 of 70 callers were dropped")
+
         # The questions, answered with keys on a private X server.
         run.env["DISPLAY"] = start_xvfb(run)
         agent_process = run.start_agent(agent)
@@ -159,10 +176,6 @@ def test(agent, tool, bridge):
             return subprocess.run(["xdotool", "search", "--onlyvisible", "--pid",
                                    str(agent_process.pid)], env=run.env, capture_output=True,
                                   text=True, timeout=5).stdout.split()
-
-        def bridge_logs(line, count=1):
-            wait_for(f"the bridge to log {line!r}", lambda: run.read("bridge.log").count(line)
-                     >= count, timeout=20)
 
         def answer(keys):
             window = wait_for("the question", lambda: next(iter(windows()), None))
