@@ -3,9 +3,11 @@
 server, a loopback font server and a private fontconfig without a Japanese font. The name left
 to another provider; the replies, introspection and errors that callers get at once, whatever
 they send; LibreOffice's sequence and the GTK module's asynchronous call (GDBus) turned into one
-question per burst; Skip remembered, an installed language asking nothing, a quitting caller
-withdrawing its question, Download installing a font that `fc-list :lang=ja` then finds.
-Skipped (77) without Xvfb, xdotool, dbus-daemon, gdbus or python3-gi.
+question per burst; the agent not running and too many callers, one line each; Skip remembered,
+an installed language asking nothing, a quitting caller withdrawing its question; zenity with
+GTK's font-install module, answered Download: the font installed, found by `fc-list :lang=ja`,
+and announced by a desktop notification. Skipped (77) without Xvfb, xdotool, dbus-daemon, gdbus,
+zenity or python3-gi.
 
 usage: bus-bridge.py AGENT GLYPHWELL BRIDGE"""
 import os
@@ -46,6 +48,21 @@ for resources in sys.argv[3:]:
     call("{MODIFY2}.InstallFontconfigResources", GLib.Variant(
         "(asssa{{sv}})", (resources, "hide-finished", sys.argv[2], {{}})), sync)
 print("sent", flush=True)
+GLib.MainLoop().run()
+"""
+# A desktop notification server that prints each notification's summary and body.
+NOTIFICATIONS = """
+from gi.repository import Gio, GLib
+def called(connection, sender, path, interface, method, args, invocation):
+    print(args[3], "|", args[4], flush=True)
+    invocation.return_value(GLib.Variant("(u)", (1,)))
+bus = Gio.bus_get_sync(Gio.BusType.SESSION)
+node = Gio.DBusNodeInfo.new_for_xml('<node><interface name="org.freedesktop.Notifications">'
+    '<method name="Notify"><arg type="s"/><arg type="u"/><arg type="s"/><arg type="s"/>'
+    '<arg type="s"/><arg type="as"/><arg type="a{sv}"/><arg type="i"/>'
+    '<arg type="u" direction="out"/></method></interface></node>')
+bus.register_object("/org/freedesktop/Notifications", node.interfaces[0], called)
+Gio.bus_own_name_on_connection(bus, "org.freedesktop.Notifications", 0, None, None)
 GLib.MainLoop().run()
 """
 
@@ -170,6 +187,7 @@ def test(agent, tool, bridge):
 
         # The questions, answered with keys on a private X server.
         run.env["DISPLAY"] = start_xvfb(run)
+        run.start("notifications", ["/usr/bin/python3", "-c", NOTIFICATIONS])
         agent_process = run.start_agent(agent)
 
         def windows():
@@ -198,7 +216,7 @@ def test(agent, tool, bridge):
         # The GTK module's calls: two from one caller within a second make one question, which
         # goes when the caller quits.
         gtk = client("async", "", "[':lang=ja']", "[':lang=zh-cn']")
-        bridge_logs(asking + f"python3")
+        bridge_logs(asking + "python3")
         wait_for("the question", windows)
         gtk.kill()
         wait_for("the question to be withdrawn", lambda: not windows(), timeout=15)
@@ -212,7 +230,10 @@ def test(agent, tool, bridge):
                                     # Pango tags CJK text "ja" only under a known language
                                     LC_ALL="de_DE.UTF-8"))
         answer(["shift+Tab", "space"])
-        bridge_logs(f"Installed WenQuanYi Micro Hei for zenity")
+        bridge_logs("Installed WenQuanYi Micro Hei for zenity")
+        wait_for("the notification", lambda: run.read("notifications.log") == (
+            "Fonts installed | WenQuanYi Micro Hei can now be used. zenity may need a restart to "
+            "show them.\n"))
         check(zenity.poll() is None, "zenity ended")
         check(fc_list().startswith(fonts + "/"), f"fc-list :lang=ja finds {fc_list()!r}")
 
