@@ -62,7 +62,9 @@ std::vector<QZDeclinedLanguages::Entry> QZDeclinedLanguages::Read(time_t now) co
             continue;
         char* end = nullptr;
         const long long time = std::strtoll(line.c_str(), &end, 10);
-        if (end != line.c_str() + first || time > now || now - time >= kRemembered)
+        // Lines from over a day ahead (a clock set back, a damaged file) do not count.
+        if (end != line.c_str() + first || time < 0 || time > now + kRemembered ||
+            now - time >= kRemembered)
             continue;
         entries.push_back(
             {time_t(time), line.substr(first + 1, second - first - 1), line.substr(second + 1)});
