@@ -78,10 +78,16 @@ void QZFontAsker::Open(const std::string& sender) {
     if (open_.count(sender))
         return;
     if (open_.size() + waiting_.size() >= kMaximumBursts) {
-        glyphwell::AppLog("Dropping the font request of %s: %zu requests are waiting already",
-                          Escaped(sender).c_str(), open_.size() + waiting_.size());
+        // One line for the first request dropped, one count when there is room again.
+        if (dropped_++ == 0)
+            glyphwell::AppLog("Dropping the font request of %s: %zu requests are waiting already",
+                              Escaped(sender).c_str(), open_.size() + waiting_.size());
         return;
     }
+    if (dropped_ > 1)
+        glyphwell::AppLog("Dropped %zu more font requests while %zu were waiting", dropped_ - 1,
+                          kMaximumBursts);
+    dropped_ = 0;
     auto burst = std::make_unique<Burst>();
     burst->asker = this;
     burst->sender = sender;

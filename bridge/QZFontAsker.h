@@ -61,6 +61,7 @@ private:
     std::map<std::string, std::unique_ptr<Burst>> open_; ///< by sender
     std::deque<std::unique_ptr<Burst>> waiting_;
     std::unique_ptr<Burst> asking_; ///< the burst whose question is on screen
+    size_t dropped_ = 0;            ///< requests dropped since the queue was last short of full
     glyphwell_call* call_ = nullptr;
     sd_event_source* callSource_ = nullptr;
 };
