@@ -151,20 +151,23 @@ const sd_bus_vtable kModifyTable[] = {
                              "", , NotSupported, 0),
     SD_BUS_VTABLE_END};
 
-/// Who provides the name already: "owned", "activatable", "" for nobody; an error message
-/// (starting with "error:") when the bus cannot say.
-std::string OtherProvider(sd_bus* bus) {
+enum class Provider { Nobody, Owner, ServiceFile, Unknown };
+
+/// Who provides the name already; Unknown, with the bus's message in `*failure`, when the bus
+/// cannot say.
+Provider OtherProvider(sd_bus* bus, std::string* failure) {
     sd_bus_error error = SD_BUS_ERROR_NULL;
     sd_bus_message* reply = nullptr;
-    std::string provider;
+    Provider provider = Provider::Nobody;
     int owned = 0;
     if (sd_bus_call_method(bus, "org.freedesktop.DBus", "/org/freedesktop/DBus",
                            "org.freedesktop.DBus", "NameHasOwner", &error, &reply, "s",
                            kQZFontInstallBusName) < 0 ||
         sd_bus_message_read(reply, "b", &owned) < 0) {
-        provider = std::string("error:") + (error.message ? error.message : "NameHasOwner failed");
+        provider = Provider::Unknown;
+        *failure = error.message ? error.message : "NameHasOwner failed";
     } else if (owned) {
-        provider = "owned";
+        provider = Provider::Owner;
     } else {
         reply = sd_bus_message_unref(reply);
         char** names = nullptr;
@@ -172,12 +175,12 @@ std::string OtherProvider(sd_bus* bus) {
                                "org.freedesktop.DBus", "ListActivatableNames", &error, &reply,
                                "") < 0 ||
             sd_bus_message_read_strv(reply, &names) < 0) {
-            provider = std::string("error:") +
-                       (error.message ? error.message : "ListActivatableNames failed");
+            provider = Provider::Unknown;
+            *failure = error.message ? error.message : "ListActivatableNames failed";
         } else {
             for (char** name = names; name && *name; ++name)
                 if (std::strcmp(*name, kQZFontInstallBusName) == 0)
-                    provider = "activatable";
+                    provider = Provider::ServiceFile;
         }
         for (char** name = names; name && *name; ++name)
             free(*name);
@@ -231,14 +234,15 @@ int QZRunBusBridge() {
     }
     std::unique_ptr<sd_bus, BusDeleter> bus(busPointer);
 
-    const std::string provider = OtherProvider(bus.get());
-    if (provider.starts_with("error:")) {
+    std::string failure;
+    const Provider provider = OtherProvider(bus.get(), &failure);
+    if (provider == Provider::Unknown) {
         glyphwell::AppLog("Cannot ask the session bus who provides %s: %s", kQZFontInstallBusName,
-                          Escaped(provider.substr(6)).c_str());
+                          Escaped(failure).c_str());
         return 1;
     }
-    if (!provider.empty()) {
-        glyphwell::AppLog(provider == "owned"
+    if (provider != Provider::Nobody) {
+        glyphwell::AppLog(provider == Provider::Owner
                               ? "%s is owned by another connection; leaving it to that provider"
                               : "%s is provided by a D-Bus service file; leaving it to that "
                                 "provider",
