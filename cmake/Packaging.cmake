@@ -62,6 +62,10 @@ set(CPACK_DEBIAN_PACKAGE_SHLIBDEPS ON)
 if(GLYPHWELL_AGENT)
     set(CPACK_DEBIAN_PACKAGE_DEPENDS "qt6-qpa-plugins, qt6-wayland")
 endif()
+# The bus bridge answers GTK applications only when their font-install module is loaded.
+if(TARGET glyphwell-bus-bridge)
+    set(CPACK_DEBIAN_PACKAGE_RECOMMENDS "packagekit-gtk3-module")
+endif()
 
 # The maintainer scripts enable the agent's user socket: only a package with the agent has them.
 set(glyphwell_control_extra)
@@ -84,6 +88,13 @@ if(glyphwell_shared_library)
     set(CPACK_DEBIAN_PACKAGE_SHLIBDEPS_PRIVATE_DIRS .${CMAKE_INSTALL_FULL_LIBDIR})
     file(WRITE ${PROJECT_BINARY_DIR}/debian/triggers "activate-noawait ldconfig\n")
     list(APPEND glyphwell_control_extra ${PROJECT_BINARY_DIR}/debian/triggers)
+endif()
+# The bridge's files in /etc are the administrator's to change: conffiles.
+if(TARGET glyphwell-bus-bridge)
+    file(WRITE ${PROJECT_BINARY_DIR}/debian/conffiles
+         "${CMAKE_INSTALL_FULL_SYSCONFDIR}/xdg/autostart/glyphwell-bus-bridge.desktop\n"
+         "${CMAKE_INSTALL_FULL_SYSCONFDIR}/X11/Xsession.d/90glyphwell-gtk-module\n")
+    list(APPEND glyphwell_control_extra ${PROJECT_BINARY_DIR}/debian/conffiles)
 endif()
 set(CPACK_DEBIAN_PACKAGE_CONTROL_EXTRA ${glyphwell_control_extra})
 set(CPACK_DEBIAN_PACKAGE_CONTROL_STRICT_PERMISSION ON)

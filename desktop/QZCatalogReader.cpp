@@ -70,6 +70,7 @@ struct CatalogStorage {
     StringArena strings;
     std::vector<QZDownloadableFont> fonts;
     std::vector<QZLocalizedName> names;
+    std::vector<std::string_view> languages;
 };
 
 /// Bytes from memory or a file, one at a time, with the place of the next one.
@@ -157,11 +158,14 @@ struct FontRecord {
     Seen postScriptName = Seen::Absent;
     Seen family = Seen::Absent;
     Seen names = Seen::Absent;
+    Seen languages = Seen::Absent;
     std::string_view postScriptNameText;
     std::string_view familyText;
     size_t namesBegin = 0;
     size_t namesCount = 0;       ///< once the font ended
     std::vector<bool> nameValid; ///< per name of this font, in arrival order
+    size_t languagesBegin = 0;
+    size_t languagesCount = 0;
 };
 
 /// The JSON events of a catalog, turned into its compact form.
@@ -200,7 +204,7 @@ public:
 
 private:
     /// Where the reader is: the container whose members or elements come next.
-    enum class Context { Top, Root, Assets, Asset, Fonts, Font, Names, Skip };
+    enum class Context { Top, Root, Assets, Asset, Fonts, Font, Names, Languages, Skip };
     /// The member whose value comes next.
     enum class Member {
         Other,
@@ -213,7 +217,8 @@ private:
         PostScriptName,
         Family,
         Names,
-        Name
+        Name,
+        Languages
     };
 
     bool Scalar(bool isString, std::string_view text);
@@ -224,6 +229,7 @@ private:
     void PlaceAssetMember(bool isString, std::string_view text, Context container);
     void PlaceFontMember(bool isString, std::string_view text, Context container);
     void StartAsset();
+    void StartFont();
     void EndAsset();
     void EndFont();
     /// The reason an asset is left out, or empty when it is kept.
@@ -235,8 +241,9 @@ private:
     std::vector<QZCatalogProblem>& problems_;
     std::shared_ptr<CatalogStorage> storage_;
     std::vector<QZDownloadableFontAsset> assets_;
-    std::vector<std::pair<size_t, size_t>> fontRanges_; ///< per asset: first font, count
-    std::vector<std::pair<size_t, size_t>> nameRanges_; ///< per kept font: first name, count
+    std::vector<std::pair<size_t, size_t>> fontRanges_;     ///< per asset: first font, count
+    std::vector<std::pair<size_t, size_t>> nameRanges_;     ///< per kept font: first name, count
+    std::vector<std::pair<size_t, size_t>> languageRanges_; ///< per kept font
     std::unordered_set<std::string_view> identifiers_;
 
     std::vector<Context> stack_{Context::Top};
@@ -280,7 +287,7 @@ bool CatalogReader::start_object(std::size_t) {
     if (opened == Context::Asset)
         StartAsset();
     else if (opened == Context::Font)
-        fonts_.emplace_back().namesBegin = storage_->names.size();
+        StartFont();
     member_ = Member::Other;
     return true;
 }
@@ -310,6 +317,8 @@ bool CatalogReader::start_array(std::size_t) {
         opened = Context::Assets;
     else if (top == Context::Asset && member_ == Member::Fonts)
         opened = Context::Fonts;
+    else if (top == Context::Font && member_ == Member::Languages)
+        opened = Context::Languages;
     Place(false, {}, opened);
     if (opened == Context::Skip) {
         skipDepth_ = 1;
@@ -378,6 +387,10 @@ bool CatalogReader::key(string_t& name) {
             font.names = Seen::Absent;
             storage_->names.resize(font.namesBegin);
             font.nameValid.clear();
+        } else if (name == "languages") {
+            member_ = Member::Languages;
+            font.languages = Seen::Absent;
+            storage_->languages.resize(font.languagesBegin);
         }
         break;
     }
@@ -428,9 +441,8 @@ void CatalogReader::Place(bool isString, std::string_view text, Context containe
         break;
     case Context::Fonts:
         if (container != Context::Font) {
-            FontRecord& font = fonts_.emplace_back();
-            font.postScriptName = Seen::Invalid;
-            font.namesBegin = storage_->names.size();
+            StartFont();
+            fonts_.back().postScriptName = Seen::Invalid;
             EndFont();
         }
         break;
@@ -441,6 +453,13 @@ void CatalogReader::Place(bool isString, std::string_view text, Context containe
         storage_->names.push_back(
             {language_, isString ? storage_->strings.Store(text) : std::string_view{}});
         fonts_.back().nameValid.push_back(isString);
+        break;
+    case Context::Languages:
+        // One element that is not a non-empty string makes the whole member malformed.
+        if (isString && !text.empty())
+            storage_->languages.push_back(storage_->strings.Store(text));
+        else
+            fonts_.back().languages = Seen::Invalid;
         break;
     default:
         break;
@@ -477,6 +496,8 @@ void CatalogReader::PlaceFontMember(bool isString, std::string_view text, Contex
             font.familyText = storage_->strings.Store(text);
     } else if (member_ == Member::Names) {
         font.names = container == Context::Names ? Seen::Valid : Seen::Invalid;
+    } else if (member_ == Member::Languages) {
+        font.languages = container == Context::Languages ? Seen::Valid : Seen::Invalid;
     }
 }
 
@@ -490,8 +511,15 @@ void CatalogReader::StartAsset() {
     fontProblem_.clear();
 }
 
+void CatalogReader::StartFont() {
+    FontRecord& font = fonts_.emplace_back();
+    font.namesBegin = storage_->names.size();
+    font.languagesBegin = storage_->languages.size();
+}
+
 void CatalogReader::EndFont() {
     FontRecord& font = fonts_.back();
+    font.languagesCount = storage_->languages.size() - font.languagesBegin;
     std::string reason;
     if (font.postScriptName != Seen::Valid)
         reason = "a font without a \"postScriptName\"";
@@ -499,6 +527,8 @@ void CatalogReader::EndFont() {
         reason = "a \"family\" that is not a string";
     else if (font.names == Seen::Invalid)
         reason = "\"localizedFamilyNames\" that is not an object";
+    else if (font.languages == Seen::Invalid)
+        reason = "\"languages\" that is not an array of language tags";
     if (!reason.empty() && fontProblem_.empty())
         fontProblem_ = reason;
     if (!reason.empty() || font.names != Seen::Valid)
@@ -566,15 +596,18 @@ void CatalogReader::EndAsset() {
     if (!problem.empty()) {
         AddProblem(QZCatalogProblem::Kind::Asset, problem, assetLine_, assetColumn_);
         // The rejected asset's strings and fonts are given back; its names follow its fonts.
-        if (!fonts_.empty())
+        if (!fonts_.empty()) {
             storage_->names.resize(fonts_.front().namesBegin);
+            storage_->languages.resize(fonts_.front().languagesBegin);
+        }
         storage_->strings.Rewind(assetMark_);
     } else {
         identifiers_.insert(asset_.localID);
         fontRanges_.emplace_back(storage_->fonts.size(), fonts_.size());
         for (const FontRecord& font : fonts_) {
-            storage_->fonts.push_back({font.postScriptNameText, font.familyText, {}});
+            storage_->fonts.push_back({font.postScriptNameText, font.familyText, {}, {}});
             nameRanges_.emplace_back(font.namesBegin, font.namesCount);
+            languageRanges_.emplace_back(font.languagesBegin, font.languagesCount);
         }
         assets_.push_back(asset_);
     }
@@ -606,9 +639,13 @@ QZDownloadableFontCatalog CatalogReader::Finish(bool parsed) {
     CatalogStorage& storage = *storage_;
     storage.fonts.shrink_to_fit();
     storage.names.shrink_to_fit();
-    for (size_t i = 0; i < storage.fonts.size(); ++i)
+    storage.languages.shrink_to_fit();
+    for (size_t i = 0; i < storage.fonts.size(); ++i) {
         storage.fonts[i].localizedFamilyNames = std::span<const QZLocalizedName>(
             storage.names.data() + nameRanges_[i].first, nameRanges_[i].second);
+        storage.fonts[i].languages = std::span<const std::string_view>(
+            storage.languages.data() + languageRanges_[i].first, languageRanges_[i].second);
+    }
     for (size_t i = 0; i < assets_.size(); ++i)
         assets_[i].fonts = std::span<const QZDownloadableFont>(
             storage.fonts.data() + fontRanges_[i].first, fontRanges_[i].second);

@@ -1,12 +1,11 @@
 #include "desktop/QZDownloadableFontCatalog.h"
 
-#include <QDateTime>
-#include <QFileInfo>
-#include <QStandardPaths>
 #include <mutex>
+#include <sys/stat.h>
 
+#include "cfutil/CFStringUtilities.h"
+#include "cfutil/CFUserDirectories.h"
 #include "cfutil/TCFRetained.h"
-#include "desktop/QZQtStrings.h"
 #include "platform/CFDictionary.h"
 #include "platform/CFNumber.h"
 #include "platform/Log.h"
@@ -18,9 +17,9 @@ namespace {
 constexpr char kCatalogRelativePath[] = "glyphwell/downloadable-fonts.json";
 /// The state of the catalog file that the cached catalog was read from.
 struct FileState {
-    QString path; ///< empty: no catalog file
-    qint64 size = -1;
-    qint64 modified = 0; ///< milliseconds since the epoch
+    std::string path; ///< empty: no catalog file
+    int64_t size = -1;
+    int64_t modified = 0; ///< nanoseconds since the epoch
     bool operator==(const FileState&) const = default;
 };
 
@@ -39,10 +38,11 @@ CatalogCache& Cache() {
 }
 
 FileState CurrentFileState() {
-    for (const QString& path : QZDownloadableFontCatalogPaths()) {
-        const QFileInfo info(path);
-        if (info.exists())
-            return {path, info.size(), info.lastModified().toMSecsSinceEpoch()};
+    for (const std::string& path : QZDownloadableFontCatalogPaths()) {
+        struct stat status {};
+        if (stat(path.c_str(), &status) == 0)
+            return {path, int64_t(status.st_size),
+                    int64_t(status.st_mtim.tv_sec) * 1000000000 + status.st_mtim.tv_nsec};
     }
     return {};
 }
@@ -67,18 +67,17 @@ void LogProblems(const std::vector<QZCatalogProblem>& problems, const std::strin
 }
 
 QZDownloadableFontCatalog LoadCatalog(const FileState& state) {
-    if (state.path.isEmpty()) {
-        glyphwell::AppLog(
-            "No downloadable font catalog: none of %s exists",
-            glyphwell::LogEscape(
-                QZDownloadableFontCatalogPaths().join(QStringLiteral(", ")).toStdString())
-                .c_str());
+    if (state.path.empty()) {
+        std::string paths;
+        for (const std::string& path : QZDownloadableFontCatalogPaths())
+            paths += (paths.empty() ? "" : ", ") + path;
+        glyphwell::AppLog("No downloadable font catalog: none of %s exists",
+                          glyphwell::LogEscape(paths).c_str());
         return {};
     }
     std::vector<QZCatalogProblem> problems;
-    const std::string path = state.path.toStdString();
-    QZDownloadableFontCatalog catalog = QZReadDownloadableFontCatalogFile(path, problems);
-    LogProblems(problems, path);
+    QZDownloadableFontCatalog catalog = QZReadDownloadableFontCatalogFile(state.path, problems);
+    LogProblems(problems, state.path);
     return catalog;
 }
 
@@ -128,12 +127,10 @@ QZDownloadableFontCatalog QZDownloadableFontCatalog::Parse(std::string_view byte
     return catalog;
 }
 
-QStringList QZDownloadableFontCatalogPaths() {
-    // The user's data directory first, then each of XDG_DATA_DIRS (with their defaults).
-    QStringList paths;
-    for (const QString& directory :
-         QStandardPaths::standardLocations(QStandardPaths::GenericDataLocation))
-        paths << directory + u'/' + QString::fromLatin1(kCatalogRelativePath);
+std::vector<std::string> QZDownloadableFontCatalogPaths() {
+    std::vector<std::string> paths;
+    for (const std::string& directory : GetDataDirectories())
+        paths.push_back(directory + '/' + kCatalogRelativePath);
     return paths;
 }
 
@@ -172,11 +169,13 @@ QZCopyDownloadableFontAttributesForRequests(CFArrayRef requestedFontAttributeDic
         const void* element = CFArrayGetValueAtIndex(requestedFontAttributeDictionaries, i);
         if (!element || CFGetTypeID(element) != CFDictionaryGetTypeID())
             continue;
-        const QString name = QZQStringIfString(
-            CFDictionaryGetValue(static_cast<CFDictionaryRef>(element), NSFontNameAttribute));
-        if (name.isEmpty())
+        const void* name =
+            CFDictionaryGetValue(static_cast<CFDictionaryRef>(element), NSFontNameAttribute);
+        std::string postScriptName;
+        if (!name || CFGetTypeID(name) != CFStringGetTypeID() ||
+            !CFString::GetUTF8(static_cast<CFStringRef>(name), postScriptName) ||
+            postScriptName.empty())
             continue;
-        const std::string postScriptName = name.toStdString();
         if (installed && installed(postScriptName))
             continue;
         for (const QZDownloadableFontAsset& asset : catalog->assets) {

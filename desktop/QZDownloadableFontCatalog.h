@@ -6,11 +6,9 @@
 // The catalog is read again whenever its file changes (path, size or modification time); a
 // catalog that cannot be read or parsed counts as empty and is logged once for that state of the
 // file, and an asset that does not have the expected shape is left out with one log line.
-// Thread-safe.
+// Thread-safe; no Qt.
 #pragma once
 
-#include <QString>
-#include <QStringList>
 #include <cstdint>
 #include <functional>
 #include <memory>
@@ -33,6 +31,9 @@ struct QZDownloadableFont {
     std::string_view family; ///< may be empty
     /// Language identifier to family name in that language: sorted by language, each once.
     std::span<const QZLocalizedName> localizedFamilyNames;
+    /// The fontconfig language tags the font covers (`ja`, `zh-cn`, `und-zsye`), from the
+    /// catalog's optional "languages" array; empty when the catalog gives none.
+    std::span<const std::string_view> languages;
 
     /// The family name in `language`; empty when the catalog gives none.
     std::string_view LocalizedFamilyName(std::string_view language) const;
@@ -89,8 +90,9 @@ QZReadDownloadableFontCatalogFile(const std::string& path, std::vector<QZCatalog
 QZDownloadableFontCatalog QZReadDownloadableFontCatalog(std::string_view bytes,
                                                         std::vector<QZCatalogProblem>& problems);
 
-/// The places searched for the catalog, in order.
-QStringList QZDownloadableFontCatalogPaths();
+/// The places searched for the catalog, in order: under $XDG_DATA_HOME (default ~/.local/share),
+/// then under each absolute directory of $XDG_DATA_DIRS (default /usr/local/share:/usr/share).
+std::vector<std::string> QZDownloadableFontCatalogPaths();
 /// The current catalog (empty when there is none); shared, never changed once handed out.
 std::shared_ptr<const QZDownloadableFontCatalog> QZCurrentDownloadableFontCatalog();
 

@@ -10,7 +10,11 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     fuzz::Quiet();
     const QZDownloadableFontCatalog catalog = QZDownloadableFontCatalog::Parse(
         std::string_view(reinterpret_cast<const char*>(data), size), "fuzz input");
-    for (const QZDownloadableFontAsset& asset : catalog.assets)
+    for (const QZDownloadableFontAsset& asset : catalog.assets) {
         fuzz::Check(!asset.localID.empty() && asset.sha256.size() == 64);
+        for (const QZDownloadableFont& font : asset.fonts)
+            for (std::string_view language : font.languages)
+                fuzz::Check(!language.empty());
+    }
     return 0;
 }

@@ -5,6 +5,7 @@
 #include <fontconfig/fontconfig.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <chrono>
 #include <cstdio>
@@ -46,6 +47,18 @@ bool FaceOfPattern(FcPattern* pattern, FontFace* face) {
         const std::string identifier = LanguageIdentifier(reinterpret_cast<const char*>(language));
         if (family != face->family && !identifier.empty())
             face->localizedFamilyNames.emplace(identifier, family);
+    }
+    FcLangSet* languages = nullptr;
+    if (FcPatternGetLangSet(pattern, FC_LANG, 0, &languages) == FcResultMatch) {
+        FcStrSet* tags = FcLangSetGetLangs(languages);
+        FcStrList* list = tags ? FcStrListCreate(tags) : nullptr;
+        while (FcChar8* tag = list ? FcStrListNext(list) : nullptr)
+            face->languages.emplace_back(reinterpret_cast<const char*>(tag));
+        if (list)
+            FcStrListDone(list);
+        if (tags)
+            FcStrSetDestroy(tags);
+        std::sort(face->languages.begin(), face->languages.end());
     }
     return true;
 }

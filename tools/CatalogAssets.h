@@ -17,6 +17,8 @@ struct FontFace {
     /// Language identifier (zh-Hans, de, ...) to the family name in that language, for the
     /// languages whose name differs from `family`.
     std::map<std::string, std::string> localizedFamilyNames;
+    /// The fontconfig language tags the face covers (its FC_LANG), sorted.
+    std::vector<std::string> languages;
 };
 
 /// Every face of the font file at `path` (all faces of a collection, in file order; the named

@@ -1,6 +1,5 @@
 #include "tools/CatalogCommand.h"
 
-#include <QStringList>
 #include <filesystem>
 #include <fontconfig/fontconfig.h>
 #include <fstream>
@@ -40,11 +39,11 @@ std::string Escaped(std::string_view text) {
 
 /// The catalog the agent would read: the first search path that exists, else the first one.
 std::string DefaultCatalogPath(bool mustExist) {
-    const QStringList paths = QZDownloadableFontCatalogPaths();
-    for (const QString& path : paths)
-        if (!mustExist || std::filesystem::exists(path.toStdString()))
-            return path.toStdString();
-    return paths.isEmpty() ? std::string() : paths.front().toStdString();
+    const std::vector<std::string> paths = QZDownloadableFontCatalogPaths();
+    for (const std::string& path : paths)
+        if (!mustExist || std::filesystem::exists(path))
+            return path;
+    return paths.empty() ? std::string() : paths.front();
 }
 
 /// Reads a whole catalog file of at most kMaximumCatalogSize bytes; false with a message.
@@ -89,6 +88,8 @@ bool DescribeAsset(const std::string& path, const std::string& urlPrefix, Json* 
             font["family"] = face.family;
         if (!face.localizedFamilyNames.empty())
             font["localizedFamilyNames"] = face.localizedFamilyNames;
+        if (!face.languages.empty())
+            font["languages"] = face.languages;
         fonts.push_back(std::move(font));
     }
     (*asset)["LocalID"] = identifier;

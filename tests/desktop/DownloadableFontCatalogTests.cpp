@@ -232,6 +232,18 @@ TEST(CatalogRead, ReportsEachProblemWithItsPlaceAndReadsMembersAsAJSONObjectDoes
         {"{\"assets\": [{}, {",
          {"1:13 0: no \"LocalID\"", "malformed: [json.exception.parse_error.101]"},
          {}},
+        {"{\"assets\": [" + asset("", "{\"postScriptName\": \"F\", \"languages\": \"ja\"}") +
+             ",\n" +
+             asset("\"LocalID\": \"B\", ",
+                   "{\"postScriptName\": \"F\", \"languages\": [\"ja\", [1]]}") +
+             ",\n" +
+             asset("\"LocalID\": \"C\", ",
+                   "{\"postScriptName\": \"F\", \"languages\": [\"ko\"], \"languages\": [\"ja\", "
+                   "\"zh-cn\"]}, {\"postScriptName\": \"G\"}") +
+             "]}",
+         {"1:13 0: \"languages\" that is not an array of language tags",
+          "2:1 1: \"languages\" that is not an array of language tags"},
+         {"C"}},
     };
     for (const Case& test : cases) {
         SCOPED_TRACE(test.text);
@@ -251,6 +263,11 @@ TEST(CatalogRead, ReportsEachProblemWithItsPlaceAndReadsMembersAsAJSONObjectDoes
     EXPECT_EQ(font.LocalizedFamilyName("de"), "x");
     EXPECT_EQ(font.LocalizedFamilyName("fr"), "y");
     EXPECT_EQ(font.LocalizedFamilyName("it"), "");
+    const auto withLanguages = QZReadDownloadableFontCatalog(cases.back().text, problems);
+    const auto fonts = withLanguages.assets.at(0).fonts;
+    EXPECT_EQ(std::vector<std::string_view>(fonts[0].languages.begin(), fonts[0].languages.end()),
+              (std::vector<std::string_view>{"ja", "zh-cn"}));
+    EXPECT_TRUE(fonts[1].languages.empty());
 }
 
 TEST(CatalogRead, AFileThatCannotBeReadOrIsTooLargeGivesAnEmptyCatalog) {
