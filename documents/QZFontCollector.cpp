@@ -1,0 +1,81 @@
+#include <algorithm>
+#include <array>
+
+#include "documents/QZDocumentReaders.h"
+
+namespace {
+
+bool IsSpace(char c) {
+    return c == ' ' || c == '\t' || c == '\n' || c == '\r' || c == '\f';
+}
+
+std::string_view Trim(std::string_view text) {
+    while (!text.empty() && IsSpace(text.front()))
+        text.remove_prefix(1);
+    while (!text.empty() && IsSpace(text.back()))
+        text.remove_suffix(1);
+    return text;
+}
+
+char Lower(char c) {
+    return c >= 'A' && c <= 'Z' ? char(c - 'A' + 'a') : c;
+}
+
+bool EqualIgnoringCase(std::string_view a, std::string_view b) {
+    return a.size() == b.size() && std::equal(a.begin(), a.end(), b.begin(),
+                                              [](char x, char y) { return Lower(x) == Lower(y); });
+}
+
+} // namespace
+
+bool QZIsGenericFamily(std::string_view name) {
+    static constexpr std::array<std::string_view, 21> kGeneric = {
+        "serif",    "sans-serif",    "monospace",    "cursive",    "fantasy", "system-ui",
+        "ui-serif", "ui-sans-serif", "ui-monospace", "ui-rounded", "math",    "emoji",
+        "fangsong", "inherit",       "initial",      "unset",      "revert",  "revert-layer",
+        "default",  "-apple-system", "none"};
+    return std::any_of(kGeneric.begin(), kGeneric.end(),
+                       [&](std::string_view generic) { return EqualIgnoringCase(name, generic); });
+}
+
+void QZFontCollector::Add(std::string_view name, QZDocumentFontKind kind, std::string_view style,
+                          bool embedded) {
+    name = Trim(name);
+    style = Trim(style);
+    // Names arrive quoted from style attributes and ODF's svg:font-family.
+    if (name.size() >= 2 && (name.front() == '"' || name.front() == '\'') &&
+        name.back() == name.front())
+        name = Trim(name.substr(1, name.size() - 2));
+    if (name.empty() || name.size() > 512 ||
+        (kind == QZDocumentFontKind::Family && QZIsGenericFamily(name)))
+        return;
+    for (QZDocumentFont& font : fonts_) {
+        if (font.kind == kind && EqualIgnoringCase(font.name, name) &&
+            EqualIgnoringCase(font.style, style)) {
+            font.embedded = font.embedded || embedded;
+            return;
+        }
+    }
+    fonts_.push_back({std::string(name), kind, std::string(style), embedded});
+}
+
+void QZFontCollector::AddCommaStyled(std::string_view name, bool embedded) {
+    const size_t comma = name.find(',');
+    if (comma == std::string_view::npos)
+        Add(name, QZDocumentFontKind::PostScript, {}, embedded);
+    else
+        Add(name.substr(0, comma), QZDocumentFontKind::Family, name.substr(comma + 1), embedded);
+}
+
+std::vector<QZDocumentFont> QZFontCollector::Take() {
+    for (const QZDocumentFont& carried : fonts_) {
+        if (!carried.embedded || carried.kind != QZDocumentFontKind::Family ||
+            !carried.style.empty())
+            continue;
+        for (QZDocumentFont& font : fonts_)
+            if (font.kind == QZDocumentFontKind::Family &&
+                EqualIgnoringCase(font.name, carried.name))
+                font.embedded = true;
+    }
+    return std::move(fonts_);
+}
