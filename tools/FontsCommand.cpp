@@ -1,9 +1,18 @@
 #include "tools/FontsCommand.h"
 
+#include <spawn.h>
+#include <sys/wait.h>
+
+#include <QCoreApplication>
+#include <QDBusConnection>
+#include <QDBusMessage>
+#include <QVariantMap>
 #include <map>
 #include <memory>
 #include <nlohmann/json.hpp>
+#include <optional>
 #include <ostream>
+#include <sstream>
 
 #include "desktop/QZDocumentFontMatching.h"
 #include "desktop/QZFontMatching.h"
@@ -13,16 +22,18 @@
 namespace glyphwell::tools {
 
 const char kFontsUsage[] =
-    "  fonts [--json] [--ask] [--app NAME] FILE...\n"
+    "  fonts [--json] [--ask] [--notify] [--app NAME] FILE...\n"
     "                                     the fonts documents name: embedded, installed,\n"
     "                                     offered by the catalog or missing; --ask asks the\n"
-    "                                     agent to download the offered ones\n";
+    "                                     agent to download the offered ones; --notify\n"
+    "                                     also shows the result on the desktop\n";
 
 namespace {
 
 struct Options {
     bool json = false;
     bool ask = false;
+    bool notify = false;
     std::string application = "Glyphwell";
     std::string port; ///< empty: the agent's
     std::vector<std::string> files;
@@ -36,6 +47,8 @@ bool ParseArguments(const std::vector<std::string>& arguments, Options* options,
             options->json = true;
         } else if (argument == "--ask") {
             options->ask = true;
+        } else if (argument == "--notify") {
+            options->notify = true;
         } else if (argument == "--app" || argument == "--name") {
             if (i + 1 == arguments.size()) {
                 err << "glyphwell fonts: " << argument << " needs a value\n";
@@ -142,6 +155,39 @@ void PrintJSON(const std::vector<Report>& reports, std::ostream& out) {
         << "\n";
 }
 
+/// Shows `summary` as a desktop notification; without a notification service, in a short alert
+/// (zenity), else on `err`. For runs from a file manager, which shows no terminal.
+void Notify(const std::string& summary, std::ostream& err) {
+    std::optional<QCoreApplication> application;
+    static int argc = 1;
+    static char name[] = "glyphwell";
+    static char* argv[] = {name, nullptr};
+    if (!QCoreApplication::instance())
+        application.emplace(argc, argv);
+    QDBusMessage call = QDBusMessage::createMethodCall(
+        QStringLiteral("org.freedesktop.Notifications"),
+        QStringLiteral("/org/freedesktop/Notifications"),
+        QStringLiteral("org.freedesktop.Notifications"), QStringLiteral("Notify"));
+    call << QStringLiteral("Glyphwell") << 0u
+         << QStringLiteral("org.glyphwell.Glyphwell.GlyphwellUIAgent")
+         << QStringLiteral("Get Missing Fonts") << QString::fromStdString(summary) << QStringList()
+         << QVariantMap() << -1;
+    const QDBusMessage reply = QDBusConnection::sessionBus().call(call, QDBus::Block, 5000);
+    if (reply.type() == QDBusMessage::ReplyMessage)
+        return;
+    const std::string text = "--text=" + summary;
+    const char* arguments[] = {"zenity",      "--info",     "--title=Get Missing Fonts",
+                               "--no-markup", text.c_str(), nullptr};
+    pid_t child = 0;
+    if (posix_spawnp(&child, "zenity", nullptr, nullptr, const_cast<char* const*>(arguments),
+                     environ) == 0) {
+        int status = 0;
+        if (waitpid(child, &status, 0) == child && WIFEXITED(status) && WEXITSTATUS(status) == 0)
+            return;
+    }
+    err << summary << "\n";
+}
+
 void PrintText(const std::vector<Report>& reports, std::ostream& out) {
     size_t counts[4] = {};
     size_t files = 0;
@@ -201,6 +247,11 @@ int RunFonts(const std::vector<std::string>& arguments, std::istream&, std::ostr
     else
         PrintText(reports, out);
     out.flush();
+    if (options.notify) {
+        std::ostringstream summary;
+        PrintText(reports, summary);
+        Notify(summary.str(), err);
+    }
     if (unreadable)
         return 2;
     for (const Report& report : reports)
