@@ -199,6 +199,14 @@ TEST_F(FontsCommandTest, TextOutputAndExitStatus) {
     EXPECT_EQ(result.status, 1);
     EXPECT_NE(result.out.find("  offered   Lato, Bold (family): Lato-Bold\n"), std::string::npos)
         << result.out;
+    // Offered fonts but no agent to ask: the question fails and the fonts stay offered.
+    const auto asked = Invoke(
+        {"fonts", "--ask", "--name", "org.glyphwell.test.NoSuchAgent", Fixture("sample.ass")});
+    EXPECT_EQ(asked.status, 1);
+    EXPECT_NE(asked.err.find("glyphwell fonts: cannot ask for the offered fonts: "),
+              std::string::npos)
+        << asked.err;
+    EXPECT_NE(asked.out.find("  offered   Lato, Bold"), std::string::npos) << asked.out;
     EXPECT_EQ(Invoke({"fonts"}).status, 2);
     EXPECT_EQ(Invoke({"fonts", "--bogus", Fixture("sample.ass")}).status, 2);
 }
