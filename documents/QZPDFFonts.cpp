@@ -150,8 +150,11 @@ template <class Open> QZDocumentScan ScanPDF(Open open) {
         PDFFontWalker walker(fonts);
         for (const QPDFObjectHandle& page : pdf.getAllPages())
             walker.Page(page);
-        if (pdf.anyWarnings())
-            throw std::runtime_error("damaged PDF");
+        if (pdf.anyWarnings()) {
+            const std::vector<QPDFExc> warnings = pdf.getWarnings();
+            throw std::runtime_error(warnings.empty() ? "unreadable objects"
+                                                      : warnings.front().getMessageDetail());
+        }
     } catch (const QPDFExc& exception) {
         scan.error = exception.getErrorCode() == qpdf_e_password
                          ? "encrypted PDF: a password is needed"

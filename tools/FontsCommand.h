@@ -7,9 +7,9 @@
 
 namespace glyphwell::tools {
 
-/// `fonts [--json] [--ask] [--notify] [--app NAME] [--name PORT] FILE...`: for each file, every font it
-/// names with its state: embedded, installed, offered (with the catalog's PostScript names) or
-/// missing. Text: one line per font and a summary; `--json`: one document for all files.
+/// `fonts [--json] [--ask] [--notify] [--app NAME] [--name PORT] FILE...`: for each file, every
+/// font it names with its state: embedded, installed, offered (with the catalog's PostScript names)
+/// or missing. Text: one line per font and a summary; `--json`: one document for all files.
 /// `--ask` asks the agent (message id 2, as application NAME, default "Glyphwell") to download
 /// every offered font of every file, then reports the states afterwards; `--notify` also shows
 /// the text report as a desktop notification (for runs from a file manager). Exit status 0 when
