@@ -108,7 +108,9 @@ std::vector<const QZMatchableFace*> QZMatchDocumentFont(const QZDocumentFont& fo
 
     matched = QZFontMatchRule::FullName;
     found = Select(faces, [&](const QZMatchableFace& face) {
-        return std::any_of(face.fullNames.begin(), face.fullNames.end(),
+        // A full name that is also the face's family ("Lato") says no more than the family.
+        return !HasFamily(face, family) &&
+               std::any_of(face.fullNames.begin(), face.fullNames.end(),
                            [&](const std::string& full) { return Folded(full) == family; });
     });
     if (!found.empty())
@@ -123,10 +125,17 @@ std::vector<const QZMatchableFace*> QZMatchDocumentFont(const QZDocumentFont& fo
             style = psStyle;
         }
     }
+    matched = QZFontMatchRule::NearestInFamily;
+    // A family without a style stands for every face of it: the document may use any.
+    if (style.empty()) {
+        found = Select(faces, [&](const QZMatchableFace& face) { return HasFamily(face, family); });
+        if (found.empty())
+            matched = QZFontMatchRule::None;
+        return found;
+    }
     int weight;
     bool italic;
     ParseStyle(style, &weight, &italic);
-    matched = QZFontMatchRule::NearestInFamily;
     const QZMatchableFace* nearest = nullptr;
     int nearestDistance = INT_MAX;
     for (const QZMatchableFace& face : faces) {
@@ -146,7 +155,6 @@ std::vector<const QZMatchableFace*> QZMatchDocumentFont(const QZDocumentFont& fo
 
 std::vector<QZMatchableFace> QZInstalledMatchableFaces() {
     std::vector<QZMatchableFace> faces;
-    FcInit();
     FcPattern* pattern = FcPatternCreate();
     FcObjectSet* objects = FcObjectSetBuild(FC_POSTSCRIPT_NAME, FC_FAMILY, FC_STYLE, FC_FULLNAME,
                                             FC_WEIGHT, FC_SLANT, nullptr);

@@ -4,7 +4,8 @@
 //
 // A name matches a face by the first rule that finds one: the exact PostScript name, then the
 // family with the exact style, then the full name, then the family (in any of its localized
-// names, spaces ignored) with the nearest weight and slant. Qt-free.
+// names, spaces ignored) with the nearest weight and slant; a family named without a style
+// matches every face of it. Qt-free.
 #pragma once
 
 #include <string>
@@ -31,8 +32,9 @@ struct QZMatchableFace {
 /// The rule by which a name matched.
 enum class QZFontMatchRule { None, PostScriptName, FamilyAndStyle, FullName, NearestInFamily };
 
-/// The faces of `faces` that `font` names, by the first rule that finds any (one face for the
-/// nearest-in-family rule); `rule` receives that rule. Pointers into `faces`.
+/// The faces of `faces` that `font` names, by the first rule that finds any (by family: the
+/// nearest face to the style given, or every face without one); `rule` receives that rule.
+/// Pointers into `faces`.
 std::vector<const QZMatchableFace*> QZMatchDocumentFont(const QZDocumentFont& font,
                                                         const std::vector<QZMatchableFace>& faces,
                                                         QZFontMatchRule* rule = nullptr);

@@ -6,7 +6,7 @@
 //     w:embed* children, a:latin/a:ea/a:cs/a:sym typeface (themes and runs), the spreadsheet's
 //     font name and rFont, p:embeddedFont;
 //   - ODF: style:font-face svg:font-family (embedded when it holds a font-face-uri),
-//     fo:font-family;
+//     fo:font-family and style:font-family-asian/-complex;
 //   - SVG and XHTML: font-family attributes, style attributes and <style> sheets, font-face.
 // Debian builds expat with DTD support, which declares the amplification limits.
 #define XML_DTD 1
@@ -86,6 +86,8 @@ struct QZXMLFontReader::State {
                     element.fontFace = value;
                 else
                     QZCollectCSSFamilies(value, fonts);
+            } else if (attribute == "font-family-asian" || attribute == "font-family-complex") {
+                QZCollectCSSFamilies(value, fonts); // ODF text properties for other scripts
             } else if (attribute == "style" && !HasNamespace(a[0])) {
                 QZCollectCSSDeclarations(value, fonts);
             } else if (local == "rFonts" && (attribute == "ascii" || attribute == "hAnsi" ||

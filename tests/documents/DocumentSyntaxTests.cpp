@@ -44,9 +44,10 @@ TEST(DocumentSyntax, NamesComeFromWhereEachSyntaxPutsThem) {
          "xmlns:s='urn:oasis:names:tc:opendocument:xmlns:style:1.0' "
          "x:mimetype='application/vnd.oasis.opendocument.spreadsheet'><s:font-face "
          "xmlns:q='urn:oasis:names:tc:opendocument:xmlns:svg-compatible:1.0' "
-         "q:font-family=\"&apos;A B&apos;\"/><s:style x:style='font-family: C'/></x:document>",
+         "q:font-family=\"&apos;A B&apos;\"/><s:style x:style='font-family: C' "
+         "s:font-family-asian='D'/></x:document>",
          "fods",
-         {"A B/family//-"}},
+         {"A B/family//-", "D/family//-"}},
         {"<svg xmlns='http://www.w3.org/2000/svg'><text font-family='Lato'>",
          "svg",
          {},
