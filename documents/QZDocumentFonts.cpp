@@ -69,7 +69,7 @@ template <class Read> QZDocumentScan ScanXML(Read read) {
         scan.error = "an XML document in no format glyphwell reads (root element " + root + ")";
     }
     if (scan.error.empty())
-        scan.fonts = fonts.Take();
+        fonts.TakeInto(scan);
     return scan;
 }
 
@@ -82,7 +82,7 @@ QZDocumentScan ScanText(Syntax syntax, std::string_view text) {
         scan.format = "html";
         QZCollectHTMLFonts(text, fonts);
     }
-    scan.fonts = fonts.Take();
+    fonts.TakeInto(scan);
     return scan;
 }
 

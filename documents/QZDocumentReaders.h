@@ -6,24 +6,32 @@
 #include <memory>
 #include <string>
 #include <string_view>
+#include <unordered_map>
 #include <vector>
 
 #include "documents/QZDocumentFonts.h"
 
 /// Gathers the fonts of one document: trims names, drops CSS generic families and empty names,
 /// keeps each (name, kind, style) once in order of first mention, and marks a font embedded when
-/// any mention says so (a family carried without a style covers every style of it).
+/// any mention says so (a family carried without a style covers every style of it). Keeps at
+/// most kQZDocumentFontLimit fonts; a document that names more is refused.
 class QZFontCollector {
 public:
+    static constexpr size_t kQZDocumentFontLimit = 4096;
+
     void Add(std::string_view name, QZDocumentFontKind kind, std::string_view style = {},
              bool embedded = false);
     /// Adds a family named in a document's own syntax: `Name,Bold` gives family and style.
     void AddCommaStyled(std::string_view name, bool embedded);
     /// The fonts gathered, in order, with embedded families applied.
     std::vector<QZDocumentFont> Take();
+    /// Moves the fonts into `scan`, or sets its error when the document named too many.
+    void TakeInto(QZDocumentScan& scan);
 
 private:
     std::vector<QZDocumentFont> fonts_;
+    std::unordered_map<std::string, size_t> index_; ///< folded (name, kind, style) to position
+    bool overflowed_ = false;
 };
 
 /// Whether `name` is a CSS generic family or keyword (serif, monospace, inherit, ...).

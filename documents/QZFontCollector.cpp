@@ -1,5 +1,7 @@
 #include <algorithm>
 #include <array>
+#include <string>
+#include <unordered_set>
 
 #include "documents/QZDocumentReaders.h"
 
@@ -26,6 +28,20 @@ bool EqualIgnoringCase(std::string_view a, std::string_view b) {
                                               [](char x, char y) { return Lower(x) == Lower(y); });
 }
 
+/// The key under which a font is kept once: case folded, kind and style apart.
+std::string Key(std::string_view name, QZDocumentFontKind kind, std::string_view style) {
+    std::string key;
+    key.reserve(name.size() + style.size() + 3);
+    for (char c : name)
+        key += Lower(c);
+    key += '\x1f';
+    key += char('0' + int(kind));
+    key += '\x1f';
+    for (char c : style)
+        key += Lower(c);
+    return key;
+}
+
 } // namespace
 
 bool QZIsGenericFamily(std::string_view name) {
@@ -49,12 +65,15 @@ void QZFontCollector::Add(std::string_view name, QZDocumentFontKind kind, std::s
     if (name.empty() || name.size() > 512 ||
         (kind == QZDocumentFontKind::Family && QZIsGenericFamily(name)))
         return;
-    for (QZDocumentFont& font : fonts_) {
-        if (font.kind == kind && EqualIgnoringCase(font.name, name) &&
-            EqualIgnoringCase(font.style, style)) {
-            font.embedded = font.embedded || embedded;
-            return;
-        }
+    const auto [found, added] = index_.emplace(Key(name, kind, style), fonts_.size());
+    if (!added) {
+        fonts_[found->second].embedded = fonts_[found->second].embedded || embedded;
+        return;
+    }
+    if (fonts_.size() == kQZDocumentFontLimit) {
+        index_.erase(found);
+        overflowed_ = true;
+        return;
     }
     fonts_.push_back({std::string(name), kind, std::string(style), embedded});
 }
@@ -68,14 +87,20 @@ void QZFontCollector::AddCommaStyled(std::string_view name, bool embedded) {
 }
 
 std::vector<QZDocumentFont> QZFontCollector::Take() {
-    for (const QZDocumentFont& carried : fonts_) {
-        if (!carried.embedded || carried.kind != QZDocumentFontKind::Family ||
-            !carried.style.empty())
-            continue;
-        for (QZDocumentFont& font : fonts_)
-            if (font.kind == QZDocumentFontKind::Family &&
-                EqualIgnoringCase(font.name, carried.name))
-                font.embedded = true;
-    }
+    std::unordered_set<std::string> carried;
+    for (const QZDocumentFont& font : fonts_)
+        if (font.embedded && font.kind == QZDocumentFontKind::Family && font.style.empty())
+            carried.insert(Key(font.name, font.kind, {}));
+    for (QZDocumentFont& font : fonts_)
+        if (font.kind == QZDocumentFontKind::Family && carried.count(Key(font.name, font.kind, {})))
+            font.embedded = true;
+    index_.clear();
     return std::move(fonts_);
+}
+
+void QZFontCollector::TakeInto(QZDocumentScan& scan) {
+    if (overflowed_)
+        scan.error = "names more than " + std::to_string(kQZDocumentFontLimit) + " fonts";
+    else
+        scan.fonts = Take();
 }

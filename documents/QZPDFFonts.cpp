@@ -170,7 +170,7 @@ template <class Open> QZDocumentScan ScanPDF(Open open) {
         scan.error = std::string("damaged PDF: ") + exception.what();
         return scan;
     }
-    scan.fonts = fonts.Take();
+    fonts.TakeInto(scan);
     return scan;
 }
 

@@ -59,7 +59,7 @@ public:
                 return scan;
             }
         }
-        scan.fonts = fonts.Take();
+        fonts.TakeInto(scan);
         return scan;
     }
 

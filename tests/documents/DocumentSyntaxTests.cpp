@@ -72,4 +72,16 @@ TEST(DocumentSyntax, NamesComeFromWhereEachSyntaxPutsThem) {
     }
 }
 
+// A document that names more fonts than any real one is refused rather than listed in part.
+TEST(DocumentSyntax, TooManyFontsIsAnError) {
+    std::string html = "<html><p style=\"font-family: F0";
+    for (int i = 1; i <= 4096; ++i)
+        html += ", F" + std::to_string(i) + ", f" + std::to_string(i);
+    const QZDocumentScan scan = QZScanDocumentBytes(html);
+    EXPECT_EQ(scan.error, "names more than 4096 fonts");
+    EXPECT_TRUE(scan.fonts.empty());
+    html.resize(html.find(", F4096"));
+    EXPECT_EQ(QZScanDocumentBytes(html).fonts.size(), 4096u);
+}
+
 } // namespace
