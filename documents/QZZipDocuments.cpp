@@ -43,7 +43,7 @@ public:
     QZDocumentScan Scan() {
         QZDocumentScan scan;
         const zip_int64_t count = zip_get_num_entries(archive_, 0);
-        scan.format = Format(count);
+        scan.format = Format();
         if (scan.format.empty()) {
             scan.error = error_.empty() ? "a ZIP archive in no format glyphwell reads" : error_;
             return scan;
@@ -65,7 +65,7 @@ public:
 
 private:
     /// The format the members show; empty (and maybe an error) when none.
-    std::string Format(zip_int64_t count) {
+    std::string Format() {
         const zip_int64_t mimetype = zip_name_locate(archive_, "mimetype", 0);
         if (mimetype >= 0) {
             std::string type;
@@ -93,7 +93,6 @@ private:
         for (const auto& [part, format] : kMainParts)
             if (zip_name_locate(archive_, part, 0) >= 0)
                 return format;
-        (void)count;
         return {};
     }
 

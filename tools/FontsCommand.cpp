@@ -18,6 +18,7 @@
 #include "desktop/QZFontMatching.h"
 #include "documents/QZDocumentFonts.h"
 #include "glyphwell/client.h"
+#include "platform/LogEscape.h"
 
 namespace glyphwell::tools {
 
@@ -195,7 +196,7 @@ void PrintText(const std::vector<Report>& reports, std::ostream& out) {
         if (!report.scan.error.empty())
             continue;
         ++files;
-        out << report.file << " (" << report.scan.format << ")\n";
+        out << glyphwell::LogEscape(report.file) << " (" << report.scan.format << ")\n";
         if (report.scan.fonts.empty())
             out << "  no fonts named\n";
         for (size_t i = 0; i < report.scan.fonts.size(); ++i) {
@@ -204,12 +205,13 @@ void PrintText(const std::vector<Report>& reports, std::ostream& out) {
             ++counts[size_t(match.state)];
             std::string state = QZDocumentFontStateName(match.state);
             state.resize(10, ' ');
-            out << "  " << state << font.name;
+            // Names come from the document: no control character reaches the terminal.
+            out << "  " << state << glyphwell::LogEscape(font.name);
             if (!font.style.empty())
-                out << ", " << font.style;
+                out << ", " << glyphwell::LogEscape(font.style);
             out << " (" << QZDocumentFontKindName(font.kind) << ")";
             for (size_t n = 0; n < match.postScriptNames.size(); ++n)
-                out << (n ? ", " : ": ") << match.postScriptNames[n];
+                out << (n ? ", " : ": ") << glyphwell::LogEscape(match.postScriptNames[n]);
             out << "\n";
         }
     }
@@ -231,7 +233,8 @@ int RunFonts(const std::vector<std::string>& arguments, std::istream&, std::ostr
     for (const std::string& file : options.files) {
         Report report{file, QZScanDocumentFile(file), {}};
         if (!report.scan.error.empty()) {
-            err << "glyphwell fonts: " << file << ": " << report.scan.error << "\n";
+            err << "glyphwell fonts: " << glyphwell::LogEscape(file) << ": "
+                << glyphwell::LogEscape(report.scan.error) << "\n";
             unreadable = true;
         }
         reports.push_back(std::move(report));

@@ -33,6 +33,10 @@ std::string Contents(const std::string& path) {
     return std::string(std::istreambuf_iterator<char>(file), std::istreambuf_iterator<char>());
 }
 
+void Write(const std::string& path, const std::string& bytes) {
+    std::ofstream(path, std::ios::binary) << bytes;
+}
+
 class FontsCommandTest : public ::testing::Test {
 protected:
     void SetUp() override {
@@ -207,6 +211,11 @@ TEST_F(FontsCommandTest, TextOutputAndExitStatus) {
               std::string::npos)
         << asked.err;
     EXPECT_NE(asked.out.find("  offered   Lato, Bold"), std::string::npos) << asked.out;
+    // A name with a terminal escape sequence is printed escaped.
+    const std::string subtitles = root_.path().toStdString() + "/escape.ass";
+    Write(subtitles, "[Script Info]\n[V4+ Styles]\nStyle: A,Red\x1b[31mName,20\n");
+    EXPECT_NE(Invoke({"fonts", subtitles}).out.find("  missing   Red\\x1b[31mName (family)\n"),
+              std::string::npos);
     EXPECT_EQ(Invoke({"fonts"}).status, 2);
     EXPECT_EQ(Invoke({"fonts", "--bogus", Fixture("sample.ass")}).status, 2);
 }
@@ -247,10 +256,6 @@ void MakeZip(const std::string& path,
         ASSERT_EQ(set, 0);
     }
     ASSERT_EQ(zip_close(archive), 0);
-}
-
-void Write(const std::string& path, const std::string& bytes) {
-    std::ofstream(path, std::ios::binary) << bytes;
 }
 
 TEST_F(FontsCommandTest, UnreadableFilesAreNamedAndTheOthersStillReported) {
