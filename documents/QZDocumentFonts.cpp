@@ -127,12 +127,18 @@ QZDocumentScan QZScanDocumentBytes(std::string_view bytes) {
         return QZScanPDFBytes(bytes);
     case Syntax::Zip:
         return QZScanZipBytes(bytes);
-    case Syntax::XML:
-        return ScanXML([&, done = false](std::string_view* piece, std::string*) mutable {
-            *piece = done ? std::string_view() : bytes;
-            done = true;
-            return true;
-        });
+    case Syntax::XML: {
+        QZDocumentScan scan =
+            ScanXML([&, done = false](std::string_view* piece, std::string*) mutable {
+                *piece = done ? std::string_view() : bytes;
+                done = true;
+                return true;
+            });
+        // XHTML that is not well-formed XML (an undeclared &nbsp;, say) is still HTML.
+        if (scan.error.empty() || scan.format != "html" || bytes.size() > kQZDocumentTextLimit)
+            return scan;
+        return ScanText(Syntax::HTML, bytes);
+    }
     case Syntax::Subtitles:
     case Syntax::HTML:
         if (bytes.size() > kQZDocumentTextLimit)
@@ -179,6 +185,7 @@ QZDocumentScan QZScanDocumentFile(const std::string& path) {
     if (syntax == Syntax::Zip)
         return QZScanZipDescriptor(descriptor); // takes the descriptor
     QZDocumentScan scan;
+    Syntax text = syntax;
     if (syntax == Syntax::PDF) {
         FILE* file = fdopen(descriptor, "rb");
         if (!file) {
@@ -202,16 +209,23 @@ QZDocumentScan QZScanDocumentFile(const std::string& path) {
             *piece = std::string_view(buffer.data(), length);
             return true;
         });
-    } else if (syntax == Syntax::Unknown) {
+        // XHTML that is not well-formed XML (an undeclared &nbsp;, say) is read again as HTML.
+        if (scan.error.empty() || scan.format != "html") {
+            close(descriptor);
+            return scan;
+        }
+        text = Syntax::HTML;
+    }
+    if (syntax == Syntax::Unknown) {
         scan = Failure("not a document format glyphwell reads");
     } else if (uint64_t(status.st_size) > kQZDocumentTextLimit) {
         scan = Failure("a text document larger than 64 MiB");
     } else {
-        std::string text(size_t(status.st_size), '\0');
-        if (!ReadAt(descriptor, text.data(), text.size(), 0, &got))
+        std::string contents(size_t(status.st_size), '\0');
+        if (!ReadAt(descriptor, contents.data(), contents.size(), 0, &got))
             scan = Failure(std::strerror(errno));
         else
-            scan = ScanText(syntax, std::string_view(text.data(), got));
+            scan = ScanText(text, std::string_view(contents.data(), got));
     }
     close(descriptor);
     return scan;
