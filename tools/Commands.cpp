@@ -10,6 +10,7 @@
 #include "tools/SendCommand.h"
 #ifdef GLYPHWELL_CATALOG_TOOL
 #include "tools/CatalogCommand.h"
+#include "tools/FontsCommand.h"
 #endif
 #include "tools/TaggedJSON.h"
 #include "tools/ToolInput.h"
@@ -29,11 +30,13 @@ const char kCodecUsage[] =
     "                                     charset, array, dictionary, set, url, uuid, error\n";
 #ifdef GLYPHWELL_CATALOG_TOOL
 const char* const kCatalogVerbUsage = kCatalogUsage;
+const char* const kFontsVerbUsage = kFontsUsage;
 #else
 const char* const kCatalogVerbUsage = "";
+const char* const kFontsVerbUsage = "";
 #endif
 const std::string kUsage = std::string(kCodecUsage) + kSendUsage + kCatalogVerbUsage +
-                           "  help                               this text\n";
+                           kFontsVerbUsage + "  help                               this text\n";
 
 /// The bytes as hexadecimal pairs separated by spaces, with a final newline.
 std::string HexDump(const std::string& bytes) {
@@ -162,6 +165,20 @@ int RunCatalogVerb(const std::vector<std::string>& arguments, std::istream&, std
 #endif
 }
 
+/// `fonts ...`, when the tool was built with the agent's desktop library.
+int RunFontsVerb(const std::vector<std::string>& arguments, std::istream& in, std::ostream& out,
+                 std::ostream& err) {
+#ifdef GLYPHWELL_CATALOG_TOOL
+    return RunFonts(arguments, in, out, err);
+#else
+    (void)arguments;
+    (void)in;
+    (void)out;
+    err << "glyphwell fonts: this glyphwell was built without the agent's desktop library\n";
+    return 2;
+#endif
+}
+
 } // namespace
 
 int RunEncode(const std::vector<std::string>& arguments, std::istream& in, std::ostream& out,
@@ -227,6 +244,7 @@ int RunTool(const std::vector<std::string>& arguments, std::istream& in, std::os
         {"ask-activation", RunAskActivation},
         {"ask-download", RunAskDownload},
         {"catalog", RunCatalogVerb},
+        {"fonts", RunFontsVerb},
     };
     if (arguments.empty()) {
         err << kUsage;

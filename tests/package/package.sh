@@ -70,6 +70,7 @@ for file in usr/libexec/GlyphwellUIAgent usr/bin/glyphwell; do
 done
 for file in usr/lib/systemd/user/$unit usr/lib/systemd/user/glyphwell-ui-agent.service \
     usr/share/applications/$app_id.desktop usr/share/icons/hicolor/scalable/apps/$app_id.svg \
+    usr/share/applications/org.glyphwell.Glyphwell.GetMissingFonts.desktop \
     usr/share/man/man1/glyphwell.1.gz usr/share/man/man8/GlyphwellUIAgent.8.gz \
     usr/share/doc/glyphwell/copyright \
     usr/share/doc/glyphwell/changelog.Debian.gz usr/share/doc/glyphwell/help/index.html; do
@@ -103,6 +104,10 @@ desktop-file-validate "$desktop" || fail "desktop-file-validate rejects the desk
 for line in Name=Glyphwell NoDisplay=true Icon=$app_id; do
     grep -qx "$line" "$desktop" || fail "the desktop entry lacks $line"
 done
+missing_fonts="$root/usr/share/applications/org.glyphwell.Glyphwell.GetMissingFonts.desktop"
+desktop-file-validate "$missing_fonts" || fail "desktop-file-validate rejects Get Missing Fonts"
+grep -qx "Exec=/usr/bin/glyphwell fonts --ask --notify %F" "$missing_fonts" ||
+    fail "Get Missing Fonts does not run /usr/bin/glyphwell fonts"
 # systemd-analyze verify checks that ExecStart and the Documentation page exist: a copy of the
 # service names the extracted agent, and the manual pages are looked up in the extracted root.
 mkdir -p "$tmp/units" "$tmp/runtime" && chmod 700 "$tmp/runtime"
