@@ -573,7 +573,7 @@ void CatalogReader::EndAsset() {
         identifiers_.insert(asset_.localID);
         fontRanges_.emplace_back(storage_->fonts.size(), fonts_.size());
         for (const FontRecord& font : fonts_) {
-            storage_->fonts.push_back({font.postScriptNameText, font.familyText, {}});
+            storage_->fonts.push_back({font.postScriptNameText, font.familyText, {}, {}});
             nameRanges_.emplace_back(font.namesBegin, font.namesCount);
         }
         assets_.push_back(asset_);

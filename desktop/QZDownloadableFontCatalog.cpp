@@ -1,11 +1,10 @@
 #include "desktop/QZDownloadableFontCatalog.h"
 
-#include <QDateTime>
-#include <QFileInfo>
 #include <QStandardPaths>
 #include <mutex>
 
 #include "cfutil/TCFRetained.h"
+#include "desktop/QZCatalogSources.h"
 #include "desktop/QZQtStrings.h"
 #include "platform/CFDictionary.h"
 #include "platform/CFNumber.h"
@@ -16,35 +15,14 @@
 namespace {
 
 constexpr char kCatalogRelativePath[] = "glyphwell/downloadable-fonts.json";
-/// The state of the catalog file that the cached catalog was read from.
-struct FileState {
-    QString path; ///< empty: no catalog file
-    qint64 size = -1;
-    qint64 modified = 0; ///< milliseconds since the epoch
-    bool operator==(const FileState&) const = default;
-};
-
 struct CatalogCache {
     std::mutex mutex;
-    bool loaded = false;
-    FileState state;
-    std::shared_ptr<const QZDownloadableFontCatalog> catalog =
-        std::make_shared<QZDownloadableFontCatalog>();
     QZInstalledFontCheck installedCheck;
 };
 
 CatalogCache& Cache() {
     static CatalogCache cache;
     return cache;
-}
-
-FileState CurrentFileState() {
-    for (const QString& path : QZDownloadableFontCatalogPaths()) {
-        const QFileInfo info(path);
-        if (info.exists())
-            return {path, info.size(), info.lastModified().toMSecsSinceEpoch()};
-    }
-    return {};
 }
 
 /// Logs the problems of the catalog `origin` as the agent reports them: an unreadable or
@@ -64,22 +42,6 @@ void LogProblems(const std::vector<QZCatalogProblem>& problems, const std::strin
         glyphwell::AppLog("Skipping asset %zu of the downloadable font catalog %s: %s",
                           problem.asset, place.c_str(),
                           glyphwell::LogEscape(problem.message).c_str());
-}
-
-QZDownloadableFontCatalog LoadCatalog(const FileState& state) {
-    if (state.path.isEmpty()) {
-        glyphwell::AppLog(
-            "No downloadable font catalog: none of %s exists",
-            glyphwell::LogEscape(
-                QZDownloadableFontCatalogPaths().join(QStringLiteral(", ")).toStdString())
-                .c_str());
-        return {};
-    }
-    std::vector<QZCatalogProblem> problems;
-    const std::string path = state.path.toStdString();
-    QZDownloadableFontCatalog catalog = QZReadDownloadableFontCatalogFile(path, problems);
-    LogProblems(problems, path);
-    return catalog;
 }
 
 CFStringRef CreateString(std::string_view utf8) {
@@ -143,15 +105,9 @@ QStringList QZDownloadableFontCatalogPaths() {
 }
 
 std::shared_ptr<const QZDownloadableFontCatalog> QZCurrentDownloadableFontCatalog() {
-    CatalogCache& cache = Cache();
-    const FileState state = CurrentFileState();
-    std::lock_guard<std::mutex> lock(cache.mutex);
-    if (!cache.loaded || !(cache.state == state)) {
-        cache.catalog = std::make_shared<const QZDownloadableFontCatalog>(LoadCatalog(state));
-        cache.state = state;
-        cache.loaded = true;
-    }
-    return cache.catalog;
+    // The merged view of every source; the catalog shares its owner.
+    const auto merged = QZCurrentMergedDownloadableFontCatalog();
+    return std::shared_ptr<const QZDownloadableFontCatalog>(merged, &merged->catalog);
 }
 
 void QZSetInstalledFontCheck(QZInstalledFontCheck check) {

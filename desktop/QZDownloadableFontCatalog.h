@@ -1,11 +1,12 @@
 // The downloadable fonts: which font assets can be fetched for a requested font, and how large
-// they are. The list comes from a JSON catalog, glyphwell/downloadable-fonts.json, found under the
-// XDG data directories (the user's own first, then each of XDG_DATA_DIRS); the first one that
-// exists is the catalog. Its format is documented in resources/catalog/README.md.
+// they are. The list comes from JSON catalogs: the user's own
+// ($XDG_DATA_HOME/glyphwell/downloadable-fonts.json), the publishers' verified ones, and those of
+// XDG_DATA_DIRS, merged as QZCatalogSources.h describes. The format is documented in
+// resources/catalog/README.md.
 //
-// The catalog is read again whenever its file changes (path, size or modification time); a
-// catalog that cannot be read or parsed counts as empty and is logged once for that state of the
-// file, and an asset that does not have the expected shape is left out with one log line.
+// Each catalog is read again whenever its files change; a catalog that cannot be read or parsed
+// counts as empty and is logged once for that state of the file, and an asset that does not have
+// the expected shape is left out with one log line.
 // Thread-safe.
 #pragma once
 
@@ -33,6 +34,9 @@ struct QZDownloadableFont {
     std::string_view family; ///< may be empty
     /// Language identifier to family name in that language: sorted by language, each once.
     std::span<const QZLocalizedName> localizedFamilyNames;
+    /// The fontconfig language tags the font covers (`ja`, `zh-cn`, `und-zsye`), from the
+    /// catalog's optional "languages" array; empty when the catalog gives none.
+    std::span<const std::string_view> languages;
 
     /// The family name in `language`; empty when the catalog gives none.
     std::string_view LocalizedFamilyName(std::string_view language) const;

@@ -1,0 +1,246 @@
+// The merged catalog view: which sources exist, loading one (verified for a publisher), merging
+// them, and the cache that keeps each source's catalog until its files change.
+#include "desktop/QZCatalogSources.h"
+
+#include <cerrno>
+#include <cstring>
+#include <ctime>
+#include <fcntl.h>
+#include <map>
+#include <mutex>
+#include <sys/stat.h>
+#include <unistd.h>
+#include <unordered_set>
+
+#include "desktop/QZCatalogPaths.h"
+#include "desktop/QZCatalogPublishers.h"
+#include "platform/Log.h"
+#include "platform/LogEscape.h"
+
+namespace {
+
+/// What identifies one state of a file: a change of any member means new contents.
+struct FileStamp {
+    bool exists = false;
+    dev_t device = 0;
+    ino_t inode = 0;
+    off_t size = 0;
+    int64_t modified = 0; ///< nanoseconds
+    bool operator==(const FileStamp&) const = default;
+};
+
+FileStamp StampOf(const std::string& path) {
+    struct stat status {};
+    if (path.empty() || stat(path.c_str(), &status) != 0)
+        return {};
+    return {true, status.st_dev, status.st_ino, status.st_size,
+            int64_t(status.st_mtim.tv_sec) * 1000000000 + status.st_mtim.tv_nsec};
+}
+
+/// The state of a source's files and key.
+struct SourceStamp {
+    FileStamp catalog;
+    FileStamp signature;
+    std::array<unsigned char, 32> key{};
+    bool operator==(const SourceStamp&) const = default;
+};
+
+SourceStamp StampOf(const QZCatalogSource& source) {
+    return {StampOf(source.path), StampOf(source.signaturePath), source.publicKey.key};
+}
+
+/// Reads the whole file at `path` (at most `limit` bytes); false with the reason otherwise.
+bool ReadWhole(const std::string& path, size_t limit, std::string* bytes, std::string* problem) {
+    const int fd = open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY);
+    struct stat status {};
+    if (fd < 0 || fstat(fd, &status) != 0 || !S_ISREG(status.st_mode) ||
+        uint64_t(status.st_size) > limit) {
+        *problem =
+            fd < 0 ? std::strerror(errno)
+                   : (S_ISREG(status.st_mode) ? "larger than " + std::to_string(limit) + " bytes"
+                                              : "not a regular file");
+        if (fd >= 0)
+            close(fd);
+        return false;
+    }
+    bytes->resize(size_t(status.st_size));
+    size_t done = 0;
+    while (done < bytes->size()) {
+        const ssize_t count = read(fd, bytes->data() + done, bytes->size() - done);
+        if (count < 0 && errno == EINTR)
+            continue;
+        if (count <= 0)
+            break;
+        done += size_t(count);
+    }
+    close(fd);
+    bytes->resize(done);
+    return true;
+}
+
+struct CachedSource {
+    SourceStamp stamp;
+    std::shared_ptr<const QZDownloadableFontCatalog> catalog;
+};
+
+struct SourcesCache {
+    std::mutex mutex;
+    std::map<std::string, CachedSource> sources; ///< by catalog path
+    std::vector<SourceStamp> stamps;             ///< of the merged view's sources
+    std::vector<std::string> paths;
+    std::shared_ptr<const QZMergedDownloadableFontCatalog> merged;
+    std::map<std::string, int64_t> expiredLogged; ///< publisher to the expiry logged
+    bool noneLogged = false;
+};
+
+SourcesCache& Cache() {
+    static SourcesCache cache;
+    return cache;
+}
+
+/// What a merged catalog's views point into.
+struct MergedStorage {
+    std::vector<std::shared_ptr<const void>> sources;
+    std::vector<std::vector<QZDownloadableFont>> fonts; ///< of assets that lost some fonts
+};
+
+} // namespace
+
+std::vector<QZCatalogSource> QZCurrentCatalogSources(int64_t now) {
+    std::vector<QZCatalogSource> sources;
+    const std::string user = QZUserCatalogPath();
+    if (StampOf(user).exists)
+        sources.push_back({QZCatalogSource::Kind::User, "user", user, {}, {}});
+    for (const QZCatalogPublisher& publisher :
+         QZReadCatalogPublishers(QZCatalogPublisherDirectories())) {
+        const std::string directory = QZPublisherCacheDirectory(publisher.name);
+        const QZPublisherState state = QZReadPublisherState(directory);
+        if (!state.present)
+            continue;
+        if (state.expires && *state.expires <= now) {
+            std::lock_guard<std::mutex> lock(Cache().mutex);
+            int64_t& logged = Cache().expiredLogged[publisher.name];
+            if (logged != *state.expires)
+                glyphwell::AppLog(
+                    "Not offering the catalog of the publisher %s: it expired at %lld",
+                    glyphwell::LogEscape(publisher.name).c_str(),
+                    static_cast<long long>(*state.expires));
+            logged = *state.expires;
+            continue;
+        }
+        sources.push_back({QZCatalogSource::Kind::Publisher, "publisher/" + publisher.name,
+                           directory + "/catalog.json", directory + "/catalog.json.minisig",
+                           publisher.publicKey});
+    }
+    for (const std::string& path : QZSystemCatalogPaths())
+        if (StampOf(path).exists)
+            sources.push_back({QZCatalogSource::Kind::System, path, path, {}, {}});
+    return sources;
+}
+
+QZDownloadableFontCatalog QZLoadCatalogSource(const QZCatalogSource& source) {
+    std::string bytes, problem;
+    if (!ReadWhole(source.path, kMaximumPublishedCatalogSize, &bytes, &problem)) {
+        glyphwell::AppLog("Cannot read the downloadable font catalog %s: %s",
+                          glyphwell::LogEscape(source.path).c_str(),
+                          glyphwell::LogEscape(problem).c_str());
+        return {};
+    }
+    if (source.kind == QZCatalogSource::Kind::Publisher) {
+        std::string signature;
+        QZCatalogSignatureCheck check;
+        if (ReadWhole(source.signaturePath, kMaximumCatalogSignatureSize, &signature, &problem)) {
+            check = QZVerifyCatalogSignature(bytes, signature, source.publicKey);
+            problem = check.problem;
+        }
+        if (!check.valid) {
+            glyphwell::AppLog("Not offering the catalog of %s: %s",
+                              glyphwell::LogEscape(source.label).c_str(),
+                              glyphwell::LogEscape(problem).c_str());
+            return {};
+        }
+    }
+    return QZDownloadableFontCatalog::Parse(bytes, source.path);
+}
+
+QZMergedDownloadableFontCatalog
+QZMergeDownloadableFontCatalogs(std::vector<QZCatalogSource> sources,
+                                const std::vector<QZDownloadableFontCatalog>& catalogs) {
+    QZMergedDownloadableFontCatalog merged;
+    merged.sources = std::move(sources);
+    auto storage = std::make_shared<MergedStorage>();
+    size_t nonEmpty = 0;
+    for (const QZDownloadableFontCatalog& catalog : catalogs)
+        nonEmpty += catalog.assets.empty() ? 0 : 1;
+    // Names offered by the earlier sources; with one source nothing needs comparing.
+    std::unordered_set<std::string_view> offered, offeredHere;
+    for (size_t index = 0; index < catalogs.size(); ++index) {
+        const QZDownloadableFontCatalog& catalog = catalogs[index];
+        if (catalog.assets.empty())
+            continue;
+        storage->sources.push_back(catalog.storage);
+        for (const QZDownloadableFontAsset& asset : catalog.assets) {
+            QZDownloadableFontAsset kept = asset;
+            if (nonEmpty > 1) {
+                std::vector<QZDownloadableFont> fonts;
+                for (const QZDownloadableFont& font : asset.fonts) {
+                    offeredHere.insert(font.postScriptName);
+                    if (!offered.count(font.postScriptName))
+                        fonts.push_back(font);
+                }
+                if (fonts.empty())
+                    continue;
+                if (fonts.size() != asset.fonts.size()) {
+                    kept.fonts = storage->fonts.emplace_back(std::move(fonts));
+                }
+            }
+            merged.catalog.assets.push_back(kept);
+            merged.assetSources.push_back(index);
+        }
+        offered.merge(offeredHere);
+        offeredHere.clear();
+    }
+    merged.catalog.storage = std::move(storage);
+    return merged;
+}
+
+std::shared_ptr<const QZMergedDownloadableFontCatalog> QZCurrentMergedDownloadableFontCatalog() {
+    std::vector<QZCatalogSource> sources = QZCurrentCatalogSources(int64_t(std::time(nullptr)));
+    std::vector<SourceStamp> stamps;
+    std::vector<std::string> paths;
+    for (const QZCatalogSource& source : sources) {
+        stamps.push_back(StampOf(source));
+        paths.push_back(source.path);
+    }
+    SourcesCache& cache = Cache();
+    std::lock_guard<std::mutex> lock(cache.mutex);
+    if (cache.merged && cache.stamps == stamps && cache.paths == paths)
+        return cache.merged;
+    if (sources.empty() && !cache.noneLogged) {
+        std::string searched = QZUserCatalogPath();
+        for (const std::string& path : QZSystemCatalogPaths())
+            searched += ", " + path;
+        glyphwell::AppLog("No downloadable font catalog: none of %s exists",
+                          glyphwell::LogEscape(searched).c_str());
+    }
+    cache.noneLogged = sources.empty();
+    std::vector<QZDownloadableFontCatalog> catalogs;
+    std::map<std::string, CachedSource> kept;
+    for (size_t i = 0; i < sources.size(); ++i) {
+        CachedSource& cached = cache.sources[sources[i].path];
+        if (!cached.catalog || !(cached.stamp == stamps[i])) {
+            cached.catalog =
+                std::make_shared<const QZDownloadableFontCatalog>(QZLoadCatalogSource(sources[i]));
+            cached.stamp = stamps[i];
+        }
+        catalogs.push_back(*cached.catalog);
+        kept[sources[i].path] = cached;
+    }
+    // Sources that are gone are forgotten, so that they are read again when they come back.
+    cache.sources = std::move(kept);
+    cache.merged = std::make_shared<const QZMergedDownloadableFontCatalog>(
+        QZMergeDownloadableFontCatalogs(std::move(sources), catalogs));
+    cache.stamps = std::move(stamps);
+    cache.paths = std::move(paths);
+    return cache.merged;
+}

@@ -1,0 +1,54 @@
+// The catalogs the agent offers, merged into one view: the user's own catalog first (unsigned:
+// the user wrote it), then each publisher's kept catalog in NAME order (verified with the
+// publisher's key, and only while it has not expired), then the system catalogs of
+// XDG_DATA_DIRS. A PostScript name offered by several catalogs goes to the first; the assets of
+// later ones keep their other fonts. No Qt.
+//
+// Each source is read again only when its files change; a source that cannot be read, verified
+// or parsed offers nothing, with one log line for that state of its files.
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "desktop/QZCatalogSignature.h"
+#include "desktop/QZDownloadableFontCatalog.h"
+
+/// One catalog that takes part in the merge.
+struct QZCatalogSource {
+    enum class Kind { User, Publisher, System };
+    Kind kind = Kind::User;
+    /// How `glyphwell catalog list` names it: "user", "publisher/NAME", or the system file.
+    std::string label;
+    std::string path; ///< the catalog file
+    /// For a publisher: the kept signature and the key that must have made it.
+    std::string signaturePath;
+    QZMinisignPublicKey publicKey;
+};
+
+/// The catalog sources that exist at the time `now` (Unix seconds), in merge order. A publisher
+/// whose kept catalog has expired is left out, with one log line for that state.
+std::vector<QZCatalogSource> QZCurrentCatalogSources(int64_t now);
+
+/// The merged view and where each asset came from.
+struct QZMergedDownloadableFontCatalog {
+    QZDownloadableFontCatalog catalog;
+    std::vector<QZCatalogSource> sources;
+    std::vector<size_t> assetSources; ///< per asset of `catalog`, its index in `sources`
+};
+
+/// Merges `catalogs` (one per source, in merge order): each font goes to the first catalog that
+/// offers its PostScript name; an asset left without fonts is left out.
+QZMergedDownloadableFontCatalog
+QZMergeDownloadableFontCatalogs(std::vector<QZCatalogSource> sources,
+                                const std::vector<QZDownloadableFontCatalog>& catalogs);
+
+/// The catalog of one source as the agent reads it (a publisher's verified first); empty, with
+/// one log line, when it cannot be read, verified or parsed.
+QZDownloadableFontCatalog QZLoadCatalogSource(const QZCatalogSource& source);
+
+/// The current merged view: shared, never changed once handed out; rebuilt when a source
+/// changes. Thread-safe.
+std::shared_ptr<const QZMergedDownloadableFontCatalog> QZCurrentMergedDownloadableFontCatalog();
