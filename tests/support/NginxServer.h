@@ -20,7 +20,9 @@ namespace glyphwell::testing {
 class NginxServer {
 public:
     /// Serves `root` on 127.0.0.1 at a free port; the configuration and logs go to `prefix`.
-    NginxServer(const std::string& root, const std::string& prefix) {
+    /// `directives` are added to the server block (e.g. "limit_rate 1m;").
+    NginxServer(const std::string& root, const std::string& prefix,
+                const std::string& directives = "") {
         const char* binary = "/usr/sbin/nginx";
         if (access(binary, X_OK) != 0)
             return;
@@ -36,7 +38,8 @@ public:
                 << "  client_body_temp_path " << prefix << "/tmp; proxy_temp_path " << prefix
                 << "/tmp; fastcgi_temp_path " << prefix << "/tmp; uwsgi_temp_path " << prefix
                 << "/tmp; scgi_temp_path " << prefix << "/tmp;\n"
-                << "  server { listen 127.0.0.1:" << port_ << "; root " << root << "; } }\n";
+                << "  server { listen 127.0.0.1:" << port_ << "; root " << root << "; "
+                << directives << " } }\n";
             const pid_t child = fork();
             if (child == 0) {
                 execl(binary, binary, "-q", "-p", prefix.c_str(), "-c", configuration.c_str(),
