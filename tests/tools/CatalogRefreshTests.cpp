@@ -107,8 +107,9 @@ TEST(CatalogRefresh, KeepsTheLastGoodCatalogAndRefusesEveryBadOne) {
             std::string damaged = Contents(c.damage == Damage::Catalog ? file : signature);
             if (c.damage == Damage::Catalog)
                 damaged[5] ^= 1;
-            else if (c.damage == Damage::Signature)
-                damaged[damaged.find('\n') + 40] ^= 1;
+            else if (c.damage == Damage::Signature) // another base64 digit
+                damaged[damaged.find('\n') + 40] =
+                    damaged[damaged.find('\n') + 40] == 'A' ? 'B' : 'A';
             else if (c.damage == Damage::Comment)
                 damaged[damaged.find("timestamp:") + 10] ^= 1;
             else if (c.damage == Damage::HugeSignature)
