@@ -12,6 +12,7 @@
 #include <unistd.h>
 #include <unordered_set>
 
+#include "desktop/QZCatalogIndex.h"
 #include "desktop/QZCatalogPaths.h"
 #include "desktop/QZCatalogPublishers.h"
 #include "platform/Log.h"
@@ -78,15 +79,9 @@ bool ReadWhole(const std::string& path, size_t limit, std::string* bytes, std::s
     return true;
 }
 
-struct CachedSource {
-    SourceStamp stamp;
-    std::shared_ptr<const QZDownloadableFontCatalog> catalog;
-};
-
 struct SourcesCache {
     std::mutex mutex;
-    std::map<std::string, CachedSource> sources; ///< by catalog path
-    std::vector<SourceStamp> stamps;             ///< of the merged view's sources
+    std::vector<SourceStamp> stamps; ///< of the merged view's sources
     std::vector<std::string> paths;
     std::shared_ptr<const QZMergedDownloadableFontCatalog> merged;
     std::map<std::string, int64_t> expiredLogged; ///< publisher to the expiry logged
@@ -165,14 +160,24 @@ QZDownloadableFontCatalog QZLoadCatalogSource(const QZCatalogSource& source) {
 
 QZMergedDownloadableFontCatalog
 QZMergeDownloadableFontCatalogs(std::vector<QZCatalogSource> sources,
-                                const std::vector<QZDownloadableFontCatalog>& catalogs) {
+                                std::vector<QZDownloadableFontCatalog> catalogs) {
     QZMergedDownloadableFontCatalog merged;
     merged.sources = std::move(sources);
     auto storage = std::make_shared<MergedStorage>();
     size_t nonEmpty = 0;
     for (const QZDownloadableFontCatalog& catalog : catalogs)
         nonEmpty += catalog.assets.empty() ? 0 : 1;
-    // Names offered by the earlier sources; with one source nothing needs comparing.
+    if (nonEmpty <= 1) {
+        // One source offers everything: its catalog is the view, nothing compared or copied.
+        for (size_t index = 0; index < catalogs.size(); ++index) {
+            if (catalogs[index].assets.empty())
+                continue;
+            merged.assetSources.assign(catalogs[index].assets.size(), index);
+            merged.catalog = std::move(catalogs[index]);
+        }
+        return merged;
+    }
+    // Names offered by the earlier sources.
     std::unordered_set<std::string_view> offered, offeredHere;
     for (size_t index = 0; index < catalogs.size(); ++index) {
         const QZDownloadableFontCatalog& catalog = catalogs[index];
@@ -181,19 +186,16 @@ QZMergeDownloadableFontCatalogs(std::vector<QZCatalogSource> sources,
         storage->sources.push_back(catalog.storage);
         for (const QZDownloadableFontAsset& asset : catalog.assets) {
             QZDownloadableFontAsset kept = asset;
-            if (nonEmpty > 1) {
-                std::vector<QZDownloadableFont> fonts;
-                for (const QZDownloadableFont& font : asset.fonts) {
-                    offeredHere.insert(font.postScriptName);
-                    if (!offered.count(font.postScriptName))
-                        fonts.push_back(font);
-                }
-                if (fonts.empty())
-                    continue;
-                if (fonts.size() != asset.fonts.size()) {
-                    kept.fonts = storage->fonts.emplace_back(std::move(fonts));
-                }
+            std::vector<QZDownloadableFont> fonts;
+            for (const QZDownloadableFont& font : asset.fonts) {
+                offeredHere.insert(font.postScriptName);
+                if (!offered.count(font.postScriptName))
+                    fonts.push_back(font);
             }
+            if (fonts.empty())
+                continue;
+            if (fonts.size() != asset.fonts.size())
+                kept.fonts = storage->fonts.emplace_back(std::move(fonts));
             merged.catalog.assets.push_back(kept);
             merged.assetSources.push_back(index);
         }
@@ -224,22 +226,12 @@ std::shared_ptr<const QZMergedDownloadableFontCatalog> QZCurrentMergedDownloadab
                           glyphwell::LogEscape(searched).c_str());
     }
     cache.noneLogged = sources.empty();
+    // Each source through its compiled index: no JSON is read while the indexes are current.
     std::vector<QZDownloadableFontCatalog> catalogs;
-    std::map<std::string, CachedSource> kept;
-    for (size_t i = 0; i < sources.size(); ++i) {
-        CachedSource& cached = cache.sources[sources[i].path];
-        if (!cached.catalog || !(cached.stamp == stamps[i])) {
-            cached.catalog =
-                std::make_shared<const QZDownloadableFontCatalog>(QZLoadCatalogSource(sources[i]));
-            cached.stamp = stamps[i];
-        }
-        catalogs.push_back(*cached.catalog);
-        kept[sources[i].path] = cached;
-    }
-    // Sources that are gone are forgotten, so that they are read again when they come back.
-    cache.sources = std::move(kept);
+    for (const QZCatalogSource& source : sources)
+        catalogs.push_back(QZLoadIndexedCatalogSource(source));
     cache.merged = std::make_shared<const QZMergedDownloadableFontCatalog>(
-        QZMergeDownloadableFontCatalogs(std::move(sources), catalogs));
+        QZMergeDownloadableFontCatalogs(std::move(sources), std::move(catalogs)));
     cache.stamps = std::move(stamps);
     cache.paths = std::move(paths);
     return cache.merged;

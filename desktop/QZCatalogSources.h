@@ -4,8 +4,9 @@
 // XDG_DATA_DIRS. A PostScript name offered by several catalogs goes to the first; the assets of
 // later ones keep their other fonts. No Qt.
 //
-// Each source is read again only when its files change; a source that cannot be read, verified
-// or parsed offers nothing, with one log line for that state of its files.
+// Each source is read through its compiled index (QZCatalogIndex.h), compiled again only when its
+// files change; a source that cannot be read, verified or parsed offers nothing, with one log
+// line for that state of its files.
 #pragma once
 
 #include <cstdint>
@@ -43,7 +44,7 @@ struct QZMergedDownloadableFontCatalog {
 /// offers its PostScript name; an asset left without fonts is left out.
 QZMergedDownloadableFontCatalog
 QZMergeDownloadableFontCatalogs(std::vector<QZCatalogSource> sources,
-                                const std::vector<QZDownloadableFontCatalog>& catalogs);
+                                std::vector<QZDownloadableFontCatalog> catalogs);
 
 /// The catalog of one source as the agent reads it (a publisher's verified first); empty, with
 /// one log line, when it cannot be read, verified or parsed.
