@@ -18,6 +18,7 @@
 #include <strings.h>
 #include <sys/stat.h>
 #include <unistd.h>
+#include <utility>
 
 #include "desktop/QZCatalogPaths.h"
 #include "desktop/QZDownloadableFontCatalog.h"
@@ -36,7 +37,8 @@ constexpr char kStateFile[] = "state";
 /// A publisher file is a few lines; anything larger is not one.
 constexpr size_t kMaximumPublisherFileSize = 16 << 10;
 
-std::mutex gLimitsMutex;
+/// Guards the limits and the record of the publisher files already logged.
+std::mutex gStateMutex;
 QZCatalogFetchLimits gLimits;
 
 std::string Trim(const std::string& text) {
@@ -259,12 +261,12 @@ QZPublisherRefresh Refused(std::string reason, const QZPublisherState& kept) {
 } // namespace
 
 void QZSetCatalogFetchLimits(const QZCatalogFetchLimits& limits) {
-    std::lock_guard<std::mutex> lock(gLimitsMutex);
+    std::lock_guard<std::mutex> lock(gStateMutex);
     gLimits = limits;
 }
 
 QZCatalogFetchLimits QZCurrentCatalogFetchLimits() {
-    std::lock_guard<std::mutex> lock(gLimitsMutex);
+    std::lock_guard<std::mutex> lock(gStateMutex);
     return gLimits;
 }
 
@@ -345,9 +347,18 @@ QZReadCatalogPublishers(const std::vector<std::string>& directories) {
             publisher = QZParseCatalogPublisher(name, *text, &problem);
         }
         if (!publisher) {
-            glyphwell::AppLog("Skipping the catalog publisher file %s: %s",
-                              glyphwell::LogEscape(path).c_str(),
-                              glyphwell::LogEscape(problem).c_str());
+            // The agent reads the files at every question: each state of a file is logged once.
+            struct stat status {};
+            stat(path.c_str(), &status);
+            const std::string state = std::to_string(status.st_size) + ":" +
+                                      std::to_string(status.st_mtim.tv_sec) + "." +
+                                      std::to_string(status.st_mtim.tv_nsec);
+            std::lock_guard<std::mutex> lock(gStateMutex);
+            static std::map<std::string, std::string> logged;
+            if (std::exchange(logged[path], state) != state)
+                glyphwell::AppLog("Skipping the catalog publisher file %s: %s",
+                                  glyphwell::LogEscape(path).c_str(),
+                                  glyphwell::LogEscape(problem).c_str());
             continue;
         }
         publisher->file = path;

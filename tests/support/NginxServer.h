@@ -1,6 +1,6 @@
 // Test helper: a real nginx serving a folder on a loopback port, with a private configuration
-// (static files: ETag, Last-Modified, 304 answers and byte ranges), stopped and removed with the
-// object. Not running when nginx is not installed.
+// (static files: ETag, Last-Modified, 304 answers and byte ranges), stopped with the object.
+// Not running when nginx is not installed.
 #pragma once
 
 #include <arpa/inet.h>
@@ -8,9 +8,7 @@
 #include <csignal>
 #include <filesystem>
 #include <fstream>
-#include <netinet/in.h>
 #include <string>
-#include <sys/socket.h>
 #include <sys/wait.h>
 #include <thread>
 #include <unistd.h>
@@ -24,36 +22,40 @@ public:
     NginxServer(const std::string& root, const std::string& prefix,
                 const std::string& directives = "") {
         const char* binary = "/usr/sbin/nginx";
-        if (access(binary, X_OK) != 0)
-            return;
         std::filesystem::create_directories(prefix + "/tmp");
-        for (int attempt = 0; attempt < 5 && pid_ <= 0; ++attempt) {
-            port_ = FreePort();
-            const std::string configuration = prefix + "/nginx.conf";
+        const std::string configuration = prefix + "/nginx.conf", temporary = prefix + "/tmp";
+        // A port the kernel just handed out is free unless another process takes it meanwhile.
+        for (int attempt = 0; attempt < 5 && access(binary, X_OK) == 0 && pid_ < 0; ++attempt) {
+            port_ = Connect(0);
             std::ofstream(configuration)
-                << "daemon off; master_process off; pid " << prefix << "/nginx.pid;\n"
-                << "error_log " << prefix << "/error.log;\n"
-                << "events { worker_connections 64; }\n"
-                << "http { access_log off; default_type application/octet-stream;\n"
-                << "  client_body_temp_path " << prefix << "/tmp; proxy_temp_path " << prefix
-                << "/tmp; fastcgi_temp_path " << prefix << "/tmp; uwsgi_temp_path " << prefix
-                << "/tmp; scgi_temp_path " << prefix << "/tmp;\n"
-                << "  server { listen 127.0.0.1:" << port_ << "; root " << root << "; "
+                << "daemon off; master_process off; pid " << prefix << "/nginx.pid; error_log "
+                << prefix << "/error.log;\nevents { worker_connections 64; }\nhttp { access_log "
+                << "off; default_type application/octet-stream; client_body_temp_path " << temporary
+                << "; proxy_temp_path " << temporary << "; fastcgi_temp_path " << temporary
+                << "; uwsgi_temp_path " << temporary << "; scgi_temp_path " << temporary
+                << ";\n  server { listen 127.0.0.1:" << port_ << "; root " << root << "; "
                 << directives << " } }\n";
-            const pid_t child = fork();
-            if (child == 0) {
+            pid_ = fork();
+            if (pid_ == 0) {
                 execl(binary, binary, "-q", "-p", prefix.c_str(), "-c", configuration.c_str(),
                       static_cast<char*>(nullptr));
                 _exit(127);
             }
-            pid_ = child;
-            if (!WaitUntilListening()) {
-                Stop();
-                pid_ = -1;
+            int status = 0;
+            for (int i = 0; i < 200 && Connect(port_) == 0; ++i) {
+                if (waitpid(pid_, &status, WNOHANG) == pid_)
+                    pid_ = -1; // it could not start (the port was taken): try another
+                if (pid_ < 0)
+                    break;
+                std::this_thread::sleep_for(std::chrono::milliseconds(25));
             }
         }
     }
-    ~NginxServer() { Stop(); }
+    ~NginxServer() {
+        int status = 0;
+        if (pid_ > 0 && kill(pid_, SIGTERM) == 0)
+            waitpid(pid_, &status, 0);
+    }
     NginxServer(const NginxServer&) = delete;
     NginxServer& operator=(const NginxServer&) = delete;
 
@@ -63,47 +65,22 @@ public:
     }
 
 private:
-    static unsigned short FreePort() {
+    /// With `port` 0: a port the kernel chooses. Otherwise: `port` when something listens on it,
+    /// else 0.
+    static unsigned short Connect(unsigned short port) {
         const int fd = socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
         sockaddr_in address{};
         address.sin_family = AF_INET;
+        address.sin_port = htons(port);
         address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
         socklen_t length = sizeof address;
-        bind(fd, reinterpret_cast<sockaddr*>(&address), length);
-        getsockname(fd, reinterpret_cast<sockaddr*>(&address), &length);
+        const auto* generic = reinterpret_cast<sockaddr*>(&address);
+        const bool done =
+            port == 0 ? bind(fd, generic, length) == 0 &&
+                            getsockname(fd, reinterpret_cast<sockaddr*>(&address), &length) == 0
+                      : connect(fd, generic, length) == 0;
         close(fd);
-        return ntohs(address.sin_port);
-    }
-
-    bool WaitUntilListening() {
-        for (int i = 0; i < 200; ++i) {
-            int status = 0;
-            if (waitpid(pid_, &status, WNOHANG) == pid_) {
-                pid_ = -1;
-                return false;
-            }
-            const int fd = socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
-            sockaddr_in address{};
-            address.sin_family = AF_INET;
-            address.sin_port = htons(port_);
-            address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-            const bool connected =
-                connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address) == 0;
-            close(fd);
-            if (connected)
-                return true;
-            std::this_thread::sleep_for(std::chrono::milliseconds(25));
-        }
-        return false;
-    }
-
-    void Stop() {
-        if (pid_ <= 0)
-            return;
-        kill(pid_, SIGTERM);
-        int status = 0;
-        waitpid(pid_, &status, 0);
-        pid_ = -1;
+        return done ? ntohs(address.sin_port) : 0;
     }
 
     pid_t pid_ = -1;

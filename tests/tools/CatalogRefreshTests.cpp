@@ -76,6 +76,8 @@ TEST(CatalogRefresh, KeepsTheLastGoodCatalogAndRefusesEveryBadOne) {
          "acme: refused: bad signature of the trusted comment; kept version 2000"},
         {"another key", "3", &other, "timestamp:3000", Damage::None,
          "acme: refused: signed with another key ("},
+        {"no version", "3", &key, "file:catalog.json", Damage::None,
+         "acme: refused: no timestamp in the trusted comment; kept version 2000"},
         {"older version", "3", &key, "timestamp:1500", Damage::None,
          "acme: refused: version 1500 is older than the kept 2000 (rollback); kept version 2000"},
         {"expired", "3", &key, "timestamp:3000 expires:" + past, Damage::None,
