@@ -21,12 +21,13 @@
 
 namespace {
 
-constexpr char kMagic[8] = {'G', 'W', 'C', 'A', 'T', 'I', 'X', '1'};
-constexpr size_t kHeaderSize = 208;
+constexpr char kMagic[8] = {'G', 'W', 'C', 'A', 'T', 'I', 'X', '2'};
+constexpr size_t kHeaderSize = 224;
 constexpr size_t kAssetSize = 40;
 constexpr size_t kFontSize = 32;
 constexpr size_t kNameSize = 16;
 constexpr size_t kLanguageSize = 8;
+constexpr size_t kLookupSize = 16; ///< hash of a PostScript name, asset, font
 /// An index beyond this size is not mapped: no catalog of 64 MiB compiles into one.
 constexpr uint64_t kMaximumIndexSize = 1ull << 30;
 
@@ -39,8 +40,8 @@ enum : size_t {
     kPublicKeyField = 72,
     kSignatureField = 104,
     kPathField = 136,     ///< string reference: offset, length
-    kCountsField = 144,   ///< assets, fonts, names, languages
-    kSectionsField = 160, ///< assets, fonts, names, languages, strings offsets; strings size
+    kCountsField = 144,   ///< assets, fonts, names, languages, lookup entries
+    kSectionsField = 168, ///< the same sections' offsets, the strings' offset, the strings' size
 };
 
 template <typename T> T Load(const char* at) {
@@ -81,6 +82,14 @@ bool IsSHA256Text(std::string_view text) {
 /// Whether `count` records of `size` bytes at `offset` lie inside `total` bytes after the header.
 bool SectionFits(uint64_t offset, uint64_t count, size_t size, uint64_t total) {
     return offset >= kHeaderSize && offset <= total && count <= (total - offset) / size;
+}
+
+/// FNV-1a: the lookup table's hash of a PostScript name.
+uint64_t NameHash(std::string_view name) {
+    uint64_t hash = 14695981039346656037ull;
+    for (const char c : name)
+        hash = (hash ^ static_cast<unsigned char>(c)) * 1099511628211ull;
+    return hash;
 }
 
 /// What the views of a catalog read from an index point into.
@@ -131,11 +140,12 @@ std::optional<std::string> ReadWhole(const std::string& path, uint64_t limit) {
     return good ? std::optional<std::string>(std::move(bytes)) : std::nullopt;
 }
 
-/// Maps and reads the index at `path`.
-std::optional<QZDownloadableFontCatalog> MapIndex(const std::string& path, QZCatalogIndexKey* key) {
+/// Maps and checks the index at `path`.
+std::shared_ptr<const QZCatalogIndexView> MapIndex(const std::string& path,
+                                                   QZCatalogIndexKey* key) {
     const int fd = open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK);
     if (fd < 0)
-        return std::nullopt;
+        return nullptr;
     struct stat status {};
     auto mapping = std::make_shared<Mapping>();
     if (fstat(fd, &status) == 0 && S_ISREG(status.st_mode) &&
@@ -145,9 +155,9 @@ std::optional<QZDownloadableFontCatalog> MapIndex(const std::string& path, QZCat
     }
     close(fd);
     if (mapping->address == MAP_FAILED)
-        return std::nullopt;
+        return nullptr;
     const std::string_view bytes(static_cast<const char*>(mapping->address), mapping->size);
-    return QZReadCatalogIndex(bytes, mapping, key);
+    return QZCatalogIndexView::Open(bytes, mapping, key);
 }
 
 /// Writes `bytes` as the index at `path`: beside it first, then renamed over it.
@@ -178,6 +188,7 @@ std::string QZCompileCatalogIndex(const QZDownloadableFontCatalog& catalog,
     StringSection strings;
     std::string assets, fonts, names, languages, path;
     uint32_t fontCount = 0, nameCount = 0, languageCount = 0;
+    std::vector<std::array<uint64_t, 3>> lookups; // hash, asset, font
     strings.Add(path, key.path);
     for (const QZDownloadableFontAsset& asset : catalog.assets) {
         strings.Add(assets, asset.localID);
@@ -187,6 +198,8 @@ std::string QZCompileCatalogIndex(const QZDownloadableFontCatalog& catalog,
         Append(assets, fontCount);
         Append(assets, uint32_t(asset.fonts.size()));
         for (const QZDownloadableFont& font : asset.fonts) {
+            lookups.push_back({NameHash(font.postScriptName),
+                               uint64_t(&asset - catalog.assets.data()), fontCount});
             strings.Add(fonts, font.postScriptName);
             strings.Add(fonts, font.family);
             Append(fonts, nameCount);
@@ -213,11 +226,18 @@ std::string QZCompileCatalogIndex(const QZDownloadableFontCatalog& catalog,
     std::memcpy(bytes.data() + kPublicKeyField, key.publicKey.data(), 32);
     std::memcpy(bytes.data() + kSignatureField, key.signatureSHA256.data(), 32);
     bytes.replace(kPathField, 8, path);
-    const uint32_t counts[4] = {uint32_t(catalog.assets.size()), fontCount, nameCount,
-                                languageCount};
+    std::sort(lookups.begin(), lookups.end());
+    std::string table;
+    for (const auto& [hash, asset, font] : lookups) {
+        Append(table, hash);
+        Append(table, uint32_t(asset));
+        Append(table, uint32_t(font));
+    }
+    const uint32_t counts[5] = {uint32_t(catalog.assets.size()), fontCount, nameCount,
+                                languageCount, uint32_t(lookups.size())};
     std::memcpy(bytes.data() + kCountsField, counts, sizeof counts);
     size_t section = kSectionsField;
-    const std::string* parts[] = {&assets, &fonts, &names, &languages, &strings.Bytes()};
+    const std::string* parts[] = {&assets, &fonts, &names, &languages, &table, &strings.Bytes()};
     for (const std::string* part : parts) {
         Store(bytes, section, uint64_t(bytes.size()));
         section += 8;
@@ -228,99 +248,192 @@ std::string QZCompileCatalogIndex(const QZDownloadableFontCatalog& catalog,
     return bytes;
 }
 
-std::optional<QZDownloadableFontCatalog> QZReadCatalogIndex(std::string_view bytes,
-                                                            std::shared_ptr<const void> owner,
-                                                            QZCatalogIndexKey* key) {
+std::string_view QZCatalogIndexView::String(const char* reference) const {
+    return std::string_view(data_ + offsets_[5] + Load<uint32_t>(reference),
+                            Load<uint32_t>(reference + 4));
+}
+
+std::shared_ptr<const QZCatalogIndexView>
+QZCatalogIndexView::Open(std::string_view bytes, std::shared_ptr<const void> owner,
+                         QZCatalogIndexKey* key) {
     const char* data = bytes.data();
     if (bytes.size() < kHeaderSize || std::memcmp(data, kMagic, sizeof kMagic) != 0 ||
         Load<uint32_t>(data + 8) != kHeaderSize ||
         Load<uint64_t>(data + kFileSizeField) != bytes.size())
-        return std::nullopt;
-    uint32_t counts[4];
-    uint64_t offsets[5];
-    std::memcpy(counts, data + kCountsField, sizeof counts);
-    std::memcpy(offsets, data + kSectionsField, sizeof offsets);
-    const uint64_t stringsSize = Load<uint64_t>(data + kSectionsField + 40);
-    const size_t sizes[4] = {kAssetSize, kFontSize, kNameSize, kLanguageSize};
-    for (int i = 0; i < 4; ++i)
+        return nullptr;
+    std::shared_ptr<QZCatalogIndexView> view(new QZCatalogIndexView);
+    uint32_t* counts = view->counts_;
+    uint64_t* offsets = view->offsets_;
+    std::memcpy(counts, data + kCountsField, sizeof view->counts_);
+    std::memcpy(offsets, data + kSectionsField, sizeof view->offsets_);
+    const uint64_t stringsSize = Load<uint64_t>(data + kSectionsField + sizeof view->offsets_);
+    const size_t sizes[5] = {kAssetSize, kFontSize, kNameSize, kLanguageSize, kLookupSize};
+    for (int i = 0; i < 5; ++i)
         if (!SectionFits(offsets[i], counts[i], sizes[i], bytes.size()))
-            return std::nullopt;
-    if (!SectionFits(offsets[4], stringsSize, 1, bytes.size()))
-        return std::nullopt;
-    const char* stringBase = data + offsets[4];
-    // A string reference read at `at`; false when it leaves the string section.
-    const auto text = [&](const char* at, std::string_view* out) {
+            return nullptr;
+    if (!SectionFits(offsets[5], stringsSize, 1, bytes.size()))
+        return nullptr;
+    view->data_ = data;
+    // Whether the string reference at `at` lies inside the string section.
+    const auto valid = [&](const char* at) {
         const uint32_t offset = Load<uint32_t>(at), length = Load<uint32_t>(at + 4);
-        if (offset > stringsSize || length > stringsSize - offset)
-            return false;
-        *out = std::string_view(stringBase + offset, length);
-        return true;
+        return offset <= stringsSize && length <= stringsSize - offset;
     };
-    std::string_view path;
-    if (!text(data + kPathField, &path))
-        return std::nullopt;
-    key->path = std::string(path);
+    // A range of `count` records from `first` inside `total`.
+    const auto range = [](uint32_t first, uint32_t count, uint32_t total) {
+        return first <= total && count <= total - first;
+    };
+    if (!valid(data + kPathField))
+        return nullptr;
+    key->path = std::string(view->String(data + kPathField));
     key->size = Load<uint64_t>(data + kSourceSizeField);
     key->modified = Load<int64_t>(data + kModifiedField);
     std::memcpy(key->sha256.data(), data + kSHA256Field, 32);
     std::memcpy(key->publicKey.data(), data + kPublicKeyField, 32);
     std::memcpy(key->signatureSHA256.data(), data + kSignatureField, 32);
 
-    auto storage = std::make_shared<IndexStorage>();
-    storage->owner = std::move(owner);
-    storage->names.resize(counts[2]);
     for (uint32_t i = 0; i < counts[2]; ++i) {
         const char* record = data + offsets[2] + i * kNameSize;
-        if (!text(record, &storage->names[i].language) ||
-            !text(record + 8, &storage->names[i].name))
-            return std::nullopt;
+        if (!valid(record) || !valid(record + 8))
+            return nullptr;
     }
-    storage->languages.resize(counts[3]);
     for (uint32_t i = 0; i < counts[3]; ++i)
-        if (!text(data + offsets[3] + i * kLanguageSize, &storage->languages[i]))
-            return std::nullopt;
-    // A range of `count` records from `first` inside `total`.
-    const auto range = [](uint32_t first, uint32_t count, uint32_t total) {
-        return first <= total && count <= total - first;
-    };
-    storage->fonts.resize(counts[1]);
+        if (!valid(data + offsets[3] + i * kLanguageSize))
+            return nullptr;
     for (uint32_t i = 0; i < counts[1]; ++i) {
         const char* record = data + offsets[1] + i * kFontSize;
-        QZDownloadableFont& font = storage->fonts[i];
         const uint32_t firstName = Load<uint32_t>(record + 16),
                        nameCount = Load<uint32_t>(record + 20);
-        const uint32_t firstLanguage = Load<uint32_t>(record + 24),
-                       languageCount = Load<uint32_t>(record + 28);
-        if (!text(record, &font.postScriptName) || font.postScriptName.empty() ||
-            !text(record + 8, &font.family) || !range(firstName, nameCount, counts[2]) ||
-            !range(firstLanguage, languageCount, counts[3]))
-            return std::nullopt;
-        font.localizedFamilyNames = {storage->names.data() + firstName, nameCount};
-        font.languages = {storage->languages.data() + firstLanguage, languageCount};
+        if (!valid(record) || Load<uint32_t>(record + 4) == 0 || !valid(record + 8) ||
+            !range(firstName, nameCount, counts[2]) ||
+            !range(Load<uint32_t>(record + 24), Load<uint32_t>(record + 28), counts[3]))
+            return nullptr;
         // LocalizedFamilyName looks names up by binary search: each language once, in order.
+        const char* names = data + offsets[2] + size_t(firstName) * kNameSize;
         for (uint32_t n = 1; n < nameCount; ++n)
-            if (!(font.localizedFamilyNames[n - 1].language <
-                  font.localizedFamilyNames[n].language))
-                return std::nullopt;
+            if (!(view->String(names + (n - 1) * kNameSize) < view->String(names + n * kNameSize)))
+                return nullptr;
     }
-    QZDownloadableFontCatalog catalog;
-    catalog.assets.resize(counts[0]);
     for (uint32_t i = 0; i < counts[0]; ++i) {
         const char* record = data + offsets[0] + i * kAssetSize;
+        const uint32_t fontCount = Load<uint32_t>(record + 36);
+        if (!valid(record) || Load<uint32_t>(record + 4) == 0 || !valid(record + 8) ||
+            Load<uint32_t>(record + 12) == 0 || !valid(record + 16) ||
+            !IsSHA256Text(view->String(record + 16)) ||
+            Load<uint64_t>(record + 24) > uint64_t(std::numeric_limits<int64_t>::max()) ||
+            fontCount == 0 || !range(Load<uint32_t>(record + 32), fontCount, counts[1]))
+            return nullptr;
+    }
+    // The lookup table: sorted, each entry a font of its asset.
+    for (uint32_t i = 0; i < counts[4]; ++i) {
+        const char* entry = data + offsets[4] + i * kLookupSize;
+        const uint32_t asset = Load<uint32_t>(entry + 8), font = Load<uint32_t>(entry + 12);
+        if (asset >= counts[0])
+            return nullptr;
+        const char* record = data + offsets[0] + size_t(asset) * kAssetSize;
+        const uint32_t first = Load<uint32_t>(record + 32);
+        if (font < first || font - first >= Load<uint32_t>(record + 36) ||
+            (i > 0 && std::make_pair(Load<uint64_t>(entry - kLookupSize),
+                                     Load<uint32_t>(entry - kLookupSize + 8)) >
+                          std::make_pair(Load<uint64_t>(entry), asset)))
+            return nullptr;
+    }
+    view->owner_ = std::move(owner);
+    return view;
+}
+
+std::vector<uint32_t> QZCatalogIndexView::AssetsOffering(std::string_view postScriptName) const {
+    const uint64_t hash = NameHash(postScriptName);
+    uint32_t low = 0, high = counts_[4];
+    const char* table = data_ + offsets_[4];
+    while (low < high) {
+        const uint32_t middle = low + (high - low) / 2;
+        if (Load<uint64_t>(table + size_t(middle) * kLookupSize) < hash)
+            low = middle + 1;
+        else
+            high = middle;
+    }
+    std::vector<uint32_t> assets;
+    for (; low < counts_[4] && Load<uint64_t>(table + size_t(low) * kLookupSize) == hash; ++low) {
+        const char* entry = table + size_t(low) * kLookupSize;
+        const uint32_t asset = Load<uint32_t>(entry + 8), font = Load<uint32_t>(entry + 12);
+        if (String(data_ + offsets_[1] + size_t(font) * kFontSize) == postScriptName &&
+            (assets.empty() || assets.back() != asset))
+            assets.push_back(asset);
+    }
+    return assets;
+}
+
+QZDownloadableFontCatalog QZCatalogIndexView::Catalog(const std::vector<uint32_t>& indexes,
+                                                      bool all) const {
+    const size_t count = all ? counts_[0] : indexes.size();
+    const auto assetRecord = [&](size_t i) {
+        return data_ + offsets_[0] + size_t(all ? uint32_t(i) : indexes[i]) * kAssetSize;
+    };
+    const auto fontRecord = [&](uint32_t font) {
+        return data_ + offsets_[1] + size_t(font) * kFontSize;
+    };
+    // The sizes first, so that the vectors never move once views into them are made.
+    auto storage = std::make_shared<IndexStorage>();
+    size_t fonts = 0, names = 0, languages = 0;
+    for (size_t i = 0; i < count; ++i) {
+        const uint32_t first = Load<uint32_t>(assetRecord(i) + 32);
+        const uint32_t fontCount = Load<uint32_t>(assetRecord(i) + 36);
+        fonts += fontCount;
+        for (uint32_t f = first; f < first + fontCount; ++f) {
+            names += Load<uint32_t>(fontRecord(f) + 20);
+            languages += Load<uint32_t>(fontRecord(f) + 28);
+        }
+    }
+    storage->owner = owner_;
+    storage->fonts.reserve(fonts);
+    storage->names.reserve(names);
+    storage->languages.reserve(languages);
+    QZDownloadableFontCatalog catalog;
+    catalog.assets.resize(count);
+    for (size_t i = 0; i < count; ++i) {
+        const char* record = assetRecord(i);
         QZDownloadableFontAsset& asset = catalog.assets[i];
+        asset.localID = String(record);
+        asset.url = String(record + 8);
+        asset.sha256 = String(record + 16);
         asset.size = Load<uint64_t>(record + 24);
-        const uint32_t firstFont = Load<uint32_t>(record + 32),
-                       fontCount = Load<uint32_t>(record + 36);
-        if (!text(record, &asset.localID) || asset.localID.empty() ||
-            !text(record + 8, &asset.url) || asset.url.empty() ||
-            !text(record + 16, &asset.sha256) || !IsSHA256Text(asset.sha256) ||
-            asset.size > uint64_t(std::numeric_limits<int64_t>::max()) || fontCount == 0 ||
-            !range(firstFont, fontCount, counts[1]))
-            return std::nullopt;
-        asset.fonts = {storage->fonts.data() + firstFont, fontCount};
+        const uint32_t first = Load<uint32_t>(record + 32), fontCount = Load<uint32_t>(record + 36);
+        const size_t fontStart = storage->fonts.size();
+        for (uint32_t f = first; f < first + fontCount; ++f) {
+            const char* font = fontRecord(f);
+            QZDownloadableFont& made = storage->fonts.emplace_back();
+            made.postScriptName = String(font);
+            made.family = String(font + 8);
+            const size_t nameStart = storage->names.size();
+            const uint32_t firstName = Load<uint32_t>(font + 16);
+            for (uint32_t n = 0; n < Load<uint32_t>(font + 20); ++n) {
+                const char* name = data_ + offsets_[2] + size_t(firstName + n) * kNameSize;
+                storage->names.push_back({String(name), String(name + 8)});
+            }
+            made.localizedFamilyNames = {storage->names.data() + nameStart,
+                                         storage->names.size() - nameStart};
+            const size_t languageStart = storage->languages.size();
+            const uint32_t firstLanguage = Load<uint32_t>(font + 24);
+            for (uint32_t l = 0; l < Load<uint32_t>(font + 28); ++l)
+                storage->languages.push_back(
+                    String(data_ + offsets_[3] + size_t(firstLanguage + l) * kLanguageSize));
+            made.languages = {storage->languages.data() + languageStart,
+                              storage->languages.size() - languageStart};
+        }
+        asset.fonts = {storage->fonts.data() + fontStart, fontCount};
     }
     catalog.storage = std::move(storage);
     return catalog;
+}
+
+std::optional<QZDownloadableFontCatalog> QZReadCatalogIndex(std::string_view bytes,
+                                                            std::shared_ptr<const void> owner,
+                                                            QZCatalogIndexKey* key) {
+    const auto view = QZCatalogIndexView::Open(bytes, std::move(owner), key);
+    if (!view)
+        return std::nullopt;
+    return view->Catalog({}, true);
 }
 
 std::string QZCatalogIndexPath(const std::string& path) {
@@ -328,10 +441,20 @@ std::string QZCatalogIndexPath(const std::string& path) {
            ".index";
 }
 
-QZDownloadableFontCatalog QZLoadIndexedCatalogSource(const QZCatalogSource& source) {
+std::shared_ptr<const QZCatalogIndexView>
+QZLoadIndexedCatalogSource(const QZCatalogSource& source) {
+    // The index of `catalog` as written to `indexPath`, or held in memory when it cannot be.
+    const auto compile = [](const QZDownloadableFontCatalog& catalog, const QZCatalogIndexKey& key,
+                            const std::string& indexPath) {
+        auto bytes = std::make_shared<const std::string>(QZCompileCatalogIndex(catalog, key));
+        WriteIndex(indexPath, *bytes);
+        QZCatalogIndexKey ignored;
+        return QZCatalogIndexView::Open(*bytes, bytes, &ignored);
+    };
+    const std::string indexPath = QZCatalogIndexPath(source.path);
     struct stat status {};
     if (stat(source.path.c_str(), &status) != 0)
-        return QZLoadCatalogSource(source);
+        return compile(QZLoadCatalogSource(source), {}, indexPath);
     QZCatalogIndexKey key;
     key.path = source.path;
     key.size = uint64_t(status.st_size);
@@ -341,24 +464,19 @@ QZDownloadableFontCatalog QZLoadIndexedCatalogSource(const QZCatalogSource& sour
         if (const auto signature = ReadWhole(source.signaturePath, kMaximumCatalogSignatureSize))
             key.signatureSHA256 = DigestBytes(*signature);
     }
-    const std::string indexPath = QZCatalogIndexPath(source.path);
     QZCatalogIndexKey stored;
-    std::optional<QZDownloadableFontCatalog> indexed = MapIndex(indexPath, &stored);
+    const std::shared_ptr<const QZCatalogIndexView> indexed = MapIndex(indexPath, &stored);
     key.sha256 = stored.sha256;
     if (indexed && stored == key)
-        return std::move(*indexed);
+        return indexed;
     // Changed, or only touched: the source's SHA-256 decides.
     const std::optional<std::string> bytes = ReadWhole(source.path, kMaximumPublishedCatalogSize);
     if (!bytes)
-        return QZLoadCatalogSource(source); // logs why it cannot be read
+        return compile(QZLoadCatalogSource(source), {}, indexPath); // logs why it is unreadable
     key.sha256 = DigestBytes(*bytes);
     key.size = bytes->size();
     if (indexed && stored.path == key.path && stored.sha256 == key.sha256 &&
-        stored.publicKey == key.publicKey && stored.signatureSHA256 == key.signatureSHA256) {
-        WriteIndex(indexPath, QZCompileCatalogIndex(*indexed, key));
-        return std::move(*indexed);
-    }
-    QZDownloadableFontCatalog catalog = QZLoadCatalogSource(source);
-    WriteIndex(indexPath, QZCompileCatalogIndex(catalog, key));
-    return catalog;
+        stored.publicKey == key.publicKey && stored.signatureSHA256 == key.signatureSHA256)
+        return compile(indexed->Catalog({}, true), key, indexPath);
+    return compile(QZLoadCatalogSource(source), key, indexPath);
 }

@@ -9,9 +9,11 @@
 // count is checked against the file before any view is made, and a damaged, truncated or hostile
 // index is compiled again. Written beside and renamed, so readers see a whole file or none.
 //
-// Layout (little-endian): a header (magic "GWCATIX1", counts, the key, the section offsets),
+// Layout (little-endian): a header (magic "GWCATIX2", counts, the key, the section offsets),
 // then arrays of fixed-size asset, font, localized-name and language records whose strings are
-// (offset, length) pairs into one string section.
+// (offset, length) pairs into one string section, and a table of (hash of a PostScript name,
+// asset, font) sorted by hash, so that the assets offering a font are found without reading the
+// others.
 #pragma once
 
 #include <array>
@@ -20,6 +22,7 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "desktop/QZCatalogSources.h"
 #include "desktop/QZDownloadableFontCatalog.h"
@@ -33,6 +36,31 @@ struct QZCatalogIndexKey {
     std::array<unsigned char, 32> publicKey{};       ///< zero for an unsigned source
     std::array<unsigned char, 32> signatureSHA256{}; ///< zero for an unsigned source
     bool operator==(const QZCatalogIndexKey&) const = default;
+};
+
+/// A checked index: every record was checked when it was opened, and views are made only of the
+/// assets asked for. Immutable; shared between threads.
+class QZCatalogIndexView {
+public:
+    /// Checks the index `bytes`, which `owner` keeps alive (the views made later point into
+    /// `bytes`). Null when any check fails. `*key` receives the key it was compiled from.
+    static std::shared_ptr<const QZCatalogIndexView>
+    Open(std::string_view bytes, std::shared_ptr<const void> owner, QZCatalogIndexKey* key);
+
+    size_t AssetCount() const { return counts_[0]; }
+    /// The assets (indexes, in catalog order) holding a font named `postScriptName`.
+    std::vector<uint32_t> AssetsOffering(std::string_view postScriptName) const;
+    /// The catalog of the assets `indexes` (in that order); every asset when `all`.
+    QZDownloadableFontCatalog Catalog(const std::vector<uint32_t>& indexes, bool all = false) const;
+
+private:
+    QZCatalogIndexView() = default;
+    std::string_view String(const char* reference) const;
+
+    std::shared_ptr<const void> owner_;
+    const char* data_ = nullptr;
+    uint32_t counts_[5] = {};  ///< assets, fonts, names, languages, lookup entries
+    uint64_t offsets_[6] = {}; ///< of the same sections, then of the strings
 };
 
 /// The index bytes of `catalog` compiled from the source `key`.
@@ -49,5 +77,6 @@ std::optional<QZDownloadableFontCatalog> QZReadCatalogIndex(std::string_view byt
 std::string QZCatalogIndexPath(const std::string& path);
 
 /// The catalog of `source` through its index: mapped when current, otherwise read as
-/// QZLoadCatalogSource does (with its log lines) and compiled into a new index.
-QZDownloadableFontCatalog QZLoadIndexedCatalogSource(const QZCatalogSource& source);
+/// QZLoadCatalogSource does (with its log lines) and compiled into a new index (kept in memory
+/// when it cannot be written). Never null.
+std::shared_ptr<const QZCatalogIndexView> QZLoadIndexedCatalogSource(const QZCatalogSource& source);

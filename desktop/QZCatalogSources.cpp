@@ -8,6 +8,7 @@
 #include <fcntl.h>
 #include <map>
 #include <mutex>
+#include <set>
 #include <sys/stat.h>
 #include <unistd.h>
 #include <unordered_set>
@@ -83,7 +84,7 @@ struct SourcesCache {
     std::mutex mutex;
     std::vector<SourceStamp> stamps; ///< of the merged view's sources
     std::vector<std::string> paths;
-    std::shared_ptr<const QZMergedDownloadableFontCatalog> merged;
+    std::shared_ptr<const QZDownloadableFontCatalogSources> merged;
     std::map<std::string, int64_t> expiredLogged; ///< publisher to the expiry logged
     bool noneLogged = false;
 };
@@ -206,7 +207,67 @@ QZMergeDownloadableFontCatalogs(std::vector<QZCatalogSource> sources,
     return merged;
 }
 
-std::shared_ptr<const QZMergedDownloadableFontCatalog> QZCurrentMergedDownloadableFontCatalog() {
+QZDownloadableFontCatalogSources::QZDownloadableFontCatalogSources(
+    std::vector<QZCatalogSource> sources,
+    std::vector<std::shared_ptr<const QZCatalogIndexView>> views)
+    : sources_(std::move(sources)), views_(std::move(views)) {}
+
+const QZMergedDownloadableFontCatalog& QZDownloadableFontCatalogSources::All() const {
+    std::call_once(allOnce_, [this] {
+        std::vector<QZDownloadableFontCatalog> catalogs;
+        for (const auto& view : views_)
+            catalogs.push_back(view->Catalog({}, true));
+        all_ = QZMergeDownloadableFontCatalogs(sources_, std::move(catalogs));
+    });
+    return all_;
+}
+
+QZMergedDownloadableFontCatalog
+QZDownloadableFontCatalogSources::Offering(const std::vector<std::string>& postScriptNames) const {
+    // Per source, the assets holding a name that no earlier source offers.
+    std::vector<std::set<uint32_t>> selected(views_.size());
+    for (const std::string& name : postScriptNames) {
+        for (size_t index = 0; index < views_.size(); ++index) {
+            const std::vector<uint32_t> assets = views_[index]->AssetsOffering(name);
+            if (assets.empty())
+                continue;
+            selected[index].insert(assets.begin(), assets.end());
+            break;
+        }
+    }
+    QZMergedDownloadableFontCatalog merged;
+    merged.sources = sources_;
+    auto storage = std::make_shared<MergedStorage>();
+    for (size_t index = 0; index < views_.size(); ++index) {
+        if (selected[index].empty())
+            continue;
+        QZDownloadableFontCatalog catalog = views_[index]->Catalog(
+            std::vector<uint32_t>(selected[index].begin(), selected[index].end()));
+        storage->sources.push_back(catalog.storage);
+        for (const QZDownloadableFontAsset& asset : catalog.assets) {
+            // As in All(): the fonts that an earlier source offers are not this asset's.
+            std::vector<QZDownloadableFont> fonts;
+            for (const QZDownloadableFont& font : asset.fonts) {
+                bool earlier = false;
+                for (size_t before = 0; before < index && !earlier; ++before)
+                    earlier = !views_[before]->AssetsOffering(font.postScriptName).empty();
+                if (!earlier)
+                    fonts.push_back(font);
+            }
+            if (fonts.empty())
+                continue;
+            QZDownloadableFontAsset kept = asset;
+            if (fonts.size() != asset.fonts.size())
+                kept.fonts = storage->fonts.emplace_back(std::move(fonts));
+            merged.catalog.assets.push_back(kept);
+            merged.assetSources.push_back(index);
+        }
+    }
+    merged.catalog.storage = std::move(storage);
+    return merged;
+}
+
+std::shared_ptr<const QZDownloadableFontCatalogSources> QZCurrentDownloadableFontCatalogSources() {
     std::vector<QZCatalogSource> sources = QZCurrentCatalogSources(int64_t(std::time(nullptr)));
     std::vector<SourceStamp> stamps;
     std::vector<std::string> paths;
@@ -227,12 +288,24 @@ std::shared_ptr<const QZMergedDownloadableFontCatalog> QZCurrentMergedDownloadab
     }
     cache.noneLogged = sources.empty();
     // Each source through its compiled index: no JSON is read while the indexes are current.
-    std::vector<QZDownloadableFontCatalog> catalogs;
+    std::vector<std::shared_ptr<const QZCatalogIndexView>> views;
     for (const QZCatalogSource& source : sources)
-        catalogs.push_back(QZLoadIndexedCatalogSource(source));
-    cache.merged = std::make_shared<const QZMergedDownloadableFontCatalog>(
-        QZMergeDownloadableFontCatalogs(std::move(sources), std::move(catalogs)));
+        views.push_back(QZLoadIndexedCatalogSource(source));
+    cache.merged = std::make_shared<const QZDownloadableFontCatalogSources>(std::move(sources),
+                                                                            std::move(views));
     cache.stamps = std::move(stamps);
     cache.paths = std::move(paths);
     return cache.merged;
+}
+
+std::shared_ptr<const QZMergedDownloadableFontCatalog> QZCurrentMergedDownloadableFontCatalog() {
+    const auto sources = QZCurrentDownloadableFontCatalogSources();
+    return std::shared_ptr<const QZMergedDownloadableFontCatalog>(sources, &sources->All());
+}
+
+std::shared_ptr<const QZDownloadableFontCatalog>
+QZCurrentDownloadableFontCatalogFor(const std::vector<std::string>& postScriptNames) {
+    auto merged = std::make_shared<const QZMergedDownloadableFontCatalog>(
+        QZCurrentDownloadableFontCatalogSources()->Offering(postScriptNames));
+    return std::shared_ptr<const QZDownloadableFontCatalog>(merged, &merged->catalog);
 }

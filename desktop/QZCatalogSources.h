@@ -11,6 +11,7 @@
 
 #include <cstdint>
 #include <memory>
+#include <mutex>
 #include <string>
 #include <vector>
 
@@ -50,6 +51,36 @@ QZMergeDownloadableFontCatalogs(std::vector<QZCatalogSource> sources,
 /// one log line, when it cannot be read, verified or parsed.
 QZDownloadableFontCatalog QZLoadCatalogSource(const QZCatalogSource& source);
 
-/// The current merged view: shared, never changed once handed out; rebuilt when a source
-/// changes. Thread-safe.
+class QZCatalogIndexView;
+
+/// The sources of one moment with their compiled indexes, from which merged views are made.
+/// Immutable once made; thread-safe.
+class QZDownloadableFontCatalogSources {
+public:
+    QZDownloadableFontCatalogSources(std::vector<QZCatalogSource> sources,
+                                     std::vector<std::shared_ptr<const QZCatalogIndexView>> views);
+    const std::vector<QZCatalogSource>& Sources() const { return sources_; }
+    /// Every asset of every source, merged; made on first use (its cost grows with the catalogs).
+    const QZMergedDownloadableFontCatalog& All() const;
+    /// The assets of All() that hold any of `postScriptNames`, in the same order and with the
+    /// same fonts, found through the indexes: a larger catalog costs no more.
+    QZMergedDownloadableFontCatalog Offering(const std::vector<std::string>& postScriptNames) const;
+
+private:
+    std::vector<QZCatalogSource> sources_;
+    std::vector<std::shared_ptr<const QZCatalogIndexView>> views_;
+    mutable std::once_flag allOnce_;
+    mutable QZMergedDownloadableFontCatalog all_;
+};
+
+/// The current sources: shared, never changed once handed out; made again when a source changes.
+/// Thread-safe.
+std::shared_ptr<const QZDownloadableFontCatalogSources> QZCurrentDownloadableFontCatalogSources();
+
+/// The current merged view of every asset (QZDownloadableFontCatalogSources::All()).
 std::shared_ptr<const QZMergedDownloadableFontCatalog> QZCurrentMergedDownloadableFontCatalog();
+
+/// The current merged view's assets that hold any of `postScriptNames`: what a question about
+/// those fonts needs, at a cost that does not grow with the catalogs.
+std::shared_ptr<const QZDownloadableFontCatalog>
+QZCurrentDownloadableFontCatalogFor(const std::vector<std::string>& postScriptNames);

@@ -120,7 +120,19 @@ CFArrayRef
 QZCopyDownloadableFontAttributesForRequests(CFArrayRef requestedFontAttributeDictionaries) {
     if (!requestedFontAttributeDictionaries)
         return nullptr;
-    const auto catalog = QZCurrentDownloadableFontCatalog();
+    // The names asked for first: only their assets are looked up, through the indexes.
+    std::vector<std::string> names;
+    const CFIndex count = CFArrayGetCount(requestedFontAttributeDictionaries);
+    for (CFIndex i = 0; i < count; ++i) {
+        const void* element = CFArrayGetValueAtIndex(requestedFontAttributeDictionaries, i);
+        const bool dictionary = element && CFGetTypeID(element) == CFDictionaryGetTypeID();
+        names.push_back(dictionary ? QZQStringIfString(
+                                         CFDictionaryGetValue(static_cast<CFDictionaryRef>(element),
+                                                              NSFontNameAttribute))
+                                         .toStdString()
+                                   : std::string());
+    }
+    const auto catalog = QZCurrentDownloadableFontCatalogFor(names);
     QZInstalledFontCheck installed;
     {
         CatalogCache& cache = Cache();
@@ -128,16 +140,9 @@ QZCopyDownloadableFontAttributesForRequests(CFArrayRef requestedFontAttributeDic
         installed = cache.installedCheck;
     }
     CFMutableArrayRef result = CFArrayCreateMutable(kCFAllocatorDefault, 0, &kCFTypeArrayCallBacks);
-    const CFIndex count = CFArrayGetCount(requestedFontAttributeDictionaries);
-    for (CFIndex i = 0; i < count; ++i) {
-        const void* element = CFArrayGetValueAtIndex(requestedFontAttributeDictionaries, i);
-        if (!element || CFGetTypeID(element) != CFDictionaryGetTypeID())
+    for (const std::string& postScriptName : names) {
+        if (postScriptName.empty())
             continue;
-        const QString name = QZQStringIfString(
-            CFDictionaryGetValue(static_cast<CFDictionaryRef>(element), NSFontNameAttribute));
-        if (name.isEmpty())
-            continue;
-        const std::string postScriptName = name.toStdString();
         if (installed && installed(postScriptName))
             continue;
         for (const QZDownloadableFontAsset& asset : catalog->assets) {

@@ -1,7 +1,9 @@
 // Reads arbitrary bytes as a compiled catalog index. Whatever it accepts must hold only views
-// inside the input, and compile back into an index that reads the same.
+// inside the input, find only assets that hold the name looked up, and compile back into an
+// index that reads the same.
 #include <cstddef>
 #include <cstdint>
+#include <optional>
 #include <string_view>
 
 #include "FuzzSupport.h"
@@ -15,9 +17,10 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
                                 text.data() + text.size() <= bytes.data() + bytes.size());
     };
     QZCatalogIndexKey key;
-    const auto catalog = QZReadCatalogIndex(bytes, nullptr, &key);
-    if (!catalog)
+    const auto view = QZCatalogIndexView::Open(bytes, nullptr, &key);
+    if (!view)
         return 0;
+    const std::optional<QZDownloadableFontCatalog> catalog = view->Catalog({}, true);
     size_t fonts = 0;
     for (const QZDownloadableFontAsset& asset : catalog->assets) {
         fuzz::Check(inside(asset.localID) && inside(asset.url) && inside(asset.sha256) &&
@@ -28,6 +31,13 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
                 fuzz::Check(inside(name.language) && inside(name.name));
             for (const std::string_view language : font.languages)
                 fuzz::Check(inside(language));
+            for (const uint32_t found : view->AssetsOffering(font.postScriptName)) {
+                fuzz::Check(found < catalog->assets.size());
+                bool holds = false;
+                for (const QZDownloadableFont& other : catalog->assets[found].fonts)
+                    holds = holds || other.postScriptName == font.postScriptName;
+                fuzz::Check(holds);
+            }
             ++fonts;
         }
     }

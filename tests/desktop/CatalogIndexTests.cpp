@@ -59,7 +59,9 @@ TEST(CatalogIndex, KeepsEveryMemberAndRefusesEveryDamagedField) {
     EXPECT_EQ(read, key);
 
     // Offsets into the file (the layout's header fields and the first records).
-    const size_t assets = 208, fonts = assets + 40, names = fonts + 32;
+    const size_t assets = 224, fonts = assets + 40, names = fonts + 32;
+    uint64_t lookups = 0;
+    std::memcpy(&lookups, index.data() + 200, sizeof lookups);
     const auto patch = [&](size_t at, uint32_t value) {
         std::string bytes = index;
         std::memcpy(bytes.data() + at, &value, sizeof value);
@@ -75,7 +77,7 @@ TEST(CatalogIndex, KeepsEveryMemberAndRefusesEveryDamagedField) {
         std::string bytes;
     } cases[] = {
         {"truncated", index.substr(0, index.size() - 1)},
-        {"header only", index.substr(0, 208)},
+        {"header only", index.substr(0, 224)},
         {"another magic", "X" + index.substr(1)},
         {"asset count beyond the file", patch(144, 0x10000000)},
         {"string offset beyond the strings", patch(assets, 0xffffff00)},
@@ -83,7 +85,9 @@ TEST(CatalogIndex, KeepsEveryMemberAndRefusesEveryDamagedField) {
         {"font range beyond the fonts", patch(assets + 36, 2)},
         {"an asset without fonts", patch(assets + 36, 0)},
         {"name range beyond the names", patch(fonts + 16, 1)},
-        {"section before the header", patch(160, 8)},
+        {"section before the header", patch(168, 8)},
+        {"a lookup entry naming no asset", patch(size_t(lookups) + 8, 5)},
+        {"a lookup entry naming another asset's font", patch(size_t(lookups) + 12, 7)},
         {"a SHA-256 that is not lower-case hex", badSHA},
         {"names out of order", unsorted},
     };
@@ -101,7 +105,7 @@ TEST(CatalogIndex, ACurrentIndexIsUsedWithoutTheSourceAndABadOneIsCompiledAgain)
     const std::string path = root + "/downloadable-fonts.json";
     std::ofstream(path) << kCatalog;
     const QZCatalogSource source{QZCatalogSource::Kind::User, "user", path, {}, {}};
-    const std::string expected = Describe(QZLoadIndexedCatalogSource(source));
+    const std::string expected = Describe(QZLoadIndexedCatalogSource(source)->Catalog({}, true));
     ASSERT_NE(expected, "");
     const std::string index = QZCatalogIndexPath(path);
     ASSERT_TRUE(fs::exists(index));
@@ -116,19 +120,19 @@ TEST(CatalogIndex, ACurrentIndexIsUsedWithoutTheSourceAndABadOneIsCompiledAgain)
     std::string garbled(kCatalog.size(), '#');
     std::ofstream(path) << garbled;
     restoreTime();
-    EXPECT_EQ(Describe(QZLoadIndexedCatalogSource(source)), expected);
+    EXPECT_EQ(Describe(QZLoadIndexedCatalogSource(source)->Catalog({}, true)), expected);
     // A damaged index is compiled again from the source, whatever it holds now.
     std::ofstream(path) << kCatalog;
     restoreTime();
     for (const std::string& damage : {std::string("junk"), Contents(index).substr(0, 300)}) {
         std::ofstream(index, std::ios::binary) << damage;
-        EXPECT_EQ(Describe(QZLoadIndexedCatalogSource(source)), expected);
+        EXPECT_EQ(Describe(QZLoadIndexedCatalogSource(source)->Catalog({}, true)), expected);
         QZCatalogIndexKey key;
         EXPECT_TRUE(QZReadCatalogIndex(Contents(index), nullptr, &key));
     }
     // A changed source is compiled again.
     std::ofstream(path) << R"({"assets": []})";
-    EXPECT_EQ(Describe(QZLoadIndexedCatalogSource(source)), "");
+    EXPECT_EQ(Describe(QZLoadIndexedCatalogSource(source)->Catalog({}, true)), "");
     fs::remove_all(root);
 }
 

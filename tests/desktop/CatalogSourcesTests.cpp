@@ -101,6 +101,18 @@ TEST(CatalogSources, TheFirstSourceOfANameWinsAndOnlyVerifiedCurrentPublishersCo
             EXPECT_EQ(lines[0].substr(0, c.log.size()), c.log);
         }
         EXPECT_EQ(View(), expected); // read once: nothing logged again
+        // A question finds the same assets through the indexes alone.
+        const auto asked = QZCurrentDownloadableFontCatalogFor({"F4", "F2", "F3", "F1", "F9"});
+        std::vector<std::string> found;
+        for (const QZDownloadableFontAsset& asset : asked->assets)
+            for (const QZDownloadableFont& font : asset.fonts)
+                found.push_back(std::string(asset.localID) + ":" +
+                                std::string(font.postScriptName));
+        std::vector<std::string> all;
+        for (const std::string& line : expected)
+            for (size_t at = 2; at < line.find('@'); at = line.find_first_of(",@", at) + 1)
+                all.push_back(line.substr(0, 2) + line.substr(at, 2));
+        EXPECT_EQ(found, all);
         EXPECT_EQ(log.Texts().size(), lines.size());
     }
     fs::remove_all(root);
