@@ -157,7 +157,7 @@ std::shared_ptr<const QZCatalogIndexView> MapIndex(const std::string& path,
     if (mapping->address == MAP_FAILED)
         return nullptr;
     const std::string_view bytes(static_cast<const char*>(mapping->address), mapping->size);
-    return QZCatalogIndexView::Open(bytes, mapping, key);
+    return QZCatalogIndexView::Open(bytes, mapping, key, path);
 }
 
 /// Writes `bytes` as the index at `path`: beside it first, then renamed over it.
@@ -255,7 +255,7 @@ std::string_view QZCatalogIndexView::String(const char* reference) const {
 
 std::shared_ptr<const QZCatalogIndexView>
 QZCatalogIndexView::Open(std::string_view bytes, std::shared_ptr<const void> owner,
-                         QZCatalogIndexKey* key) {
+                         QZCatalogIndexKey* key, std::string path) {
     const char* data = bytes.data();
     if (bytes.size() < kHeaderSize || std::memcmp(data, kMagic, sizeof kMagic) != 0 ||
         Load<uint32_t>(data + 8) != kHeaderSize ||
@@ -304,24 +304,15 @@ QZCatalogIndexView::Open(std::string_view bytes, std::shared_ptr<const void> own
         const char* record = data + offsets[1] + i * kFontSize;
         const uint32_t firstName = Load<uint32_t>(record + 16),
                        nameCount = Load<uint32_t>(record + 20);
-        if (!valid(record) || Load<uint32_t>(record + 4) == 0 || !valid(record + 8) ||
-            !range(firstName, nameCount, counts[2]) ||
+        if (!valid(record) || !valid(record + 8) || !range(firstName, nameCount, counts[2]) ||
             !range(Load<uint32_t>(record + 24), Load<uint32_t>(record + 28), counts[3]))
             return nullptr;
-        // LocalizedFamilyName looks names up by binary search: each language once, in order.
-        const char* names = data + offsets[2] + size_t(firstName) * kNameSize;
-        for (uint32_t n = 1; n < nameCount; ++n)
-            if (!(view->String(names + (n - 1) * kNameSize) < view->String(names + n * kNameSize)))
-                return nullptr;
     }
     for (uint32_t i = 0; i < counts[0]; ++i) {
         const char* record = data + offsets[0] + i * kAssetSize;
         const uint32_t fontCount = Load<uint32_t>(record + 36);
-        if (!valid(record) || Load<uint32_t>(record + 4) == 0 || !valid(record + 8) ||
-            Load<uint32_t>(record + 12) == 0 || !valid(record + 16) ||
-            !IsSHA256Text(view->String(record + 16)) ||
-            Load<uint64_t>(record + 24) > uint64_t(std::numeric_limits<int64_t>::max()) ||
-            fontCount == 0 || !range(Load<uint32_t>(record + 32), fontCount, counts[1]))
+        if (!valid(record) || !valid(record + 8) || !valid(record + 16) || fontCount == 0 ||
+            !range(Load<uint32_t>(record + 32), fontCount, counts[1]))
             return nullptr;
     }
     // The lookup table: sorted, each entry a font of its asset.
@@ -339,7 +330,30 @@ QZCatalogIndexView::Open(std::string_view bytes, std::shared_ptr<const void> own
             return nullptr;
     }
     view->owner_ = std::move(owner);
+    view->path_ = std::move(path);
     return view;
+}
+
+bool QZCatalogIndexView::AssetIsSound(const char* record) const {
+    const auto fontRecord = [&](uint32_t font) {
+        return data_ + offsets_[1] + size_t(font) * kFontSize;
+    };
+    if (String(record).empty() || String(record + 8).empty() ||
+        !IsSHA256Text(String(record + 16)) ||
+        Load<uint64_t>(record + 24) > uint64_t(std::numeric_limits<int64_t>::max()))
+        return false;
+    const uint32_t first = Load<uint32_t>(record + 32), fontCount = Load<uint32_t>(record + 36);
+    for (uint32_t f = first; f < first + fontCount; ++f) {
+        const char* font = fontRecord(f);
+        if (String(font).empty())
+            return false;
+        // LocalizedFamilyName looks names up by binary search: each language once, in order.
+        const char* names = data_ + offsets_[2] + size_t(Load<uint32_t>(font + 16)) * kNameSize;
+        for (uint32_t n = 1; n < Load<uint32_t>(font + 20); ++n)
+            if (!(String(names + (n - 1) * kNameSize) < String(names + n * kNameSize)))
+                return false;
+    }
+    return true;
 }
 
 std::vector<uint32_t> QZCatalogIndexView::AssetsOffering(std::string_view postScriptName) const {
@@ -364,11 +378,21 @@ std::vector<uint32_t> QZCatalogIndexView::AssetsOffering(std::string_view postSc
     return assets;
 }
 
-QZDownloadableFontCatalog QZCatalogIndexView::Catalog(const std::vector<uint32_t>& indexes,
+QZDownloadableFontCatalog QZCatalogIndexView::Catalog(const std::vector<uint32_t>& wanted,
                                                       bool all) const {
-    const size_t count = all ? counts_[0] : indexes.size();
+    // Each asset's contents are checked before a view of it is made; a damaged one is left out
+    // and the index file removed, so that the next question compiles it again.
+    std::vector<uint32_t> indexes;
+    for (size_t i = 0, end = all ? counts_[0] : wanted.size(); i < end; ++i) {
+        const uint32_t index = all ? uint32_t(i) : wanted[i];
+        if (AssetIsSound(data_ + offsets_[0] + size_t(index) * kAssetSize))
+            indexes.push_back(index);
+        else if (!damaged_.exchange(true) && !path_.empty())
+            unlink(path_.c_str());
+    }
+    const size_t count = indexes.size();
     const auto assetRecord = [&](size_t i) {
-        return data_ + offsets_[0] + size_t(all ? uint32_t(i) : indexes[i]) * kAssetSize;
+        return data_ + offsets_[0] + size_t(indexes[i]) * kAssetSize;
     };
     const auto fontRecord = [&](uint32_t font) {
         return data_ + offsets_[1] + size_t(font) * kFontSize;
@@ -433,7 +457,10 @@ std::optional<QZDownloadableFontCatalog> QZReadCatalogIndex(std::string_view byt
     const auto view = QZCatalogIndexView::Open(bytes, std::move(owner), key);
     if (!view)
         return std::nullopt;
-    return view->Catalog({}, true);
+    QZDownloadableFontCatalog catalog = view->Catalog({}, true);
+    if (view->IsDamaged())
+        return std::nullopt;
+    return catalog;
 }
 
 std::string QZCatalogIndexPath(const std::string& path) {

@@ -17,6 +17,7 @@
 #pragma once
 
 #include <array>
+#include <atomic>
 #include <cstdint>
 #include <memory>
 #include <optional>
@@ -38,26 +39,37 @@ struct QZCatalogIndexKey {
     bool operator==(const QZCatalogIndexKey&) const = default;
 };
 
-/// A checked index: every record was checked when it was opened, and views are made only of the
-/// assets asked for. Immutable; shared between threads.
+/// A checked index: every offset, length and count was checked when it was opened; an asset's
+/// contents (non-empty names, a SHA-256 of 64 lower-case hexadecimal digits, a size up to
+/// INT64_MAX, localized names in order) are checked before a view of it is made, and views are
+/// made only of the assets asked for. Immutable; shared between threads.
 class QZCatalogIndexView {
 public:
     /// Checks the index `bytes`, which `owner` keeps alive (the views made later point into
-    /// `bytes`). Null when any check fails. `*key` receives the key it was compiled from.
-    static std::shared_ptr<const QZCatalogIndexView>
-    Open(std::string_view bytes, std::shared_ptr<const void> owner, QZCatalogIndexKey* key);
+    /// `bytes`). Null when any check fails. `*key` receives the key it was compiled from. When an
+    /// asset turns out damaged later, the file `path` (if given) is removed.
+    static std::shared_ptr<const QZCatalogIndexView> Open(std::string_view bytes,
+                                                          std::shared_ptr<const void> owner,
+                                                          QZCatalogIndexKey* key,
+                                                          std::string path = {});
 
     size_t AssetCount() const { return counts_[0]; }
     /// The assets (indexes, in catalog order) holding a font named `postScriptName`.
     std::vector<uint32_t> AssetsOffering(std::string_view postScriptName) const;
-    /// The catalog of the assets `indexes` (in that order); every asset when `all`.
+    /// The catalog of the assets `indexes` (in that order); every asset when `all`. A damaged
+    /// asset is left out, and the index file removed so that it is compiled again.
     QZDownloadableFontCatalog Catalog(const std::vector<uint32_t>& indexes, bool all = false) const;
+    /// Whether an asset was found damaged.
+    bool IsDamaged() const { return damaged_.load(); }
 
 private:
     QZCatalogIndexView() = default;
     std::string_view String(const char* reference) const;
+    bool AssetIsSound(const char* record) const;
 
     std::shared_ptr<const void> owner_;
+    std::string path_;
+    mutable std::atomic<bool> damaged_{false};
     const char* data_ = nullptr;
     uint32_t counts_[5] = {};  ///< assets, fonts, names, languages, lookup entries
     uint64_t offsets_[6] = {}; ///< of the same sections, then of the strings

@@ -2,6 +2,7 @@
 // them, and the cache that keeps each source's catalog until its files change.
 #include "desktop/QZCatalogSources.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
 #include <ctime>
@@ -222,6 +223,11 @@ const QZMergedDownloadableFontCatalog& QZDownloadableFontCatalogSources::All() c
     return all_;
 }
 
+bool QZDownloadableFontCatalogSources::IsDamaged() const {
+    return std::any_of(views_.begin(), views_.end(),
+                       [](const auto& view) { return view->IsDamaged(); });
+}
+
 QZMergedDownloadableFontCatalog
 QZDownloadableFontCatalogSources::Offering(const std::vector<std::string>& postScriptNames) const {
     // Per source, the assets holding a name that no earlier source offers.
@@ -277,7 +283,8 @@ std::shared_ptr<const QZDownloadableFontCatalogSources> QZCurrentDownloadableFon
     }
     SourcesCache& cache = Cache();
     std::lock_guard<std::mutex> lock(cache.mutex);
-    if (cache.merged && cache.stamps == stamps && cache.paths == paths)
+    if (cache.merged && cache.stamps == stamps && cache.paths == paths &&
+        !cache.merged->IsDamaged())
         return cache.merged;
     if (sources.empty() && !cache.noneLogged) {
         std::string searched = QZUserCatalogPath();

@@ -65,6 +65,8 @@ public:
     /// The assets of All() that hold any of `postScriptNames`, in the same order and with the
     /// same fonts, found through the indexes: a larger catalog costs no more.
     QZMergedDownloadableFontCatalog Offering(const std::vector<std::string>& postScriptNames) const;
+    /// Whether an index turned out damaged since: the sources must be read again.
+    bool IsDamaged() const;
 
 private:
     std::vector<QZCatalogSource> sources_;

@@ -130,6 +130,12 @@ TEST(CatalogIndex, ACurrentIndexIsUsedWithoutTheSourceAndABadOneIsCompiledAgain)
         QZCatalogIndexKey key;
         EXPECT_TRUE(QZReadCatalogIndex(Contents(index), nullptr, &key));
     }
+    // An asset found damaged only when it is used is left out, and the index compiled again.
+    std::string index2 = Contents(index);
+    index2[index2.find(kSHA)] = 'x';
+    std::ofstream(index, std::ios::binary) << index2;
+    EXPECT_EQ(Describe(QZLoadIndexedCatalogSource(source)->Catalog({}, true)), "");
+    EXPECT_EQ(Describe(QZLoadIndexedCatalogSource(source)->Catalog({}, true)), expected);
     // A changed source is compiled again.
     std::ofstream(path) << R"({"assets": []})";
     EXPECT_EQ(Describe(QZLoadIndexedCatalogSource(source)->Catalog({}, true)), "");
