@@ -405,15 +405,20 @@ QZPublisherState QZReadPublisherState(const std::string& directory) {
 QZPublisherRefresh QZRefreshCatalogPublisher(const QZCatalogPublisher& publisher, int64_t now) {
     const std::string directory = QZPublisherCacheDirectory(publisher.name);
     const QZPublisherState kept = QZReadPublisherState(directory);
+    // A state whose files were removed by hand still guards against a rollback, but asks for the
+    // catalog unconditionally.
+    const bool haveCopy = kept.present &&
+                          access((directory + "/" + kCatalogFile).c_str(), R_OK) == 0 &&
+                          access((directory + "/" + kSignatureFile).c_str(), R_OK) == 0;
     std::vector<std::string> headers;
-    if (kept.present && !kept.etag.empty())
+    if (haveCopy && !kept.etag.empty())
         headers.push_back("If-None-Match: " + kept.etag);
-    else if (kept.present && !kept.lastModified.empty())
+    else if (haveCopy && !kept.lastModified.empty())
         headers.push_back("If-Modified-Since: " + kept.lastModified);
     const Response catalog = Get(publisher.url, kMaximumPublishedCatalogSize, headers);
     if (!catalog.error.empty())
         return Refused("the catalog: " + catalog.error, kept);
-    if (catalog.status == 304 && kept.present) {
+    if (catalog.status == 304 && haveCopy) {
         QZPublisherRefresh refresh;
         refresh.outcome = QZPublisherRefresh::Outcome::NotModified;
         refresh.version = kept.version;
