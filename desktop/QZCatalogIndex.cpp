@@ -475,8 +475,11 @@ QZLoadIndexedCatalogSource(const QZCatalogSource& source) {
                             const std::string& indexPath) {
         auto bytes = std::make_shared<const std::string>(QZCompileCatalogIndex(catalog, key));
         WriteIndex(indexPath, *bytes);
-        QZCatalogIndexKey ignored;
-        return QZCatalogIndexView::Open(*bytes, bytes, &ignored);
+        // Mapped from the file when it was written: pages the kernel can share and drop.
+        QZCatalogIndexKey written;
+        if (auto mapped = MapIndex(indexPath, &written); mapped && written == key)
+            return mapped;
+        return QZCatalogIndexView::Open(*bytes, bytes, &written);
     };
     const std::string indexPath = QZCatalogIndexPath(source.path);
     struct stat status {};
