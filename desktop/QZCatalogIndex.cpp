@@ -118,28 +118,6 @@ std::array<unsigned char, 32> DigestBytes(std::string_view bytes) {
     return digest;
 }
 
-/// The whole regular file at `path` if it has at most `limit` bytes.
-std::optional<std::string> ReadWhole(const std::string& path, uint64_t limit) {
-    const int fd = open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY);
-    struct stat status {};
-    if (fd < 0)
-        return std::nullopt;
-    std::string bytes;
-    bool good =
-        fstat(fd, &status) == 0 && S_ISREG(status.st_mode) && uint64_t(status.st_size) <= limit;
-    if (good)
-        bytes.resize(size_t(status.st_size));
-    for (size_t done = 0; good && done < bytes.size();) {
-        const ssize_t count = read(fd, bytes.data() + done, bytes.size() - done);
-        if (count < 0 && errno == EINTR)
-            continue;
-        good = count > 0;
-        done += good ? size_t(count) : 0;
-    }
-    close(fd);
-    return good ? std::optional<std::string>(std::move(bytes)) : std::nullopt;
-}
-
 /// Maps and checks the index at `path`.
 std::shared_ptr<const QZCatalogIndexView> MapIndex(const std::string& path,
                                                    QZCatalogIndexKey* key) {
@@ -491,7 +469,8 @@ QZLoadIndexedCatalogSource(const QZCatalogSource& source) {
     key.modified = int64_t(status.st_mtim.tv_sec) * 1000000000 + status.st_mtim.tv_nsec;
     if (source.kind == QZCatalogSource::Kind::Publisher) {
         key.publicKey = source.publicKey.key;
-        if (const auto signature = ReadWhole(source.signaturePath, kMaximumCatalogSignatureSize))
+        if (const auto signature =
+                QZReadCatalogFile(source.signaturePath, kMaximumCatalogSignatureSize))
             key.signatureSHA256 = DigestBytes(*signature);
     }
     QZCatalogIndexKey stored;
@@ -500,7 +479,8 @@ QZLoadIndexedCatalogSource(const QZCatalogSource& source) {
     if (indexed && stored == key)
         return indexed;
     // Changed, or only touched: the source's SHA-256 decides.
-    const std::optional<std::string> bytes = ReadWhole(source.path, kMaximumPublishedCatalogSize);
+    const std::optional<std::string> bytes =
+        QZReadCatalogFile(source.path, kMaximumPublishedCatalogSize);
     if (!bytes)
         return compile(QZLoadCatalogSource(source), {}, indexPath); // logs why it is unreadable
     key.sha256 = DigestBytes(*bytes);

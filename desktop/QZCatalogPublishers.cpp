@@ -63,29 +63,6 @@ bool IsHTTPURL(const std::string& url) {
     return false;
 }
 
-/// The whole regular file at `path` if it has at most `limit` bytes.
-std::optional<std::string> ReadSmallFile(const std::string& path, size_t limit) {
-    const int fd = open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY);
-    if (fd < 0)
-        return std::nullopt;
-    struct stat status {};
-    std::string text;
-    bool good =
-        fstat(fd, &status) == 0 && S_ISREG(status.st_mode) && uint64_t(status.st_size) <= limit;
-    char buffer[8192];
-    while (good) {
-        const ssize_t count = read(fd, buffer, sizeof buffer);
-        if (count < 0 && errno == EINTR)
-            continue;
-        good = count >= 0 && text.size() + size_t(count) <= limit;
-        if (count <= 0)
-            break;
-        text.append(buffer, size_t(count));
-    }
-    close(fd);
-    return good ? std::optional<std::string>(std::move(text)) : std::nullopt;
-}
-
 /// Writes `bytes` to a temporary file in `directory`, synced; its path, or empty on failure.
 std::string WriteTemporary(const std::string& directory, const std::string& bytes) {
     std::string path = directory + "/.new-XXXXXX";
@@ -340,7 +317,7 @@ QZReadCatalogPublishers(const std::vector<std::string>& directories) {
         std::optional<QZCatalogPublisher> publisher;
         if (!IsPublisherName(name)) {
             problem = "the name may hold only letters, digits, '-', '_' and '.'";
-        } else if (const auto text = ReadSmallFile(path, kMaximumPublisherFileSize); !text) {
+        } else if (const auto text = QZReadCatalogFile(path, kMaximumPublisherFileSize); !text) {
             problem = "not a readable file of at most " +
                       std::to_string(kMaximumPublisherFileSize) + " bytes";
         } else {
@@ -374,7 +351,7 @@ std::string QZPublisherCacheDirectory(const std::string& name) {
 QZPublisherState QZReadPublisherState(const std::string& directory) {
     QZPublisherState state;
     const std::optional<std::string> text =
-        ReadSmallFile(directory + "/" + kStateFile, kMaximumPublisherFileSize);
+        QZReadCatalogFile(directory + "/" + kStateFile, kMaximumPublisherFileSize);
     if (!text)
         return state;
     std::istringstream lines(*text);

@@ -1,17 +1,14 @@
 // The merged catalog view: which sources exist, loading one (verified for a publisher), merging
-// them, and the cache that keeps each source's catalog until its files change.
+// them whole or for a few fonts, and the cache that keeps the current sources and their indexes
+// until a file changes.
 #include "desktop/QZCatalogSources.h"
 
 #include <algorithm>
-#include <cerrno>
-#include <cstring>
 #include <ctime>
-#include <fcntl.h>
 #include <map>
 #include <mutex>
 #include <set>
 #include <sys/stat.h>
-#include <unistd.h>
 #include <unordered_set>
 
 #include "desktop/QZCatalogIndex.h"
@@ -50,35 +47,6 @@ struct SourceStamp {
 
 SourceStamp StampOf(const QZCatalogSource& source) {
     return {StampOf(source.path), StampOf(source.signaturePath), source.publicKey.key};
-}
-
-/// Reads the whole file at `path` (at most `limit` bytes); false with the reason otherwise.
-bool ReadWhole(const std::string& path, size_t limit, std::string* bytes, std::string* problem) {
-    const int fd = open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY);
-    struct stat status {};
-    if (fd < 0 || fstat(fd, &status) != 0 || !S_ISREG(status.st_mode) ||
-        uint64_t(status.st_size) > limit) {
-        *problem =
-            fd < 0 ? std::strerror(errno)
-                   : (S_ISREG(status.st_mode) ? "larger than " + std::to_string(limit) + " bytes"
-                                              : "not a regular file");
-        if (fd >= 0)
-            close(fd);
-        return false;
-    }
-    bytes->resize(size_t(status.st_size));
-    size_t done = 0;
-    while (done < bytes->size()) {
-        const ssize_t count = read(fd, bytes->data() + done, bytes->size() - done);
-        if (count < 0 && errno == EINTR)
-            continue;
-        if (count <= 0)
-            break;
-        done += size_t(count);
-    }
-    close(fd);
-    bytes->resize(done);
-    return true;
 }
 
 struct SourcesCache {
@@ -136,18 +104,20 @@ std::vector<QZCatalogSource> QZCurrentCatalogSources(int64_t now) {
 }
 
 QZDownloadableFontCatalog QZLoadCatalogSource(const QZCatalogSource& source) {
-    std::string bytes, problem;
-    if (!ReadWhole(source.path, kMaximumPublishedCatalogSize, &bytes, &problem)) {
+    std::string problem;
+    const std::optional<std::string> bytes =
+        QZReadCatalogFile(source.path, kMaximumPublishedCatalogSize, &problem);
+    if (!bytes) {
         glyphwell::AppLog("Cannot read the downloadable font catalog %s: %s",
                           glyphwell::LogEscape(source.path).c_str(),
                           glyphwell::LogEscape(problem).c_str());
         return {};
     }
     if (source.kind == QZCatalogSource::Kind::Publisher) {
-        std::string signature;
         QZCatalogSignatureCheck check;
-        if (ReadWhole(source.signaturePath, kMaximumCatalogSignatureSize, &signature, &problem)) {
-            check = QZVerifyCatalogSignature(bytes, signature, source.publicKey);
+        if (const auto signature =
+                QZReadCatalogFile(source.signaturePath, kMaximumCatalogSignatureSize, &problem)) {
+            check = QZVerifyCatalogSignature(*bytes, *signature, source.publicKey);
             problem = check.problem;
         }
         if (!check.valid) {
@@ -157,7 +127,7 @@ QZDownloadableFontCatalog QZLoadCatalogSource(const QZCatalogSource& source) {
             return {};
         }
     }
-    return QZDownloadableFontCatalog::Parse(bytes, source.path);
+    return QZDownloadableFontCatalog::Parse(*bytes, source.path);
 }
 
 QZMergedDownloadableFontCatalog
