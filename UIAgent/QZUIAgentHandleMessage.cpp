@@ -13,6 +13,7 @@
 #include "cfutil/TCFNumber.h"
 #include "cfutil/TCFRetained.h"
 #include "cfutil/TCFTypeRef.h"
+#include "desktop/QZCatalogSources.h"
 #include "desktop/QZDownloadableFontCatalog.h"
 #include "desktop/QZFontMatching.h"
 #include "desktop/QZQtStrings.h"
@@ -102,16 +103,19 @@ bool FontIsAvailable(const QZDownloadableFontCatalog& catalog, const std::string
 /// a new array; the caller releases it.
 CFArrayRef CreateAvailableFontDescriptors(CFDictionaryRef request) {
     TCFAdopted<CFArrayRef> all(QZCreateFontDescriptors(request));
+    std::vector<std::string> names;
+    for (CFIndex i = 0; i < CFArrayGetCount(all); ++i)
+        names.push_back(
+            QZQString(QZGetTypedValue<CFStringRef>(QZGetTypedElement<CFDictionaryRef>(all, i),
+                                                   NSFontNameAttribute))
+                .toStdString());
+    // Only the assets of these fonts, found through the catalogs' indexes.
     const std::shared_ptr<const QZDownloadableFontCatalog> catalog =
-        QZCurrentDownloadableFontCatalog();
+        QZCurrentDownloadableFontCatalogFor(names);
     TCFMutableArray available(0);
-    for (CFIndex i = 0; i < CFArrayGetCount(all); ++i) {
-        const auto descriptor = QZGetTypedElement<CFDictionaryRef>(all, i);
-        const QString name =
-            QZQString(QZGetTypedValue<CFStringRef>(descriptor, NSFontNameAttribute));
-        if (FontIsAvailable(*catalog, name.toStdString()))
-            available.Append(descriptor);
-    }
+    for (CFIndex i = 0; i < CFArrayGetCount(all); ++i)
+        if (FontIsAvailable(*catalog, names[size_t(i)]))
+            available.Append(QZGetTypedElement<CFDictionaryRef>(all, i));
     return available.Orphan();
 }
 

@@ -1,11 +1,11 @@
 #include "desktop/QZDownloadableFontCatalog.h"
 
 #include <mutex>
-#include <sys/stat.h>
 
 #include "cfutil/CFStringUtilities.h"
-#include "cfutil/CFUserDirectories.h"
 #include "cfutil/TCFRetained.h"
+#include "desktop/QZCatalogPaths.h"
+#include "desktop/QZCatalogSources.h"
 #include "platform/CFDictionary.h"
 #include "platform/CFNumber.h"
 #include "platform/Log.h"
@@ -14,37 +14,14 @@
 
 namespace {
 
-constexpr char kCatalogRelativePath[] = "glyphwell/downloadable-fonts.json";
-/// The state of the catalog file that the cached catalog was read from.
-struct FileState {
-    std::string path; ///< empty: no catalog file
-    int64_t size = -1;
-    int64_t modified = 0; ///< nanoseconds since the epoch
-    bool operator==(const FileState&) const = default;
-};
-
 struct CatalogCache {
     std::mutex mutex;
-    bool loaded = false;
-    FileState state;
-    std::shared_ptr<const QZDownloadableFontCatalog> catalog =
-        std::make_shared<QZDownloadableFontCatalog>();
     QZInstalledFontCheck installedCheck;
 };
 
 CatalogCache& Cache() {
     static CatalogCache cache;
     return cache;
-}
-
-FileState CurrentFileState() {
-    for (const std::string& path : QZDownloadableFontCatalogPaths()) {
-        struct stat status {};
-        if (stat(path.c_str(), &status) == 0)
-            return {path, int64_t(status.st_size),
-                    int64_t(status.st_mtim.tv_sec) * 1000000000 + status.st_mtim.tv_nsec};
-    }
-    return {};
 }
 
 /// Logs the problems of the catalog `origin` as the agent reports them: an unreadable or
@@ -64,21 +41,6 @@ void LogProblems(const std::vector<QZCatalogProblem>& problems, const std::strin
         glyphwell::AppLog("Skipping asset %zu of the downloadable font catalog %s: %s",
                           problem.asset, place.c_str(),
                           glyphwell::LogEscape(problem.message).c_str());
-}
-
-QZDownloadableFontCatalog LoadCatalog(const FileState& state) {
-    if (state.path.empty()) {
-        std::string paths;
-        for (const std::string& path : QZDownloadableFontCatalogPaths())
-            paths += (paths.empty() ? "" : ", ") + path;
-        glyphwell::AppLog("No downloadable font catalog: none of %s exists",
-                          glyphwell::LogEscape(paths).c_str());
-        return {};
-    }
-    std::vector<QZCatalogProblem> problems;
-    QZDownloadableFontCatalog catalog = QZReadDownloadableFontCatalogFile(state.path, problems);
-    LogProblems(problems, state.path);
-    return catalog;
 }
 
 /// The dictionary that describes `asset` for the font `font` it holds. The caller releases it.
@@ -128,22 +90,16 @@ QZDownloadableFontCatalog QZDownloadableFontCatalog::Parse(std::string_view byte
 }
 
 std::vector<std::string> QZDownloadableFontCatalogPaths() {
-    std::vector<std::string> paths;
-    for (const std::string& directory : GetDataDirectories())
-        paths.push_back(directory + '/' + kCatalogRelativePath);
+    // The user's data directory first, then each of XDG_DATA_DIRS (with their defaults).
+    std::vector<std::string> paths = QZSystemCatalogPaths();
+    paths.insert(paths.begin(), QZUserCatalogPath());
     return paths;
 }
 
 std::shared_ptr<const QZDownloadableFontCatalog> QZCurrentDownloadableFontCatalog() {
-    CatalogCache& cache = Cache();
-    const FileState state = CurrentFileState();
-    std::lock_guard<std::mutex> lock(cache.mutex);
-    if (!cache.loaded || !(cache.state == state)) {
-        cache.catalog = std::make_shared<const QZDownloadableFontCatalog>(LoadCatalog(state));
-        cache.state = state;
-        cache.loaded = true;
-    }
-    return cache.catalog;
+    // The merged view of every source; the catalog shares its owner.
+    const auto merged = QZCurrentMergedDownloadableFontCatalog();
+    return std::shared_ptr<const QZDownloadableFontCatalog>(merged, &merged->catalog);
 }
 
 void QZSetInstalledFontCheck(QZInstalledFontCheck check) {
@@ -156,7 +112,21 @@ CFArrayRef
 QZCopyDownloadableFontAttributesForRequests(CFArrayRef requestedFontAttributeDictionaries) {
     if (!requestedFontAttributeDictionaries)
         return nullptr;
-    const auto catalog = QZCurrentDownloadableFontCatalog();
+    // The names asked for first: only their assets are looked up, through the indexes.
+    std::vector<std::string> names;
+    const CFIndex count = CFArrayGetCount(requestedFontAttributeDictionaries);
+    for (CFIndex i = 0; i < count; ++i) {
+        const void* element = CFArrayGetValueAtIndex(requestedFontAttributeDictionaries, i);
+        const void* name =
+            element && CFGetTypeID(element) == CFDictionaryGetTypeID()
+                ? CFDictionaryGetValue(static_cast<CFDictionaryRef>(element), NSFontNameAttribute)
+                : nullptr;
+        std::string postScriptName;
+        if (name && CFGetTypeID(name) == CFStringGetTypeID())
+            CFString::GetUTF8(static_cast<CFStringRef>(name), postScriptName);
+        names.push_back(std::move(postScriptName));
+    }
+    const auto catalog = QZCurrentDownloadableFontCatalogFor(names);
     QZInstalledFontCheck installed;
     {
         CatalogCache& cache = Cache();
@@ -164,17 +134,8 @@ QZCopyDownloadableFontAttributesForRequests(CFArrayRef requestedFontAttributeDic
         installed = cache.installedCheck;
     }
     CFMutableArrayRef result = CFArrayCreateMutable(kCFAllocatorDefault, 0, &kCFTypeArrayCallBacks);
-    const CFIndex count = CFArrayGetCount(requestedFontAttributeDictionaries);
-    for (CFIndex i = 0; i < count; ++i) {
-        const void* element = CFArrayGetValueAtIndex(requestedFontAttributeDictionaries, i);
-        if (!element || CFGetTypeID(element) != CFDictionaryGetTypeID())
-            continue;
-        const void* name =
-            CFDictionaryGetValue(static_cast<CFDictionaryRef>(element), NSFontNameAttribute);
-        std::string postScriptName;
-        if (!name || CFGetTypeID(name) != CFStringGetTypeID() ||
-            !CFString::GetUTF8(static_cast<CFStringRef>(name), postScriptName) ||
-            postScriptName.empty())
+    for (const std::string& postScriptName : names) {
+        if (postScriptName.empty())
             continue;
         if (installed && installed(postScriptName))
             continue;

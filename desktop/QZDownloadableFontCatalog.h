@@ -1,11 +1,12 @@
 // The downloadable fonts: which font assets can be fetched for a requested font, and how large
-// they are. The list comes from a JSON catalog, glyphwell/downloadable-fonts.json, found under the
-// XDG data directories (the user's own first, then each of XDG_DATA_DIRS); the first one that
-// exists is the catalog. Its format is documented in resources/catalog/README.md.
+// they are. The list comes from JSON catalogs: the user's own
+// ($XDG_DATA_HOME/glyphwell/downloadable-fonts.json), the publishers' verified ones, and those of
+// XDG_DATA_DIRS, merged as QZCatalogSources.h describes. The format is documented in
+// resources/catalog/README.md.
 //
-// The catalog is read again whenever its file changes (path, size or modification time); a
-// catalog that cannot be read or parsed counts as empty and is logged once for that state of the
-// file, and an asset that does not have the expected shape is left out with one log line.
+// Each catalog is read again whenever its files change; a catalog that cannot be read or parsed
+// counts as empty and is logged once for that state of the file, and an asset that does not have
+// the expected shape is left out with one log line.
 // Thread-safe; no Qt.
 #pragma once
 

@@ -15,10 +15,13 @@
 #include <optional>
 #include <strings.h>
 #include <sys/stat.h>
+#include <sys/statvfs.h>
+#include <thread>
 #include <unistd.h>
 
 #include "desktop/QZFontFileWriter.h"
 #include "desktop/QZFontMatching.h"
+#include "desktop/QZPartialDownload.h"
 #include "desktop/QZSHA256.h"
 #include "platform/Log.h"
 #include "platform/LogEscape.h"
@@ -34,6 +37,8 @@ constexpr std::chrono::milliseconds kShareWaitInterval{50};
 /// libcurl's receive buffer: its largest size, so that a large asset costs fewer callbacks and
 /// system calls.
 constexpr long kReceiveBufferSize = 512 * 1024;
+/// How often a cut transfer is resumed on its own before the download fails.
+constexpr int kMaximumResumes = 3;
 
 std::string Text(const char* sourceText) {
     return QCoreApplication::translate("QZFontDownloader", sourceText).toStdString();
@@ -64,23 +69,29 @@ using Clock = std::chrono::steady_clock;
 std::mutex gLimitsMutex;
 QZDownloadLimits gLimits;
 
-/// State shared with libcurl's callbacks during one transfer.
+/// State shared with libcurl's callbacks during one try of a transfer.
 struct Transfer {
     CURL* easy = nullptr;
-    QZFontFileWriter* file = nullptr;
-    QZSHA256Digest digest;
+    QZPartialDownload* partial = nullptr;
+    std::optional<QZSHA256Digest>* digest = nullptr;
     uint64_t expectedSize = 0;
-    uint64_t written = 0;
+    uint64_t resumedFrom = 0; ///< bytes kept before this try, asked for with a range
+    uint64_t written = 0;     ///< bytes in the partial file
     uint64_t reported = 0;
-    unsigned char head[4] = {};
     const QZDownloadProgressFunction* progress = nullptr;
     QZDownloadCancellation* cancellation = nullptr;
 
     QZDownloadLimits limits;
     Clock::time_point start = Clock::now();
     bool answered = false; ///< a header line or body byte arrived
+    bool bodyStarted = false;
     /// Byte counts at most one low-speed window apart, oldest first, taken every eighth of it.
     std::deque<std::pair<Clock::time_point, uint64_t>> samples;
+
+    // The answer's headers (of the last answer, after redirects).
+    std::string etag;
+    std::string lastModified;
+    int64_t rangeStart = -1; ///< of a Content-Range
 
     // Why the transfer was ended from our side, if it was.
     bool cancelled = false;
@@ -88,35 +99,88 @@ struct Transfer {
     bool tooLarge = false;
     bool noAnswer = false;
     bool tooSlow = false;
+    bool restart = false;       ///< the answer does not continue the kept bytes
     int64_t announcedSize = -1; ///< a Content-Length that differs from the expected size
     int writeError = 0;
 };
 
-size_t ReceiveHeader(char*, size_t, size_t count, void* context) {
-    static_cast<Transfer*>(context)->answered = true;
+std::string HeaderValue(const std::string& line, size_t colon) {
+    const size_t first = line.find_first_not_of(" \t", colon + 1);
+    const size_t last = line.find_last_not_of(" \t\r\n");
+    return first == std::string::npos || last < first ? std::string()
+                                                      : line.substr(first, last - first + 1);
+}
+
+size_t ReceiveHeader(char* bytes, size_t, size_t count, void* context) {
+    auto* transfer = static_cast<Transfer*>(context);
+    transfer->answered = true;
+    const std::string line(bytes, count);
+    if (line.rfind("HTTP/", 0) == 0) { // a new answer: a redirect's headers do not count
+        transfer->etag.clear();
+        transfer->lastModified.clear();
+        transfer->rangeStart = -1;
+        return count;
+    }
+    const size_t colon = line.find(':');
+    if (colon == std::string::npos)
+        return count;
+    const std::string name = line.substr(0, colon);
+    if (strcasecmp(name.c_str(), "ETag") == 0) {
+        transfer->etag = HeaderValue(line, colon);
+    } else if (strcasecmp(name.c_str(), "Last-Modified") == 0) {
+        transfer->lastModified = HeaderValue(line, colon);
+    } else if (strcasecmp(name.c_str(), "Content-Range") == 0) {
+        const std::string value = HeaderValue(line, colon);
+        unsigned long long first = 0;
+        if (std::sscanf(value.c_str(), "bytes %llu-", &first) == 1)
+            transfer->rangeStart = int64_t(first);
+    }
     return count;
+}
+
+/// The first body bytes of an answer: whether it continues the kept bytes (206 from where they
+/// end, with the same ETag) or starts over (200: the kept bytes are dropped).
+bool StartBody(Transfer& transfer) {
+    transfer.bodyStarted = true;
+    long status = 0;
+    curl_easy_getinfo(transfer.easy, CURLINFO_RESPONSE_CODE, &status);
+    if (status == 206) {
+        const std::string& kept = transfer.partial->ETag();
+        if (transfer.rangeStart != int64_t(transfer.resumedFrom) ||
+            (!kept.empty() && !transfer.etag.empty() && transfer.etag != kept)) {
+            transfer.restart = true;
+            return false;
+        }
+    } else if (transfer.partial->Size() > 0) {
+        if (!transfer.partial->Clear()) {
+            transfer.writeError = errno;
+            return false;
+        }
+        transfer.digest->emplace();
+        transfer.written = 0;
+    }
+    curl_off_t announced = -1;
+    if (curl_easy_getinfo(transfer.easy, CURLINFO_CONTENT_LENGTH_DOWNLOAD_T, &announced) ==
+            CURLE_OK &&
+        announced >= 0 && uint64_t(announced) != transfer.expectedSize - transfer.written) {
+        transfer.announcedSize = announced + int64_t(transfer.written);
+        return false;
+    }
+    transfer.partial->SetValidators(transfer.etag, transfer.lastModified);
+    return true;
 }
 
 size_t WriteBody(char* bytes, size_t, size_t count, void* context) {
     auto* transfer = static_cast<Transfer*>(context);
     transfer->answered = true;
-    if (transfer->written == 0) {
-        curl_off_t announced = -1;
-        if (curl_easy_getinfo(transfer->easy, CURLINFO_CONTENT_LENGTH_DOWNLOAD_T, &announced) ==
-                CURLE_OK &&
-            announced >= 0 && uint64_t(announced) != transfer->expectedSize) {
-            transfer->announcedSize = announced;
-            return CURL_WRITEFUNC_ERROR;
-        }
-    }
+    if (!transfer->bodyStarted && !StartBody(*transfer))
+        return CURL_WRITEFUNC_ERROR;
     if (count > transfer->expectedSize - transfer->written) {
         transfer->tooLarge = true;
         return CURL_WRITEFUNC_ERROR;
     }
-    for (size_t i = 0; i < count && transfer->written + i < sizeof transfer->head; ++i)
-        transfer->head[transfer->written + i] = static_cast<unsigned char>(bytes[i]);
-    transfer->digest.Update(bytes, count);
-    if (!transfer->file->Write(bytes, count)) {
+    (*transfer->digest)->Update(bytes, count);
+    if (!transfer->partial->Append(bytes, count)) {
         transfer->writeError = errno;
         return CURL_WRITEFUNC_ERROR;
     }
@@ -311,45 +375,195 @@ void ConfigureTransfer(CURL* easy, const QZFontAssetDownload& asset, Transfer& t
     curl_easy_setopt(easy, CURLOPT_XFERINFODATA, &transfer);
 }
 
-/// Fetches `asset` into `file` and checks its size and SHA-256. Installed (without a path) when
-/// every byte arrived as expected; otherwise the outcome that ends the download.
-QZFontDownloadResult Fetch(const QZFontAssetDownload& asset, QZFontFileWriter& file,
-                           const QZDownloadProgressFunction& progress,
+/// The validator that makes a range request safe: a strong ETag, else the Last-Modified date;
+/// empty when the kept bytes have neither (a weak ETag never is one).
+std::string RangeValidator(const QZPartialDownload& partial) {
+    if (!partial.ETag().empty() && partial.ETag().rfind("W/", 0) != 0)
+        return partial.ETag();
+    return partial.LastModified();
+}
+
+/// Digests the bytes kept in `partial` into a new `digest`; false when they cannot be read.
+bool DigestKept(const QZPartialDownload& partial, std::optional<QZSHA256Digest>& digest) {
+    digest.emplace();
+    std::vector<char> buffer(kReceiveBufferSize);
+    for (uint64_t offset = 0; offset < partial.Size();) {
+        const ssize_t count = pread(
+            partial.Descriptor(), buffer.data(),
+            size_t(std::min<uint64_t>(buffer.size(), partial.Size() - offset)), off_t(offset));
+        if (count < 0 && errno == EINTR)
+            continue;
+        if (count <= 0)
+            return false;
+        digest->Update(buffer.data(), size_t(count));
+        offset += uint64_t(count);
+    }
+    return digest->IsValid();
+}
+
+/// Why `asset` cannot be downloaded for lack of space, or empty: the bytes still to come must fit
+/// beside the partial file, and the whole file in the font folder.
+std::string FreeSpaceProblem(const QZFontAssetDownload& asset, const QZPartialDownload& partial,
+                             const std::string& directory) {
+    struct statvfs cache {
+    }, fonts{};
+    if (statvfs(QZPartialDownloadDirectory().c_str(), &cache) != 0 ||
+        statvfs(directory.c_str(), &fonts) != 0)
+        return {};
+    const auto available = [](const struct statvfs& status) {
+        return uint64_t(status.f_bavail) * uint64_t(status.f_frsize);
+    };
+    const uint64_t toCome = asset.size - partial.Size();
+    const bool shared = cache.f_fsid == fonts.f_fsid;
+    const uint64_t needed = shared ? toCome + asset.size : asset.size;
+    const bool fits = available(fonts) >= needed && (shared || available(cache) >= toCome);
+    if (fits)
+        return {};
+    return QCoreApplication::translate("QZFontDownloader",
+                                       "There is not enough free space for the font: it needs "
+                                       "%1 bytes, and %2 has %3 bytes free.")
+        .arg(qulonglong(shared || available(fonts) < needed ? needed : toCome))
+        .arg(QString::fromStdString(available(fonts) < needed ? directory
+                                                              : QZPartialDownloadDirectory()))
+        .arg(qulonglong(available(fonts) < needed ? available(fonts) : available(cache)))
+        .toStdString();
+}
+
+/// Waits `pause` before a resume; false when the download was cancelled meanwhile.
+bool PauseBeforeResume(std::chrono::milliseconds pause, QZDownloadCancellation* cancellation) {
+    const auto end = Clock::now() + pause;
+    while (Clock::now() < end) {
+        if (cancellation && cancellation->IsCancelled())
+            return false;
+        std::this_thread::sleep_for(
+            std::min<Clock::duration>(end - Clock::now(), std::chrono::milliseconds(20)));
+    }
+    return !(cancellation && cancellation->IsCancelled());
+}
+
+/// Copies the complete `partial` into `file`, with the first bytes into `head`.
+bool CopyPartial(const QZPartialDownload& partial, QZFontFileWriter& file,
+                 unsigned char (&head)[4]) {
+    std::vector<char> buffer(kReceiveBufferSize);
+    for (uint64_t offset = 0; offset < partial.Size();) {
+        const ssize_t count =
+            pread(partial.Descriptor(), buffer.data(), buffer.size(), off_t(offset));
+        if (count < 0 && errno == EINTR)
+            continue;
+        if (count <= 0)
+            return false;
+        if (offset == 0)
+            std::memcpy(head, buffer.data(), std::min<size_t>(size_t(count), sizeof head));
+        if (!file.Write(buffer.data(), size_t(count)))
+            return false;
+        offset += uint64_t(count);
+    }
+    return true;
+}
+
+/// Fetches `asset` into its partial file, resuming a cut transfer up to kMaximumResumes times,
+/// checks its size and SHA-256, and copies it into `file`. Installed (without a path) when every
+/// byte arrived as expected; otherwise the outcome that ends the download. A cancelled, stopped
+/// or cut download keeps its partial file for the next try.
+QZFontDownloadResult Fetch(const QZFontAssetDownload& asset, const std::string& directory,
+                           QZFontFileWriter& file, const QZDownloadProgressFunction& progress,
                            QZDownloadCancellation* cancellation, unsigned char (&head)[4]) {
     InitializeCurlOnce();
-    const EasyHandle easy(curl_easy_init());
-    Transfer transfer;
-    if (!easy || !transfer.digest.IsValid())
+    QZPartialDownload partial;
+    if (!partial.Open(QZPartialDownloadDirectory(), asset.sha256, asset.url, asset.size))
+        return WriteFailure(errno);
+    if (std::string problem = FreeSpaceProblem(asset, partial, directory); !problem.empty())
+        return Failure(std::move(problem));
+    std::optional<QZSHA256Digest> digest;
+    if (!DigestKept(partial, digest) && !partial.Clear())
+        return WriteFailure(errno);
+    if (!digest->IsValid())
         return Failure(Text("The download failed: %1", QStringLiteral("out of memory")));
-    transfer.easy = easy.get();
-    transfer.file = &file;
-    transfer.expectedSize = asset.size;
-    transfer.progress = &progress;
-    transfer.cancellation = cancellation;
-    transfer.limits = QZCurrentDownloadLimits();
-    char detail[CURL_ERROR_SIZE] = {};
-    ConfigureTransfer(easy.get(), asset, transfer, detail);
-
-    const CURLcode code = RunTransfer(easy.get(), transfer, cancellation);
-    if (transfer.cancelled)
-        return {QZFontDownloadOutcome::Cancelled, {}, {}};
-    if (transfer.stopped)
+    // The bytes kept count as done from the start.
+    if (partial.Size() > 0 && progress && !progress(partial.Size()))
         return {QZFontDownloadOutcome::Stopped, {}, {}};
-    if (code != CURLE_OK)
-        return Failure(TransferFailureReason(transfer, easy.get(), code, detail));
-    long status = 0;
-    curl_easy_getinfo(easy.get(), CURLINFO_RESPONSE_CODE, &status);
-    if (IsHTTPScheme(easy.get()) && status != 200)
-        return Failure(
-            Text("The server answered with the HTTP status %1.", QString::number(status)));
-    if (transfer.written != asset.size)
+    const QZDownloadLimits limits = QZCurrentDownloadLimits();
+    for (int resumes = 0;; ++resumes) {
+        const std::string validator = RangeValidator(partial);
+        if (partial.Size() > 0 && validator.empty()) {
+            // Nothing tells whether the server's file is still the one the bytes came from.
+            if (!partial.Clear())
+                return WriteFailure(errno);
+            digest.emplace();
+        }
+        const EasyHandle easy(curl_easy_init());
+        if (!easy)
+            return Failure(Text("The download failed: %1", QStringLiteral("out of memory")));
+        Transfer transfer;
+        transfer.easy = easy.get();
+        transfer.partial = &partial;
+        transfer.digest = &digest;
+        transfer.expectedSize = asset.size;
+        transfer.resumedFrom = transfer.written = transfer.reported = partial.Size();
+        transfer.progress = &progress;
+        transfer.cancellation = cancellation;
+        transfer.limits = limits;
+        char detail[CURL_ERROR_SIZE] = {};
+        ConfigureTransfer(easy.get(), asset, transfer, detail);
+        // No compression: the bytes must be the file's, countable against its size and ranges.
+        curl_slist* headers = curl_slist_append(nullptr, "Accept-Encoding:");
+        const std::string range = std::to_string(transfer.resumedFrom) + "-";
+        if (transfer.resumedFrom > 0) {
+            curl_easy_setopt(easy.get(), CURLOPT_RANGE, range.c_str());
+            headers = curl_slist_append(headers, ("If-Range: " + validator).c_str());
+        }
+        const std::unique_ptr<curl_slist, decltype(&curl_slist_free_all)> headerList(
+            headers, curl_slist_free_all);
+        curl_easy_setopt(easy.get(), CURLOPT_HTTPHEADER, headers);
+
+        const CURLcode code = RunTransfer(easy.get(), transfer, cancellation);
+        if (transfer.cancelled)
+            return {QZFontDownloadOutcome::Cancelled, {}, {}};
+        if (transfer.stopped)
+            return {QZFontDownloadOutcome::Stopped, {}, {}};
+        long status = 0;
+        curl_easy_getinfo(easy.get(), CURLINFO_RESPONSE_CODE, &status);
+        const bool http = IsHTTPScheme(easy.get());
+        if (http && status == 416 && transfer.resumedFrom == asset.size)
+            break; // every byte was kept already; the digest below decides
+        const bool again = transfer.restart || (http && status == 416);
+        if (again && resumes < kMaximumResumes) {
+            if (!partial.Clear())
+                return WriteFailure(errno);
+            digest.emplace();
+            continue;
+        }
+        if (code == CURLE_OK && !again) {
+            if (http && status != 200 && status != 206)
+                return Failure(
+                    Text("The server answered with the HTTP status %1.", QString::number(status)));
+            break;
+        }
+        // Cut off mid-body: resumed after a pause that grows with each resume.
+        const bool cut = !again && transfer.written > transfer.resumedFrom && !transfer.tooLarge &&
+                         transfer.announcedSize < 0 && !transfer.writeError && !transfer.tooSlow;
+        if (cut && resumes < kMaximumResumes) {
+            if (!PauseBeforeResume(limits.resumePause * (1 << resumes), cancellation))
+                return {QZFontDownloadOutcome::Cancelled, {}, {}};
+            continue;
+        }
+        return Failure(again ? Text("The server's file changed during the download.")
+                             : TransferFailureReason(transfer, easy.get(), code, detail));
+    }
+    if (partial.Size() != asset.size) {
+        partial.Remove();
         return Failure(Text("The download holds %1 bytes, but the font should have %2 bytes.",
-                            transfer.written, asset.size));
-    const std::string digest = transfer.digest.FinishHex();
-    if (digest.empty() || strcasecmp(digest.c_str(), asset.sha256.c_str()) != 0)
+                            partial.Size(), asset.size));
+    }
+    const std::string sha256 = digest->FinishHex();
+    if (sha256.empty() || strcasecmp(sha256.c_str(), asset.sha256.c_str()) != 0) {
+        partial.Remove();
         return Failure(Text("The downloaded file is damaged: its SHA-256 checksum is not the "
                             "expected one."));
-    std::memcpy(head, transfer.head, sizeof head);
+    }
+    if (!CopyPartial(partial, file, head))
+        return WriteFailure(errno);
+    partial.Remove();
     return {QZFontDownloadOutcome::Installed, {}, {}};
 }
 
@@ -402,7 +616,7 @@ QZFontDownloadResult DownloadAndInstall(const QZFontAssetDownload& asset,
     if (!file.Open(directory, baseName))
         return WriteFailure(errno);
     unsigned char head[4] = {};
-    QZFontDownloadResult result = Fetch(asset, file, progress, cancellation, head);
+    QZFontDownloadResult result = Fetch(asset, directory, file, progress, cancellation, head);
     if (result.outcome != QZFontDownloadOutcome::Installed)
         return result;
     if (!file.Sync())

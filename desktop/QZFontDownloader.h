@@ -1,9 +1,12 @@
 // Downloading one font asset and installing it for the user.
 //
 // The asset is fetched with libcurl (https, http or file URLs; redirects only to http or https)
-// into a temporary file in the destination directory (QZFontFileWriter: unnamed where the file
-// system allows, so that a crash leaves nothing), its size and SHA-256 checked as the bytes
-// arrive. Once complete, the temporary is read as a font and must hold the requested fonts; only
+// into its partial file in the cache (QZPartialDownload), its size and SHA-256 checked as the
+// bytes arrive. A transfer cut off mid-body resumes on its own, up to three times with a growing
+// pause, with a range request made safe by If-Range; a later download of the asset resumes from
+// the partial file too. Once complete and checked, it is copied into a temporary file in the
+// destination directory (QZFontFileWriter: unnamed where the file system allows, so that a crash
+// leaves nothing). Then the temporary is read as a font and must hold the requested fonts; only
 // then does it replace, in one rename, the file installed under a name made from its LocalID
 // (never from the URL), and it is registered with fontconfig, so that this process and other
 // applications find it. A download that is cancelled, stopped, fails or is rejected leaves the
@@ -62,6 +65,8 @@ struct QZDownloadLimits {
     /// this long is given up.
     std::chrono::milliseconds lowSpeedWindow{30000};
     uint64_t lowSpeedBytesPerSecond = 1024;
+    /// The pause before the first automatic resume of a cut transfer; it doubles for each next.
+    std::chrono::milliseconds resumePause{1000};
 };
 
 /// The limits of the downloads that start from now on; process-wide (tests shorten them).

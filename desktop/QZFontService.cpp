@@ -12,6 +12,7 @@
 #include <vector>
 
 #include "cfutil/TCFRetained.h"
+#include "desktop/QZCatalogSources.h"
 #include "desktop/QZDownloadableFontCatalog.h"
 #include "desktop/QZFontDownloader.h"
 #include "desktop/QZFontMatching.h"
@@ -257,7 +258,11 @@ bool MatchingRun::MatchOne(CFTypeRef descriptor, const std::string& postScriptNa
 }
 
 void MatchingRun::Run() {
-    catalog_ = QZCurrentDownloadableFontCatalog();
+    // Only the assets of the fonts asked for, found through the catalogs' indexes.
+    std::vector<std::string> requested;
+    for (CFIndex i = 0; i < CFArrayGetCount(descriptors_); ++i)
+        requested.push_back(PostScriptName(CFArrayGetValueAtIndex(descriptors_, i)));
+    catalog_ = QZCurrentDownloadableFontCatalogFor(requested);
     // The byte total: every distinct asset needed by a font that is not installed yet.
     std::vector<std::pair<CFTypeRef, std::string>> fonts;
     const CFIndex count = CFArrayGetCount(descriptors_);

@@ -3,6 +3,7 @@
 #include <curl/curl.h>
 #include <fcntl.h>
 #include <fontconfig/fontconfig.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -92,21 +93,32 @@ bool ReadFontFaces(const std::string& path, std::vector<FontFace>* faces, std::s
 }
 
 bool DigestFile(const std::string& path, uint64_t* size, std::string* sha256, std::string* error) {
-    std::ifstream file(path, std::ios::binary);
-    if (!file) {
-        *error = "cannot open " + path + ": " + std::strerror(errno);
+    // Opened without blocking and checked to be a regular file: a FIFO put in its place would
+    // otherwise wait forever.
+    const int fd = open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY);
+    struct stat status {};
+    if (fd < 0 || fstat(fd, &status) != 0 || !S_ISREG(status.st_mode)) {
+        *error = fd < 0 ? "cannot open " + path + ": " + std::strerror(errno)
+                        : path + ": not a regular file";
+        if (fd >= 0)
+            close(fd);
         return false;
     }
     QZSHA256Digest digest;
     char buffer[65536];
     *size = 0;
-    while (file) {
-        file.read(buffer, sizeof buffer);
-        digest.Update(buffer, size_t(file.gcount()));
-        *size += uint64_t(file.gcount());
+    ssize_t count = 0;
+    while ((count = read(fd, buffer, sizeof buffer)) != 0) {
+        if (count < 0 && errno == EINTR)
+            continue;
+        if (count < 0)
+            break;
+        digest.Update(buffer, size_t(count));
+        *size += uint64_t(count);
     }
+    close(fd);
     *sha256 = digest.FinishHex();
-    if (file.bad() || sha256->empty()) {
+    if (count < 0 || sha256->empty()) {
         *error = path + ": cannot read";
         return false;
     }

@@ -1,5 +1,6 @@
 #include "tools/CatalogCommand.h"
 
+#include <ctime>
 #include <filesystem>
 #include <fontconfig/fontconfig.h>
 #include <fstream>
@@ -8,7 +9,12 @@
 #include <nlohmann/json.hpp>
 #include <ostream>
 #include <sstream>
+#include <strings.h>
+#include <sys/stat.h>
 
+#include "desktop/QZCatalogPaths.h"
+#include "desktop/QZCatalogPublishers.h"
+#include "desktop/QZCatalogSources.h"
 #include "desktop/QZDownloadableFontCatalog.h"
 #include "desktop/QZFontMatching.h"
 #include "platform/Log.h"
@@ -22,7 +28,9 @@ const char kCatalogUsage[] =
     "  catalog add FONTFILE... --url-prefix URL [--catalog FILE]\n"
     "                                     write or update the assets of font files\n"
     "  catalog check [FILE] [--fetch]     check a catalog; --fetch downloads every asset\n"
-    "  catalog list [FILE]                the fonts offered, and whether they are installed\n"
+    "  catalog list [FILE]                the fonts offered, whether they are installed, and\n"
+    "                                     which catalog offers them\n"
+    "  catalog refresh                    fetch and verify every publisher's catalog\n"
     "    FILE: the catalog the agent reads (default)\n";
 
 namespace {
@@ -69,12 +77,36 @@ struct AddOptions {
     std::string catalogPath;
 };
 
+/// Whether `prefix` is an http or https URL with a host: the only addresses the agent downloads
+/// from on a catalog's word.
+bool IsDownloadPrefix(const std::string& prefix) {
+    for (const std::string_view scheme : {"http://", "https://"}) {
+        if (prefix.size() > scheme.size() &&
+            strncasecmp(prefix.c_str(), scheme.data(), scheme.size()) == 0)
+            return prefix[scheme.size()] != '/';
+    }
+    return false;
+}
+
+/// Why the file at `path` cannot be added, before anything opens it: it must exist and be a
+/// regular file (a FIFO or a device would block or never end). Empty when it may be read.
+std::string FileProblem(const std::string& path) {
+    struct stat status {};
+    if (stat(path.c_str(), &status) != 0)
+        return path + (errno == ENOENT ? ": no such file" : ": " + std::string(strerror(errno)));
+    if (!S_ISREG(status.st_mode))
+        return path + ": not a regular file";
+    return {};
+}
+
 /// The asset of one font file: every member the catalog format knows.
 bool DescribeAsset(const std::string& path, const std::string& urlPrefix, Json* asset,
                    std::string* error) {
     std::vector<FontFace> faces;
     uint64_t size = 0;
     std::string sha256;
+    if (*error = FileProblem(path); !error->empty())
+        return false;
     if (!ReadFontFaces(path, &faces, error) || !DigestFile(path, &size, &sha256, error))
         return false;
     // The asset is named after its fonts: a single font's PostScript name, or the names of all
@@ -162,6 +194,11 @@ bool ParseAddArguments(const std::vector<std::string>& arguments, AddOptions* op
     }
     if (options->files.empty() || options->urlPrefix.empty()) {
         err << "glyphwell catalog add: give the font files and --url-prefix URL\n";
+        return false;
+    }
+    if (!IsDownloadPrefix(options->urlPrefix)) {
+        err << "glyphwell catalog add: --url-prefix must be an http:// or https:// URL, not "
+            << Escaped(options->urlPrefix) << "\n";
         return false;
     }
     return true;
@@ -329,25 +366,66 @@ int RunCheck(const std::vector<std::string>& arguments, std::ostream& out, std::
     return total == 0 ? 0 : 1;
 }
 
-/// `catalog list`: one tab-separated line per font offered.
+/// `catalog list`: one tab-separated line per font offered, ending with the catalog that offers
+/// it: without FILE, the agent's merged view of every catalog.
 int RunList(const std::vector<std::string>& arguments, std::ostream& out, std::ostream& err) {
+    bool merged = true;
+    for (const std::string& argument : arguments)
+        merged = merged && argument.size() > 1 && argument[0] == '-';
     ReadOptions options;
     if (!ParseReadArguments("list", false, arguments, &options, err))
         return 2;
-    QZDownloadableFontCatalog catalog;
+    QZMergedDownloadableFontCatalog view;
     std::vector<std::string> problems;
-    if (!LoadCatalog("list", options, err, &catalog, &problems))
-        return 1;
+    if (merged) {
+        LogSink previous = SetLogSink(
+            [&problems](const LogRecord& record) { problems.emplace_back(record.text); });
+        view = *QZCurrentMergedDownloadableFontCatalog();
+        SetLogSink(previous);
+    } else {
+        if (!LoadCatalog("list", options, err, &view.catalog, &problems))
+            return 1;
+        view.sources.push_back({QZCatalogSource::Kind::User, options.catalogPath, {}, {}, {}});
+        view.assetSources.assign(view.catalog.assets.size(), 0);
+    }
     for (const std::string& problem : problems)
         err << problem << "\n";
-    for (const QZDownloadableFontAsset& asset : catalog.assets)
+    for (size_t i = 0; i < view.catalog.assets.size(); ++i) {
+        const QZDownloadableFontAsset& asset = view.catalog.assets[i];
         for (const QZDownloadableFont& font : asset.fonts)
             out << (QZIsFontInstalled(std::string(font.postScriptName)) ? "installed" : "offered")
                 << "\t" << Escaped(font.postScriptName) << "\t" << Escaped(font.family) << "\t"
-                << Escaped(asset.localID) << "\t" << asset.size << "\n";
+                << Escaped(asset.localID) << "\t" << asset.size << "\t"
+                << Escaped(view.sources[view.assetSources[i]].label) << "\n";
+    }
     // fontconfig holds its configuration until told to let go.
     FcFini();
     return 0;
+}
+
+// ---- refresh ------------------------------------------------------------------------------
+
+/// `catalog refresh`: one line per publisher; 0 only when every one is current and verified.
+int RunRefresh(const std::vector<std::string>& arguments, std::ostream& out, std::ostream& err) {
+    if (!arguments.empty()) {
+        err << "glyphwell catalog refresh: takes no arguments\n";
+        return 2;
+    }
+    const std::vector<std::string> directories = QZCatalogPublisherDirectories();
+    const std::vector<QZCatalogPublisher> publishers = QZReadCatalogPublishers(directories);
+    if (publishers.empty()) {
+        out << "no publishers in " << Escaped(directories[0]) << " or " << Escaped(directories[1])
+            << "\n";
+        return 0;
+    }
+    const int64_t now = int64_t(std::time(nullptr));
+    bool current = true;
+    for (const QZCatalogPublisher& publisher : publishers) {
+        const QZPublisherRefresh refresh = QZRefreshCatalogPublisher(publisher, now);
+        current = current && refresh.outcome != QZPublisherRefresh::Outcome::Refused;
+        out << QZDescribePublisherRefresh(publisher.name, refresh) << "\n";
+    }
+    return current ? 0 : 1;
 }
 
 } // namespace
@@ -363,7 +441,9 @@ int RunCatalog(const std::vector<std::string>& arguments, std::ostream& out, std
         return RunCheck(rest, out, err, progress);
     if (verb == "list")
         return RunList(rest, out, err);
-    err << "glyphwell catalog: give add, check or list\n" << kCatalogUsage;
+    if (verb == "refresh")
+        return RunRefresh(rest, out, err);
+    err << "glyphwell catalog: give add, check, list or refresh\n" << kCatalogUsage;
     return 2;
 }
 

@@ -11,6 +11,7 @@
 
 #include "UIAgent/FontDownloadWindowController.h"
 #include "UIAgent/QZNetworkCheck.h"
+#include "desktop/QZFontDownloader.h"
 #include "desktop/QZFontMatching.h"
 #include "tests/UIAgent/AgentTestSupport.h"
 #include "tests/support/LoopbackHTTPServer.h"
@@ -98,11 +99,16 @@ protected:
         });
         QZSetPreferredLanguagesForTesting({"en-US"});
         QZSetDownloadProgressTapForTesting(callbacks_.Tap());
+        // A dropped connection is resumed after a pause; the tests need not wait for it.
+        QZDownloadLimits limits;
+        limits.resumePause = std::chrono::milliseconds(10);
+        QZSetDownloadLimits(limits);
     }
     void TearDown() override {
         // A matching whose window has gone ends at its next callback; wait for its thread.
         callbacks_.Release();
         EXPECT_TRUE(WaitForTheMatchingToEnd());
+        QZSetDownloadLimits({});
         QZSetDownloadProgressTapForTesting({});
         QZSetNetworkFlagsSourceForTesting(nullptr);
         QZSetPreferredLanguagesForTesting({});

@@ -30,10 +30,12 @@ protected:
     void SetUp() override {
         qputenv("XDG_DATA_HOME", home_.path().toUtf8());
         qputenv("XDG_DATA_DIRS", (system_.path() + "/a:" + system_.path() + "/b").toUtf8());
+        qputenv("XDG_CACHE_HOME", (system_.path() + "/cache").toUtf8());
     }
     void TearDown() override {
         qunsetenv("XDG_DATA_HOME");
         qunsetenv("XDG_DATA_DIRS");
+        qunsetenv("XDG_CACHE_HOME");
         QZSetInstalledFontCheck({});
     }
 

@@ -152,8 +152,15 @@ protected:
         fonts_ = UsePrivateFonts(root_.path());
         ASSERT_FALSE(fonts_.isEmpty());
         ASSERT_FALSE(QZIsFontInstalled("DejaVuSans-Bold"));
+        // A cut transfer resumes after a pause; tests need not wait for it.
+        QZDownloadLimits limits;
+        limits.resumePause = milliseconds(10);
+        QZSetDownloadLimits(limits);
     }
-    void TearDown() override { StopUsingPrivateFonts(); }
+    void TearDown() override {
+        QZSetDownloadLimits({});
+        StopUsingPrivateFonts();
+    }
 
     /// Serves the DejaVu file `file` at "/<file>" with `resource`'s delivery settings and
     /// returns its catalog entry holding `postScriptName`; `sha256` replaces the file's own.

@@ -69,6 +69,8 @@ for file in usr/libexec/GlyphwellUIAgent usr/bin/glyphwell; do
     [ -x "$root/$file" ] || fail "/$file is missing or not executable"
 done
 for file in usr/lib/systemd/user/$unit usr/lib/systemd/user/glyphwell-ui-agent.service \
+    usr/lib/systemd/user/glyphwell-catalog-refresh.timer \
+    usr/lib/systemd/user/glyphwell-catalog-refresh.service \
     usr/share/applications/$app_id.desktop usr/share/icons/hicolor/scalable/apps/$app_id.svg \
     usr/share/applications/org.glyphwell.Glyphwell.GetMissingFonts.desktop \
     usr/share/man/man1/glyphwell.1.gz usr/share/man/man8/GlyphwellUIAgent.8.gz \
@@ -114,9 +116,17 @@ mkdir -p "$tmp/units" "$tmp/runtime" && chmod 700 "$tmp/runtime"
 cp "$root/usr/lib/systemd/user/$unit" "$tmp/units/"
 sed "s|^ExecStart=|ExecStart=$root|" "$root/usr/lib/systemd/user/glyphwell-ui-agent.service" \
     >"$tmp/units/glyphwell-ui-agent.service"
+cp "$root/usr/lib/systemd/user/glyphwell-catalog-refresh.timer" "$tmp/units/"
+sed "s|^ExecStart=|ExecStart=$root|" \
+    "$root/usr/lib/systemd/user/glyphwell-catalog-refresh.service" \
+    >"$tmp/units/glyphwell-catalog-refresh.service"
+grep -qx 'Persistent=true' "$tmp/units/glyphwell-catalog-refresh.timer" ||
+    fail "the catalog refresh timer does not catch up missed runs"
 verify_status=0
 XDG_RUNTIME_DIR="$tmp/runtime" MANPATH="$root/usr/share/man" systemd-analyze --user verify \
-    "$tmp/units/$unit" "$tmp/units/glyphwell-ui-agent.service" >"$tmp/verify.log" 2>&1 ||
+    "$tmp/units/$unit" "$tmp/units/glyphwell-ui-agent.service" \
+    "$tmp/units/glyphwell-catalog-refresh.timer" "$tmp/units/glyphwell-catalog-refresh.service" \
+    >"$tmp/verify.log" 2>&1 ||
     verify_status=$?
 if [ "$verify_status" != 0 ] && grep -q 'initialize manager' "$tmp/verify.log"; then
     echo "SKIP (systemd-analyze verify does not work here): $(head -1 "$tmp/verify.log")"

@@ -1,12 +1,15 @@
 // A small HTTP/1.1 server on 127.0.0.1 for tests and benchmarks: serves byte strings by path, and
-// on demand drips them, drops the connection part-way, never answers, or redirects. One thread and
-// one response per connection; it reads the request line only (HEAD gets no body).
+// on demand drips them, drops the connection part-way, never answers, or redirects. It answers
+// "Range: bytes=N-" with 206 when If-Range (if any) names its ETag or Last-Modified, unless told
+// to ignore ranges; it can also change the file after the first answer. One thread and one
+// response per connection; HEAD gets no body.
 #pragma once
 
 #include <arpa/inet.h>
 #include <cerrno>
 #include <chrono>
 #include <condition_variable>
+#include <cstdlib>
 #include <cstring>
 #include <map>
 #include <memory>
@@ -33,6 +36,15 @@ public:
         std::string redirectTo = {};
         /// Read the request, then send nothing until the server stops.
         bool neverAnswer = false;
+        /// The validators sent (none when empty).
+        std::string etag = {};
+        std::string lastModified = {};
+        /// Range requests get the whole body with 200.
+        bool ignoreRange = false;
+        /// `dropAfter` applies to the first answer only.
+        bool dropOnce = false;
+        /// From the second answer on, this ETag instead; a 206 is sent whatever If-Range says.
+        std::string changedETag = {};
     };
 
     /// Listens on 127.0.0.1, on a port the kernel chooses.
@@ -89,6 +101,13 @@ public:
         return found == requestCounts_.end() ? 0 : found->second;
     }
 
+    /// The header lines of the last request for `path`, "Name: value\r\n" each.
+    std::string LastRequestHeaders(const std::string& path) const {
+        std::lock_guard<std::mutex> lock(mutex_);
+        const auto found = lastHeaders_.find(path);
+        return found == lastHeaders_.end() ? std::string() : found->second;
+    }
+
     /// Waits until `path` was requested at least `count` times; false after `timeout`.
     bool WaitForRequests(const std::string& path, int count, std::chrono::milliseconds timeout) {
         std::unique_lock<std::mutex> lock(mutex_);
@@ -143,10 +162,13 @@ private:
             return;
         const bool head = request.compare(0, methodEnd, "HEAD") == 0;
         const std::string path = request.substr(methodEnd + 1, pathEnd - methodEnd - 1);
+        const std::string headers = request.substr(pathEnd, request.find("\r\n\r\n") - pathEnd);
         std::shared_ptr<const Resource> shared;
+        int number = 0;
         {
             std::lock_guard<std::mutex> lock(mutex_);
-            ++requestCounts_[path];
+            number = ++requestCounts_[path];
+            lastHeaders_[path] = headers.substr(std::min(headers.size(), headers.find('\n') + 1));
             requested_.notify_all();
             const auto entry = resources_.find(path);
             if (entry != resources_.end())
@@ -172,11 +194,41 @@ private:
             sendHeader("302 Found\r\nLocation: " + resource.redirectTo, 0);
             return;
         }
-        if (!sendHeader("200 OK\r\nContent-Type: application/octet-stream", resource.body.size()) ||
+        const std::string etag =
+            number > 1 && !resource.changedETag.empty() ? resource.changedETag : resource.etag;
+        std::string validators;
+        if (!etag.empty())
+            validators += "\r\nETag: " + etag;
+        if (!resource.lastModified.empty())
+            validators += "\r\nLast-Modified: " + resource.lastModified;
+        // A range is served when If-Range (if sent) matches, or always once the file "changed".
+        size_t start = 0;
+        const std::string ifRange = HeaderOf(request, "If-Range");
+        const std::string range = HeaderOf(request, "Range");
+        if (!resource.ignoreRange && range.rfind("bytes=", 0) == 0 &&
+            (ifRange.empty() || ifRange == etag || ifRange == resource.lastModified ||
+             (number > 1 && !resource.changedETag.empty())))
+            start = std::strtoull(range.c_str() + 6, nullptr, 10);
+        if (start > resource.body.size() || (start > 0 && start == resource.body.size())) {
+            sendHeader("416 Range Not Satisfiable\r\nContent-Range: bytes */" +
+                           std::to_string(resource.body.size()),
+                       0);
+            return;
+        }
+        const std::string status = start > 0 ? "206 Partial Content\r\nContent-Range: bytes " +
+                                                   std::to_string(start) + "-" +
+                                                   std::to_string(resource.body.size() - 1) + "/" +
+                                                   std::to_string(resource.body.size())
+                                             : "200 OK";
+        if (!sendHeader(status + "\r\nContent-Type: application/octet-stream" + validators,
+                        resource.body.size() - start) ||
             head)
             return;
-        const size_t end = std::min(resource.body.size(), resource.dropAfter);
-        for (size_t offset = 0; offset < end;) {
+        const size_t dropAfter =
+            resource.dropOnce && number > 1 ? std::string::npos : resource.dropAfter;
+        const size_t end =
+            std::min(resource.body.size(), start + std::min(dropAfter, resource.body.size()));
+        for (size_t offset = start; offset < end;) {
             const size_t count = std::min(resource.chunkSize, end - offset);
             if (!SendAll(fd, resource.body.data() + offset, count))
                 return;
@@ -192,6 +244,16 @@ private:
         shutdown(fd, SHUT_RDWR);
     }
 
+    /// The value of the header `name` in `request`, empty when absent.
+    static std::string HeaderOf(const std::string& request, const std::string& name) {
+        const std::string key = "\r\n" + name + ": ";
+        const size_t found = request.find(key);
+        if (found == std::string::npos)
+            return {};
+        const size_t start = found + key.size();
+        return request.substr(start, request.find("\r\n", start) - start);
+    }
+
     int listener_ = -1;
     unsigned short port_ = 0;
     std::thread acceptor_;
@@ -202,6 +264,7 @@ private:
     std::vector<std::thread> connections_;
     std::map<std::string, std::shared_ptr<const Resource>> resources_;
     std::map<std::string, int> requestCounts_;
+    std::map<std::string, std::string> lastHeaders_;
 };
 
 } // namespace glyphwell::testing

@@ -6,6 +6,7 @@
 #include <filesystem>
 #include <fstream>
 #include <nlohmann/json.hpp>
+#include <sys/stat.h>
 
 #include "support/LoopbackHTTPServer.h"
 #include "support/SHA256.h"
@@ -104,6 +105,9 @@ TEST_F(CatalogCommandTest, AddsEveryFaceAndKeepsWhatItDidNotTouch) {
 TEST_F(CatalogCommandTest, RefusesBadInputAndLeavesTheCatalogAlone) {
     const std::string notAFont = directory_ + "/notes.ttf";
     std::ofstream(notAFont) << "not a font";
+    const std::string fifo = directory_ + "/pipe.ttf";
+    ASSERT_EQ(mkfifo(fifo.c_str(), 0600), 0);
+    const std::string sans = kDejaVu + "DejaVuSans.ttf";
     struct Case {
         const char* catalog;
         std::vector<std::string> arguments;
@@ -111,18 +115,33 @@ TEST_F(CatalogCommandTest, RefusesBadInputAndLeavesTheCatalogAlone) {
         std::string message;
     } cases[] = {
         {"{\"assets\": []}",
-         {"add", kDejaVu + "DejaVuSans.ttf", notAFont, "--url-prefix", "u"},
+         {"add", sans, notAFont, "--url-prefix", "http://h/"},
          1,
          notAFont + ": not a font file fontconfig can read"},
+        {"{}",
+         {"add", directory_ + "/absent.ttf", "--url-prefix", "http://h/"},
+         1,
+         directory_ + "/absent.ttf: no such file"},
+        {"{}",
+         {"add", directory_, "--url-prefix", "http://h/"},
+         1,
+         directory_ + ": not a regular file"},
+        {"{}", {"add", fifo, "--url-prefix", "http://h/"}, 1, fifo + ": not a regular file"},
+        {"{}",
+         {"add", sans, "--url-prefix", "javascript:alert(1)"},
+         2,
+         "--url-prefix must be an http:// or https:// URL, not javascript:alert(1)"},
+        {"{}", {"add", sans, "--url-prefix", "file:///srv/fonts"}, 2, "not file:///srv/fonts"},
+        {"{}", {"add", sans, "--url-prefix", "https:///nohost"}, 2, "not https:///nohost"},
         {"[1, 2]",
-         {"add", kDejaVu + "DejaVuSans.ttf", "--url-prefix", "u"},
+         {"add", sans, "--url-prefix", "HTTPS://h"},
          1,
          ": no \"assets\" array; fix or remove it first"},
-        {"{", {"add", kDejaVu + "DejaVuSans.ttf", "--url-prefix", "u"}, 1, ": not JSON"},
-        {"{}", {"add", kDejaVu + "DejaVuSans.ttf"}, 2, "give the font files and --url-prefix"},
+        {"{", {"add", sans, "--url-prefix", "http://h/"}, 1, ": not JSON"},
+        {"{}", {"add", sans}, 2, "give the font files and --url-prefix"},
         {"{}", {"check", "--bogus"}, 2, "unknown option --bogus"},
         {"{}", {"list", "a", "b"}, 2, "more than one catalog given"},
-        {"{}", {"remove"}, 2, "give add, check or list"},
+        {"{}", {"remove"}, 2, "give add, check, list or refresh"},
     };
     for (const Case& c : cases) {
         Write(c.catalog);
@@ -205,8 +224,10 @@ TEST_F(CatalogCommandTest, ListsWhatIsOfferedAndWhatIsInstalled) {
           "family": "DejaVu Sans"}, {"postScriptName": "Nobody-Regular"}]}]})");
     const Result result = Run({"list", catalog_});
     EXPECT_EQ(result.status, 0) << result.err;
-    EXPECT_EQ(result.out, "installed\tDejaVuSans-Bold\tDejaVu Sans\tS\t7\n"
-                          "offered\tNobody-Regular\t\tS\t7\n");
+    EXPECT_EQ(result.out, "installed\tDejaVuSans-Bold\tDejaVu Sans\tS\t7\t" + catalog_ +
+                              "\n"
+                              "offered\tNobody-Regular\t\tS\t7\t" +
+                              catalog_ + "\n");
 }
 
 #endif // GLYPHWELL_CATALOG_TOOL
