@@ -25,6 +25,10 @@
 inline constexpr uint64_t kMaximumPublishedCatalogSize = 64u << 20;
 /// How far ahead of this machine's clock a catalog's version may be.
 inline constexpr int64_t kCatalogClockAllowance = 24 * 60 * 60;
+/// The files of a publisher's kept copy, in its cache directory.
+inline constexpr char kPublisherCatalogFile[] = "catalog.json";
+inline constexpr char kPublisherSignatureFile[] = "catalog.json.minisig";
+inline constexpr char kPublisherStateFile[] = "state";
 
 /// When a catalog transfer is given up.
 struct QZCatalogFetchLimits {

@@ -94,8 +94,8 @@ std::vector<QZCatalogSource> QZCurrentCatalogSources(int64_t now) {
             continue;
         }
         sources.push_back({QZCatalogSource::Kind::Publisher, "publisher/" + publisher.name,
-                           directory + "/catalog.json", directory + "/catalog.json.minisig",
-                           publisher.publicKey});
+                           directory + "/" + kPublisherCatalogFile,
+                           directory + "/" + kPublisherSignatureFile, publisher.publicKey});
     }
     for (const std::string& path : QZSystemCatalogPaths())
         if (StampOf(path).exists)

@@ -1,6 +1,7 @@
 // The compiled catalog index: what it keeps, what it refuses, and when it is compiled again.
 #include <gtest/gtest.h>
 
+#include <cstring>
 #include <fcntl.h>
 #include <filesystem>
 #include <fstream>
