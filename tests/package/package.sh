@@ -65,12 +65,15 @@ dpkg-deb -x "$deb" "$root" || fail "dpkg-deb -x failed"
 dpkg-deb -e "$deb" "$tmp/control" || fail "dpkg-deb -e failed"
 
 # --- Contents and dependencies.
-for file in usr/libexec/GlyphwellUIAgent usr/bin/glyphwell; do
+for file in usr/libexec/GlyphwellUIAgent usr/libexec/glyphwell-bus-bridge usr/bin/glyphwell; do
     [ -x "$root/$file" ] || fail "/$file is missing or not executable"
 done
 for file in usr/lib/systemd/user/$unit usr/lib/systemd/user/glyphwell-ui-agent.service \
     usr/lib/systemd/user/glyphwell-catalog-refresh.timer \
     usr/lib/systemd/user/glyphwell-catalog-refresh.service \
+    usr/lib/systemd/user/glyphwell-bus-bridge.service \
+    etc/xdg/autostart/glyphwell-bus-bridge.desktop etc/X11/Xsession.d/90glyphwell-gtk-module \
+    usr/lib/environment.d/90-glyphwell-gtk-module.conf usr/share/man/man8/glyphwell-bus-bridge.8.gz \
     usr/share/applications/$app_id.desktop usr/share/icons/hicolor/scalable/apps/$app_id.svg \
     usr/share/applications/org.glyphwell.Glyphwell.GetMissingFonts.desktop \
     usr/share/man/man1/glyphwell.1.gz usr/share/man/man8/GlyphwellUIAgent.8.gz \
@@ -120,13 +123,15 @@ cp "$root/usr/lib/systemd/user/glyphwell-catalog-refresh.timer" "$tmp/units/"
 sed "s|^ExecStart=|ExecStart=$root|" \
     "$root/usr/lib/systemd/user/glyphwell-catalog-refresh.service" \
     >"$tmp/units/glyphwell-catalog-refresh.service"
+sed "s|^ExecStart=|ExecStart=$root|" "$root/usr/lib/systemd/user/glyphwell-bus-bridge.service" \
+    >"$tmp/units/glyphwell-bus-bridge.service"
 grep -qx 'Persistent=true' "$tmp/units/glyphwell-catalog-refresh.timer" ||
     fail "the catalog refresh timer does not catch up missed runs"
 verify_status=0
 XDG_RUNTIME_DIR="$tmp/runtime" MANPATH="$root/usr/share/man" systemd-analyze --user verify \
     "$tmp/units/$unit" "$tmp/units/glyphwell-ui-agent.service" \
     "$tmp/units/glyphwell-catalog-refresh.timer" "$tmp/units/glyphwell-catalog-refresh.service" \
-    >"$tmp/verify.log" 2>&1 ||
+    "$tmp/units/glyphwell-bus-bridge.service" >"$tmp/verify.log" 2>&1 ||
     verify_status=$?
 if [ "$verify_status" != 0 ] && grep -q 'initialize manager' "$tmp/verify.log"; then
     echo "SKIP (systemd-analyze verify does not work here): $(head -1 "$tmp/verify.log")"
@@ -139,7 +144,7 @@ else
 fi
 
 # --- Manual page: no formatting warnings, and every verb and option of the usage text in it.
-for page in man1/glyphwell.1.gz man8/GlyphwellUIAgent.8.gz; do
+for page in man1/glyphwell.1.gz man8/GlyphwellUIAgent.8.gz man8/glyphwell-bus-bridge.8.gz; do
     MANWIDTH=80 man --warnings -E UTF-8 -l -Tutf8 -Z "$root/usr/share/man/$page" \
         2>"$tmp/man.err" >/dev/null || fail "man cannot format $page"
     [ ! -s "$tmp/man.err" ] || fail "$page: $(cat "$tmp/man.err")"
@@ -178,7 +183,9 @@ maintainer_step enabled postinst configure "$version"
 rm "$link" # what `systemctl --global disable` does
 maintainer_step disabled postinst configure "$version"
 maintainer_step disabled postrm purge
-leftovers=$(find "$root/etc" "$root/var" -mindepth 1 ! -type d 2>/dev/null)
+# The package's own files in /etc (its conffiles) stay: they are dpkg's to remove on purge.
+leftovers=$(find "$root/etc" "$root/var" -mindepth 1 ! -type d 2>/dev/null |
+    sed "s|^$root||" | grep -vxF -f "$tmp/control/conffiles")
 [ -z "$leftovers" ] || fail "left after purge: $leftovers"
 
 # --- End to end: the extracted agent started by its socket, one request, idle exit.
