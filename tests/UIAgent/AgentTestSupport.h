@@ -199,12 +199,16 @@ inline QString WriteFile(const QString& path, const QByteArray& contents = QByte
     return path;
 }
 
-/// A temporary data home (and no other data directory) for the download catalog while it lives.
+/// A temporary data home (and no other data directory) for the download catalog while it lives,
+/// with private cache and configuration homes, so that the catalog's compiled indexes and the
+/// user's publishers stay out of the tests and the tests out of the user's cache.
 class PrivateDataHome {
 public:
     PrivateDataHome() {
         environment_.Set("XDG_DATA_HOME", directory_.path().toUtf8().constData());
         environment_.Set("XDG_DATA_DIRS", directory_.filePath("none").toUtf8().constData());
+        environment_.Set("XDG_CACHE_HOME", directory_.filePath("cache").toUtf8().constData());
+        environment_.Set("XDG_CONFIG_HOME", directory_.filePath("config").toUtf8().constData());
         QDir().mkpath(directory_.filePath("glyphwell"));
     }
     QString FilePath(const QString& name) const { return directory_.filePath(name); }
