@@ -11,6 +11,29 @@
 
 #include "documents/QZDocumentFonts.h"
 
+/// ASCII text helpers the readers share: document syntaxes put their keywords in ASCII, and
+/// font names are compared without regard to the locale.
+inline bool QZIsWhitespace(char c) {
+    return c == ' ' || c == '\t' || c == '\n' || c == '\r' || c == '\f';
+}
+inline char QZLowerASCII(char c) {
+    return c >= 'A' && c <= 'Z' ? char(c - 'A' + 'a') : c;
+}
+inline std::string QZLowerCopy(std::string_view text) {
+    std::string lower(text);
+    for (char& c : lower)
+        c = QZLowerASCII(c);
+    return lower;
+}
+/// `text` without the whitespace (QZIsWhitespace) at either end.
+inline std::string_view QZTrimWhitespace(std::string_view text) {
+    while (!text.empty() && QZIsWhitespace(text.front()))
+        text.remove_prefix(1);
+    while (!text.empty() && QZIsWhitespace(text.back()))
+        text.remove_suffix(1);
+    return text;
+}
+
 /// Gathers the fonts of one document: trims names, drops CSS generic families and empty names,
 /// keeps each (name, kind, style) once in order of first mention, and marks a font embedded when
 /// any mention says so (a family carried without a style covers every style of it). Keeps at
