@@ -9,7 +9,7 @@
 
 #include "bridge/QZApplicationName.h"
 
-#include "platform/HomeDirectory.h"
+#include "cfutil/CFUserDirectories.h"
 
 namespace {
 
@@ -35,14 +35,8 @@ void MakeDirectories(const std::string& directory) {
 } // namespace
 
 std::string QZDeclinedLanguages::DefaultPath() {
-    std::string state;
-    if (const char* variable = getenv("XDG_STATE_HOME"); variable && variable[0] == '/')
-        state = variable;
-    else if (const std::string home = glyphwell::HomeDirectory(); !home.empty())
-        state = home + "/.local/state";
-    else
-        return {};
-    return state + "/glyphwell/declined-languages";
+    const std::string state = GetUserBaseDirectory(XDGUserDirectory::State);
+    return state.empty() ? std::string() : state + "/glyphwell/declined-languages";
 }
 
 std::vector<QZDeclinedLanguages::Entry> QZDeclinedLanguages::Read(time_t now) const {
