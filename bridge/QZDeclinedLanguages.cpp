@@ -10,6 +10,7 @@
 #include "bridge/QZApplicationName.h"
 
 #include "cfutil/CFUserDirectories.h"
+#include "platform/ReplaceFile.h"
 
 namespace {
 
@@ -87,23 +88,9 @@ bool QZDeclinedLanguages::Record(const std::string& application,
     if (entries.size() > kMaximumEntries)
         entries.erase(entries.begin(), entries.end() - kMaximumEntries);
     MakeDirectories(path_.substr(0, path_.rfind('/')));
-    const std::string temporary = path_ + ".new";
     std::string text;
     for (const Entry& entry : entries)
         text +=
             std::to_string(entry.time) + '\t' + entry.language + '\t' + entry.application + '\n';
-    const int fd = open(temporary.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0600);
-    bool written = fd >= 0;
-    for (size_t done = 0; written && done < text.size();) {
-        const ssize_t count = write(fd, text.data() + done, text.size() - done);
-        written = count > 0 || (count < 0 && errno == EINTR);
-        done += count > 0 ? size_t(count) : 0;
-    }
-    if (fd >= 0 && close(fd) != 0)
-        written = false;
-    if (!written || std::rename(temporary.c_str(), path_.c_str()) != 0) {
-        unlink(temporary.c_str());
-        return false;
-    }
-    return true;
+    return glyphwell::ReplaceFile(path_, text, 0600);
 }

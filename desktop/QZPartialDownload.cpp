@@ -12,6 +12,7 @@
 #include <unistd.h>
 
 #include "desktop/QZCatalogPaths.h"
+#include "platform/ReplaceFile.h"
 
 namespace {
 
@@ -162,19 +163,11 @@ void QZPartialDownload::Remove() {
 void QZPartialDownload::WriteMetadata() {
     if (path_.empty())
         return;
-    // Written beside and renamed, so that a crash leaves the old metadata or the new.
+    // Replaced whole, so that a crash leaves the old metadata or the new.
     std::string text = "url: " + url_ + "\nsize: " + std::to_string(expected_) + "\n";
     if (!etag_.empty())
         text += "etag: " + etag_ + "\n";
     if (!lastModified_.empty())
         text += "last-modified: " + lastModified_ + "\n";
-    const std::string temporary = path_ + ".meta.new";
-    const int fd =
-        open(temporary.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC | O_NOFOLLOW, 0600);
-    if (fd < 0)
-        return;
-    const bool written = write(fd, text.data(), text.size()) == ssize_t(text.size());
-    close(fd);
-    if (!written || rename(temporary.c_str(), (path_ + ".meta").c_str()) != 0)
-        unlink(temporary.c_str());
+    glyphwell::ReplaceFile(path_ + ".meta", text, 0600);
 }
