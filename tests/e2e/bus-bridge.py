@@ -16,7 +16,7 @@ import sys
 
 sys.dont_write_bytecode = True  # no cache files in the source tree
 sys.path.insert(0, os.path.dirname(os.path.abspath(__file__)))
-from e2e_support import (FontServer, Failure, Run, check, require, start_xvfb,  # noqa: E402
+from e2e_support import (FontServer, Run, check, main, require, start_xvfb,  # noqa: E402
                          wait_for)
 
 NAME, PATH = "org.freedesktop.PackageKit", "/org/freedesktop/PackageKit"
@@ -245,11 +245,4 @@ def test(agent, tool, bridge):
 
 
 if __name__ == "__main__":
-    if len(sys.argv) != 4:
-        sys.exit(__doc__.splitlines()[-1])
-    try:
-        test(*sys.argv[1:])
-    except Failure as failure:
-        print(f"FAIL: {failure}", file=sys.stderr)
-        sys.exit(1)
-    print("PASS")
+    main(test, __doc__, 3)

@@ -221,9 +221,10 @@ def start_xvfb(run):
     return f":{number}"
 
 
-def main(test, usage):
-    """Runs `test(AGENT, GLYPHWELL)`: PASS, or FAIL with the reason (status 1)."""
-    if len(sys.argv) != 3:
+def main(test, usage, arguments=2):
+    """Runs `test` with the program's `arguments` (AGENT, GLYPHWELL, ...): PASS, or FAIL with the
+    reason (status 1)."""
+    if len(sys.argv) != arguments + 1:
         sys.exit(usage.splitlines()[-1])
     try:
         test(*sys.argv[1:])
