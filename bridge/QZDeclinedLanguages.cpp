@@ -10,6 +10,7 @@
 #include "bridge/QZApplicationName.h"
 
 #include "cfutil/CFUserDirectories.h"
+#include "platform/ReadFile.h"
 #include "platform/ReplaceFile.h"
 
 namespace {
@@ -43,7 +44,7 @@ std::string QZDeclinedLanguages::DefaultPath() {
 std::vector<QZDeclinedLanguages::Entry> QZDeclinedLanguages::Read(time_t now) const {
     std::vector<Entry> entries;
     std::string text;
-    if (!QZReadFileStart(path_, kMaximumFileSize, &text))
+    if (!glyphwell::ReadFileStart(path_, kMaximumFileSize, &text))
         return entries;
     for (size_t start = 0; start < text.size();) {
         const size_t lineEnd = text.find('\n', start);

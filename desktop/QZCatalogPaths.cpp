@@ -8,6 +8,7 @@
 #include <unistd.h>
 
 #include "cfutil/CFUserDirectories.h"
+#include "platform/ReadFile.h"
 
 namespace {
 
@@ -47,21 +48,9 @@ std::optional<std::string> QZReadCatalogFile(const std::string& path, uint64_t l
         reason = "not a regular file";
     else if (uint64_t(status.st_size) > limit)
         reason = "larger than " + std::to_string(limit) + " bytes";
-    else
-        bytes.resize(size_t(status.st_size));
     // A file that grows while it is read is cut at the size it had; one that shrinks, at its end.
-    for (size_t done = 0; reason.empty() && done < bytes.size();) {
-        const ssize_t count = read(fd, bytes.data() + done, bytes.size() - done);
-        if (count < 0 && errno == EINTR)
-            continue;
-        if (count < 0)
-            reason = std::strerror(errno);
-        if (count <= 0) {
-            bytes.resize(done);
-            break;
-        }
-        done += size_t(count);
-    }
+    else if (!glyphwell::ReadUpTo(fd, size_t(status.st_size), &bytes))
+        reason = std::strerror(errno);
     if (fd >= 0)
         close(fd);
     if (reason.empty())

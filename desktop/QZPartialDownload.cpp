@@ -12,6 +12,7 @@
 #include <unistd.h>
 
 #include "desktop/QZCatalogPaths.h"
+#include "platform/ReadFile.h"
 #include "platform/ReplaceFile.h"
 
 namespace {
@@ -87,12 +88,8 @@ bool QZPartialDownload::Open(const std::string& directory, const std::string& sh
         return fd_ >= 0;
     }
     // The bytes are kept only when the metadata says they belong to this URL and size.
-    std::string text(kMaximumMetadataSize, '\0');
-    const int meta = open((path_ + ".meta").c_str(), O_RDONLY | O_CLOEXEC | O_NOFOLLOW);
-    const ssize_t count = meta >= 0 ? read(meta, text.data(), text.size()) : -1;
-    if (meta >= 0)
-        close(meta);
-    text.resize(count > 0 ? size_t(count) : 0);
+    std::string text;
+    glyphwell::ReadFileStart(path_ + ".meta", kMaximumMetadataSize, &text, O_NOFOLLOW);
     std::istringstream lines(text);
     std::string line, keptURL, keptSize;
     while (std::getline(lines, line)) {
