@@ -99,15 +99,7 @@ def test(agent, tool, bridge):
                         run.path("data/glyphwell/downloadable-fonts.json")],
                        env=run.env, check=True, capture_output=True)
 
-        with open(run.path("bus.conf"), "w") as f:
-            f.write(f'<busconfig><type>session</type><listen>unix:path={run.path("bus")}</listen>'
-                    f'<servicedir>{run.path("services")}</servicedir><auth>EXTERNAL</auth>'
-                    '<policy context="default"><allow send_destination="*" eavesdrop="true"/>'
-                    '<allow eavesdrop="true"/><allow own="*"/>'
-                    '</policy></busconfig>\n')
-        run.start("dbus", ["dbus-daemon", "--nofork", "--config-file", run.path("bus.conf")])
-        wait_for("the private bus", lambda: os.path.exists(run.path("bus")))
-        run.env["DBUS_SESSION_BUS_ADDRESS"] = "unix:path=" + run.path("bus")
+        run.start_session_bus(run.path("services"))
 
         def gdbus(method, *arguments, dest=NAME, path=PATH):
             result = subprocess.run(["gdbus", "call", "--session", "--dest", dest,
