@@ -474,5 +474,5 @@ QZLoadIndexedCatalogSource(const QZCatalogSource& source) {
     if (indexed && stored.path == key.path && stored.sha256 == key.sha256 &&
         stored.publicKey == key.publicKey && stored.signatureSHA256 == key.signatureSHA256)
         return compile(indexed->Catalog({}, true), key, indexPath);
-    return compile(QZLoadCatalogSource(source), key, indexPath);
+    return compile(QZCatalogFromSourceBytes(source, *bytes), key, indexPath);
 }
