@@ -106,11 +106,11 @@ std::string StyleOf(std::string_view weight, std::string_view slant) {
         {"500", "Medium"}, {"600", "SemiBold"},   {"700", "Bold"},
         {"bold", "Bold"},  {"800", "ExtraBold"},  {"900", "Black"}};
     std::string style;
-    const std::string lowerWeight = QZLowerCopy(QZTrimWhitespace(weight));
+    const std::string lowerWeight = glyphwell::LowerASCIICopy(QZTrimWhitespace(weight));
     for (const auto& [value, name] : kWeights)
         if (lowerWeight == value)
             style = name;
-    const std::string lowerSlant = QZLowerCopy(QZTrimWhitespace(slant));
+    const std::string lowerSlant = glyphwell::LowerASCIICopy(QZTrimWhitespace(slant));
     if (lowerSlant.starts_with("italic") || lowerSlant.starts_with("oblique"))
         style += style.empty() ? "Italic" : " Italic";
     return style;
@@ -128,7 +128,7 @@ std::string_view ShorthandFamilies(std::string_view value) {
         const size_t start = i;
         while (i < value.size() && !QZIsWhitespace(value[i]) && value[i] != ',')
             ++i;
-        std::string token = QZLowerCopy(value.substr(start, i - start));
+        std::string token = glyphwell::LowerASCIICopy(value.substr(start, i - start));
         if (token.empty())
             return {};
         const bool digits = token.find_first_not_of("0123456789") == std::string::npos;
@@ -161,7 +161,8 @@ void CollectFontFace(std::string_view declarations, QZFontCollector& fonts) {
         const size_t colon = declaration.find(':');
         if (colon == std::string_view::npos)
             return;
-        const std::string property = QZLowerCopy(QZTrimWhitespace(declaration.substr(0, colon)));
+        const std::string property =
+            glyphwell::LowerASCIICopy(QZTrimWhitespace(declaration.substr(0, colon)));
         const std::string_view value = QZTrimWhitespace(declaration.substr(colon + 1));
         if (property == "font-family")
             family = FamilyName(value);
@@ -172,13 +173,13 @@ void CollectFontFace(std::string_view declarations, QZFontCollector& fonts) {
         else if (property == "font-style")
             slant = std::string(value);
     });
-    if (QZLowerCopy(source).find("url(") != std::string::npos) {
+    if (glyphwell::LowerASCIICopy(source).find("url(") != std::string::npos) {
         fonts.Add(family, QZDocumentFontKind::Family, StyleOf(weight, slant), true);
         return;
     }
     Split(source, ',', [&](std::string_view item) {
         item = QZTrimWhitespace(item);
-        if (QZLowerCopy(item.substr(0, 6)) == "local(" && item.back() == ')')
+        if (glyphwell::LowerASCIICopy(item.substr(0, 6)) == "local(" && item.back() == ')')
             fonts.Add(FamilyName(item.substr(6, item.size() - 7)), QZDocumentFontKind::Full);
     });
 }
@@ -221,7 +222,7 @@ void CollectRules(std::string_view css, QZFontCollector& fonts, unsigned depth) 
         if (end == css.size())
             return;
         const std::string prelude =
-            QZLowerCopy(QZTrimWhitespace(WithoutComments(css.substr(i, end - i))));
+            glyphwell::LowerASCIICopy(QZTrimWhitespace(WithoutComments(css.substr(i, end - i))));
         if (css[end] == ';') { // @import, @charset...
             i = end + 1;
             continue;
@@ -269,7 +270,7 @@ std::string DecodeReferences(std::string_view value) {
 size_t FindIgnoringCase(std::string_view text, std::string_view needle, size_t from) {
     for (size_t i = from; i + needle.size() <= text.size(); ++i) {
         size_t j = 0;
-        while (j < needle.size() && QZLowerASCII(text[i + j]) == needle[j])
+        while (j < needle.size() && glyphwell::LowerASCII(text[i + j]) == needle[j])
             ++j;
         if (j == needle.size())
             return i;
@@ -290,7 +291,8 @@ void QZCollectCSSDeclarations(std::string_view declarations, QZFontCollector& fo
         const size_t colon = declaration.find(':');
         if (colon == std::string_view::npos)
             return;
-        const std::string property = QZLowerCopy(QZTrimWhitespace(declaration.substr(0, colon)));
+        const std::string property =
+            glyphwell::LowerASCIICopy(QZTrimWhitespace(declaration.substr(0, colon)));
         const std::string value = WithoutComments(declaration.substr(colon + 1));
         if (property == "font-family")
             QZCollectCSSFamilies(value, fonts);
@@ -321,7 +323,7 @@ void QZCollectHTMLFonts(std::string_view html, QZFontCollector& fonts) {
         while (i < html.size() && (std::isalnum(static_cast<unsigned char>(html[i])) ||
                                    html[i] == ':' || html[i] == '-'))
             ++i;
-        std::string tag = QZLowerCopy(html.substr(nameStart, i - nameStart));
+        std::string tag = glyphwell::LowerASCIICopy(html.substr(nameStart, i - nameStart));
         if (const size_t colon = tag.rfind(':'); colon != std::string::npos)
             tag.erase(0, colon + 1);
         if (tag.empty())
@@ -337,7 +339,7 @@ void QZCollectHTMLFonts(std::string_view html, QZFontCollector& fonts) {
                    html[i] != '>' && html[i] != '/')
                 ++i;
             const std::string attribute =
-                QZLowerCopy(html.substr(attributeStart, i - attributeStart));
+                glyphwell::LowerASCIICopy(html.substr(attributeStart, i - attributeStart));
             if (attributeStart == i) {
                 ++i;
                 continue;

@@ -16,7 +16,7 @@ bool StartsWithIgnoringCase(std::string_view text, std::string_view prefix) {
     if (text.size() < prefix.size())
         return false;
     for (size_t i = 0; i < prefix.size(); ++i)
-        if (QZLowerASCII(text[i]) != prefix[i])
+        if (glyphwell::LowerASCII(text[i]) != prefix[i])
             return false;
     return true;
 }

@@ -10,20 +10,11 @@
 #include <vector>
 
 #include "documents/QZDocumentFonts.h"
+#include "platform/ASCIIText.h"
 
-/// ASCII text helpers the readers share: document syntaxes put their keywords in ASCII, and
-/// font names are compared without regard to the locale.
+/// Whitespace as the document syntaxes count it (space, tab, line ends, form feed).
 inline bool QZIsWhitespace(char c) {
     return c == ' ' || c == '\t' || c == '\n' || c == '\r' || c == '\f';
-}
-inline char QZLowerASCII(char c) {
-    return c >= 'A' && c <= 'Z' ? char(c - 'A' + 'a') : c;
-}
-inline std::string QZLowerCopy(std::string_view text) {
-    std::string lower(text);
-    for (char& c : lower)
-        c = QZLowerASCII(c);
-    return lower;
 }
 /// `text` without the whitespace (QZIsWhitespace) at either end.
 inline std::string_view QZTrimWhitespace(std::string_view text) {

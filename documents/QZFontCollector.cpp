@@ -7,23 +7,17 @@
 
 namespace {
 
-bool EqualIgnoringCase(std::string_view a, std::string_view b) {
-    return a.size() == b.size() && std::equal(a.begin(), a.end(), b.begin(), [](char x, char y) {
-               return QZLowerASCII(x) == QZLowerASCII(y);
-           });
-}
-
 /// The key under which a font is kept once: case folded, kind and style apart.
 std::string Key(std::string_view name, QZDocumentFontKind kind, std::string_view style) {
     std::string key;
     key.reserve(name.size() + style.size() + 3);
     for (char c : name)
-        key += QZLowerASCII(c);
+        key += glyphwell::LowerASCII(c);
     key += '\x1f';
     key += char('0' + int(kind));
     key += '\x1f';
     for (char c : style)
-        key += QZLowerASCII(c);
+        key += glyphwell::LowerASCII(c);
     return key;
 }
 
@@ -35,8 +29,9 @@ bool QZIsGenericFamily(std::string_view name) {
         "ui-serif", "ui-sans-serif", "ui-monospace", "ui-rounded", "math",    "emoji",
         "fangsong", "inherit",       "initial",      "unset",      "revert",  "revert-layer",
         "default",  "-apple-system", "none"};
-    return std::any_of(kGeneric.begin(), kGeneric.end(),
-                       [&](std::string_view generic) { return EqualIgnoringCase(name, generic); });
+    return std::any_of(kGeneric.begin(), kGeneric.end(), [&](std::string_view generic) {
+        return glyphwell::EqualIgnoringASCIICase(name, generic);
+    });
 }
 
 void QZFontCollector::Add(std::string_view name, QZDocumentFontKind kind, std::string_view style,

@@ -57,7 +57,7 @@ bool QZCollectSubtitleFonts(std::string_view text, QZFontCollector& fonts, std::
         text.remove_prefix(3);
     while (!text.empty() && (text.front() == '\n' || text.front() == '\r' || text.front() == ' '))
         text.remove_prefix(1);
-    if (QZLowerCopy(text.substr(0, 13)) != "[script info]")
+    if (glyphwell::LowerASCIICopy(text.substr(0, 13)) != "[script info]")
         return false;
     *format = "ass";
     std::string section;
@@ -69,7 +69,7 @@ bool QZCollectSubtitleFonts(std::string_view text, QZFontCollector& fonts, std::
         const std::string_view line = Trim(text.substr(start, end - start));
         start = end + 1;
         if (line.starts_with("[")) {
-            section = QZLowerCopy(line);
+            section = glyphwell::LowerASCIICopy(line);
             if (section == "[v4 styles]")
                 *format = "ssa";
             continue;
@@ -77,13 +77,13 @@ bool QZCollectSubtitleFonts(std::string_view text, QZFontCollector& fonts, std::
         const size_t colon = line.find(':');
         if (colon == std::string_view::npos)
             continue;
-        const std::string key = QZLowerCopy(Trim(line.substr(0, colon)));
+        const std::string key = glyphwell::LowerASCIICopy(Trim(line.substr(0, colon)));
         const std::string_view value = Trim(line.substr(colon + 1));
         if (section == "[v4+ styles]" || section == "[v4 styles]") {
             const std::vector<std::string_view> fields = Fields(value);
             if (key == "format") {
                 for (size_t i = 0; i < fields.size(); ++i) {
-                    const std::string field = QZLowerCopy(fields[i]);
+                    const std::string field = glyphwell::LowerASCIICopy(fields[i]);
                     if (field == "fontname")
                         fontnameField = i;
                     else if (field == "bold")
