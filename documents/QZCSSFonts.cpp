@@ -73,6 +73,17 @@ template <class Visit> void Split(std::string_view text, char separator, Visit v
     visit(text.substr(start));
 }
 
+/// Calls `visit(property, value)` for each "property: value" of a declaration list, the property
+/// trimmed and in lower case, the value as written.
+template <class Visit> void ForEachDeclaration(std::string_view declarations, Visit visit) {
+    Split(declarations, ';', [&](std::string_view declaration) {
+        const size_t colon = declaration.find(':');
+        if (colon != std::string_view::npos)
+            visit(glyphwell::LowerASCIICopy(QZTrimWhitespace(declaration.substr(0, colon))),
+                  declaration.substr(colon + 1));
+    });
+}
+
 /// One family of a font-family list: a quoted string without its quotes and escapes, or
 /// identifiers joined by single spaces.
 std::string FamilyName(std::string_view item) {
@@ -157,13 +168,8 @@ std::string_view ShorthandFamilies(std::string_view value) {
 /// local() names it points at otherwise.
 void CollectFontFace(std::string_view declarations, QZFontCollector& fonts) {
     std::string family, source, weight, slant;
-    Split(declarations, ';', [&](std::string_view declaration) {
-        const size_t colon = declaration.find(':');
-        if (colon == std::string_view::npos)
-            return;
-        const std::string property =
-            glyphwell::LowerASCIICopy(QZTrimWhitespace(declaration.substr(0, colon)));
-        const std::string_view value = QZTrimWhitespace(declaration.substr(colon + 1));
+    ForEachDeclaration(declarations, [&](const std::string& property, std::string_view value) {
+        value = QZTrimWhitespace(value);
         if (property == "font-family")
             family = FamilyName(value);
         else if (property == "src")
@@ -287,13 +293,8 @@ void QZCollectCSSFamilies(std::string_view value, QZFontCollector& fonts, bool e
 }
 
 void QZCollectCSSDeclarations(std::string_view declarations, QZFontCollector& fonts) {
-    Split(declarations, ';', [&](std::string_view declaration) {
-        const size_t colon = declaration.find(':');
-        if (colon == std::string_view::npos)
-            return;
-        const std::string property =
-            glyphwell::LowerASCIICopy(QZTrimWhitespace(declaration.substr(0, colon)));
-        const std::string value = WithoutComments(declaration.substr(colon + 1));
+    ForEachDeclaration(declarations, [&](const std::string& property, std::string_view text) {
+        const std::string value = WithoutComments(text);
         if (property == "font-family")
             QZCollectCSSFamilies(value, fonts);
         else if (property == "font")
