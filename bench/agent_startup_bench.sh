@@ -13,59 +13,26 @@ agent=${1:?usage: agent_startup_bench.sh AGENT [N]}
 runs=${2:-20}
 export QT_QPA_PLATFORM=offscreen
 
-python3 - "$agent" "$runs" <<'PY'
-import math, os, signal, socket, struct, subprocess, sys, tempfile, time
+python3 - "$agent" "$runs" "$(dirname "$0")" <<'PY'
+import os, sys, tempfile, time
 
 agent, runs = sys.argv[1], int(sys.argv[2])
-port_name = "org.glyphwell.Glyphwell.GlyphwellUIAgent"
+sys.dont_write_bytecode = True  # no cache files in the source tree
+sys.path.insert(0, sys.argv[3])
+from agent_port import percentile, start_and_ask, stop as stop_agent  # noqa: E402
 
 def start():
     runtime = tempfile.mkdtemp(prefix="glyphwell-bench-")
     os.chmod(runtime, 0o700)
-    path = os.path.join(runtime, port_name)
     env = dict(os.environ, XDG_RUNTIME_DIR=runtime)
-    started = time.monotonic_ns()
-    proc = subprocess.Popen([agent], env=env, stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL)
-    sock = None
-    deadline = started + 10 * 10**9
-    while time.monotonic_ns() < deadline:
-        s = socket.socket(socket.AF_UNIX, socket.SOCK_STREAM)
-        try:
-            s.connect(path)
-            sock = s
-            break
-        except OSError:
-            s.close()
-            time.sleep(0.0005)
-    if sock is None:
-        proc.kill(); proc.wait()
-        sys.exit("the agent did not open its port within 10 s")
-    connected = time.monotonic_ns()
-    sock.sendall(struct.pack(">iI", 3, 0))  # unknown message id, empty body
-    header = b""
-    while len(header) < 4:
-        chunk = sock.recv(4 - len(header))
-        if not chunk:
-            sys.exit("the agent closed the connection without a reply")
-        header += chunk
-    replied = time.monotonic_ns()
-    sock.close()
-    return proc, runtime, (connected - started) / 1e6, (replied - started) / 1e6
+    proc, connect_ms, reply_ms = start_and_ask(agent, env, 3, b"", 10)  # unknown message id
+    return proc, runtime, connect_ms, reply_ms
 
 def stop(proc, runtime):
-    proc.send_signal(signal.SIGTERM)
-    try:
-        proc.wait(timeout=5)
-    except subprocess.TimeoutExpired:
-        proc.kill(); proc.wait()
+    stop_agent(proc)
     for name in os.listdir(runtime):
         os.unlink(os.path.join(runtime, name))
     os.rmdir(runtime)
-
-def percentile(values, p):
-    ordered = sorted(values)
-    # Nearest rank: the smallest value with at least p % of the values at or below it.
-    return ordered[max(0, math.ceil(p / 100 * len(ordered)) - 1)]
 
 # One warm-up start (file cache, fontconfig cache) that is not counted.
 stop(*start()[:2])

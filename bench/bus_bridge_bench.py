@@ -49,14 +49,7 @@ def main(bridge, agent=None, tool=None):
                     '</cachedir></fontconfig>\n')
         run.env.update(XDG_DATA_DIRS=run.path("data"), XDG_STATE_HOME=run.path("state"),
                        GLYPHWELL_INPUT_GUARD_MS="0", QT_QPA_PLATFORM="xcb")
-        with open(run.path("bus.conf"), "w") as f:
-            f.write(f'<busconfig><type>session</type><listen>unix:path={run.path("bus")}</listen>'
-                    '<auth>EXTERNAL</auth><policy context="default"><allow send_destination="*" '
-                    'eavesdrop="true"/><allow eavesdrop="true"/><allow own="*"/></policy>'
-                    '</busconfig>\n')
-        run.start("dbus", ["dbus-daemon", "--nofork", "--config-file", run.path("bus.conf")])
-        wait_for("the bus", lambda: os.path.exists(run.path("bus")))
-        run.env["DBUS_SESSION_BUS_ADDRESS"] = "unix:path=" + run.path("bus")
+        run.start_session_bus()
         # Start-up: exec to the name owned, asked of the bus in a tight loop, 10 starts.
         from gi.repository import Gio, GLib
         os.environ["DBUS_SESSION_BUS_ADDRESS"] = run.env["DBUS_SESSION_BUS_ADDRESS"]

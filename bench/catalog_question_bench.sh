@@ -38,12 +38,14 @@ echo '{"QZUIPropertyApplicationName": "Bench", "QZUIPropertySuppress": true,
        "QZUIPropertyFontProperties": [{"NSFontNameAttribute": "NotInAnyCatalog-Regular"}]}' |
     "$tool" encode -o "$work/request.bin"
 
-python3 - "$agent" "$runs" "$work" <<'PY'
-import math, os, random, shutil, signal, socket, struct, subprocess, sys, tempfile, time
+python3 - "$agent" "$runs" "$work" "$(dirname "$0")" <<'PY'
+import os, random, shutil, sys, tempfile
 
 agent, runs, work = sys.argv[1], int(sys.argv[2]), sys.argv[3]
+sys.dont_write_bytecode = True  # no cache files in the source tree
+sys.path.insert(0, sys.argv[4])
+from agent_port import percentile, start_and_ask, stop  # noqa: E402
 request = open(os.path.join(work, "request.bin"), "rb").read()
-port_name = "org.glyphwell.Glyphwell.GlyphwellUIAgent"
 
 def catalog(count):
     rng = random.Random(42)
@@ -65,42 +67,10 @@ def question(home):
     env = dict(os.environ, XDG_RUNTIME_DIR=runtime, XDG_DATA_HOME=home + "/data",
                XDG_DATA_DIRS=home + "/none", XDG_CACHE_HOME=home + "/cache",
                XDG_CONFIG_HOME=home + "/config")
-    path = os.path.join(runtime, port_name)
-    started = time.monotonic_ns()
-    proc = subprocess.Popen([agent], env=env, stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL)
-    deadline = started + 30 * 10**9
-    sock = None
-    while sock is None and time.monotonic_ns() < deadline:
-        s = socket.socket(socket.AF_UNIX, socket.SOCK_STREAM)
-        try:
-            s.connect(path)
-            sock = s
-        except OSError:
-            s.close()
-            time.sleep(0.0005)
-    if sock is None:
-        proc.kill(); proc.wait()
-        sys.exit("the agent did not open its port within 30 s")
-    sock.sendall(struct.pack(">iI", 2, len(request)) + request)
-    header = b""
-    while len(header) < 4:
-        chunk = sock.recv(4 - len(header))
-        if not chunk:
-            sys.exit("the agent closed the connection without a reply")
-        header += chunk
-    replied = time.monotonic_ns()
-    sock.close()
-    proc.send_signal(signal.SIGTERM)
-    try:
-        proc.wait(timeout=5)
-    except subprocess.TimeoutExpired:
-        proc.kill(); proc.wait()
+    proc, _, reply_ms = start_and_ask(agent, env, 2, request, 30)
+    stop(proc)
     shutil.rmtree(runtime)
-    return (replied - started) / 1e6
-
-def percentile(values, p):
-    ordered = sorted(values)
-    return ordered[max(0, math.ceil(p / 100 * len(ordered)) - 1)]
+    return reply_ms
 
 question(os.path.join(work, "warm-up"))  # file cache, fontconfig cache: not counted
 print(f"questions per figure: {runs}; platform {os.environ['QT_QPA_PLATFORM']}")

@@ -20,6 +20,7 @@
 #include <vector>
 
 #include "documents/QZDocumentFonts.h"
+#include "support/PDFFile.h"
 
 extern char** environ;
 
@@ -70,21 +71,7 @@ std::string MakePDF() {
         kids += std::to_string(page) + " 0 R ";
     }
     objects[1] = "<< /Type /Pages /Kids [" + kids + "] /Count " + std::to_string(kPages) + " >>";
-    std::string pdf = "%PDF-1.7\n";
-    std::vector<size_t> offsets;
-    for (size_t i = 0; i < objects.size(); ++i) {
-        offsets.push_back(pdf.size());
-        pdf += std::to_string(i + 1) + " 0 obj\n" + objects[i] + "\nendobj\n";
-    }
-    const size_t xref = pdf.size();
-    pdf += "xref\n0 " + std::to_string(objects.size() + 1) + "\n0000000000 65535 f \n";
-    char entry[32];
-    for (size_t offset : offsets) {
-        snprintf(entry, sizeof entry, "%010zu 00000 n \n", offset);
-        pdf += entry;
-    }
-    return pdf + "trailer\n<< /Size " + std::to_string(objects.size() + 1) +
-           " /Root 1 0 R >>\nstartxref\n" + std::to_string(xref) + "\n%%EOF\n";
+    return glyphwell::testing::PDFFromObjects(objects);
 }
 
 /// A DOCX of about 20 MB: 48 MiB of paragraphs whose runs name kFonts fonts (deflated to a few

@@ -9,6 +9,7 @@
 #include <vector>
 
 #include "cfutil/CFUserDirectories.h"
+#include "platform/ReadFile.h"
 
 namespace {
 
@@ -69,33 +70,10 @@ std::string QZDesktopEntryPath(std::string_view desktopID) {
     return {};
 }
 
-bool QZReadFileStart(const std::string& path, size_t limit, std::string* text) {
-    const int fd = open(path.c_str(), O_RDONLY | O_CLOEXEC);
-    if (fd < 0)
-        return false;
-    text->assign(limit, '\0');
-    size_t used = 0;
-    while (used < limit) {
-        const ssize_t count = read(fd, text->data() + used, limit - used);
-        if (count < 0 && errno == EINTR)
-            continue;
-        if (count <= 0) {
-            if (count < 0)
-                used = SIZE_MAX;
-            break;
-        }
-        used += size_t(count);
-    }
-    close(fd);
-    if (used == SIZE_MAX)
-        return false;
-    text->resize(used);
-    return true;
-}
-
 std::string QZDesktopEntryName(const std::string& path) {
     std::string text;
-    if (!QZReadFileStart(path, kMaximumEntrySize + 1, &text) || text.size() > kMaximumEntrySize)
+    if (!glyphwell::ReadFileStart(path, kMaximumEntrySize + 1, &text) ||
+        text.size() > kMaximumEntrySize)
         return {};
     const std::vector<std::string> keys = LocaleKeys();
     std::string name;
@@ -150,7 +128,7 @@ std::string QZExecutableName(pid_t pid) {
         return path.substr(path.rfind('/') + 1);
     }
     std::string name;
-    if (!QZReadFileStart(process + "/comm", 64, &name))
+    if (!glyphwell::ReadFileStart(process + "/comm", 64, &name))
         return {};
     return name.substr(0, name.find('\n'));
 }

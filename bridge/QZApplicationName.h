@@ -17,10 +17,6 @@ std::string QZDesktopEntryPath(std::string_view desktopID);
 /// `Name[ll]`, then `Name`). Empty when the file cannot be read, is over 1 MiB or has none.
 std::string QZDesktopEntryName(const std::string& path);
 
-/// The first `limit` bytes of the file at `path` (POSIX reads: no stream or locale machinery is
-/// kept resident by it); false when it cannot be opened or read.
-bool QZReadFileStart(const std::string& path, size_t limit, std::string* text);
-
 /// The name of the executable of process `pid` (the file name of /proc/PID/exe, else
 /// /proc/PID/comm); empty when the process is gone or cannot be inspected.
 std::string QZExecutableName(pid_t pid);

@@ -9,7 +9,9 @@
 
 #include "bridge/QZApplicationName.h"
 
-#include "platform/HomeDirectory.h"
+#include "cfutil/CFUserDirectories.h"
+#include "platform/ReadFile.h"
+#include "platform/ReplaceFile.h"
 
 namespace {
 
@@ -35,20 +37,14 @@ void MakeDirectories(const std::string& directory) {
 } // namespace
 
 std::string QZDeclinedLanguages::DefaultPath() {
-    std::string state;
-    if (const char* variable = getenv("XDG_STATE_HOME"); variable && variable[0] == '/')
-        state = variable;
-    else if (const std::string home = glyphwell::HomeDirectory(); !home.empty())
-        state = home + "/.local/state";
-    else
-        return {};
-    return state + "/glyphwell/declined-languages";
+    const std::string state = GetUserBaseDirectory(XDGUserDirectory::State);
+    return state.empty() ? std::string() : state + "/glyphwell/declined-languages";
 }
 
 std::vector<QZDeclinedLanguages::Entry> QZDeclinedLanguages::Read(time_t now) const {
     std::vector<Entry> entries;
     std::string text;
-    if (!QZReadFileStart(path_, kMaximumFileSize, &text))
+    if (!glyphwell::ReadFileStart(path_, kMaximumFileSize, &text))
         return entries;
     for (size_t start = 0; start < text.size();) {
         const size_t lineEnd = text.find('\n', start);
@@ -93,23 +89,9 @@ bool QZDeclinedLanguages::Record(const std::string& application,
     if (entries.size() > kMaximumEntries)
         entries.erase(entries.begin(), entries.end() - kMaximumEntries);
     MakeDirectories(path_.substr(0, path_.rfind('/')));
-    const std::string temporary = path_ + ".new";
     std::string text;
     for (const Entry& entry : entries)
         text +=
             std::to_string(entry.time) + '\t' + entry.language + '\t' + entry.application + '\n';
-    const int fd = open(temporary.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0600);
-    bool written = fd >= 0;
-    for (size_t done = 0; written && done < text.size();) {
-        const ssize_t count = write(fd, text.data() + done, text.size() - done);
-        written = count > 0 || (count < 0 && errno == EINTR);
-        done += count > 0 ? size_t(count) : 0;
-    }
-    if (fd >= 0 && close(fd) != 0)
-        written = false;
-    if (!written || std::rename(temporary.c_str(), path_.c_str()) != 0) {
-        unlink(temporary.c_str());
-        return false;
-    }
-    return true;
+    return glyphwell::ReplaceFile(path_, text, 0600);
 }

@@ -20,6 +20,7 @@
 #include "desktop/QZFontLanguages.h"
 #include "platform/Log.h"
 #include "platform/LogEscape.h"
+#include "platform/ReadFile.h"
 
 struct QZFontAsker::Burst {
     QZFontAsker* asker = nullptr;
@@ -50,7 +51,7 @@ std::string Escaped(std::string_view text) {
 /// Whether process `pid` runs: it exists and is not a zombie waiting for its parent.
 bool ProcessExists(pid_t pid) {
     std::string stat;
-    if (!QZReadFileStart("/proc/" + std::to_string(pid) + "/stat", 1024, &stat))
+    if (!glyphwell::ReadFileStart("/proc/" + std::to_string(pid) + "/stat", 1024, &stat))
         return false;
     const size_t end = stat.rfind(')');
     return end != std::string::npos && end + 2 < stat.size() && stat[end + 2] != 'Z' &&

@@ -33,20 +33,13 @@ std::string InHome(std::string home, const char* subdirectory) {
 /// The path that `name` stands for; false when it has none.
 bool ConfigurationPath(confstr_path_t name, std::string& path) {
     const char* value = nullptr;
-    std::string home;
     switch (name) {
     case kUserRuntimeDirectory:
         value = AbsolutePathVariable("XDG_RUNTIME_DIR");
         break;
     case kUserCacheDirectory:
-        value = AbsolutePathVariable("XDG_CACHE_HOME");
-        if (!value) {
-            if (!HomeDirectoryPath(nullptr, home))
-                return false;
-            path = InHome(home, ".cache");
-            return true;
-        }
-        break;
+        path = GetUserBaseDirectory(XDGUserDirectory::Cache);
+        return !path.empty();
     case kUserTemporaryDirectory:
         value = AbsolutePathVariable("TMPDIR");
         if (!value)
@@ -91,16 +84,23 @@ size_t GetConfigurationPath(confstr_path_t name, char* buffer, size_t length) {
     return path.size() + 1;
 }
 
-std::vector<std::string> GetDataDirectories() {
-    std::vector<std::string> directories;
-    if (const char* dataHome = AbsolutePathVariable("XDG_DATA_HOME")) {
-        directories.emplace_back(dataHome);
-    } else {
-        std::string home;
-        if (HomeDirectoryPath(nullptr, home))
-            directories.push_back(InHome(home, ".local/share"));
-    }
+std::string GetUserBaseDirectory(XDGUserDirectory which) {
+    static constexpr struct {
+        const char* variable;
+        const char* inHome;
+    } kRules[] = {{"XDG_CACHE_HOME", ".cache"},
+                  {"XDG_CONFIG_HOME", ".config"},
+                  {"XDG_DATA_HOME", ".local/share"},
+                  {"XDG_STATE_HOME", ".local/state"}};
+    const auto& rule = kRules[int(which)];
+    if (const char* value = AbsolutePathVariable(rule.variable))
+        return value;
+    std::string home;
+    return HomeDirectoryPath(nullptr, home) ? InHome(home, rule.inHome) : std::string();
+}
 
+std::vector<std::string> GetSystemDataDirectories() {
+    std::vector<std::string> directories;
     const char* dataDirs = getenv("XDG_DATA_DIRS");
     if (!dataDirs || !*dataDirs)
         dataDirs = "/usr/local/share:/usr/share";
@@ -114,5 +114,16 @@ std::vector<std::string> GetDataDirectories() {
     }
     for (std::string& directory : directories)
         RemoveTrailingSlashes(directory);
+    return directories;
+}
+
+std::vector<std::string> GetDataDirectories() {
+    std::vector<std::string> directories;
+    if (std::string dataHome = GetUserBaseDirectory(XDGUserDirectory::Data); !dataHome.empty()) {
+        RemoveTrailingSlashes(dataHome);
+        directories.push_back(std::move(dataHome));
+    }
+    for (std::string& directory : GetSystemDataDirectories())
+        directories.push_back(std::move(directory));
     return directories;
 }

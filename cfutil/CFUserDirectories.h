@@ -35,6 +35,18 @@ enum confstr_path_t : int {
 /// copy was cut short.
 size_t GetConfigurationPath(confstr_path_t name, char* buffer, size_t length);
 
+/// The per-user base directories of the XDG scheme.
+enum class XDGUserDirectory { Cache, Config, Data, State };
+
+/// $XDG_CACHE_HOME, $XDG_CONFIG_HOME, $XDG_DATA_HOME or $XDG_STATE_HOME, else ".cache",
+/// ".config", ".local/share" or ".local/state" in the current user's home directory. Empty when
+/// the variable is unset and there is no home directory.
+std::string GetUserBaseDirectory(XDGUserDirectory which);
+
+/// The absolute entries of $XDG_DATA_DIRS (else /usr/local/share and /usr/share), in order,
+/// without trailing slashes.
+std::vector<std::string> GetSystemDataDirectories();
+
 /// The XDG data directories, most important first: $XDG_DATA_HOME (else ".local/share" in the
 /// current user's home directory), then each absolute entry of $XDG_DATA_DIRS (else
 /// /usr/local/share and /usr/share). Paths carry no trailing slash.

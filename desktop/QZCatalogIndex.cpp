@@ -4,7 +4,6 @@
 #include "desktop/QZCatalogIndex.h"
 
 #include <algorithm>
-#include <cerrno>
 #include <cstring>
 #include <fcntl.h>
 #include <filesystem>
@@ -18,6 +17,7 @@
 #include "desktop/QZCatalogPaths.h"
 #include "desktop/QZCatalogPublishers.h"
 #include "desktop/QZSHA256.h"
+#include "platform/ReplaceFile.h"
 
 namespace {
 
@@ -138,25 +138,11 @@ std::shared_ptr<const QZCatalogIndexView> MapIndex(const std::string& path,
     return QZCatalogIndexView::Open(bytes, mapping, key, path);
 }
 
-/// Writes `bytes` as the index at `path`: beside it first, then renamed over it.
+/// Writes `bytes` as the index at `path` (private to the user, like the cache it lives in).
 void WriteIndex(const std::string& path, const std::string& bytes) {
     std::error_code ignored;
     std::filesystem::create_directories(std::filesystem::path(path).parent_path(), ignored);
-    std::string temporary = path + ".XXXXXX";
-    const int fd = mkstemp(temporary.data());
-    if (fd < 0)
-        return;
-    bool good = true;
-    for (size_t done = 0; good && done < bytes.size();) {
-        const ssize_t written = write(fd, bytes.data() + done, bytes.size() - done);
-        if (written < 0 && errno == EINTR)
-            continue;
-        good = written > 0;
-        done += good ? size_t(written) : 0;
-    }
-    good = close(fd) == 0 && good;
-    if (!good || rename(temporary.c_str(), path.c_str()) != 0)
-        unlink(temporary.c_str());
+    glyphwell::ReplaceFile(path, bytes, 0600);
 }
 
 } // namespace
@@ -488,5 +474,5 @@ QZLoadIndexedCatalogSource(const QZCatalogSource& source) {
     if (indexed && stored.path == key.path && stored.sha256 == key.sha256 &&
         stored.publicKey == key.publicKey && stored.signatureSHA256 == key.signatureSHA256)
         return compile(indexed->Catalog({}, true), key, indexPath);
-    return compile(QZLoadCatalogSource(source), key, indexPath);
+    return compile(QZCatalogFromSourceBytes(source, *bytes), key, indexPath);
 }

@@ -7,50 +7,32 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include "platform/HomeDirectory.h"
+#include "cfutil/CFUserDirectories.h"
+#include "platform/ReadFile.h"
 
 namespace {
 
 constexpr char kCatalogRelativePath[] = "glyphwell/downloadable-fonts.json";
 
-/// The absolute directory in `variable`, else `fallback` under the home directory.
-std::string BaseDirectory(const char* variable, const char* fallback) {
-    const char* value = std::getenv(variable);
-    if (value && value[0] == '/')
-        return value;
-    return glyphwell::HomeDirectory() + "/" + fallback;
-}
-
 } // namespace
 
 std::string QZGlyphwellCacheDirectory() {
-    return BaseDirectory("XDG_CACHE_HOME", ".cache") + "/glyphwell";
+    return GetUserBaseDirectory(XDGUserDirectory::Cache) + "/glyphwell";
 }
 
 std::string QZUserCatalogPath() {
-    return BaseDirectory("XDG_DATA_HOME", ".local/share") + "/" + kCatalogRelativePath;
+    return GetUserBaseDirectory(XDGUserDirectory::Data) + "/" + kCatalogRelativePath;
 }
 
 std::vector<std::string> QZSystemCatalogPaths() {
-    const char* value = std::getenv("XDG_DATA_DIRS");
-    const std::string list = value && *value ? value : "/usr/local/share:/usr/share";
     std::vector<std::string> paths;
-    for (size_t start = 0; start <= list.size();) {
-        size_t end = list.find(':', start);
-        if (end == std::string::npos)
-            end = list.size();
-        std::string directory = list.substr(start, end - start);
-        while (directory.size() > 1 && directory.back() == '/')
-            directory.pop_back();
-        if (!directory.empty() && directory[0] == '/')
-            paths.push_back(directory + "/" + kCatalogRelativePath);
-        start = end + 1;
-    }
+    for (const std::string& directory : GetSystemDataDirectories())
+        paths.push_back(directory + "/" + kCatalogRelativePath);
     return paths;
 }
 
 std::vector<std::string> QZCatalogPublisherDirectories() {
-    return {BaseDirectory("XDG_CONFIG_HOME", ".config") + "/glyphwell/publishers.d",
+    return {GetUserBaseDirectory(XDGUserDirectory::Config) + "/glyphwell/publishers.d",
             "/etc/glyphwell/publishers.d"};
 }
 
@@ -66,21 +48,9 @@ std::optional<std::string> QZReadCatalogFile(const std::string& path, uint64_t l
         reason = "not a regular file";
     else if (uint64_t(status.st_size) > limit)
         reason = "larger than " + std::to_string(limit) + " bytes";
-    else
-        bytes.resize(size_t(status.st_size));
     // A file that grows while it is read is cut at the size it had; one that shrinks, at its end.
-    for (size_t done = 0; reason.empty() && done < bytes.size();) {
-        const ssize_t count = read(fd, bytes.data() + done, bytes.size() - done);
-        if (count < 0 && errno == EINTR)
-            continue;
-        if (count < 0)
-            reason = std::strerror(errno);
-        if (count <= 0) {
-            bytes.resize(done);
-            break;
-        }
-        done += size_t(count);
-    }
+    else if (!glyphwell::ReadUpTo(fd, size_t(status.st_size), &bytes))
+        reason = std::strerror(errno);
     if (fd >= 0)
         close(fd);
     if (reason.empty())

@@ -16,6 +16,7 @@
 #include "desktop/QZCatalogPublishers.h"
 #include "desktop/QZDownloadableFontCatalog.h"
 #include "platform/LogEscape.h"
+#include "platform/ReplaceFile.h"
 
 namespace {
 
@@ -30,29 +31,6 @@ std::string Trim(const std::string& text) {
     return text.substr(first, text.find_last_not_of(" \t\r\n") - first + 1);
 }
 
-/// Writes `bytes` to a temporary file in `directory`, synced; its path, or empty on failure.
-std::string WriteTemporary(const std::string& directory, const std::string& bytes) {
-    std::string path = directory + "/.new-XXXXXX";
-    const int fd = mkstemp(path.data());
-    if (fd < 0)
-        return {};
-    bool good = fchmod(fd, 0644) == 0;
-    for (size_t done = 0; good && done < bytes.size();) {
-        const ssize_t written = write(fd, bytes.data() + done, bytes.size() - done);
-        if (written < 0 && errno == EINTR)
-            continue;
-        good = written > 0;
-        done += good ? size_t(written) : 0;
-    }
-    good = fsync(fd) == 0 && good;
-    good = close(fd) == 0 && good;
-    if (!good) {
-        unlink(path.c_str());
-        return {};
-    }
-    return path;
-}
-
 /// Puts the new kept copy in place: every file written first, then renamed over the old ones
 /// (signature, catalog, state), so that an interrupted refresh leaves the old copy or the new one
 /// readable; a reader that sees a catalog and a signature that do not match refuses the pair.
@@ -65,7 +43,7 @@ bool Keep(const std::string& directory, const std::string& catalog, const std::s
                                      {kPublisherStateFile, state}};
     std::string temporaries[3];
     for (int i = 0; i < 3; ++i) {
-        temporaries[i] = WriteTemporary(directory, files[i][1]);
+        temporaries[i] = glyphwell::WriteFileBeside(directory + "/" + files[i][0], files[i][1]);
         if (temporaries[i].empty()) {
             for (int j = 0; j < i; ++j)
                 unlink(temporaries[j].c_str());

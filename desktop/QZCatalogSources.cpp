@@ -113,11 +113,17 @@ QZDownloadableFontCatalog QZLoadCatalogSource(const QZCatalogSource& source) {
                           glyphwell::LogEscape(problem).c_str());
         return {};
     }
+    return QZCatalogFromSourceBytes(source, *bytes);
+}
+
+QZDownloadableFontCatalog QZCatalogFromSourceBytes(const QZCatalogSource& source,
+                                                   const std::string& bytes) {
     if (source.kind == QZCatalogSource::Kind::Publisher) {
+        std::string problem;
         QZCatalogSignatureCheck check;
         if (const auto signature =
                 QZReadCatalogFile(source.signaturePath, kMaximumCatalogSignatureSize, &problem)) {
-            check = QZVerifyCatalogSignature(*bytes, *signature, source.publicKey);
+            check = QZVerifyCatalogSignature(bytes, *signature, source.publicKey);
             problem = check.problem;
         }
         if (!check.valid) {
@@ -127,7 +133,7 @@ QZDownloadableFontCatalog QZLoadCatalogSource(const QZCatalogSource& source) {
             return {};
         }
     }
-    return QZDownloadableFontCatalog::Parse(*bytes, source.path);
+    return QZDownloadableFontCatalog::Parse(bytes, source.path);
 }
 
 QZMergedDownloadableFontCatalog

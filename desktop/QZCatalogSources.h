@@ -50,6 +50,9 @@ QZMergeDownloadableFontCatalogs(std::vector<QZCatalogSource> sources,
 /// The catalog of one source as the agent reads it (a publisher's verified first); empty, with
 /// one log line, when it cannot be read, verified or parsed.
 QZDownloadableFontCatalog QZLoadCatalogSource(const QZCatalogSource& source);
+/// The same from the source's `bytes`, already read.
+QZDownloadableFontCatalog QZCatalogFromSourceBytes(const QZCatalogSource& source,
+                                                   const std::string& bytes);
 
 class QZCatalogIndexView;
 

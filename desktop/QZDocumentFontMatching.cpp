@@ -6,24 +6,17 @@
 #include <climits>
 #include <cstdlib>
 
-namespace {
+#include "platform/ASCIIText.h"
 
-char Lower(char c) {
-    return c >= 'A' && c <= 'Z' ? char(c - 'A' + 'a') : c;
-}
+namespace {
 
 /// Lower case without spaces, hyphens or underscores: "DejaVu Sans" and "DejaVuSans" meet.
 std::string Folded(std::string_view text) {
     std::string folded;
     for (char c : text)
         if (c != ' ' && c != '-' && c != '_')
-            folded += Lower(c);
+            folded += glyphwell::LowerASCII(c);
     return folded;
-}
-
-bool EqualIgnoringCase(std::string_view a, std::string_view b) {
-    return a.size() == b.size() && std::equal(a.begin(), a.end(), b.begin(),
-                                              [](char x, char y) { return Lower(x) == Lower(y); });
 }
 
 /// The weight and slant a style's words say ("Bold Italic": 700, italic).
@@ -100,7 +93,7 @@ std::vector<const QZMatchableFace*> QZMatchDocumentFont(const QZDocumentFont& fo
     if (!style.empty()) {
         matched = QZFontMatchRule::FamilyAndStyle;
         found = Select(faces, [&](const QZMatchableFace& face) {
-            return HasFamily(face, family) && EqualIgnoringCase(face.style, style);
+            return HasFamily(face, family) && glyphwell::EqualIgnoringASCIICase(face.style, style);
         });
         if (!found.empty())
             return found;

@@ -6,16 +6,14 @@
 #include <algorithm>
 #include <memory>
 
+#include "platform/ASCIIText.h"
+
 namespace {
 
 constexpr size_t kMaximumTagSize = 32;
 
 bool IsASCIILetter(char c) {
     return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z');
-}
-
-char LowerASCII(char c) {
-    return c >= 'A' && c <= 'Z' ? char(c - 'A' + 'a') : c;
 }
 
 std::string_view PrimaryLanguage(std::string_view tag) {
@@ -27,7 +25,7 @@ std::string FamilyKey(std::string_view text) {
     std::string key;
     for (char c : text)
         if (c != ' ')
-            key += LowerASCII(c);
+            key += glyphwell::LowerASCII(c);
     return key;
 }
 
@@ -86,7 +84,7 @@ std::string QZFontLanguageTag(std::string_view text) {
             c = '-';
         if (!IsASCIILetter(c) && !(c >= '0' && c <= '9') && c != '-')
             return {};
-        tag += LowerASCII(c);
+        tag += glyphwell::LowerASCII(c);
     }
     if (tag.front() == '-' || tag.back() == '-' || tag.find("--") != std::string::npos)
         return {};

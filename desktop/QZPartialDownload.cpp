@@ -12,6 +12,8 @@
 #include <unistd.h>
 
 #include "desktop/QZCatalogPaths.h"
+#include "platform/ReadFile.h"
+#include "platform/ReplaceFile.h"
 
 namespace {
 
@@ -86,12 +88,8 @@ bool QZPartialDownload::Open(const std::string& directory, const std::string& sh
         return fd_ >= 0;
     }
     // The bytes are kept only when the metadata says they belong to this URL and size.
-    std::string text(kMaximumMetadataSize, '\0');
-    const int meta = open((path_ + ".meta").c_str(), O_RDONLY | O_CLOEXEC | O_NOFOLLOW);
-    const ssize_t count = meta >= 0 ? read(meta, text.data(), text.size()) : -1;
-    if (meta >= 0)
-        close(meta);
-    text.resize(count > 0 ? size_t(count) : 0);
+    std::string text;
+    glyphwell::ReadFileStart(path_ + ".meta", kMaximumMetadataSize, &text, O_NOFOLLOW);
     std::istringstream lines(text);
     std::string line, keptURL, keptSize;
     while (std::getline(lines, line)) {
@@ -162,19 +160,11 @@ void QZPartialDownload::Remove() {
 void QZPartialDownload::WriteMetadata() {
     if (path_.empty())
         return;
-    // Written beside and renamed, so that a crash leaves the old metadata or the new.
+    // Replaced whole, so that a crash leaves the old metadata or the new.
     std::string text = "url: " + url_ + "\nsize: " + std::to_string(expected_) + "\n";
     if (!etag_.empty())
         text += "etag: " + etag_ + "\n";
     if (!lastModified_.empty())
         text += "last-modified: " + lastModified_ + "\n";
-    const std::string temporary = path_ + ".meta.new";
-    const int fd =
-        open(temporary.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC | O_NOFOLLOW, 0600);
-    if (fd < 0)
-        return;
-    const bool written = write(fd, text.data(), text.size()) == ssize_t(text.size());
-    close(fd);
-    if (!written || rename(temporary.c_str(), (path_ + ".meta").c_str()) != 0)
-        unlink(temporary.c_str());
+    glyphwell::ReplaceFile(path_ + ".meta", text, 0600);
 }

@@ -13,28 +13,6 @@
 
 namespace {
 
-bool IsSpace(char c) {
-    return c == ' ' || c == '\t' || c == '\n' || c == '\r' || c == '\f';
-}
-char Lower(char c) {
-    return c >= 'A' && c <= 'Z' ? char(c - 'A' + 'a') : c;
-}
-
-std::string LowerCopy(std::string_view text) {
-    std::string lower(text);
-    for (char& c : lower)
-        c = Lower(c);
-    return lower;
-}
-
-std::string_view Trim(std::string_view text) {
-    while (!text.empty() && IsSpace(text.front()))
-        text.remove_prefix(1);
-    while (!text.empty() && IsSpace(text.back()))
-        text.remove_suffix(1);
-    return text;
-}
-
 /// The position after the comment or string that starts at `i`, or `i` when none starts there.
 size_t SkipCommentOrString(std::string_view css, size_t i) {
     if (css.compare(i, 2, "/*") == 0) {
@@ -95,12 +73,23 @@ template <class Visit> void Split(std::string_view text, char separator, Visit v
     visit(text.substr(start));
 }
 
+/// Calls `visit(property, value)` for each "property: value" of a declaration list, the property
+/// trimmed and in lower case, the value as written.
+template <class Visit> void ForEachDeclaration(std::string_view declarations, Visit visit) {
+    Split(declarations, ';', [&](std::string_view declaration) {
+        const size_t colon = declaration.find(':');
+        if (colon != std::string_view::npos)
+            visit(glyphwell::LowerASCIICopy(QZTrimWhitespace(declaration.substr(0, colon))),
+                  declaration.substr(colon + 1));
+    });
+}
+
 /// One family of a font-family list: a quoted string without its quotes and escapes, or
 /// identifiers joined by single spaces.
 std::string FamilyName(std::string_view item) {
-    item = Trim(item);
+    item = QZTrimWhitespace(item);
     if (const size_t bang = item.find("!important"); bang != std::string_view::npos)
-        item = Trim(item.substr(0, bang));
+        item = QZTrimWhitespace(item.substr(0, bang));
     std::string name;
     if (!item.empty() && (item.front() == '"' || item.front() == '\'')) {
         for (size_t i = 1; i < item.size() && item[i] != item.front(); ++i) {
@@ -111,14 +100,14 @@ std::string FamilyName(std::string_view item) {
         return name;
     }
     for (char c : item) {
-        if (IsSpace(c)) {
+        if (QZIsWhitespace(c)) {
             if (!name.empty() && name.back() != ' ')
                 name += ' ';
         } else if (c != '\\') {
             name += c;
         }
     }
-    return std::string(Trim(name));
+    return std::string(QZTrimWhitespace(name));
 }
 
 /// The style that font-weight and font-style values give, e.g. "Bold Italic"; empty for normal.
@@ -128,11 +117,11 @@ std::string StyleOf(std::string_view weight, std::string_view slant) {
         {"500", "Medium"}, {"600", "SemiBold"},   {"700", "Bold"},
         {"bold", "Bold"},  {"800", "ExtraBold"},  {"900", "Black"}};
     std::string style;
-    const std::string lowerWeight = LowerCopy(Trim(weight));
+    const std::string lowerWeight = glyphwell::LowerASCIICopy(QZTrimWhitespace(weight));
     for (const auto& [value, name] : kWeights)
         if (lowerWeight == value)
             style = name;
-    const std::string lowerSlant = LowerCopy(Trim(slant));
+    const std::string lowerSlant = glyphwell::LowerASCIICopy(QZTrimWhitespace(slant));
     if (lowerSlant.starts_with("italic") || lowerSlant.starts_with("oblique"))
         style += style.empty() ? "Italic" : " Italic";
     return style;
@@ -143,14 +132,14 @@ std::string_view ShorthandFamilies(std::string_view value) {
     static const char* const kSizes[] = {"xx-small", "x-small",  "small",  "medium", "large",
                                          "x-large",  "xx-large", "larger", "smaller"};
     for (size_t i = 0; i < value.size();) {
-        while (i < value.size() && IsSpace(value[i]))
+        while (i < value.size() && QZIsWhitespace(value[i]))
             ++i;
         if (i < value.size() && (value[i] == '"' || value[i] == '\''))
             return {}; // a quoted family before any size: not a valid shorthand
         const size_t start = i;
-        while (i < value.size() && !IsSpace(value[i]) && value[i] != ',')
+        while (i < value.size() && !QZIsWhitespace(value[i]) && value[i] != ',')
             ++i;
-        std::string token = LowerCopy(value.substr(start, i - start));
+        std::string token = glyphwell::LowerASCIICopy(value.substr(start, i - start));
         if (token.empty())
             return {};
         const bool digits = token.find_first_not_of("0123456789") == std::string::npos;
@@ -161,13 +150,13 @@ std::string_view ShorthandFamilies(std::string_view value) {
         if (!size)
             continue;
         // The line height follows the size after a slash, joined or apart.
-        while (i < value.size() && IsSpace(value[i]))
+        while (i < value.size() && QZIsWhitespace(value[i]))
             ++i;
         if (token.find('/') == std::string::npos && i < value.size() && value[i] == '/') {
             ++i;
-            while (i < value.size() && IsSpace(value[i]))
+            while (i < value.size() && QZIsWhitespace(value[i]))
                 ++i;
-            while (i < value.size() && !IsSpace(value[i]))
+            while (i < value.size() && !QZIsWhitespace(value[i]))
                 ++i;
         }
         return value.substr(i);
@@ -179,12 +168,8 @@ std::string_view ShorthandFamilies(std::string_view value) {
 /// local() names it points at otherwise.
 void CollectFontFace(std::string_view declarations, QZFontCollector& fonts) {
     std::string family, source, weight, slant;
-    Split(declarations, ';', [&](std::string_view declaration) {
-        const size_t colon = declaration.find(':');
-        if (colon == std::string_view::npos)
-            return;
-        const std::string property = LowerCopy(Trim(declaration.substr(0, colon)));
-        const std::string_view value = Trim(declaration.substr(colon + 1));
+    ForEachDeclaration(declarations, [&](const std::string& property, std::string_view value) {
+        value = QZTrimWhitespace(value);
         if (property == "font-family")
             family = FamilyName(value);
         else if (property == "src")
@@ -194,13 +179,13 @@ void CollectFontFace(std::string_view declarations, QZFontCollector& fonts) {
         else if (property == "font-style")
             slant = std::string(value);
     });
-    if (LowerCopy(source).find("url(") != std::string::npos) {
+    if (glyphwell::LowerASCIICopy(source).find("url(") != std::string::npos) {
         fonts.Add(family, QZDocumentFontKind::Family, StyleOf(weight, slant), true);
         return;
     }
     Split(source, ',', [&](std::string_view item) {
-        item = Trim(item);
-        if (LowerCopy(item.substr(0, 6)) == "local(" && item.back() == ')')
+        item = QZTrimWhitespace(item);
+        if (glyphwell::LowerASCIICopy(item.substr(0, 6)) == "local(" && item.back() == ')')
             fonts.Add(FamilyName(item.substr(6, item.size() - 7)), QZDocumentFontKind::Full);
     });
 }
@@ -242,7 +227,8 @@ void CollectRules(std::string_view css, QZFontCollector& fonts, unsigned depth) 
         const size_t end = PreludeEnd(css, i);
         if (end == css.size())
             return;
-        const std::string prelude = LowerCopy(Trim(WithoutComments(css.substr(i, end - i))));
+        const std::string prelude =
+            glyphwell::LowerASCIICopy(QZTrimWhitespace(WithoutComments(css.substr(i, end - i))));
         if (css[end] == ';') { // @import, @charset...
             i = end + 1;
             continue;
@@ -290,7 +276,7 @@ std::string DecodeReferences(std::string_view value) {
 size_t FindIgnoringCase(std::string_view text, std::string_view needle, size_t from) {
     for (size_t i = from; i + needle.size() <= text.size(); ++i) {
         size_t j = 0;
-        while (j < needle.size() && Lower(text[i + j]) == needle[j])
+        while (j < needle.size() && glyphwell::LowerASCII(text[i + j]) == needle[j])
             ++j;
         if (j == needle.size())
             return i;
@@ -307,12 +293,8 @@ void QZCollectCSSFamilies(std::string_view value, QZFontCollector& fonts, bool e
 }
 
 void QZCollectCSSDeclarations(std::string_view declarations, QZFontCollector& fonts) {
-    Split(declarations, ';', [&](std::string_view declaration) {
-        const size_t colon = declaration.find(':');
-        if (colon == std::string_view::npos)
-            return;
-        const std::string property = LowerCopy(Trim(declaration.substr(0, colon)));
-        const std::string value = WithoutComments(declaration.substr(colon + 1));
+    ForEachDeclaration(declarations, [&](const std::string& property, std::string_view text) {
+        const std::string value = WithoutComments(text);
         if (property == "font-family")
             QZCollectCSSFamilies(value, fonts);
         else if (property == "font")
@@ -342,33 +324,33 @@ void QZCollectHTMLFonts(std::string_view html, QZFontCollector& fonts) {
         while (i < html.size() && (std::isalnum(static_cast<unsigned char>(html[i])) ||
                                    html[i] == ':' || html[i] == '-'))
             ++i;
-        std::string tag = LowerCopy(html.substr(nameStart, i - nameStart));
+        std::string tag = glyphwell::LowerASCIICopy(html.substr(nameStart, i - nameStart));
         if (const size_t colon = tag.rfind(':'); colon != std::string::npos)
             tag.erase(0, colon + 1);
         if (tag.empty())
             continue;
         // Attributes up to the end of the tag.
         while (i < html.size() && html[i] != '>') {
-            if (IsSpace(html[i]) || html[i] == '/') {
+            if (QZIsWhitespace(html[i]) || html[i] == '/') {
                 ++i;
                 continue;
             }
             const size_t attributeStart = i;
-            while (i < html.size() && !IsSpace(html[i]) && html[i] != '=' && html[i] != '>' &&
-                   html[i] != '/')
+            while (i < html.size() && !QZIsWhitespace(html[i]) && html[i] != '=' &&
+                   html[i] != '>' && html[i] != '/')
                 ++i;
             const std::string attribute =
-                LowerCopy(html.substr(attributeStart, i - attributeStart));
+                glyphwell::LowerASCIICopy(html.substr(attributeStart, i - attributeStart));
             if (attributeStart == i) {
                 ++i;
                 continue;
             }
-            while (i < html.size() && IsSpace(html[i]))
+            while (i < html.size() && QZIsWhitespace(html[i]))
                 ++i;
             if (i >= html.size() || html[i] != '=')
                 continue;
             ++i;
-            while (i < html.size() && IsSpace(html[i]))
+            while (i < html.size() && QZIsWhitespace(html[i]))
                 ++i;
             std::string_view value;
             if (i < html.size() && (html[i] == '"' || html[i] == '\'')) {
@@ -378,7 +360,7 @@ void QZCollectHTMLFonts(std::string_view html, QZFontCollector& fonts) {
                 i = std::min(html.size(), stop + 1);
             } else {
                 const size_t start = i;
-                while (i < html.size() && !IsSpace(html[i]) && html[i] != '>')
+                while (i < html.size() && !QZIsWhitespace(html[i]) && html[i] != '>')
                     ++i;
                 value = html.substr(start, i - start);
             }

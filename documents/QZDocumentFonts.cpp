@@ -12,15 +12,11 @@
 
 namespace {
 
-char Lower(char c) {
-    return c >= 'A' && c <= 'Z' ? char(c - 'A' + 'a') : c;
-}
-
 bool StartsWithIgnoringCase(std::string_view text, std::string_view prefix) {
     if (text.size() < prefix.size())
         return false;
     for (size_t i = 0; i < prefix.size(); ++i)
-        if (Lower(text[i]) != prefix[i])
+        if (glyphwell::LowerASCII(text[i]) != prefix[i])
             return false;
     return true;
 }

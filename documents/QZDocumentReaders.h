@@ -10,6 +10,20 @@
 #include <vector>
 
 #include "documents/QZDocumentFonts.h"
+#include "platform/ASCIIText.h"
+
+/// Whitespace as the document syntaxes count it (space, tab, line ends, form feed).
+inline bool QZIsWhitespace(char c) {
+    return c == ' ' || c == '\t' || c == '\n' || c == '\r' || c == '\f';
+}
+/// `text` without the whitespace (QZIsWhitespace) at either end.
+inline std::string_view QZTrimWhitespace(std::string_view text) {
+    while (!text.empty() && QZIsWhitespace(text.front()))
+        text.remove_prefix(1);
+    while (!text.empty() && QZIsWhitespace(text.back()))
+        text.remove_suffix(1);
+    return text;
+}
 
 /// Gathers the fonts of one document: trims names, drops CSS generic families and empty names,
 /// keeps each (name, kind, style) once in order of first mention, and marks a font embedded when

@@ -7,38 +7,17 @@
 
 namespace {
 
-bool IsSpace(char c) {
-    return c == ' ' || c == '\t' || c == '\n' || c == '\r' || c == '\f';
-}
-
-std::string_view Trim(std::string_view text) {
-    while (!text.empty() && IsSpace(text.front()))
-        text.remove_prefix(1);
-    while (!text.empty() && IsSpace(text.back()))
-        text.remove_suffix(1);
-    return text;
-}
-
-char Lower(char c) {
-    return c >= 'A' && c <= 'Z' ? char(c - 'A' + 'a') : c;
-}
-
-bool EqualIgnoringCase(std::string_view a, std::string_view b) {
-    return a.size() == b.size() && std::equal(a.begin(), a.end(), b.begin(),
-                                              [](char x, char y) { return Lower(x) == Lower(y); });
-}
-
 /// The key under which a font is kept once: case folded, kind and style apart.
 std::string Key(std::string_view name, QZDocumentFontKind kind, std::string_view style) {
     std::string key;
     key.reserve(name.size() + style.size() + 3);
     for (char c : name)
-        key += Lower(c);
+        key += glyphwell::LowerASCII(c);
     key += '\x1f';
     key += char('0' + int(kind));
     key += '\x1f';
     for (char c : style)
-        key += Lower(c);
+        key += glyphwell::LowerASCII(c);
     return key;
 }
 
@@ -50,18 +29,19 @@ bool QZIsGenericFamily(std::string_view name) {
         "ui-serif", "ui-sans-serif", "ui-monospace", "ui-rounded", "math",    "emoji",
         "fangsong", "inherit",       "initial",      "unset",      "revert",  "revert-layer",
         "default",  "-apple-system", "none"};
-    return std::any_of(kGeneric.begin(), kGeneric.end(),
-                       [&](std::string_view generic) { return EqualIgnoringCase(name, generic); });
+    return std::any_of(kGeneric.begin(), kGeneric.end(), [&](std::string_view generic) {
+        return glyphwell::EqualIgnoringASCIICase(name, generic);
+    });
 }
 
 void QZFontCollector::Add(std::string_view name, QZDocumentFontKind kind, std::string_view style,
                           bool embedded) {
-    name = Trim(name);
-    style = Trim(style);
+    name = QZTrimWhitespace(name);
+    style = QZTrimWhitespace(style);
     // Names arrive quoted from style attributes and ODF's svg:font-family.
     if (name.size() >= 2 && (name.front() == '"' || name.front() == '\'') &&
         name.back() == name.front())
-        name = Trim(name.substr(1, name.size() - 2));
+        name = QZTrimWhitespace(name.substr(1, name.size() - 2));
     if (name.empty() || name.size() > 512 ||
         (kind == QZDocumentFontKind::Family && QZIsGenericFamily(name)))
         return;

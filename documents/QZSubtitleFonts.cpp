@@ -8,17 +8,6 @@
 
 namespace {
 
-char Lower(char c) {
-    return c >= 'A' && c <= 'Z' ? char(c - 'A' + 'a') : c;
-}
-
-std::string LowerCopy(std::string_view text) {
-    std::string lower(text);
-    for (char& c : lower)
-        c = Lower(c);
-    return lower;
-}
-
 std::string_view Trim(std::string_view text) {
     while (!text.empty() && (text.front() == ' ' || text.front() == '\t'))
         text.remove_prefix(1);
@@ -68,7 +57,7 @@ bool QZCollectSubtitleFonts(std::string_view text, QZFontCollector& fonts, std::
         text.remove_prefix(3);
     while (!text.empty() && (text.front() == '\n' || text.front() == '\r' || text.front() == ' '))
         text.remove_prefix(1);
-    if (LowerCopy(text.substr(0, 13)) != "[script info]")
+    if (glyphwell::LowerASCIICopy(text.substr(0, 13)) != "[script info]")
         return false;
     *format = "ass";
     std::string section;
@@ -80,7 +69,7 @@ bool QZCollectSubtitleFonts(std::string_view text, QZFontCollector& fonts, std::
         const std::string_view line = Trim(text.substr(start, end - start));
         start = end + 1;
         if (line.starts_with("[")) {
-            section = LowerCopy(line);
+            section = glyphwell::LowerASCIICopy(line);
             if (section == "[v4 styles]")
                 *format = "ssa";
             continue;
@@ -88,13 +77,13 @@ bool QZCollectSubtitleFonts(std::string_view text, QZFontCollector& fonts, std::
         const size_t colon = line.find(':');
         if (colon == std::string_view::npos)
             continue;
-        const std::string key = LowerCopy(Trim(line.substr(0, colon)));
+        const std::string key = glyphwell::LowerASCIICopy(Trim(line.substr(0, colon)));
         const std::string_view value = Trim(line.substr(colon + 1));
         if (section == "[v4+ styles]" || section == "[v4 styles]") {
             const std::vector<std::string_view> fields = Fields(value);
             if (key == "format") {
                 for (size_t i = 0; i < fields.size(); ++i) {
-                    const std::string field = LowerCopy(fields[i]);
+                    const std::string field = glyphwell::LowerASCIICopy(fields[i]);
                     if (field == "fontname")
                         fontnameField = i;
                     else if (field == "bold")

@@ -27,10 +27,7 @@ bool EndsWithIgnoringCase(std::string_view text, std::string_view suffix) {
     if (text.size() < suffix.size())
         return false;
     for (size_t i = 0; i < suffix.size(); ++i) {
-        char c = text[text.size() - suffix.size() + i];
-        if (c >= 'A' && c <= 'Z')
-            c = char(c - 'A' + 'a');
-        if (c != suffix[i])
+        if (glyphwell::LowerASCII(text[text.size() - suffix.size() + i]) != suffix[i])
             return false;
     }
     return true;

@@ -125,34 +125,6 @@ bool DigestFile(const std::string& path, uint64_t* size, std::string* sha256, st
     return true;
 }
 
-bool ReplaceFileAtomically(const std::string& path, const std::string& text, std::string* error) {
-    const std::filesystem::path target(path);
-    std::string pattern =
-        (target.parent_path().empty() ? std::filesystem::path(".") : target.parent_path()) /
-        ("." + target.filename().string() + ".XXXXXX");
-    const int fd = mkstemp(pattern.data());
-    if (fd < 0) {
-        *error = "cannot write beside " + path + ": " + std::strerror(errno);
-        return false;
-    }
-    bool good = fchmod(fd, 0644) == 0;
-    for (size_t done = 0; good && done < text.size();) {
-        const ssize_t written = write(fd, text.data() + done, text.size() - done);
-        if (written < 0 && errno == EINTR)
-            continue;
-        good = written > 0;
-        done += good ? size_t(written) : 0;
-    }
-    good = good && fsync(fd) == 0;
-    const int savedErrno = errno;
-    good = close(fd) == 0 && good;
-    if (good && rename(pattern.c_str(), path.c_str()) == 0)
-        return true;
-    *error = "cannot write " + path + ": " + std::strerror(good ? errno : savedErrno);
-    unlink(pattern.c_str());
-    return false;
-}
-
 std::string AssetURL(const std::string& prefix, const std::string& path) {
     static const char digits[] = "0123456789ABCDEF";
     std::string url = prefix;

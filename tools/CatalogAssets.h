@@ -30,11 +30,6 @@ bool ReadFontFaces(const std::string& path, std::vector<FontFace>* faces, std::s
 /// be read.
 bool DigestFile(const std::string& path, uint64_t* size, std::string* sha256, std::string* error);
 
-/// Replaces the file at `path` with `text`: written to a temporary file beside it, synced and
-/// renamed over it, so that readers see the old or the new file whole. False with a message in
-/// `*error` (and the old file untouched) on failure.
-bool ReplaceFileAtomically(const std::string& path, const std::string& text, std::string* error);
-
 /// `prefix` joined to the percent-escaped file name of `path` with exactly one "/".
 std::string AssetURL(const std::string& prefix, const std::string& path);
 

@@ -1,5 +1,7 @@
 #include "tools/CatalogCommand.h"
 
+#include <cerrno>
+#include <cstring>
 #include <ctime>
 #include <filesystem>
 #include <fontconfig/fontconfig.h>
@@ -19,6 +21,7 @@
 #include "desktop/QZFontMatching.h"
 #include "platform/Log.h"
 #include "platform/LogEscape.h"
+#include "platform/ReplaceFile.h"
 #include "tools/CatalogAssets.h"
 #include "tools/ToolInput.h"
 
@@ -241,8 +244,9 @@ int RunAdd(const std::vector<std::string>& arguments, std::ostream& out, std::os
     const std::filesystem::path parent = std::filesystem::path(options.catalogPath).parent_path();
     if (!parent.empty())
         std::filesystem::create_directories(parent, ignored);
-    if (!ReplaceFileAtomically(options.catalogPath, document.dump(2) + "\n", &error)) {
-        err << "glyphwell catalog add: " << Escaped(error) << "\n";
+    if (!glyphwell::ReplaceFile(options.catalogPath, document.dump(2) + "\n")) {
+        err << "glyphwell catalog add: "
+            << Escaped("cannot write " + options.catalogPath + ": " + std::strerror(errno)) << "\n";
         return 1;
     }
     for (const std::string& line : lines)

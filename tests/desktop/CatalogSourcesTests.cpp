@@ -4,6 +4,7 @@
 #include <filesystem>
 #include <fstream>
 
+#include "desktop/QZCatalogPaths.h"
 #include "desktop/QZCatalogSources.h"
 #include "support/LogCapture.h"
 #include "support/Minisign.h"
@@ -116,6 +117,37 @@ TEST(CatalogSources, TheFirstSourceOfANameWinsAndOnlyVerifiedCurrentPublishersCo
         EXPECT_EQ(log.Texts().size(), lines.size());
     }
     fs::remove_all(root);
+}
+
+// Each user directory is its XDG variable when that is absolute, else its default in the home.
+TEST(CatalogPaths, XDGVariableWhenAbsoluteElseItsDefaultInTheHome) {
+    const struct {
+        const char* variable;
+        const char* inHome;
+        std::string (*path)();
+        const char* below;
+    } rows[] = {
+        {"XDG_CACHE_HOME", "/home/u/.cache", QZGlyphwellCacheDirectory, "/glyphwell"},
+        {"XDG_DATA_HOME", "/home/u/.local/share", QZUserCatalogPath,
+         "/glyphwell/downloadable-fonts.json"},
+        {"XDG_CONFIG_HOME", "/home/u/.config",
+         [] { return QZCatalogPublisherDirectories().front(); }, "/glyphwell/publishers.d"},
+    };
+    glyphwell::testing::ScopedEnvironment environment;
+    environment.Set("HOME", "/home/u");
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.variable);
+        for (const char* value : {static_cast<const char*>(nullptr), "", "relative/dir"}) {
+            environment.Set(row.variable, value);
+            EXPECT_EQ(row.path(), std::string(row.inHome) + row.below);
+        }
+        environment.Set(row.variable, "/x/y");
+        EXPECT_EQ(row.path(), std::string("/x/y") + row.below);
+    }
+    environment.Set("XDG_DATA_DIRS", "/a/:relative:/b");
+    EXPECT_EQ(QZSystemCatalogPaths(),
+              (std::vector<std::string>{"/a/glyphwell/downloadable-fonts.json",
+                                        "/b/glyphwell/downloadable-fonts.json"}));
 }
 
 } // namespace

@@ -16,7 +16,7 @@ import sys
 
 sys.dont_write_bytecode = True  # no cache files in the source tree
 sys.path.insert(0, os.path.dirname(os.path.abspath(__file__)))
-from e2e_support import (FontServer, Failure, Run, check, require, start_xvfb,  # noqa: E402
+from e2e_support import (FontServer, Run, check, main, require, start_xvfb,  # noqa: E402
                          wait_for)
 
 NAME, PATH = "org.freedesktop.PackageKit", "/org/freedesktop/PackageKit"
@@ -99,15 +99,7 @@ def test(agent, tool, bridge):
                         run.path("data/glyphwell/downloadable-fonts.json")],
                        env=run.env, check=True, capture_output=True)
 
-        with open(run.path("bus.conf"), "w") as f:
-            f.write(f'<busconfig><type>session</type><listen>unix:path={run.path("bus")}</listen>'
-                    f'<servicedir>{run.path("services")}</servicedir><auth>EXTERNAL</auth>'
-                    '<policy context="default"><allow send_destination="*" eavesdrop="true"/>'
-                    '<allow eavesdrop="true"/><allow own="*"/>'
-                    '</policy></busconfig>\n')
-        run.start("dbus", ["dbus-daemon", "--nofork", "--config-file", run.path("bus.conf")])
-        wait_for("the private bus", lambda: os.path.exists(run.path("bus")))
-        run.env["DBUS_SESSION_BUS_ADDRESS"] = "unix:path=" + run.path("bus")
+        run.start_session_bus(run.path("services"))
 
         def gdbus(method, *arguments, dest=NAME, path=PATH):
             result = subprocess.run(["gdbus", "call", "--session", "--dest", dest,
@@ -245,11 +237,4 @@ def test(agent, tool, bridge):
 
 
 if __name__ == "__main__":
-    if len(sys.argv) != 4:
-        sys.exit(__doc__.splitlines()[-1])
-    try:
-        test(*sys.argv[1:])
-    except Failure as failure:
-        print(f"FAIL: {failure}", file=sys.stderr)
-        sys.exit(1)
-    print("PASS")
+    main(test, __doc__, 3)

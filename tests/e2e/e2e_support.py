@@ -147,6 +147,19 @@ class Run:
         self.processes.append(process)
         return process
 
+    def start_session_bus(self, service_dir=None):
+        """Starts a private session bus (eavesdropping allowed, services from `service_dir` when
+        given) and points the environment at it."""
+        services = f"<servicedir>{service_dir}</servicedir>" if service_dir else ""
+        with open(self.path("bus.conf"), "w") as f:
+            f.write(f'<busconfig><type>session</type><listen>unix:path={self.path("bus")}</listen>'
+                    f'{services}<auth>EXTERNAL</auth><policy context="default"><allow '
+                    'send_destination="*" eavesdrop="true"/><allow eavesdrop="true"/><allow '
+                    'own="*"/></policy></busconfig>\n')
+        self.start("dbus", ["dbus-daemon", "--nofork", "--config-file", self.path("bus.conf")])
+        wait_for("the private bus", lambda: os.path.exists(self.path("bus")))
+        self.env["DBUS_SESSION_BUS_ADDRESS"] = "unix:path=" + self.path("bus")
+
     def serve_download_font(self):
         """Starts the font server and lists its font in the catalog, with a font it lacks."""
         self.server = FontServer(DOWNLOAD_FONT)
@@ -221,9 +234,10 @@ def start_xvfb(run):
     return f":{number}"
 
 
-def main(test, usage):
-    """Runs `test(AGENT, GLYPHWELL)`: PASS, or FAIL with the reason (status 1)."""
-    if len(sys.argv) != 3:
+def main(test, usage, arguments=2):
+    """Runs `test` with the program's `arguments` (AGENT, GLYPHWELL, ...): PASS, or FAIL with the
+    reason (status 1)."""
+    if len(sys.argv) != arguments + 1:
         sys.exit(usage.splitlines()[-1])
     try:
         test(*sys.argv[1:])

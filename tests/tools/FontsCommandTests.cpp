@@ -15,6 +15,7 @@
 #include <qpdf/QPDF.hh>
 #include <qpdf/QPDFWriter.hh>
 
+#include "support/PDFFile.h"
 #include "support/PrivateFonts.h"
 #include "tests/tools/ToolRun.h"
 
@@ -22,6 +23,7 @@ namespace {
 
 namespace fs = std::filesystem;
 using glyphwell::testing::Invoke;
+using glyphwell::testing::PDFFromObjects;
 
 std::string Fixture(const std::string& name) {
     const char* source = getenv("GLYPHWELL_SOURCE_DIR");
@@ -220,25 +222,6 @@ TEST_F(FontsCommandTest, TextOutputAndExitStatus) {
     EXPECT_EQ(Invoke({"fonts", "--bogus", Fixture("sample.ass")}).status, 2);
 }
 
-/// A PDF made of `objects` (object 1 the catalog) with a correct cross-reference table.
-std::string MakePDF(const std::vector<std::string>& objects) {
-    std::string pdf = "%PDF-1.7\n";
-    std::vector<size_t> offsets;
-    for (size_t i = 0; i < objects.size(); ++i) {
-        offsets.push_back(pdf.size());
-        pdf += std::to_string(i + 1) + " 0 obj\n" + objects[i] + "\nendobj\n";
-    }
-    const size_t xref = pdf.size();
-    pdf += "xref\n0 " + std::to_string(objects.size() + 1) + "\n0000000000 65535 f \n";
-    for (size_t offset : offsets) {
-        char entry[21];
-        snprintf(entry, sizeof entry, "%010zu 00000 n \n", offset);
-        pdf += entry;
-    }
-    return pdf + "trailer\n<< /Size " + std::to_string(objects.size() + 1) +
-           " /Root 1 0 R >>\nstartxref\n" + std::to_string(xref) + "\n%%EOF\n";
-}
-
 /// Writes a ZIP archive of `members` (name, text) to `path`; `encrypted` members use AES.
 void MakeZip(const std::string& path,
              const std::vector<std::pair<std::string, std::string>>& members,
@@ -348,11 +331,11 @@ TEST_F(FontsCommandTest, UnreadableFilesAreNamedAndTheOthersStillReported) {
          "encrypted PDF: a password is needed"},
         {"pdf reference loop",
          [&](const std::string& path) {
-             Write(path, MakePDF({"<< /Type /Catalog /Pages 2 0 R >>",
-                                  "<< /Type /Pages /Kids [3 0 R] /Count 1 >>",
-                                  "<< /Type /Page /Parent 2 0 R /MediaBox [0 0 1 1] "
-                                  "/Resources << /XObject << /X 4 0 R >> >> >>",
-                                  form}));
+             Write(path, PDFFromObjects({"<< /Type /Catalog /Pages 2 0 R >>",
+                                         "<< /Type /Pages /Kids [3 0 R] /Count 1 >>",
+                                         "<< /Type /Page /Parent 2 0 R /MediaBox [0 0 1 1] "
+                                         "/Resources << /XObject << /X 4 0 R >> >> >>",
+                                         form}));
          },
          "damaged PDF: reference loop at object 4"},
         {"sparse 2 GB file",
