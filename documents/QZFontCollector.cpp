@@ -24,11 +24,14 @@ std::string Key(std::string_view name, QZDocumentFontKind kind, std::string_view
 } // namespace
 
 bool QZIsGenericFamily(std::string_view name) {
-    static constexpr std::array<std::string_view, 21> kGeneric = {
-        "serif",    "sans-serif",    "monospace",    "cursive",    "fantasy", "system-ui",
-        "ui-serif", "ui-sans-serif", "ui-monospace", "ui-rounded", "math",    "emoji",
-        "fangsong", "inherit",       "initial",      "unset",      "revert",  "revert-layer",
-        "default",  "-apple-system", "none"};
+    static constexpr std::array<std::string_view, 20> kGeneric = {
+        "serif",     "sans-serif", "monospace",     "cursive",      "fantasy",
+        "system-ui", "ui-serif",   "ui-sans-serif", "ui-monospace", "ui-rounded",
+        "math",      "emoji",      "fangsong",      "inherit",      "initial",
+        "unset",     "revert",     "revert-layer",  "default",      "none"};
+    // Browser vendors' prefixed keywords for the system font ("-vendor-system") name no family.
+    if (name.size() > 1 && name.front() == '-' && name[1] != '-')
+        return true;
     return std::any_of(kGeneric.begin(), kGeneric.end(), [&](std::string_view generic) {
         return glyphwell::EqualIgnoringASCIICase(name, generic);
     });

@@ -32,7 +32,8 @@ TEST(DocumentSyntax, NamesComeFromWhereEachSyntaxPutsThem) {
          "html",
          {"Lato Black/full//-", "Lato-Black/full//-", "Gelasio/family/Bold Italic/e",
           "Gelasio/family//-"}},
-        {"<HTML><p style=\"font-family: &quot;Fira Sans&quot;, sans-serif\"><font face=Lato,Arial>"
+        {"<HTML><p style=\"font-family: &quot;Fira Sans&quot;, -vendor-system, sans-serif\">"
+         "<font face=Lato,Arial>"
          "<script>var s = '<style>p{font-family:Nope}</style>'</script><!-- <font face=No> -->",
          "html",
          {"Fira Sans/family//-", "Lato/family//-", "Arial/family//-"}},
