@@ -62,10 +62,16 @@ set(CPACK_DEBIAN_PACKAGE_SHLIBDEPS ON)
 if(GLYPHWELL_AGENT)
     set(CPACK_DEBIAN_PACKAGE_DEPENDS "qt6-qpa-plugins, qt6-wayland")
 endif()
-# The bus bridge answers GTK applications only when their font-install module is loaded.
+# The bus bridge answers GTK applications only when their font-install module is loaded; "Get
+# Missing Fonts" shows its result in a zenity alert where no notification service runs.
+set(glyphwell_recommends)
 if(TARGET glyphwell-bus-bridge)
-    set(CPACK_DEBIAN_PACKAGE_RECOMMENDS "packagekit-gtk3-module")
+    list(APPEND glyphwell_recommends packagekit-gtk3-module)
 endif()
+if(GLYPHWELL_AGENT)
+    list(APPEND glyphwell_recommends zenity)
+endif()
+list(JOIN glyphwell_recommends ", " CPACK_DEBIAN_PACKAGE_RECOMMENDS)
 
 # The maintainer scripts enable the agent's user socket: only a package with the agent has them.
 set(glyphwell_control_extra)

@@ -91,6 +91,8 @@ if compgen -G "$build/client/libglyphwell-client.so.*" >/dev/null; then
     grep -q '^libglyphwell-client 0 glyphwell ' "$tmp/control/shlibs" || fail "no shlibs entry"
     grep -qx 'activate-noawait ldconfig' "$tmp/control/triggers" || fail "no ldconfig trigger"
 fi
+recommends=$(sed -n 's/^Recommends: //p' "$tmp/control/control")
+[ "$recommends" = "packagekit-gtk3-module, zenity" ] || fail "Recommends is \"$recommends\""
 depends=$(sed -n 's/^Depends: //p' "$tmp/control/control")
 echo "Depends: $depends"
 for package in libc6 libqt6widgets6 libcurl4 libfontconfig1 qt6-qpa-plugins qt6-wayland; do
