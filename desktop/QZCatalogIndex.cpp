@@ -4,6 +4,7 @@
 #include "desktop/QZCatalogIndex.h"
 
 #include <algorithm>
+#include <chrono>
 #include <cstring>
 #include <fcntl.h>
 #include <filesystem>
@@ -138,11 +139,39 @@ std::shared_ptr<const QZCatalogIndexView> MapIndex(const std::string& path,
     return QZCatalogIndexView::Open(bytes, mapping, key, path);
 }
 
+/// Removes the other indexes of the folder of `path` whose source is gone (or that cannot be
+/// read as an index), and temporaries that a writer left a day ago: an index is compiled rarely,
+/// and the folder holds one file per catalog ever read.
+void RemoveOrphanIndexes(const std::string& path) {
+    namespace fs = std::filesystem;
+    std::error_code error;
+    const auto now = fs::file_time_type::clock::now();
+    for (fs::directory_iterator it(fs::path(path).parent_path(), error), end; !error && it != end;
+         it.increment(error)) {
+        const fs::path entry = it->path();
+        const std::string name = entry.filename().string();
+        std::error_code ignored;
+        if (entry == path || !it->is_regular_file(ignored))
+            continue;
+        if (name.starts_with('.')) {
+            if (now - it->last_write_time(ignored) > std::chrono::hours(24))
+                fs::remove(entry, ignored);
+            continue;
+        }
+        QZCatalogIndexKey key;
+        if (!name.ends_with(".index"))
+            continue;
+        if (!MapIndex(entry, &key) || key.path.empty() || !fs::exists(key.path, ignored))
+            fs::remove(entry, ignored);
+    }
+}
+
 /// Writes `bytes` as the index at `path` (private to the user, like the cache it lives in).
 void WriteIndex(const std::string& path, const std::string& bytes) {
     std::error_code ignored;
     std::filesystem::create_directories(std::filesystem::path(path).parent_path(), ignored);
     glyphwell::ReplaceFile(path, bytes, 0600);
+    RemoveOrphanIndexes(path);
 }
 
 } // namespace

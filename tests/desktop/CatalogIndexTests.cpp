@@ -140,6 +140,12 @@ TEST(CatalogIndex, ACurrentIndexIsUsedWithoutTheSourceAndABadOneIsCompiledAgain)
     // A changed source is compiled again.
     std::ofstream(path) << R"({"assets": []})";
     EXPECT_EQ(Describe(QZLoadIndexedCatalogSource(source)->Catalog({}, true)), "");
+    // The index of a catalog that is gone goes when another is compiled.
+    const std::string other = root + "/other.json";
+    fs::rename(path, other);
+    QZLoadIndexedCatalogSource({QZCatalogSource::Kind::User, "user", other, {}, {}});
+    EXPECT_FALSE(fs::exists(index));
+    EXPECT_TRUE(fs::exists(QZCatalogIndexPath(other)));
     fs::remove_all(root);
 }
 
