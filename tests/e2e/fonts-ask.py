@@ -87,9 +87,6 @@ def test(agent, tool):
         print(f"after --ask: {after} (exit {status})")
         check(after.get("DejaVu Serif") == "installed", f"after --ask: {after}")
         check(status == 1, f"exit status {status}, not 1 (other fonts stay missing)")
-        installed = [name for _, _, files in os.walk(run.path("home")) for name in files
-                     if name.endswith(".ttf")]
-        check(installed, "no font file in the user's font folder")
         again, _ = states(run, tool)
         check(again.get("DejaVu Serif") == "installed", f"a new run: {again}")
 
