@@ -31,12 +31,11 @@ public:
 
     /// Signs the file `path` into `path`.minisig with `trustedComment` (prehashed unless
     /// `legacy`); true when the tool succeeded.
-    bool Sign(const std::string& path, const std::string& trustedComment, bool legacy = false,
-              const std::string& signaturePath = "") const {
+    bool Sign(const std::string& path, const std::string& trustedComment,
+              bool legacy = false) const {
         const std::string command = std::string("minisign -S") + (legacy ? " -l" : "") + " -s '" +
-                                    secretPath_ + "' -m '" + path + "' -x '" +
-                                    (signaturePath.empty() ? path + ".minisig" : signaturePath) +
-                                    "' -t '" + trustedComment + "' >/dev/null 2>&1";
+                                    secretPath_ + "' -m '" + path + "' -t '" + trustedComment +
+                                    "' >/dev/null 2>&1";
         return std::system(command.c_str()) == 0;
     }
 

@@ -104,90 +104,42 @@ protected:
     QTemporaryDir root_;
 };
 
-// LibreOffice's OOXML adds its own defaults to the font table and themes.
-TEST_F(FontsCommandTest, OfficeOpenXML) {
-    Check({{"sample.docx",
-            {"DejaVu Sans/family//-/installed/",
-             "Lato/family//-/offered/Lato-Regular Lato-Bold Lato-Italic ",
-             "Vollkorn/family//-/missing/", "DejaVu Serif/family//-/missing/",
-             "Times New Roman/family//-/missing/", "Symbol/family//-/missing/",
-             "Arial/family//-/missing/"}},
-           {"sample-embedded.docx",
-            {"DejaVu Sans/family//-/installed/",
-             "Lato/family//-/offered/Lato-Regular Lato-Bold Lato-Italic ",
-             "Vollkorn/family//-/missing/", "DejaVu Serif/family//e/embedded/",
-             "WenQuanYi Micro Hei/family//-/missing/", "Times New Roman/family//-/missing/",
-             "Symbol/family//-/missing/", "Arial/family//-/missing/"}},
-           {"sample.pptx",
-            {"DejaVu Serif/family//-/missing/", "Arial/family//-/missing/",
-             "DejaVu Sans/family//-/installed/",
-             "Lato/family//-/offered/Lato-Regular Lato-Bold Lato-Italic ",
-             "Vollkorn/family//-/missing/"}},
-           {"sample.xlsx",
-            {"DejaVu Serif/family//-/missing/", "Arial/family//-/missing/",
-             "DejaVu Sans/family//-/installed/",
-             "Lato/family//-/offered/Lato-Regular Lato-Bold Lato-Italic ",
-             "Vollkorn/family//-/missing/"}}});
-}
-
-// The flat form keeps the embedded font as binary data inside its font face.
-TEST_F(FontsCommandTest, OpenDocument) {
-    const std::vector<std::string> plain = {
-        "DejaVu Sans/family//-/installed/", "DejaVu Serif/family//-/missing/",
-        "Lato/family//-/offered/Lato-Regular Lato-Bold Lato-Italic ",
-        "Vollkorn/family//-/missing/"};
-    const std::vector<std::string> embedded = {
-        "DejaVu Sans/family//-/installed/", "DejaVu Serif/family//e/embedded/",
-        "Lato/family//-/offered/Lato-Regular Lato-Bold Lato-Italic ", "Vollkorn/family//-/missing/",
-        "WenQuanYi Micro Hei/family//-/missing/"};
-    std::vector<std::string> three = plain;
-    three.erase(three.begin() + 1);
-    Check({{"sample.fodt", plain},
-           {"sample-embedded.odt", embedded},
-           {"sample-embedded.fodt", embedded},
-           {"sample.fodp", three},
-           {"sample.fods", three}});
-}
-
-// pdffonts lists the same fonts; it names a Type 0 font by its own /BaseFont and keeps the
-// subset tags and the ",Bold" suffix, where the tool names the face.
-TEST_F(FontsCommandTest, PDF) {
-    Check({{"handmade.pdf",
-            {"Vollkorn-Bold/postscript//-/missing/", "DejaVuSans/family/Bold/-/installed/",
-             "Lato-Italic/postscript//-/offered/Lato-Italic ", "Gelasio/postscript//e/embedded/",
-             "Helvetica/postscript//-/missing/"}},
-           {"sample.pdf",
-            {"DejaVuSans/postscript//e/embedded/", "DejaVuSans-Bold/postscript//e/embedded/",
-             "DejaVuSerif/postscript//e/embedded/"}}});
-    if (system("command -v pdffonts >/dev/null") != 0)
-        GTEST_SKIP() << "pdffonts is not installed (poppler-utils)";
-    const std::string listing = fs::temp_directory_path() / "gw-pdffonts.txt";
-    ASSERT_EQ(system(("pdffonts " + Fixture("handmade.pdf") + " > " + listing).c_str()), 0);
-    const std::string text = Contents(listing);
-    fs::remove(listing);
-    for (const char* row : {"Vollkorn-Bold ", "DejaVuSans,Bold ", "Lato-Italic-Identity-H ",
-                            "ABCDEF+Gelasio ", "Helvetica "})
-        EXPECT_NE(text.find(row), std::string::npos) << row << " not in\n" << text;
-}
-
-// Generic families are no fonts; @font-face and attached fonts are carried by the file.
-TEST_F(FontsCommandTest, WebAndSubtitles) {
-    Check({{"sample.svg",
-            {"DejaVu Sans/family//-/installed/", "Gelasio/family//e/embedded/",
-             "Vollkorn/family//-/missing/",
-             "Lato/family//-/offered/Lato-Regular Lato-Bold Lato-Italic "}},
-           {"sample.html",
-            {"DejaVu Sans/family//-/installed/",
-             "Lato/family//-/offered/Lato-Regular Lato-Bold Lato-Italic ",
-             "Vollkorn/family//-/missing/", "DejaVu Serif/family//-/missing/"}},
-           {"sample.epub",
-            {"DejaVu Serif/family//-/missing/", "Vollkorn/family//-/missing/",
-             "Lato/family//-/offered/Lato-Regular Lato-Bold Lato-Italic ",
-             "DejaVu Sans/family//-/installed/"}},
-           {"sample.ass",
-            {"DejaVu Sans/family//-/installed/", "Lato/family/Bold/-/offered/Lato-Bold ",
-             "Gelasio/family/Italic/e/embedded/", "Gelasio/family//e/embedded/",
-             "Vollkorn/family//-/missing/", "Serif Display/family//-/missing/"}}});
+// Every format in one run. LibreOffice's OOXML adds its own defaults to the font table and
+// themes; the flat OpenDocument form keeps the embedded font as binary data inside its font face;
+// a PDF Type 0 font is named by its face, without subset tag or ",Bold" suffix; generic families
+// are no fonts; @font-face and attached fonts are carried by the file.
+TEST_F(FontsCommandTest, EveryFormat) {
+    const auto missing = [](const std::string& family) { return family + "/family//-/missing/"; };
+    const std::string sans = "DejaVu Sans/family//-/installed/", serif = missing("DejaVu Serif"),
+                      embeddedSerif = "DejaVu Serif/family//e/embedded/",
+                      lato = "Lato/family//-/offered/Lato-Regular Lato-Bold Lato-Italic ",
+                      vollkorn = missing("Vollkorn"), arial = missing("Arial"),
+                      times = missing("Times New Roman"), symbol = missing("Symbol"),
+                      hei = missing("WenQuanYi Micro Hei");
+    const std::vector<std::string> embeddedODF = {sans, embeddedSerif, lato, vollkorn, hei};
+    Check(
+        {{"sample.docx", {sans, lato, vollkorn, serif, times, symbol, arial}},
+         {"sample-embedded.docx", {sans, lato, vollkorn, embeddedSerif, hei, times, symbol, arial}},
+         {"sample.pptx", {serif, arial, sans, lato, vollkorn}},
+         {"sample.xlsx", {serif, arial, sans, lato, vollkorn}},
+         {"sample.fodt", {sans, serif, lato, vollkorn}},
+         {"sample-embedded.odt", embeddedODF},
+         {"sample-embedded.fodt", embeddedODF},
+         {"sample.fodp", {sans, lato, vollkorn}},
+         {"sample.fods", {sans, lato, vollkorn}},
+         {"handmade.pdf",
+          {"Vollkorn-Bold/postscript//-/missing/", "DejaVuSans/family/Bold/-/installed/",
+           "Lato-Italic/postscript//-/offered/Lato-Italic ", "Gelasio/postscript//e/embedded/",
+           "Helvetica/postscript//-/missing/"}},
+         {"sample.pdf",
+          {"DejaVuSans/postscript//e/embedded/", "DejaVuSans-Bold/postscript//e/embedded/",
+           "DejaVuSerif/postscript//e/embedded/"}},
+         {"sample.svg", {sans, "Gelasio/family//e/embedded/", vollkorn, lato}},
+         {"sample.html", {sans, lato, vollkorn, serif}},
+         {"sample.epub", {serif, vollkorn, lato, sans}},
+         {"sample.ass",
+          {sans, "Lato/family/Bold/-/offered/Lato-Bold ", "Gelasio/family/Italic/e/embedded/",
+           "Gelasio/family//e/embedded/", vollkorn, missing("Serif Display")}}});
 }
 
 TEST_F(FontsCommandTest, TextOutputAndExitStatus) {
@@ -280,11 +232,6 @@ TEST_F(FontsCommandTest, UnreadableFilesAreNamedAndTheOthersStillReported) {
              Write(path, bytes);
          },
          "damaged ZIP member word/document.xml"},
-        {"truncated zip",
-         [&](const std::string& path) {
-             Write(path, Contents(Fixture("sample.docx")).substr(0, 2000));
-         },
-         "not a ZIP archive"},
         {"entity expansion",
          [&](const std::string& path) {
              std::string dtd = "<!DOCTYPE svg [<!ENTITY e0 \"lol\">";
@@ -306,11 +253,6 @@ TEST_F(FontsCommandTest, UnreadableFilesAreNamedAndTheOthersStillReported) {
              Write(path, svg);
          },
          "elements nested deeper than 256"},
-        {"truncated pdf",
-         [&](const std::string& path) {
-             Write(path, Contents(Fixture("handmade.pdf")).substr(0, 1500));
-         },
-         "damaged PDF"},
         {"damaged pdf",
          [&](const std::string& path) {
              std::string bytes = Contents(Fixture("handmade.pdf"));
