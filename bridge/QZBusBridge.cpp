@@ -221,6 +221,8 @@ int QZRunBusBridge() {
     sigemptyset(&stopSignals);
     sigaddset(&stopSignals, SIGTERM);
     sigaddset(&stopSignals, SIGINT);
+    // SIGCHLD too: the loop watches the font-choice workers.
+    sigaddset(&stopSignals, SIGCHLD);
     sigprocmask(SIG_BLOCK, &stopSignals, nullptr);
 
     sd_event* eventPointer = nullptr;

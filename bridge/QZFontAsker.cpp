@@ -1,23 +1,27 @@
 // Map: a burst opens on a caller's first request (its pid asked of the bus at once, a 1 s timer
 // started), moves to the waiting list when the timer ends, and is asked when no other question
-// is on screen: languages and families become catalog fonts (fontconfig loaded for that moment
-// only), the fonts one request, the request one asynchronous call. Its reply records a declined
+// is on screen: languages and families become catalog fonts in a short-lived worker process (so
+// that fontconfig and the catalog never stay resident here), the fonts one request, the request
+// one asynchronous call. Its reply records a declined
 // language or announces the installed fonts.
 #include "bridge/QZFontAsker.h"
 
+#include <fcntl.h>
 #include <glyphwell/client.h>
-#include <malloc.h>
+#include <limits.h>
 #include <poll.h>
+#include <signal.h>
+#include <spawn.h>
 #include <sys/epoll.h>
+#include <sys/wait.h>
 #include <systemd/sd-bus.h>
 #include <systemd/sd-event.h>
 #include <unistd.h>
 
-#include <set>
+#include <cerrno>
+#include <cstring>
 
 #include "bridge/QZApplicationName.h"
-#include "desktop/QZDownloadableFontCatalog.h"
-#include "desktop/QZFontLanguages.h"
 #include "platform/Log.h"
 #include "platform/LogEscape.h"
 #include "platform/ReadFile.h"
@@ -63,14 +67,23 @@ uint32_t EpollEvents(short events) {
            ((events & POLLOUT) ? uint32_t(EPOLLOUT) : 0u);
 }
 
+/// The font-choice worker: installed beside the bridge.
+std::string WorkerPath() {
+    std::string path(PATH_MAX, '\0');
+    const ssize_t length = readlink("/proc/self/exe", path.data(), path.size());
+    path.resize(length > 0 ? size_t(length) : 0);
+    return path.substr(0, path.rfind('/') + 1) + "glyphwell-bus-bridge-worker";
+}
+
 } // namespace
 
 QZFontAsker::QZFontAsker(sd_event* event, sd_bus* bus, QZDeclinedLanguages declined,
                          const char* portName)
     : event_(event), bus_(bus), declined_(std::move(declined)), portName_(portName ? portName : ""),
-      hasPortName_(portName != nullptr) {}
+      hasPortName_(portName != nullptr), workerPath_(WorkerPath()) {}
 
 QZFontAsker::~QZFontAsker() {
+    EndWorker();
     sd_event_source_disable_unref(callSource_);
     glyphwell_call_free(call_);
 }
@@ -143,12 +156,12 @@ void QZFontAsker::Next() {
     while (!asking_ && !waiting_.empty()) {
         std::unique_ptr<Burst> burst = std::move(waiting_.front());
         waiting_.pop_front();
-        if (Ask(*burst))
+        if (Choose(*burst))
             asking_ = std::move(burst);
     }
 }
 
-bool QZFontAsker::Ask(Burst& burst) {
+bool QZFontAsker::Choose(Burst& burst) {
     // A caller that quit while its burst waited is not asked about (the bus cannot give the
     // pid of a connection that has gone).
     if (burst.pid <= 0 || !ProcessExists(burst.pid)) {
@@ -156,56 +169,160 @@ bool QZFontAsker::Ask(Burst& burst) {
                           Escaped(burst.sender).c_str());
         return false;
     }
-    const std::string executable = QZExecutableName(burst.pid);
-    const std::string desktopFile = QZDesktopEntryPath(burst.desktopID);
-    burst.application = !burst.desktopID.empty() ? burst.desktopID : executable;
-    burst.displayName = desktopFile.empty() ? std::string() : QZDesktopEntryName(desktopFile);
-    if (burst.displayName.empty())
-        burst.displayName = !executable.empty() ? executable : burst.sender;
+    QZFontChoiceRequest request{burst.sender, burst.desktopID, QZExecutableName(burst.pid),
+                                declined_.Path(), burst.wants};
+    std::vector<std::string> arguments = QZFontChoiceArguments(request);
+    std::vector<char*> argv = {workerPath_.data()};
+    for (std::string& argument : arguments)
+        argv.push_back(argument.data());
+    argv.push_back(nullptr);
 
-    const auto catalog = QZCurrentDownloadableFontCatalog();
-    std::vector<const QZDownloadableFont*> fonts;
-    std::set<std::string> families;
-    const auto offer = [&](const std::vector<const QZDownloadableFont*>& chosen) {
-        for (const QZDownloadableFont* font : chosen)
-            if (std::find(fonts.begin(), fonts.end(), font) == fonts.end()) {
-                fonts.push_back(font);
-                if (families.emplace(font->family).second && !font->family.empty())
-                    burst.fontNames +=
-                        (burst.fontNames.empty() ? "" : ", ") + std::string(font->family);
-            }
-    };
-    std::string unserved;
-    {
-        // fontconfig's view lives only for this moment: a loaded configuration costs megabytes.
-        const QZInstalledFontView installed;
-        const time_t now = time(nullptr);
-        for (const std::string& language : burst.wants.languages) {
-            if (installed.CoversLanguage(language) ||
-                declined_.IsDeclined(burst.application, language, now))
-                continue;
-            const auto chosen = QZCatalogFontsForLanguage(*catalog, language);
-            if (chosen.empty())
-                unserved += (unserved.empty() ? "" : ", ") + language;
-            else
-                burst.askedLanguages.push_back(language);
-            offer(chosen);
-        }
-        for (const std::string& family : burst.wants.families) {
-            if (installed.HasFamily(family))
-                continue;
-            const auto chosen = QZCatalogFontsForFamily(*catalog, family);
-            if (chosen.empty())
-                unserved += (unserved.empty() ? "" : ", ") + family;
-            offer(chosen);
-        }
+    int pipe[2];
+    if (pipe2(pipe, O_CLOEXEC | O_NONBLOCK) < 0) {
+        glyphwell::AppLog("Cannot choose the fonts for %s: %s", Escaped(burst.sender).c_str(),
+                          std::strerror(errno));
+        return false;
     }
-    malloc_trim(0);
-    if (!unserved.empty())
-        glyphwell::AppLog("No catalog font for %s, asked for by %s", Escaped(unserved).c_str(),
-                          Escaped(burst.displayName).c_str());
-    if (fonts.empty()) {
-        if (unserved.empty())
+    // The worker gets the default signal handling and mask (the bridge blocks the signals its
+    // loop handles), /dev/null for input and the pipe for output.
+    posix_spawn_file_actions_t actions;
+    posix_spawnattr_t attributes;
+    posix_spawn_file_actions_init(&actions);
+    posix_spawn_file_actions_addopen(&actions, STDIN_FILENO, "/dev/null", O_RDONLY, 0);
+    posix_spawn_file_actions_adddup2(&actions, pipe[1], STDOUT_FILENO);
+    posix_spawnattr_init(&attributes);
+    sigset_t none, all;
+    sigemptyset(&none);
+    sigfillset(&all);
+    posix_spawnattr_setsigmask(&attributes, &none);
+    posix_spawnattr_setsigdefault(&attributes, &all);
+    posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETSIGDEF);
+    pid_t worker = 0;
+    const int error =
+        posix_spawn(&worker, workerPath_.c_str(), &actions, &attributes, argv.data(), environ);
+    posix_spawn_file_actions_destroy(&actions);
+    posix_spawnattr_destroy(&attributes);
+    close(pipe[1]);
+    if (error != 0) {
+        close(pipe[0]);
+        glyphwell::AppLog("Cannot start %s: %s", Escaped(workerPath_).c_str(),
+                          std::strerror(error));
+        return false;
+    }
+    workerAnswer_.clear();
+    int result = sd_event_add_child(event_, &workerExit_, worker, WEXITED, OnWorkerExit, this);
+    if (result < 0) {
+        kill(worker, SIGKILL);
+        waitpid(worker, nullptr, 0);
+        close(pipe[0]);
+    } else {
+        sd_event_source_set_child_process_own(workerExit_, 1);
+        result = sd_event_add_io(event_, &workerOutput_, pipe[0], EPOLLIN, OnWorkerOutput, this);
+        if (result < 0)
+            close(pipe[0]);
+        else
+            sd_event_source_set_io_fd_own(workerOutput_, 1);
+    }
+    if (result >= 0)
+        result = sd_event_add_time_relative(event_, &workerTimer_, CLOCK_MONOTONIC,
+                                            kWorkerMicroseconds, 0, OnWorkerTimeout, this);
+    if (result < 0) {
+        EndWorker();
+        glyphwell::AppLog("Cannot watch the font chooser for %s: %s", Escaped(burst.sender).c_str(),
+                          std::strerror(-result));
+        return false;
+    }
+    return true;
+}
+
+bool QZFontAsker::ReadWorkerOutput() {
+    char buffer[16384];
+    for (;;) {
+        const ssize_t count = read(sd_event_source_get_io_fd(workerOutput_), buffer, sizeof buffer);
+        if (count < 0 && errno == EINTR)
+            continue;
+        if (count == 0 || (count < 0 && errno != EAGAIN))
+            sd_event_source_set_enabled(workerOutput_, SD_EVENT_OFF); // the worker's exit follows
+        if (count <= 0)
+            return true;
+        if (workerAnswer_.size() + size_t(count) > kMaximumAnswerSize)
+            return false;
+        workerAnswer_.append(buffer, size_t(count));
+    }
+}
+
+int QZFontAsker::OnWorkerOutput(sd_event_source*, int, uint32_t, void* data) {
+    QZFontAsker& asker = *static_cast<QZFontAsker*>(data);
+    if (!asker.ReadWorkerOutput()) {
+        glyphwell::AppLog("Dropping the font request of %s: its font chooser wrote over %zu bytes",
+                          Escaped(asker.asking_->sender).c_str(), kMaximumAnswerSize);
+        asker.DropChoice();
+    }
+    return 0;
+}
+
+int QZFontAsker::OnWorkerTimeout(sd_event_source*, uint64_t, void* data) {
+    QZFontAsker& asker = *static_cast<QZFontAsker*>(data);
+    glyphwell::AppLog("Dropping the font request of %s: its font chooser did not finish in %llu s",
+                      Escaped(asker.asking_->sender).c_str(),
+                      static_cast<unsigned long long>(kWorkerMicroseconds / 1000000));
+    asker.DropChoice();
+    return 0;
+}
+
+int QZFontAsker::OnWorkerExit(sd_event_source*, const siginfo_t* info, void* data) {
+    QZFontAsker& asker = *static_cast<QZFontAsker*>(data);
+    // The worker has written all it will: what the pipe still holds is read now.
+    const bool read = asker.ReadWorkerOutput();
+    QZFontChoice choice;
+    const bool answered = read && info->si_code == CLD_EXITED && info->si_status == 0 &&
+                          QZDecodeFontChoice(asker.workerAnswer_, &choice);
+    if (!answered) {
+        const std::string sender = Escaped(asker.asking_->sender);
+        if (info->si_code != CLD_EXITED)
+            glyphwell::AppLog("Dropping the font request of %s: its font chooser was ended by "
+                              "signal %d",
+                              sender.c_str(), info->si_status);
+        else if (info->si_status != 0)
+            glyphwell::AppLog("Dropping the font request of %s: its font chooser ended with "
+                              "status %d",
+                              sender.c_str(), info->si_status);
+        else
+            glyphwell::AppLog("Dropping the font request of %s: its font chooser gave no answer",
+                              sender.c_str());
+        asker.DropChoice();
+        return 0;
+    }
+    asker.EndWorker();
+    if (!asker.Ask(choice))
+        asker.DropChoice();
+    return 0;
+}
+
+void QZFontAsker::EndWorker() {
+    workerTimer_ = sd_event_source_disable_unref(workerTimer_);
+    workerOutput_ = sd_event_source_disable_unref(workerOutput_);
+    workerExit_ = sd_event_source_disable_unref(workerExit_);
+    workerAnswer_ = std::string();
+}
+
+void QZFontAsker::DropChoice() {
+    EndWorker();
+    asking_.reset();
+    Next();
+}
+
+bool QZFontAsker::Ask(const QZFontChoice& choice) {
+    Burst& burst = *asking_;
+    burst.application = choice.application;
+    burst.displayName = choice.displayName;
+    burst.askedLanguages = choice.askedLanguages;
+    burst.fontNames = choice.fontNames;
+    if (!choice.unserved.empty())
+        glyphwell::AppLog("No catalog font for %s, asked for by %s",
+                          Escaped(choice.unserved).c_str(), Escaped(burst.displayName).c_str());
+    if (choice.fonts.empty()) {
+        if (choice.unserved.empty())
             glyphwell::AppLog("Not asking about fonts for %s: what it asked for is installed or "
                               "was declined",
                               Escaped(burst.displayName).c_str());
@@ -216,12 +333,11 @@ bool QZFontAsker::Ask(Burst& burst) {
     if (!request)
         return false;
     glyphwell_request_set_application_name(request, burst.displayName.c_str());
-    if (!desktopFile.empty())
-        glyphwell_request_set_bundle_path(request, desktopFile.c_str());
+    if (!choice.desktopFile.empty())
+        glyphwell_request_set_bundle_path(request, choice.desktopFile.c_str());
     glyphwell_request_set_process_id(request, burst.pid);
-    for (const QZDownloadableFont* font : fonts)
-        glyphwell_request_add_font(request, std::string(font->postScriptName).c_str(),
-                                   std::string(font->family).c_str());
+    for (const auto& [postScriptName, family] : choice.fonts)
+        glyphwell_request_add_font(request, postScriptName.c_str(), family.c_str());
     const int status =
         glyphwell_call_start(request, hasPortName_ ? portName_.c_str() : nullptr, &call_);
     glyphwell_request_free(request);

@@ -1,0 +1,64 @@
+// The request and answer that pass between the bridge and its font-choice worker.
+#include <gtest/gtest.h>
+
+#include "bridge/QZFontChoice.h"
+
+namespace {
+
+TEST(FontChoice, RequestSurvivesTheArgumentsAndBadArgumentsAreRefused) {
+    QZFontChoiceRequest request{":1.7",
+                                "org.example.App.desktop",
+                                "app",
+                                "/state/declined",
+                                {{"ja", "zh-cn"}, {"Noto Sans", "A=B"}}};
+    const std::vector<std::string> arguments = QZFontChoiceArguments(request);
+    std::vector<const char*> argv;
+    for (const std::string& argument : arguments)
+        argv.push_back(argument.c_str());
+    QZFontChoiceRequest read;
+    ASSERT_TRUE(QZParseFontChoiceArguments(int(argv.size()), argv.data(), &read));
+    EXPECT_EQ(read.sender, request.sender);
+    EXPECT_EQ(read.desktopID, request.desktopID);
+    EXPECT_EQ(read.executable, request.executable);
+    EXPECT_EQ(read.declinedPath, request.declinedPath);
+    EXPECT_EQ(read.wants.languages, request.wants.languages);
+    EXPECT_EQ(read.wants.families, request.wants.families);
+
+    for (const char* bad : {"sender", "colour=red", "desktop=a"}) {
+        SCOPED_TRACE(bad);
+        const char* twice[] = {"desktop=a", bad};
+        QZFontChoiceRequest refused;
+        EXPECT_FALSE(QZParseFontChoiceArguments(2, twice, &refused));
+    }
+}
+
+TEST(FontChoice, AnswerSurvivesEncodingAndIncompleteAnswersAreRefused) {
+    QZFontChoice choice{
+        "app",
+        "Example App",
+        "/apps/app.desktop",
+        {"ja"},
+        "Noto Sans JP",
+        "xx",
+        {{"NotoSansJP-Regular", "Noto Sans JP"}, {"NotoSansJP-Bold", "Noto Sans JP"}}};
+    const std::string text = QZEncodeFontChoice(choice);
+    QZFontChoice read;
+    ASSERT_TRUE(QZDecodeFontChoice(text, &read));
+    EXPECT_EQ(QZEncodeFontChoice(read), text);
+    EXPECT_EQ(read.fonts, choice.fonts);
+    EXPECT_EQ(read.askedLanguages, choice.askedLanguages);
+
+    const std::string noEnd = text.substr(0, text.rfind("end="));
+    const std::string cutFamily = noEnd.substr(0, noEnd.rfind("family="));
+    const std::string cut = text.substr(0, text.size() - 1);
+    const std::string familyFirst = std::string("family=F\0end=\0", 14);
+    const std::string afterEnd = text + "name=x" + '\0';
+    const std::string unknown = std::string("colour=red\0end=\0", 16);
+    for (const std::string& bad : {std::string(), noEnd, cutFamily, cut, familyFirst, afterEnd,
+                                   unknown, std::string("garbage")}) {
+        SCOPED_TRACE(bad);
+        EXPECT_FALSE(QZDecodeFontChoice(bad, &read));
+    }
+}
+
+} // namespace
