@@ -7,9 +7,7 @@
 #include "bridge/QZFontAsker.h"
 
 #include <fcntl.h>
-#include <glyphwell/client.h>
 #include <limits.h>
-#include <poll.h>
 #include <signal.h>
 #include <spawn.h>
 #include <sys/epoll.h>
@@ -62,11 +60,6 @@ bool ProcessExists(pid_t pid) {
            stat[end + 2] != 'X';
 }
 
-uint32_t EpollEvents(short events) {
-    return ((events & POLLIN) ? uint32_t(EPOLLIN) : 0u) |
-           ((events & POLLOUT) ? uint32_t(EPOLLOUT) : 0u);
-}
-
 /// The font-choice worker: installed beside the bridge.
 std::string WorkerPath() {
     std::string path(PATH_MAX, '\0');
@@ -84,8 +77,6 @@ QZFontAsker::QZFontAsker(sd_event* event, sd_bus* bus, QZDeclinedLanguages decli
 
 QZFontAsker::~QZFontAsker() {
     EndWorker();
-    sd_event_source_disable_unref(callSource_);
-    glyphwell_call_free(call_);
 }
 
 void QZFontAsker::Open(const std::string& sender) {
@@ -169,8 +160,9 @@ bool QZFontAsker::Choose(Burst& burst) {
                           Escaped(burst.sender).c_str());
         return false;
     }
-    QZFontChoiceRequest request{burst.sender, burst.desktopID, QZExecutableName(burst.pid),
-                                declined_.Path(), burst.wants};
+    QZFontChoiceRequest request{burst.sender,     burst.desktopID, QZExecutableName(burst.pid),
+                                declined_.Path(), burst.wants,     burst.pid,
+                                hasPortName_,     portName_};
     std::vector<std::string> arguments = QZFontChoiceArguments(request);
     std::vector<char*> argv = {workerPath_.data()};
     for (std::string& argument : arguments)
@@ -210,6 +202,8 @@ bool QZFontAsker::Choose(Burst& burst) {
         return false;
     }
     workerAnswer_.clear();
+    choiceSize_ = std::string::npos;
+    asked_ = false;
     int result = sd_event_add_child(event_, &workerExit_, worker, WEXITED, OnWorkerExit, this);
     if (result < 0) {
         kill(worker, SIGKILL);
@@ -257,6 +251,12 @@ int QZFontAsker::OnWorkerOutput(sd_event_source*, int, uint32_t, void* data) {
         glyphwell::AppLog("Dropping the font request of %s: its font chooser wrote over %zu bytes",
                           Escaped(asker.asking_->sender).c_str(), kMaximumAnswerSize);
         asker.DropChoice();
+        return 0;
+    }
+    if (!asker.Progress()) {
+        glyphwell::AppLog("Dropping the font request of %s: its font chooser gave no answer",
+                          Escaped(asker.asking_->sender).c_str());
+        asker.DropChoice();
     }
     return 0;
 }
@@ -273,10 +273,13 @@ int QZFontAsker::OnWorkerTimeout(sd_event_source*, uint64_t, void* data) {
 int QZFontAsker::OnWorkerExit(sd_event_source*, const siginfo_t* info, void* data) {
     QZFontAsker& asker = *static_cast<QZFontAsker*>(data);
     // The worker has written all it will: what the pipe still holds is read now.
-    const bool read = asker.ReadWorkerOutput();
-    QZFontChoice choice;
-    const bool answered = read && info->si_code == CLD_EXITED && info->si_status == 0 &&
-                          QZDecodeFontChoice(asker.workerAnswer_, &choice);
+    const bool read = asker.ReadWorkerOutput() && asker.Progress();
+    QZFontQuestionTail tail;
+    const bool answered =
+        read && info->si_code == CLD_EXITED && info->si_status == 0 &&
+        asker.choiceSize_ != std::string::npos &&
+        QZDecodeQuestionTail(std::string_view(asker.workerAnswer_).substr(asker.choiceSize_),
+                             &tail);
     if (!answered) {
         const std::string sender = Escaped(asker.asking_->sender);
         if (info->si_code != CLD_EXITED)
@@ -294,9 +297,40 @@ int QZFontAsker::OnWorkerExit(sd_event_source*, const siginfo_t* info, void* dat
         return 0;
     }
     asker.EndWorker();
-    if (!asker.Ask(choice))
+    if (tail.ended && !tail.asking)
+        glyphwell::AppLog("Cannot ask the agent about the fonts for %s: %s",
+                          Escaped(asker.asking_->displayName).c_str(),
+                          Escaped(tail.statusText).c_str());
+    if (tail.ended && tail.asking)
+        asker.Finish(tail.status, tail.result, tail.statusText);
+    else
         asker.DropChoice();
     return 0;
+}
+
+bool QZFontAsker::Progress() {
+    if (choiceSize_ == std::string::npos) {
+        const size_t size = QZFontChoiceSize(workerAnswer_);
+        if (size == std::string::npos)
+            return true;
+        QZFontChoice choice;
+        if (!QZDecodeFontChoice(std::string_view(workerAnswer_).substr(0, size), &choice))
+            return false;
+        choiceSize_ = size;
+        Chosen(choice);
+    }
+    QZFontQuestionTail tail;
+    if (!asked_ &&
+        QZDecodeQuestionTail(std::string_view(workerAnswer_).substr(choiceSize_), &tail) &&
+        tail.asking) {
+        // The question is up: the user takes the time they need.
+        asked_ = true;
+        workerTimer_ = sd_event_source_disable_unref(workerTimer_);
+        glyphwell::AppLog("Asking to download %s for %s (process %d)",
+                          Escaped(asking_->fontNames).c_str(),
+                          Escaped(asking_->displayName).c_str(), int(asking_->pid));
+    }
+    return true;
 }
 
 void QZFontAsker::EndWorker() {
@@ -312,7 +346,7 @@ void QZFontAsker::DropChoice() {
     Next();
 }
 
-bool QZFontAsker::Ask(const QZFontChoice& choice) {
+void QZFontAsker::Chosen(const QZFontChoice& choice) {
     Burst& burst = *asking_;
     burst.application = choice.application;
     burst.displayName = choice.displayName;
@@ -321,61 +355,17 @@ bool QZFontAsker::Ask(const QZFontChoice& choice) {
     if (!choice.unserved.empty())
         glyphwell::AppLog("No catalog font for %s, asked for by %s",
                           Escaped(choice.unserved).c_str(), Escaped(burst.displayName).c_str());
-    if (choice.fonts.empty()) {
-        if (choice.unserved.empty())
-            glyphwell::AppLog("Not asking about fonts for %s: what it asked for is installed or "
-                              "was declined",
-                              Escaped(burst.displayName).c_str());
-        return false;
-    }
-
-    glyphwell_request* request = glyphwell_request_new(GLYPHWELL_ASK_DOWNLOAD);
-    if (!request)
-        return false;
-    glyphwell_request_set_application_name(request, burst.displayName.c_str());
-    if (!choice.desktopFile.empty())
-        glyphwell_request_set_bundle_path(request, choice.desktopFile.c_str());
-    glyphwell_request_set_process_id(request, burst.pid);
-    for (const auto& [postScriptName, family] : choice.fonts)
-        glyphwell_request_add_font(request, postScriptName.c_str(), family.c_str());
-    const int status =
-        glyphwell_call_start(request, hasPortName_ ? portName_.c_str() : nullptr, &call_);
-    glyphwell_request_free(request);
-    if (status < 0 ||
-        sd_event_add_io(event_, &callSource_, glyphwell_call_get_fd(call_),
-                        EpollEvents(glyphwell_call_get_events(call_)), OnCallEvent, this) < 0) {
-        glyphwell::AppLog("Cannot ask the agent about the fonts for %s: %s",
-                          Escaped(burst.displayName).c_str(), glyphwell_status_text(status));
-        call_ = (glyphwell_call_free(call_), nullptr);
-        return false;
-    }
-    glyphwell::AppLog("Asking to download %s for %s (process %d)", Escaped(burst.fontNames).c_str(),
-                      Escaped(burst.displayName).c_str(), int(burst.pid));
-    return true;
+    if (choice.fonts.empty() && choice.unserved.empty())
+        glyphwell::AppLog("Not asking about fonts for %s: what it asked for is installed or "
+                          "was declined",
+                          Escaped(burst.displayName).c_str());
 }
 
-int QZFontAsker::OnCallEvent(sd_event_source*, int, uint32_t, void* data) {
-    QZFontAsker& asker = *static_cast<QZFontAsker*>(data);
-    glyphwell_reply* reply = nullptr;
-    const int status = glyphwell_call_dispatch(asker.call_, &reply);
-    if (status == GLYPHWELL_IN_PROGRESS) {
-        sd_event_source_set_io_events(asker.callSource_,
-                                      EpollEvents(glyphwell_call_get_events(asker.call_)));
-        return 0;
-    }
-    const int result = glyphwell_reply_get_result(reply);
-    glyphwell_reply_free(reply);
-    asker.Finish(status, result);
-    return 0;
-}
-
-void QZFontAsker::Finish(int status, int result) {
-    callSource_ = sd_event_source_disable_unref(callSource_);
-    call_ = (glyphwell_call_free(call_), nullptr);
+void QZFontAsker::Finish(int status, int result, const std::string& statusText) {
     std::unique_ptr<Burst> burst = std::move(asking_);
     if (status < 0) {
         glyphwell::AppLog("The agent did not answer about the fonts for %s: %s",
-                          Escaped(burst->displayName).c_str(), glyphwell_status_text(status));
+                          Escaped(burst->displayName).c_str(), Escaped(statusText).c_str());
     } else if (result == 1) {
         glyphwell::AppLog("Installed %s for %s", Escaped(burst->fontNames).c_str(),
                           Escaped(burst->displayName).c_str());

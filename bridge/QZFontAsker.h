@@ -19,8 +19,6 @@
 #include "bridge/QZFontChoice.h"
 #include "bridge/QZFontResources.h"
 
-struct glyphwell_call;
-
 class QZFontAsker {
 public:
     static constexpr size_t kMaximumBursts = 64;
@@ -51,7 +49,6 @@ private:
     struct Burst;
     static int OnProcessID(sd_bus_message* reply, void* burst, sd_bus_error*);
     static int OnBurstEnd(sd_event_source*, uint64_t, void* burst);
-    static int OnCallEvent(sd_event_source*, int, uint32_t, void* asker);
     /// Starts the next waiting burst's question when none is on screen.
     void Next();
     /// Starts the worker that chooses the fonts for `burst`; false when it could not start.
@@ -65,10 +62,12 @@ private:
     void EndWorker();
     /// Drops the burst being chosen for and moves on.
     void DropChoice();
-    /// Asks the agent about the burst being chosen for, with the fonts `choice` offers; false
-    /// when there is nothing to ask or the call failed.
-    bool Ask(const QZFontChoice& choice);
-    void Finish(int status, int result);
+    /// Takes in what the worker has written so far; false when it is not a choice.
+    bool Progress();
+    /// Records the worker's choice in the burst and logs what it leaves out.
+    void Chosen(const QZFontChoice& choice);
+    /// Ends the question with the agent's answer (or the call's failure) and moves on.
+    void Finish(int status, int result, const std::string& statusText);
     void Notify(const std::string& fonts, const std::string& application);
 
     sd_event* event_;
@@ -84,7 +83,7 @@ private:
     sd_event_source* workerOutput_ = nullptr;
     sd_event_source* workerTimer_ = nullptr;
     std::string workerAnswer_;
+    size_t choiceSize_ = std::string::npos; ///< where the choice ends in the answer, once read
+    bool asked_ = false;                    ///< the worker has put the question
     size_t dropped_ = 0; ///< requests dropped since the queue was last short of full
-    glyphwell_call* call_ = nullptr;
-    sd_event_source* callSource_ = nullptr;
 };

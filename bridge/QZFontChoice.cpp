@@ -1,5 +1,6 @@
 #include "bridge/QZFontChoice.h"
 
+#include <charconv>
 #include <cstring>
 
 namespace {
@@ -18,6 +19,9 @@ std::vector<std::string> QZFontChoiceArguments(const QZFontChoiceRequest& reques
         arguments.push_back("language=" + language);
     for (const std::string& family : request.wants.families)
         arguments.push_back("family=" + family);
+    arguments.push_back("pid=" + std::to_string(request.pid));
+    if (request.hasPortName)
+        arguments.push_back("port=" + request.portName);
     return arguments;
 }
 
@@ -36,6 +40,20 @@ bool QZParseFontChoiceArguments(int count, const char* const* arguments,
             if (list.size() >= QZFontResourceWants::kMaximumWanted)
                 return false;
             list.push_back(value);
+            continue;
+        }
+        if (key == "pid") {
+            const auto [end, error] =
+                std::from_chars(value.data(), value.data() + value.size(), request->pid);
+            if (error != std::errc() || end != value.data() + value.size() || request->pid <= 0)
+                return false;
+            continue;
+        }
+        if (key == "port") {
+            if (request->hasPortName)
+                return false;
+            request->hasPortName = true;
+            request->portName = value;
             continue;
         }
         static constexpr std::string_view kKeys[] = {"sender", "desktop", "executable", "declined"};
@@ -109,4 +127,56 @@ bool QZDecodeFontChoice(std::string_view text, QZFontChoice* choice) {
             return false;
     }
     return ended && !family;
+}
+
+std::string QZEncodeQuestionAsking() {
+    std::string text;
+    Add(text, "asking", "");
+    return text;
+}
+
+std::string QZEncodeQuestionOutcome(int status, int result, const std::string& statusText) {
+    std::string text;
+    Add(text, "status", std::to_string(status));
+    Add(text, "result", std::to_string(result));
+    Add(text, "text", statusText);
+    return text;
+}
+
+size_t QZFontChoiceSize(std::string_view text) {
+    // Every record follows a NUL, and a value holds none: "\0end=\0" is the end record.
+    static constexpr std::string_view kEnd("\0end=\0", 6);
+    const size_t end = text.find(kEnd);
+    return end == std::string_view::npos ? end : end + kEnd.size();
+}
+
+bool QZDecodeQuestionTail(std::string_view text, QZFontQuestionTail* tail) {
+    *tail = {};
+    static constexpr std::string_view kAsking("asking=\0", 8);
+    if (text.substr(0, kAsking.size()) == kAsking) {
+        tail->asking = true;
+        text.remove_prefix(kAsking.size());
+    }
+    if (text.empty())
+        return true;
+    // The outcome: its three records in order, then nothing.
+    std::string_view values[3];
+    static constexpr std::string_view kKeys[] = {"status=", "result=", "text="};
+    for (size_t index = 0; index < 3; ++index) {
+        const size_t end = text.find('\0');
+        if (end == std::string_view::npos || text.substr(0, kKeys[index].size()) != kKeys[index])
+            return false;
+        values[index] = text.substr(kKeys[index].size(), end - kKeys[index].size());
+        text.remove_prefix(end + 1);
+    }
+    for (size_t index = 0; index < 2; ++index) {
+        int& number = index == 0 ? tail->status : tail->result;
+        const auto [last, error] = std::from_chars(
+            values[index].data(), values[index].data() + values[index].size(), number);
+        if (error != std::errc() || last != values[index].data() + values[index].size())
+            return false;
+    }
+    tail->statusText = values[2];
+    tail->ended = true;
+    return text.empty();
 }

@@ -1,8 +1,10 @@
 // Choosing the catalog fonts to offer for a burst of requests. The choice loads fontconfig and
 // reads the catalog and desktop entries, so the bridge makes it in a short-lived worker process
-// (glyphwell-bus-bridge-worker): the long-lived bridge never maps those libraries or keeps the
-// pages they touch. The request travels as the worker's arguments, the answer as NUL-terminated
-// "key=value" records on its standard output.
+// (glyphwell-bus-bridge-worker), which then asks the agent and waits for the user: the
+// long-lived bridge never maps those libraries or runs the client's code, nor keeps the pages
+// they touch. The request travels as the worker's arguments, the answer as NUL-terminated
+// "key=value" records on its standard output: the choice, then "asking=" once the question is
+// up, then the call's status, result and status text.
 #pragma once
 
 #include <string>
@@ -20,6 +22,9 @@ struct QZFontChoiceRequest {
     std::string executable; ///< the caller's executable name, may be empty
     std::string declinedPath;
     QZFontResourceWants wants;
+    pid_t pid = 0;            ///< the caller's process, for the agent to watch
+    bool hasPortName = false; ///< false: the agent's own port
+    std::string portName;
 };
 
 /// The fonts chosen, and the names the question and the log use.
@@ -43,6 +48,23 @@ std::string QZEncodeFontChoice(const QZFontChoice& choice);
 /// The choice `text` holds; false when it is not a complete answer (the worker crashed or was
 /// killed while writing it, or wrote something else).
 bool QZDecodeFontChoice(std::string_view text, QZFontChoice* choice);
+
+/// What the worker reports after the choice.
+struct QZFontQuestionTail {
+    bool asking = false; ///< the question was put to the agent
+    bool ended = false;  ///< the call ended: status, result and text hold its outcome
+    int status = 0;
+    int result = 0;
+    std::string statusText;
+};
+
+/// The records that end the worker's output: "asking=", or the call's outcome.
+std::string QZEncodeQuestionAsking();
+std::string QZEncodeQuestionOutcome(int status, int result, const std::string& statusText);
+/// Where the choice in `text` ends (after its "end=" record); npos while it has not arrived.
+size_t QZFontChoiceSize(std::string_view text);
+/// Reads what follows the choice; false for anything but the records above in their order.
+bool QZDecodeQuestionTail(std::string_view text, QZFontQuestionTail* tail);
 
 /// Makes the choice (fontconfig loaded for this call only, the catalog read).
 QZFontChoice QZChooseFonts(const QZFontChoiceRequest& request);
