@@ -252,8 +252,7 @@ int QZRunBusBridge() {
         return 0;
     }
 
-    QZFontAsker asker(event.get(), bus.get(),
-                      QZDeclinedLanguages(QZDeclinedLanguages::DefaultPath()), nullptr);
+    QZFontAsker asker(event.get(), bus.get(), nullptr);
     gAsker = &asker;
     struct AskerReset {
         ~AskerReset() { gAsker = nullptr; }

@@ -1,9 +1,9 @@
 // Map: a burst opens on a caller's first request (its pid asked of the bus at once, a 1 s timer
 // started), moves to the waiting list when the timer ends, and is asked when no other question
-// is on screen: languages and families become catalog fonts in a short-lived worker process (so
-// that fontconfig and the catalog never stay resident here), the fonts one request, the request
-// one asynchronous call. Its reply records a declined
-// language or announces the installed fonts.
+// is on screen, by a worker process: it turns languages and families into catalog fonts, asks
+// the agent and remembers a declined language, so that fontconfig, the catalog and the client
+// library never stay resident here. The bridge logs each step it reports and announces the
+// installed fonts.
 #include "bridge/QZFontAsker.h"
 
 #include <fcntl.h>
@@ -19,10 +19,8 @@
 #include <cerrno>
 #include <cstring>
 
-#include "bridge/QZApplicationName.h"
 #include "platform/Log.h"
 #include "platform/LogEscape.h"
-#include "platform/ReadFile.h"
 
 struct QZFontAsker::Burst {
     QZFontAsker* asker = nullptr;
@@ -33,8 +31,6 @@ struct QZFontAsker::Burst {
     sd_bus_slot* pidQuery = nullptr;
     sd_event_source* timer = nullptr;
     // Set when the question is asked.
-    std::string application; ///< the key declined languages are remembered under
-    std::vector<std::string> askedLanguages;
     std::string fontNames; ///< the families offered, for the notification
     std::string displayName;
 
@@ -50,16 +46,6 @@ std::string Escaped(std::string_view text) {
     return glyphwell::LogEscape(text);
 }
 
-/// Whether process `pid` runs: it exists and is not a zombie waiting for its parent.
-bool ProcessExists(pid_t pid) {
-    std::string stat;
-    if (!glyphwell::ReadFileStart("/proc/" + std::to_string(pid) + "/stat", 1024, &stat))
-        return false;
-    const size_t end = stat.rfind(')');
-    return end != std::string::npos && end + 2 < stat.size() && stat[end + 2] != 'Z' &&
-           stat[end + 2] != 'X';
-}
-
 /// The font-choice worker: installed beside the bridge.
 std::string WorkerPath() {
     std::string path(PATH_MAX, '\0');
@@ -70,9 +56,8 @@ std::string WorkerPath() {
 
 } // namespace
 
-QZFontAsker::QZFontAsker(sd_event* event, sd_bus* bus, QZDeclinedLanguages declined,
-                         const char* portName)
-    : event_(event), bus_(bus), declined_(std::move(declined)), portName_(portName ? portName : ""),
+QZFontAsker::QZFontAsker(sd_event* event, sd_bus* bus, const char* portName)
+    : event_(event), bus_(bus), portName_(portName ? portName : ""),
       hasPortName_(portName != nullptr), workerPath_(WorkerPath()) {}
 
 QZFontAsker::~QZFontAsker() {
@@ -155,14 +140,13 @@ void QZFontAsker::Next() {
 bool QZFontAsker::Choose(Burst& burst) {
     // A caller that quit while its burst waited is not asked about (the bus cannot give the
     // pid of a connection that has gone).
-    if (burst.pid <= 0 || !ProcessExists(burst.pid)) {
+    if (!QZProcessRuns(burst.pid)) {
         glyphwell::AppLog("Not asking about fonts for %s: it has quit",
                           Escaped(burst.sender).c_str());
         return false;
     }
-    QZFontChoiceRequest request{burst.sender,     burst.desktopID, QZExecutableName(burst.pid),
-                                declined_.Path(), burst.wants,     burst.pid,
-                                hasPortName_,     portName_};
+    QZFontChoiceRequest request{burst.sender, burst.desktopID, burst.wants,
+                                burst.pid,    hasPortName_,    portName_};
     std::vector<std::string> arguments = QZFontChoiceArguments(request);
     std::vector<char*> argv = {workerPath_.data()};
     for (std::string& argument : arguments)
@@ -348,9 +332,7 @@ void QZFontAsker::DropChoice() {
 
 void QZFontAsker::Chosen(const QZFontChoice& choice) {
     Burst& burst = *asking_;
-    burst.application = choice.application;
     burst.displayName = choice.displayName;
-    burst.askedLanguages = choice.askedLanguages;
     burst.fontNames = choice.fontNames;
     if (!choice.unserved.empty())
         glyphwell::AppLog("No catalog font for %s, asked for by %s",
@@ -370,12 +352,6 @@ void QZFontAsker::Finish(int status, int result, const std::string& statusText) 
         glyphwell::AppLog("Installed %s for %s", Escaped(burst->fontNames).c_str(),
                           Escaped(burst->displayName).c_str());
         Notify(burst->fontNames, burst->displayName);
-    } else if (!ProcessExists(burst->pid)) {
-        // The application quit and its question was withdrawn: nothing was declined.
-    } else if (!burst->askedLanguages.empty() &&
-               !declined_.Record(burst->application, burst->askedLanguages, time(nullptr))) {
-        glyphwell::AppLog("Cannot remember the declined languages in %s",
-                          Escaped(QZDeclinedLanguages::DefaultPath()).c_str());
     }
     Next();
 }

@@ -15,7 +15,6 @@
 #include <memory>
 #include <string>
 
-#include "bridge/QZDeclinedLanguages.h"
 #include "bridge/QZFontChoice.h"
 #include "bridge/QZFontResources.h"
 
@@ -31,7 +30,7 @@ public:
 
     /// Uses `event` and `bus` (not retained: they outlive the asker); `portName` is the agent's
     /// port (null: the agent's own).
-    QZFontAsker(sd_event* event, sd_bus* bus, QZDeclinedLanguages declined, const char* portName);
+    QZFontAsker(sd_event* event, sd_bus* bus, const char* portName);
     ~QZFontAsker();
     QZFontAsker(const QZFontAsker&) = delete;
     QZFontAsker& operator=(const QZFontAsker&) = delete;
@@ -72,7 +71,6 @@ private:
 
     sd_event* event_;
     sd_bus* bus_;
-    QZDeclinedLanguages declined_;
     std::string portName_;
     bool hasPortName_ = false;
     std::map<std::string, std::unique_ptr<Burst>> open_; ///< by sender

@@ -3,6 +3,8 @@
 #include <charconv>
 #include <cstring>
 
+#include "platform/ReadFile.h"
+
 namespace {
 
 void Add(std::string& text, std::string_view key, std::string_view value) {
@@ -11,10 +13,19 @@ void Add(std::string& text, std::string_view key, std::string_view value) {
 
 } // namespace
 
+bool QZProcessRuns(pid_t pid) {
+    std::string stat;
+    if (pid <= 0 ||
+        !glyphwell::ReadFileStart("/proc/" + std::to_string(pid) + "/stat", 1024, &stat))
+        return false;
+    const size_t end = stat.rfind(')');
+    return end != std::string::npos && end + 2 < stat.size() && stat[end + 2] != 'Z' &&
+           stat[end + 2] != 'X';
+}
+
 std::vector<std::string> QZFontChoiceArguments(const QZFontChoiceRequest& request) {
-    std::vector<std::string> arguments = {
-        "sender=" + request.sender, "desktop=" + request.desktopID,
-        "executable=" + request.executable, "declined=" + request.declinedPath};
+    std::vector<std::string> arguments = {"sender=" + request.sender,
+                                          "desktop=" + request.desktopID};
     for (const std::string& language : request.wants.languages)
         arguments.push_back("language=" + language);
     for (const std::string& family : request.wants.families)
@@ -27,7 +38,7 @@ std::vector<std::string> QZFontChoiceArguments(const QZFontChoiceRequest& reques
 
 bool QZParseFontChoiceArguments(int count, const char* const* arguments,
                                 QZFontChoiceRequest* request) {
-    std::vector<bool> seen(4);
+    std::vector<bool> seen(2);
     for (int index = 0; index < count; ++index) {
         const std::string_view argument(arguments[index]);
         const size_t equals = argument.find('=');
@@ -56,13 +67,12 @@ bool QZParseFontChoiceArguments(int count, const char* const* arguments,
             request->portName = value;
             continue;
         }
-        static constexpr std::string_view kKeys[] = {"sender", "desktop", "executable", "declined"};
-        std::string* fields[] = {&request->sender, &request->desktopID, &request->executable,
-                                 &request->declinedPath};
+        static constexpr std::string_view kKeys[] = {"sender", "desktop"};
+        std::string* fields[] = {&request->sender, &request->desktopID};
         size_t field = 0;
-        while (field < 4 && kKeys[field] != key)
+        while (field < 2 && kKeys[field] != key)
             ++field;
-        if (field == 4 || seen[field])
+        if (field == 2 || seen[field])
             return false;
         seen[field] = true;
         *fields[field] = value;

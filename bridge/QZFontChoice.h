@@ -17,10 +17,8 @@
 
 /// What a burst asks for, and of whom.
 struct QZFontChoiceRequest {
-    std::string sender;     ///< the caller's unique bus name, named when nothing better is known
-    std::string desktopID;  ///< may be empty
-    std::string executable; ///< the caller's executable name, may be empty
-    std::string declinedPath;
+    std::string sender;    ///< the caller's unique bus name, named when nothing better is known
+    std::string desktopID; ///< may be empty
     QZFontResourceWants wants;
     pid_t pid = 0;            ///< the caller's process, for the agent to watch
     bool hasPortName = false; ///< false: the agent's own port
@@ -37,6 +35,9 @@ struct QZFontChoice {
     std::string unserved;  ///< languages and families no catalog font serves, joined by ", "
     std::vector<std::pair<std::string, std::string>> fonts; ///< PostScript name, family
 };
+
+/// Whether process `pid` runs: it exists and is not a zombie waiting for its parent.
+bool QZProcessRuns(pid_t pid);
 
 /// `request` as the worker's arguments (after the program name).
 std::vector<std::string> QZFontChoiceArguments(const QZFontChoiceRequest& request);
@@ -66,5 +67,6 @@ size_t QZFontChoiceSize(std::string_view text);
 /// Reads what follows the choice; false for anything but the records above in their order.
 bool QZDecodeQuestionTail(std::string_view text, QZFontQuestionTail* tail);
 
-/// Makes the choice (fontconfig loaded for this call only, the catalog read).
+/// Makes the choice (fontconfig loaded for this call only, the catalog read), leaving out the
+/// languages the application's user declined lately.
 QZFontChoice QZChooseFonts(const QZFontChoiceRequest& request);

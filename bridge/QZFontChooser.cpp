@@ -13,14 +13,15 @@
 QZFontChoice QZChooseFonts(const QZFontChoiceRequest& request) {
     QZFontChoice choice;
     choice.desktopFile = QZDesktopEntryPath(request.desktopID);
-    choice.application = !request.desktopID.empty() ? request.desktopID : request.executable;
+    const std::string executable = QZExecutableName(request.pid);
+    choice.application = !request.desktopID.empty() ? request.desktopID : executable;
     if (!choice.desktopFile.empty())
         choice.displayName = QZDesktopEntryName(choice.desktopFile);
     if (choice.displayName.empty())
-        choice.displayName = !request.executable.empty() ? request.executable : request.sender;
+        choice.displayName = !executable.empty() ? executable : request.sender;
 
     const auto catalog = QZCurrentDownloadableFontCatalog();
-    const QZDeclinedLanguages declined(request.declinedPath);
+    const QZDeclinedLanguages declined(QZDeclinedLanguages::DefaultPath());
     std::vector<const QZDownloadableFont*> fonts;
     std::set<std::string> families;
     const auto offer = [&](const std::vector<const QZDownloadableFont*>& chosen) {

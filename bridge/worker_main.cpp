@@ -10,7 +10,12 @@
 #include <cerrno>
 #include <cstdio>
 
+#include <ctime>
+
+#include "bridge/QZDeclinedLanguages.h"
 #include "bridge/QZFontChoice.h"
+#include "platform/Log.h"
+#include "platform/LogEscape.h"
 
 namespace {
 
@@ -34,7 +39,7 @@ int main(int argc, char** argv) {
     QZFontChoiceRequest request;
     if (argc < 2 || !QZParseFontChoiceArguments(argc - 1, argv + 1, &request)) {
         std::fprintf(stderr,
-                     "usage: %s sender=NAME desktop=ID executable=NAME declined=PATH "
+                     "usage: %s sender=NAME desktop=ID "
                      "pid=PID [port=NAME] [language=TAG]... [family=NAME]...\n"
                      "Started by glyphwell-bus-bridge; not for direct use.\n",
                      argv[0]);
@@ -73,6 +78,13 @@ int main(int argc, char** argv) {
         result = glyphwell_reply_get_result(reply);
         glyphwell_reply_free(reply);
         glyphwell_call_free(call);
+        // Skipped, not withdrawn because the application quit: not asked again for a while.
+        QZDeclinedLanguages declined(QZDeclinedLanguages::DefaultPath());
+        if (status >= 0 && result != 1 && !choice.askedLanguages.empty() &&
+            QZProcessRuns(request.pid) &&
+            !declined.Record(choice.application, choice.askedLanguages, time(nullptr)))
+            glyphwell::AppLog("Cannot remember the declined languages in %s",
+                              glyphwell::LogEscape(QZDeclinedLanguages::DefaultPath()).c_str());
     }
     return Write(QZEncodeQuestionOutcome(status, result, glyphwell_status_text(status))) ? 0 : 1;
 }
