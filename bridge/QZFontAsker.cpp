@@ -263,7 +263,8 @@ int QZFontAsker::OnWorkerExit(sd_event_source*, const siginfo_t* info, void* dat
         read && info->si_code == CLD_EXITED && info->si_status == 0 &&
         asker.choiceSize_ != std::string::npos &&
         QZDecodeQuestionTail(std::string_view(asker.workerAnswer_).substr(asker.choiceSize_),
-                             &tail);
+                             &tail) &&
+        (tail.ended || !tail.asking);
     if (!answered) {
         const std::string sender = Escaped(asker.asking_->sender);
         if (info->si_code != CLD_EXITED)
@@ -303,10 +304,8 @@ bool QZFontAsker::Progress() {
         choiceSize_ = size;
         Chosen(choice);
     }
-    QZFontQuestionTail tail;
-    if (!asked_ &&
-        QZDecodeQuestionTail(std::string_view(workerAnswer_).substr(choiceSize_), &tail) &&
-        tail.asking) {
+    static const std::string kAsking = QZEncodeQuestionAsking();
+    if (!asked_ && workerAnswer_.compare(choiceSize_, kAsking.size(), kAsking) == 0) {
         // The question is up: the user takes the time they need.
         asked_ = true;
         workerTimer_ = sd_event_source_disable_unref(workerTimer_);
