@@ -18,7 +18,6 @@ public:
     explicit QZDeclinedLanguages(std::string path) : path_(std::move(path)) {}
     /// $XDG_STATE_HOME/glyphwell/declined-languages; empty without a home directory.
     static std::string DefaultPath();
-    const std::string& Path() const { return path_; }
 
     /// Whether `application` declined `language` less than kRemembered seconds before `now`.
     bool IsDeclined(const std::string& application, const std::string& language, time_t now) const;
