@@ -1,10 +1,10 @@
 // Choosing the catalog fonts to offer for a burst of requests. The choice loads fontconfig and
-// reads the catalog and desktop entries, so the bridge makes it in a short-lived worker process
-// (glyphwell-bus-bridge-worker), which then asks the agent and waits for the user: the
-// long-lived bridge never maps those libraries or runs the client's code, nor keeps the pages
-// they touch. The request travels as the worker's arguments, the answer as NUL-terminated
-// "key=value" records on its standard output: the choice, then "asking=" once the question is
-// up, then the call's status, result and status text.
+// reads the catalog and desktop entries, so the bridge leaves it to a short-lived worker process
+// (glyphwell-bus-bridge-worker), which then asks the agent, waits for the user and remembers a
+// skipped language: the long-lived bridge never maps those libraries or runs the client's code,
+// nor keeps the pages they touch. The request travels as the worker's arguments, the answer as
+// NUL-terminated "key=value" records on its standard output: the choice, then "asking=" once
+// the question is up, then the call's status, result and status text.
 #pragma once
 
 #include <string>
