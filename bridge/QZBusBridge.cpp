@@ -221,6 +221,8 @@ int QZRunBusBridge() {
     sigemptyset(&stopSignals);
     sigaddset(&stopSignals, SIGTERM);
     sigaddset(&stopSignals, SIGINT);
+    // SIGCHLD too: the loop watches the font-choice workers.
+    sigaddset(&stopSignals, SIGCHLD);
     sigprocmask(SIG_BLOCK, &stopSignals, nullptr);
 
     sd_event* eventPointer = nullptr;
@@ -250,8 +252,7 @@ int QZRunBusBridge() {
         return 0;
     }
 
-    QZFontAsker asker(event.get(), bus.get(),
-                      QZDeclinedLanguages(QZDeclinedLanguages::DefaultPath()), nullptr);
+    QZFontAsker asker(event.get(), bus.get(), nullptr);
     gAsker = &asker;
     struct AskerReset {
         ~AskerReset() { gAsker = nullptr; }

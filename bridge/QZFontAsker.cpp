@@ -1,26 +1,26 @@
 // Map: a burst opens on a caller's first request (its pid asked of the bus at once, a 1 s timer
 // started), moves to the waiting list when the timer ends, and is asked when no other question
-// is on screen: languages and families become catalog fonts (fontconfig loaded for that moment
-// only), the fonts one request, the request one asynchronous call. Its reply records a declined
-// language or announces the installed fonts.
+// is on screen, by a worker process: it turns languages and families into catalog fonts, asks
+// the agent and remembers a declined language, so that fontconfig, the catalog and the client
+// library never stay resident here. The bridge logs each step it reports and announces the
+// installed fonts.
 #include "bridge/QZFontAsker.h"
 
-#include <glyphwell/client.h>
-#include <malloc.h>
-#include <poll.h>
+#include <fcntl.h>
+#include <limits.h>
+#include <signal.h>
+#include <spawn.h>
 #include <sys/epoll.h>
+#include <sys/wait.h>
 #include <systemd/sd-bus.h>
 #include <systemd/sd-event.h>
 #include <unistd.h>
 
-#include <set>
+#include <cerrno>
+#include <cstring>
 
-#include "bridge/QZApplicationName.h"
-#include "desktop/QZDownloadableFontCatalog.h"
-#include "desktop/QZFontLanguages.h"
 #include "platform/Log.h"
 #include "platform/LogEscape.h"
-#include "platform/ReadFile.h"
 
 struct QZFontAsker::Burst {
     QZFontAsker* asker = nullptr;
@@ -31,8 +31,6 @@ struct QZFontAsker::Burst {
     sd_bus_slot* pidQuery = nullptr;
     sd_event_source* timer = nullptr;
     // Set when the question is asked.
-    std::string application; ///< the key declined languages are remembered under
-    std::vector<std::string> askedLanguages;
     std::string fontNames; ///< the families offered, for the notification
     std::string displayName;
 
@@ -48,31 +46,22 @@ std::string Escaped(std::string_view text) {
     return glyphwell::LogEscape(text);
 }
 
-/// Whether process `pid` runs: it exists and is not a zombie waiting for its parent.
-bool ProcessExists(pid_t pid) {
-    std::string stat;
-    if (!glyphwell::ReadFileStart("/proc/" + std::to_string(pid) + "/stat", 1024, &stat))
-        return false;
-    const size_t end = stat.rfind(')');
-    return end != std::string::npos && end + 2 < stat.size() && stat[end + 2] != 'Z' &&
-           stat[end + 2] != 'X';
-}
-
-uint32_t EpollEvents(short events) {
-    return ((events & POLLIN) ? uint32_t(EPOLLIN) : 0u) |
-           ((events & POLLOUT) ? uint32_t(EPOLLOUT) : 0u);
+/// The font-choice worker: installed beside the bridge.
+std::string WorkerPath() {
+    std::string path(PATH_MAX, '\0');
+    const ssize_t length = readlink("/proc/self/exe", path.data(), path.size());
+    path.resize(length > 0 ? size_t(length) : 0);
+    return path.substr(0, path.rfind('/') + 1) + "glyphwell-bus-bridge-worker";
 }
 
 } // namespace
 
-QZFontAsker::QZFontAsker(sd_event* event, sd_bus* bus, QZDeclinedLanguages declined,
-                         const char* portName)
-    : event_(event), bus_(bus), declined_(std::move(declined)), portName_(portName ? portName : ""),
-      hasPortName_(portName != nullptr) {}
+QZFontAsker::QZFontAsker(sd_event* event, sd_bus* bus, const char* portName)
+    : event_(event), bus_(bus), portName_(portName ? portName : ""),
+      hasPortName_(portName != nullptr), workerPath_(WorkerPath()) {}
 
 QZFontAsker::~QZFontAsker() {
-    sd_event_source_disable_unref(callSource_);
-    glyphwell_call_free(call_);
+    EndWorker();
 }
 
 void QZFontAsker::Open(const std::string& sender) {
@@ -143,133 +132,225 @@ void QZFontAsker::Next() {
     while (!asking_ && !waiting_.empty()) {
         std::unique_ptr<Burst> burst = std::move(waiting_.front());
         waiting_.pop_front();
-        if (Ask(*burst))
+        if (Choose(*burst))
             asking_ = std::move(burst);
     }
 }
 
-bool QZFontAsker::Ask(Burst& burst) {
+bool QZFontAsker::Choose(Burst& burst) {
     // A caller that quit while its burst waited is not asked about (the bus cannot give the
     // pid of a connection that has gone).
-    if (burst.pid <= 0 || !ProcessExists(burst.pid)) {
+    if (!QZProcessRuns(burst.pid)) {
         glyphwell::AppLog("Not asking about fonts for %s: it has quit",
                           Escaped(burst.sender).c_str());
         return false;
     }
-    const std::string executable = QZExecutableName(burst.pid);
-    const std::string desktopFile = QZDesktopEntryPath(burst.desktopID);
-    burst.application = !burst.desktopID.empty() ? burst.desktopID : executable;
-    burst.displayName = desktopFile.empty() ? std::string() : QZDesktopEntryName(desktopFile);
-    if (burst.displayName.empty())
-        burst.displayName = !executable.empty() ? executable : burst.sender;
+    QZFontChoiceRequest request{burst.sender, burst.desktopID, burst.wants,
+                                burst.pid,    hasPortName_,    portName_};
+    std::vector<std::string> arguments = QZFontChoiceArguments(request);
+    std::vector<char*> argv = {workerPath_.data()};
+    for (std::string& argument : arguments)
+        argv.push_back(argument.data());
+    argv.push_back(nullptr);
 
-    const auto catalog = QZCurrentDownloadableFontCatalog();
-    std::vector<const QZDownloadableFont*> fonts;
-    std::set<std::string> families;
-    const auto offer = [&](const std::vector<const QZDownloadableFont*>& chosen) {
-        for (const QZDownloadableFont* font : chosen)
-            if (std::find(fonts.begin(), fonts.end(), font) == fonts.end()) {
-                fonts.push_back(font);
-                if (families.emplace(font->family).second && !font->family.empty())
-                    burst.fontNames +=
-                        (burst.fontNames.empty() ? "" : ", ") + std::string(font->family);
-            }
-    };
-    std::string unserved;
-    {
-        // fontconfig's view lives only for this moment: a loaded configuration costs megabytes.
-        const QZInstalledFontView installed;
-        const time_t now = time(nullptr);
-        for (const std::string& language : burst.wants.languages) {
-            if (installed.CoversLanguage(language) ||
-                declined_.IsDeclined(burst.application, language, now))
-                continue;
-            const auto chosen = QZCatalogFontsForLanguage(*catalog, language);
-            if (chosen.empty())
-                unserved += (unserved.empty() ? "" : ", ") + language;
-            else
-                burst.askedLanguages.push_back(language);
-            offer(chosen);
-        }
-        for (const std::string& family : burst.wants.families) {
-            if (installed.HasFamily(family))
-                continue;
-            const auto chosen = QZCatalogFontsForFamily(*catalog, family);
-            if (chosen.empty())
-                unserved += (unserved.empty() ? "" : ", ") + family;
-            offer(chosen);
-        }
-    }
-    malloc_trim(0);
-    if (!unserved.empty())
-        glyphwell::AppLog("No catalog font for %s, asked for by %s", Escaped(unserved).c_str(),
-                          Escaped(burst.displayName).c_str());
-    if (fonts.empty()) {
-        if (unserved.empty())
-            glyphwell::AppLog("Not asking about fonts for %s: what it asked for is installed or "
-                              "was declined",
-                              Escaped(burst.displayName).c_str());
+    int pipe[2];
+    if (pipe2(pipe, O_CLOEXEC | O_NONBLOCK) < 0) {
+        glyphwell::AppLog("Cannot choose the fonts for %s: %s", Escaped(burst.sender).c_str(),
+                          std::strerror(errno));
         return false;
     }
-
-    glyphwell_request* request = glyphwell_request_new(GLYPHWELL_ASK_DOWNLOAD);
-    if (!request)
-        return false;
-    glyphwell_request_set_application_name(request, burst.displayName.c_str());
-    if (!desktopFile.empty())
-        glyphwell_request_set_bundle_path(request, desktopFile.c_str());
-    glyphwell_request_set_process_id(request, burst.pid);
-    for (const QZDownloadableFont* font : fonts)
-        glyphwell_request_add_font(request, std::string(font->postScriptName).c_str(),
-                                   std::string(font->family).c_str());
-    const int status =
-        glyphwell_call_start(request, hasPortName_ ? portName_.c_str() : nullptr, &call_);
-    glyphwell_request_free(request);
-    if (status < 0 ||
-        sd_event_add_io(event_, &callSource_, glyphwell_call_get_fd(call_),
-                        EpollEvents(glyphwell_call_get_events(call_)), OnCallEvent, this) < 0) {
-        glyphwell::AppLog("Cannot ask the agent about the fonts for %s: %s",
-                          Escaped(burst.displayName).c_str(), glyphwell_status_text(status));
-        call_ = (glyphwell_call_free(call_), nullptr);
+    // The worker gets the default signal handling and mask (the bridge blocks the signals its
+    // loop handles), /dev/null for input and the pipe for output.
+    posix_spawn_file_actions_t actions;
+    posix_spawnattr_t attributes;
+    posix_spawn_file_actions_init(&actions);
+    posix_spawn_file_actions_addopen(&actions, STDIN_FILENO, "/dev/null", O_RDONLY, 0);
+    posix_spawn_file_actions_adddup2(&actions, pipe[1], STDOUT_FILENO);
+    posix_spawnattr_init(&attributes);
+    sigset_t none, all;
+    sigemptyset(&none);
+    sigfillset(&all);
+    posix_spawnattr_setsigmask(&attributes, &none);
+    posix_spawnattr_setsigdefault(&attributes, &all);
+    posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETSIGDEF);
+    pid_t worker = 0;
+    const int error =
+        posix_spawn(&worker, workerPath_.c_str(), &actions, &attributes, argv.data(), environ);
+    posix_spawn_file_actions_destroy(&actions);
+    posix_spawnattr_destroy(&attributes);
+    close(pipe[1]);
+    if (error != 0) {
+        close(pipe[0]);
+        glyphwell::AppLog("Cannot start %s: %s", Escaped(workerPath_).c_str(),
+                          std::strerror(error));
         return false;
     }
-    glyphwell::AppLog("Asking to download %s for %s (process %d)", Escaped(burst.fontNames).c_str(),
-                      Escaped(burst.displayName).c_str(), int(burst.pid));
+    workerAnswer_.clear();
+    choiceSize_ = std::string::npos;
+    asked_ = false;
+    int result = sd_event_add_child(event_, &workerExit_, worker, WEXITED, OnWorkerExit, this);
+    if (result < 0) {
+        kill(worker, SIGKILL);
+        waitpid(worker, nullptr, 0);
+        close(pipe[0]);
+    } else {
+        sd_event_source_set_child_process_own(workerExit_, 1);
+        result = sd_event_add_io(event_, &workerOutput_, pipe[0], EPOLLIN, OnWorkerOutput, this);
+        if (result < 0)
+            close(pipe[0]);
+        else
+            sd_event_source_set_io_fd_own(workerOutput_, 1);
+    }
+    if (result >= 0)
+        result = sd_event_add_time_relative(event_, &workerTimer_, CLOCK_MONOTONIC,
+                                            kWorkerMicroseconds, 0, OnWorkerTimeout, this);
+    if (result < 0) {
+        EndWorker();
+        glyphwell::AppLog("Cannot watch the font chooser for %s: %s", Escaped(burst.sender).c_str(),
+                          std::strerror(-result));
+        return false;
+    }
     return true;
 }
 
-int QZFontAsker::OnCallEvent(sd_event_source*, int, uint32_t, void* data) {
+bool QZFontAsker::ReadWorkerOutput() {
+    char buffer[16384];
+    for (;;) {
+        const ssize_t count = read(sd_event_source_get_io_fd(workerOutput_), buffer, sizeof buffer);
+        if (count < 0 && errno == EINTR)
+            continue;
+        if (count == 0 || (count < 0 && errno != EAGAIN))
+            sd_event_source_set_enabled(workerOutput_, SD_EVENT_OFF); // the worker's exit follows
+        if (count <= 0)
+            return true;
+        if (workerAnswer_.size() + size_t(count) > kMaximumAnswerSize)
+            return false;
+        workerAnswer_.append(buffer, size_t(count));
+    }
+}
+
+int QZFontAsker::OnWorkerOutput(sd_event_source*, int, uint32_t, void* data) {
     QZFontAsker& asker = *static_cast<QZFontAsker*>(data);
-    glyphwell_reply* reply = nullptr;
-    const int status = glyphwell_call_dispatch(asker.call_, &reply);
-    if (status == GLYPHWELL_IN_PROGRESS) {
-        sd_event_source_set_io_events(asker.callSource_,
-                                      EpollEvents(glyphwell_call_get_events(asker.call_)));
+    if (!asker.ReadWorkerOutput()) {
+        glyphwell::AppLog("Dropping the font request of %s: its font chooser wrote over %zu bytes",
+                          Escaped(asker.asking_->sender).c_str(), kMaximumAnswerSize);
+        asker.DropChoice();
         return 0;
     }
-    const int result = glyphwell_reply_get_result(reply);
-    glyphwell_reply_free(reply);
-    asker.Finish(status, result);
+    if (!asker.Progress()) {
+        glyphwell::AppLog("Dropping the font request of %s: its font chooser gave no answer",
+                          Escaped(asker.asking_->sender).c_str());
+        asker.DropChoice();
+    }
     return 0;
 }
 
-void QZFontAsker::Finish(int status, int result) {
-    callSource_ = sd_event_source_disable_unref(callSource_);
-    call_ = (glyphwell_call_free(call_), nullptr);
+int QZFontAsker::OnWorkerTimeout(sd_event_source*, uint64_t, void* data) {
+    QZFontAsker& asker = *static_cast<QZFontAsker*>(data);
+    glyphwell::AppLog("Dropping the font request of %s: its font chooser did not finish in %llu s",
+                      Escaped(asker.asking_->sender).c_str(),
+                      static_cast<unsigned long long>(kWorkerMicroseconds / 1000000));
+    asker.DropChoice();
+    return 0;
+}
+
+int QZFontAsker::OnWorkerExit(sd_event_source*, const siginfo_t* info, void* data) {
+    QZFontAsker& asker = *static_cast<QZFontAsker*>(data);
+    // The worker has written all it will: what the pipe still holds is read now.
+    const bool read = asker.ReadWorkerOutput() && asker.Progress();
+    QZFontQuestionTail tail;
+    const bool answered =
+        read && info->si_code == CLD_EXITED && info->si_status == 0 &&
+        asker.choiceSize_ != std::string::npos &&
+        QZDecodeQuestionTail(std::string_view(asker.workerAnswer_).substr(asker.choiceSize_),
+                             &tail) &&
+        (tail.ended || !tail.asking);
+    if (!answered) {
+        const std::string sender = Escaped(asker.asking_->sender);
+        if (info->si_code != CLD_EXITED)
+            glyphwell::AppLog("Dropping the font request of %s: its font chooser was ended by "
+                              "signal %d",
+                              sender.c_str(), info->si_status);
+        else if (info->si_status != 0)
+            glyphwell::AppLog("Dropping the font request of %s: its font chooser ended with "
+                              "status %d",
+                              sender.c_str(), info->si_status);
+        else
+            glyphwell::AppLog("Dropping the font request of %s: its font chooser gave no answer",
+                              sender.c_str());
+        asker.DropChoice();
+        return 0;
+    }
+    asker.EndWorker();
+    if (tail.ended && !tail.asking)
+        glyphwell::AppLog("Cannot ask the agent about the fonts for %s: %s",
+                          Escaped(asker.asking_->displayName).c_str(),
+                          Escaped(tail.statusText).c_str());
+    if (tail.ended && tail.asking)
+        asker.Finish(tail.status, tail.result, tail.statusText);
+    else
+        asker.DropChoice();
+    return 0;
+}
+
+bool QZFontAsker::Progress() {
+    if (choiceSize_ == std::string::npos) {
+        const size_t size = QZFontChoiceSize(workerAnswer_);
+        if (size == std::string::npos)
+            return true;
+        QZFontChoice choice;
+        if (!QZDecodeFontChoice(std::string_view(workerAnswer_).substr(0, size), &choice))
+            return false;
+        choiceSize_ = size;
+        Chosen(choice);
+    }
+    static const std::string kAsking = QZEncodeQuestionAsking();
+    if (!asked_ && workerAnswer_.compare(choiceSize_, kAsking.size(), kAsking) == 0) {
+        // The question is up: the user takes the time they need.
+        asked_ = true;
+        workerTimer_ = sd_event_source_disable_unref(workerTimer_);
+        glyphwell::AppLog("Asking to download %s for %s (process %d)",
+                          Escaped(asking_->fontNames).c_str(),
+                          Escaped(asking_->displayName).c_str(), int(asking_->pid));
+    }
+    return true;
+}
+
+void QZFontAsker::EndWorker() {
+    workerTimer_ = sd_event_source_disable_unref(workerTimer_);
+    workerOutput_ = sd_event_source_disable_unref(workerOutput_);
+    workerExit_ = sd_event_source_disable_unref(workerExit_);
+    workerAnswer_ = std::string();
+}
+
+void QZFontAsker::DropChoice() {
+    EndWorker();
+    asking_.reset();
+    Next();
+}
+
+void QZFontAsker::Chosen(const QZFontChoice& choice) {
+    Burst& burst = *asking_;
+    burst.displayName = choice.displayName;
+    burst.fontNames = choice.fontNames;
+    if (!choice.unserved.empty())
+        glyphwell::AppLog("No catalog font for %s, asked for by %s",
+                          Escaped(choice.unserved).c_str(), Escaped(burst.displayName).c_str());
+    if (choice.fonts.empty() && choice.unserved.empty())
+        glyphwell::AppLog("Not asking about fonts for %s: what it asked for is installed or "
+                          "was declined",
+                          Escaped(burst.displayName).c_str());
+}
+
+void QZFontAsker::Finish(int status, int result, const std::string& statusText) {
     std::unique_ptr<Burst> burst = std::move(asking_);
     if (status < 0) {
         glyphwell::AppLog("The agent did not answer about the fonts for %s: %s",
-                          Escaped(burst->displayName).c_str(), glyphwell_status_text(status));
+                          Escaped(burst->displayName).c_str(), Escaped(statusText).c_str());
     } else if (result == 1) {
         glyphwell::AppLog("Installed %s for %s", Escaped(burst->fontNames).c_str(),
                           Escaped(burst->displayName).c_str());
         Notify(burst->fontNames, burst->displayName);
-    } else if (!ProcessExists(burst->pid)) {
-        // The application quit and its question was withdrawn: nothing was declined.
-    } else if (!burst->askedLanguages.empty() &&
-               !declined_.Record(burst->application, burst->askedLanguages, time(nullptr))) {
-        glyphwell::AppLog("Cannot remember the declined languages in %s",
-                          Escaped(QZDeclinedLanguages::DefaultPath()).c_str());
     }
     Next();
 }

@@ -11,6 +11,7 @@ zenity or python3-gi.
 
 usage: bus-bridge.py AGENT GLYPHWELL BRIDGE"""
 import os
+import shutil
 import subprocess
 import sys
 
@@ -234,6 +235,25 @@ def test(agent, tool, bridge):
         bridge_process.terminate()
         check(bridge_process.wait(10) == 0, "the bridge did not end cleanly on SIGTERM")
         check(owned() == "(false,)", "the name outlived the bridge")
+
+        # A font chooser that crashes, fails or answers nonsense: one line, the burst dropped.
+        os.makedirs(run.path("broken"))
+        shutil.copy(bridge, run.path("broken"))
+        worker = run.path("broken/glyphwell-bus-bridge-worker")
+        broken = run.start("broken", [run.path("broken/glyphwell-bus-bridge")])
+        wait_for("the bridge to own the name", lambda: owned() == "(true,)")
+        for script, line in [("kill -SEGV $$", "its font chooser was ended by signal 11"),
+                             ("exit 3", "its font chooser ended with status 3"),
+                             ("printf 'name=x'", "its font chooser gave no answer")]:
+            with open(worker, "w") as f:
+                f.write(f"#!/bin/sh\n{script}\n")
+            os.chmod(worker, 0o755)
+            client("async", "", "[':lang=ja']")
+            wait_for(f"the bridge to log {line!r}", lambda: line in run.read("broken.log"))
+        check(run.read("broken.log").count("Dropping the font request") == 3,
+              f"not one line per broken chooser: {run.read('broken.log')}")
+        broken.terminate()
+        check(broken.wait(10) == 0, "the bridge did not end cleanly on SIGTERM")
 
 
 if __name__ == "__main__":

@@ -65,7 +65,8 @@ dpkg-deb -x "$deb" "$root" || fail "dpkg-deb -x failed"
 dpkg-deb -e "$deb" "$tmp/control" || fail "dpkg-deb -e failed"
 
 # --- Contents and dependencies.
-for file in usr/libexec/GlyphwellUIAgent usr/libexec/glyphwell-bus-bridge usr/bin/glyphwell; do
+for file in usr/libexec/GlyphwellUIAgent usr/libexec/glyphwell-bus-bridge \
+    usr/libexec/glyphwell-bus-bridge-worker usr/bin/glyphwell; do
     [ -x "$root/$file" ] || fail "/$file is missing or not executable"
 done
 for file in usr/lib/systemd/user/$unit usr/lib/systemd/user/glyphwell-ui-agent.service \
