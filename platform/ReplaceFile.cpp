@@ -3,6 +3,7 @@
 #include <cerrno>
 #include <cstdio>
 #include <cstdlib>
+#include <fcntl.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -13,7 +14,8 @@ std::string WriteFileBeside(const std::string& target, std::string_view bytes, m
     std::string path = slash == std::string::npos ? "." + target + ".XXXXXX"
                                                   : target.substr(0, slash + 1) + "." +
                                                         target.substr(slash + 1) + ".XXXXXX";
-    const int fd = mkstemp(path.data());
+    // Close-on-exec: a process that spawns helpers (the bridge, the agent) hands them no copy.
+    const int fd = mkostemp(path.data(), O_CLOEXEC);
     if (fd < 0)
         return {};
     bool good = fchmod(fd, mode) == 0;
