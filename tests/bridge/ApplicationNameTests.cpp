@@ -2,6 +2,7 @@
 #include <filesystem>
 #include <fstream>
 #include <gtest/gtest.h>
+#include <tuple>
 
 #include "bridge/QZApplicationName.h"
 #include "bridge/QZDeclinedLanguages.h"
@@ -33,12 +34,8 @@ TEST_F(BridgeFilesTest, NamesTheApplicationInTheUsersLanguage) {
           "[Other]\nName=Later\n");
     const std::string path = QZDesktopEntryPath("org.example.App");
     ASSERT_EQ(path, (directory_ / "applications/org.example.App.desktop").string());
-    struct Case {
-        const char* language; ///< LANGUAGE
-        const char* locale;   ///< LC_ALL
-        std::string name;
-    };
-    const std::vector<Case> cases = {
+    // LANGUAGE, LC_ALL, the name read.
+    const std::tuple<const char*, const char*, std::string> cases[] = {
         {nullptr, "C.UTF-8", "Application"},
         {nullptr, "de_AT.UTF-8", "Anwendung"},
         {nullptr, "pt_BR.UTF-8", "Aplicativo"},
@@ -46,11 +43,11 @@ TEST_F(BridgeFilesTest, NamesTheApplicationInTheUsersLanguage) {
         {"it:de", "C", "Anwendung"},
         {nullptr, "fr_FR.ISO-8859-15@euro", "Appli"},
     };
-    for (const Case& test : cases) {
-        SCOPED_TRACE(test.locale);
-        environment_.Set("LANGUAGE", test.language);
-        environment_.Set("LC_ALL", test.locale);
-        EXPECT_EQ(QZDesktopEntryName(path), test.name);
+    for (const auto& [language, locale, name] : cases) {
+        SCOPED_TRACE(locale);
+        environment_.Set("LANGUAGE", language);
+        environment_.Set("LC_ALL", locale);
+        EXPECT_EQ(QZDesktopEntryName(path), name);
     }
     for (const char* id : {"", "../x.desktop", ".hidden", "missing.desktop"})
         EXPECT_EQ(QZDesktopEntryPath(id), "") << id;

@@ -34,14 +34,8 @@ TEST(FontChoice, RequestSurvivesTheArgumentsAndBadArgumentsAreRefused) {
 }
 
 TEST(FontChoice, AnswerSurvivesEncodingAndIncompleteAnswersAreRefused) {
-    QZFontChoice choice{
-        "app",
-        "Example App",
-        "/apps/app.desktop",
-        {"ja"},
-        "Noto Sans JP",
-        "xx",
-        {{"NotoSansJP-Regular", "Noto Sans JP"}, {"NotoSansJP-Bold", "Noto Sans JP"}}};
+    QZFontChoice choice{"app", "Example App", "/a/app.desktop", {"ja"}, "Noto Sans JP", "xx", {}};
+    choice.fonts = {{"NotoSansJP-Regular", "Noto Sans JP"}, {"NotoSansJP-Bold", "Noto Sans JP"}};
     const std::string text = QZEncodeFontChoice(choice);
     QZFontChoice read;
     ASSERT_TRUE(QZDecodeFontChoice(text, &read));

@@ -50,6 +50,8 @@ protected:
 TEST_F(FontResumeTest, ACutTransferResumesWhereItStopped) {
     const std::string serif = ReadFile(kDejaVu + "DejaVuSerif.ttf");
     const size_t half = serif.size() / 2;
+    const std::string fromHalf = "bytes=" + std::to_string(half) + "-",
+                      fromEnd = "bytes=" + std::to_string(serif.size()) + "-";
     LoopbackHTTPServer server;
     struct Case {
         const char* what;
@@ -58,28 +60,12 @@ TEST_F(FontResumeTest, ACutTransferResumesWhereItStopped) {
         std::string lastRange;     // the Range header of the last request, "" for none
         bool seedComplete = false; // a complete partial is there before the download
     } cases[] = {
-        {"drop once, strong ETag",
-         {.dropAfter = half, .etag = "\"v1\"", .dropOnce = true},
-         2,
-         "bytes=" + std::to_string(half) + "-"},
-        {"drop once, Last-Modified only",
-         {.dropAfter = half, .lastModified = "Mon, 07 Dec 2026 01:00:00 GMT", .dropOnce = true},
-         2,
-         "bytes=" + std::to_string(half) + "-"},
-        {"weak ETag: no range", {.dropAfter = half, .etag = "W/\"v1\"", .dropOnce = true}, 2, ""},
-        {"ignores Range: starts over",
-         {.dropAfter = half, .etag = "\"v1\"", .ignoreRange = true, .dropOnce = true},
-         2,
-         "bytes=" + std::to_string(half) + "-"},
-        {"changed between tries: starts over",
-         {.dropAfter = half, .etag = "\"v1\"", .dropOnce = true, .changedETag = "\"v2\""},
-         3,
-         ""},
-        {"416 on a complete partial",
-         {.etag = "\"v1\""},
-         1,
-         "bytes=" + std::to_string(serif.size()) + "-",
-         true},
+        {"strong ETag", {.etag = "\"v1\""}, 2, fromHalf},
+        {"Last-Modified only", {.lastModified = "Mon, 07 Dec 2026 01:00:00 GMT"}, 2, fromHalf},
+        {"weak ETag: no range", {.etag = "W/\"v1\""}, 2, ""},
+        {"ignores Range: starts over", {.etag = "\"v1\"", .ignoreRange = true}, 2, fromHalf},
+        {"changed between tries: starts over", {.etag = "\"v1\"", .changedETag = "\"v2\""}, 3, ""},
+        {"416 on a complete partial", {.etag = "\"v1\""}, 1, fromEnd, true},
     };
     int index = 0;
     for (const Case& c : cases) {
@@ -87,6 +73,8 @@ TEST_F(FontResumeTest, ACutTransferResumesWhereItStopped) {
         const std::string path = "/f" + std::to_string(index++);
         Resource resource = c.resource;
         resource.body = serif;
+        resource.dropAfter = half; // the first answer breaks off half-way
+        resource.dropOnce = true;
         server.Serve(path, resource);
         if (c.seedComplete) {
             fs::create_directories(QZPartialDownloadDirectory());
@@ -98,14 +86,8 @@ TEST_F(FontResumeTest, ACutTransferResumesWhereItStopped) {
         ASSERT_EQ(result.outcome, QZFontDownloadOutcome::Installed) << result.failureReason;
         EXPECT_EQ(SHA256Of(ReadFile(QString::fromStdString(result.path))), SHA256Of(serif));
         EXPECT_EQ(server.RequestCount(path), c.requests);
-        const std::string headers = server.LastRequestHeaders(path);
-        const size_t range = headers.find("Range: ");
-        EXPECT_EQ(range == std::string::npos
-                      ? ""
-                      : headers.substr(range + 7, headers.find("\r\n", range) - range - 7),
-                  c.lastRange)
-            << headers;
-        EXPECT_EQ(headers.find("Accept-Encoding"), std::string::npos);
+        EXPECT_EQ(server.LastRequestHeader(path, "Range"), c.lastRange);
+        EXPECT_EQ(server.LastRequestHeader(path, "Accept-Encoding"), "");
         EXPECT_FALSE(fs::exists(Partial(serif)));
         fs::remove(result.path);
     }

@@ -147,15 +147,15 @@ class Run:
         self.processes.append(process)
         return process
 
-    def start_session_bus(self, service_dir=None):
-        """Starts a private session bus (eavesdropping allowed, services from `service_dir` when
-        given) and points the environment at it."""
-        services = f"<servicedir>{service_dir}</servicedir>" if service_dir else ""
+    def start_session_bus(self):
+        """Starts a private session bus, its service files in the folder `services`, and points
+        the environment at it."""
+        os.makedirs(self.path("services"))
         with open(self.path("bus.conf"), "w") as f:
             f.write(f'<busconfig><type>session</type><listen>unix:path={self.path("bus")}</listen>'
-                    f'{services}<auth>EXTERNAL</auth><policy context="default"><allow '
-                    'send_destination="*" eavesdrop="true"/><allow eavesdrop="true"/><allow '
-                    'own="*"/></policy></busconfig>\n')
+                    f'<servicedir>{self.path("services")}</servicedir><auth>EXTERNAL</auth><policy '
+                    'context="default"><allow send_destination="*" eavesdrop="true"/><allow '
+                    'eavesdrop="true"/><allow own="*"/></policy></busconfig>\n')
         self.start("dbus", ["dbus-daemon", "--nofork", "--config-file", self.path("bus.conf")])
         wait_for("the private bus", lambda: os.path.exists(self.path("bus")))
         self.env["DBUS_SESSION_BUS_ADDRESS"] = "unix:path=" + self.path("bus")

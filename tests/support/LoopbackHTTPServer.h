@@ -101,11 +101,11 @@ public:
         return found == requestCounts_.end() ? 0 : found->second;
     }
 
-    /// The header lines of the last request for `path`, "Name: value\r\n" each.
-    std::string LastRequestHeaders(const std::string& path) const {
+    /// The value of the header `name` in the last request for `path`, empty when absent.
+    std::string LastRequestHeader(const std::string& path, const std::string& name) const {
         std::lock_guard<std::mutex> lock(mutex_);
-        const auto found = lastHeaders_.find(path);
-        return found == lastHeaders_.end() ? std::string() : found->second;
+        const auto found = lastRequests_.find(path);
+        return found == lastRequests_.end() ? std::string() : HeaderOf(found->second, name);
     }
 
     /// Waits until `path` was requested at least `count` times; false after `timeout`.
@@ -162,13 +162,12 @@ private:
             return;
         const bool head = request.compare(0, methodEnd, "HEAD") == 0;
         const std::string path = request.substr(methodEnd + 1, pathEnd - methodEnd - 1);
-        const std::string headers = request.substr(pathEnd, request.find("\r\n\r\n") - pathEnd);
         std::shared_ptr<const Resource> shared;
         int number = 0;
         {
             std::lock_guard<std::mutex> lock(mutex_);
             number = ++requestCounts_[path];
-            lastHeaders_[path] = headers.substr(std::min(headers.size(), headers.find('\n') + 1));
+            lastRequests_[path] = request;
             requested_.notify_all();
             const auto entry = resources_.find(path);
             if (entry != resources_.end())
@@ -264,7 +263,7 @@ private:
     std::vector<std::thread> connections_;
     std::map<std::string, std::shared_ptr<const Resource>> resources_;
     std::map<std::string, int> requestCounts_;
-    std::map<std::string, std::string> lastHeaders_;
+    std::map<std::string, std::string> lastRequests_;
 };
 
 } // namespace glyphwell::testing
