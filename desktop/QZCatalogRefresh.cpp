@@ -14,6 +14,7 @@
 #include <unistd.h>
 
 #include "desktop/QZCatalogPublishers.h"
+#include "desktop/QZCurlHandle.h"
 #include "desktop/QZDownloadableFontCatalog.h"
 #include "platform/LogEscape.h"
 #include "platform/ReplaceFile.h"
@@ -127,10 +128,8 @@ size_t ReceiveHeader(char* bytes, size_t, size_t count, void* context) {
 
 /// GETs `url` with the extra request `headers`, keeping at most `limit` body bytes.
 Response Get(const std::string& url, uint64_t limit, const std::vector<std::string>& headers) {
-    static const CURLcode initialized = curl_global_init(CURL_GLOBAL_DEFAULT);
     Response response;
-    std::unique_ptr<CURL, decltype(&curl_easy_cleanup)> curl(
-        initialized == CURLE_OK ? curl_easy_init() : nullptr, curl_easy_cleanup);
+    const QZCurlHandle curl = QZCreateCurlHandle();
     if (!curl) {
         response.error = "libcurl cannot be set up";
         return response;

@@ -19,6 +19,7 @@
 #include <thread>
 #include <unistd.h>
 
+#include "desktop/QZCurlHandle.h"
 #include "desktop/QZFontFileWriter.h"
 #include "desktop/QZFontMatching.h"
 #include "desktop/QZPartialDownload.h"
@@ -52,17 +53,6 @@ std::string Text(const char* sourceText, uint64_t first, uint64_t second) {
         .arg(qulonglong(second))
         .toStdString();
 }
-
-void InitializeCurlOnce() {
-    static std::once_flag once;
-    std::call_once(once, [] { curl_global_init(CURL_GLOBAL_DEFAULT); });
-}
-
-/// The libcurl easy handle of one transfer, cleaned up with it.
-struct EasyHandleCleanup {
-    void operator()(CURL* easy) const { curl_easy_cleanup(easy); }
-};
-using EasyHandle = std::unique_ptr<CURL, EasyHandleCleanup>;
 
 using Clock = std::chrono::steady_clock;
 
@@ -468,7 +458,6 @@ bool CopyPartial(const QZPartialDownload& partial, QZFontFileWriter& file,
 QZFontDownloadResult Fetch(const QZFontAssetDownload& asset, const std::string& directory,
                            QZFontFileWriter& file, const QZDownloadProgressFunction& progress,
                            QZDownloadCancellation* cancellation, unsigned char (&head)[4]) {
-    InitializeCurlOnce();
     QZPartialDownload partial;
     if (!partial.Open(QZPartialDownloadDirectory(), asset.sha256, asset.url, asset.size))
         return WriteFailure(errno);
@@ -491,7 +480,7 @@ QZFontDownloadResult Fetch(const QZFontAssetDownload& asset, const std::string& 
                 return WriteFailure(errno);
             digest.emplace();
         }
-        const EasyHandle easy(curl_easy_init());
+        const QZCurlHandle easy = QZCreateCurlHandle();
         if (!easy)
             return Failure(Text("The download failed: %1", QStringLiteral("out of memory")));
         Transfer transfer;

@@ -15,6 +15,7 @@
 #include <fstream>
 #include <memory>
 
+#include "desktop/QZCurlHandle.h"
 #include "desktop/QZSHA256.h"
 
 namespace glyphwell::tools {
@@ -177,10 +178,8 @@ size_t Receive(char* bytes, size_t size, size_t count, void* context) {
 } // namespace
 
 FetchResult FetchAsset(const std::string& url, uint64_t limit, const FetchProgress& progress) {
-    static const CURLcode initialized = curl_global_init(CURL_GLOBAL_DEFAULT);
     FetchResult result;
-    std::unique_ptr<CURL, decltype(&curl_easy_cleanup)> curl(
-        initialized == CURLE_OK ? curl_easy_init() : nullptr, curl_easy_cleanup);
+    const QZCurlHandle curl = QZCreateCurlHandle();
     if (!curl) {
         result.error = "libcurl cannot be set up";
         return result;
